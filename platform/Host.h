@@ -1,0 +1,77 @@
+// The one seam of the platform: where it finds things on this machine, and the few parts of it that touch the world.
+//
+// Production code takes the defaults. A test installs a host of its own for one scope with HostOverride, and
+// everything below the faces uses that one until the scope ends.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace platform {
+
+namespace apply {
+class Agent;
+}
+namespace services {
+class Downloader;
+class Opener;
+}  // namespace services
+namespace live {
+class NetworkState;
+}
+
+struct Host {
+    // Holds preferences.plist and its lock file.
+    std::string preferencesDirectory = "/var/lib/location-assistant";
+    // Holds the record of what was applied and of how the machine was before; lives as long as one boot.
+    std::string runtimeDirectory = "/run/location-assistant";
+    std::string sysfsRoot = "/sys";
+    // The name servers' file.
+    std::string resolverFile = "/etc/resolv.conf";
+    // The system bus, as a path of a socket.
+    std::string systemBusSocket = "/run/dbus/system_bus_socket";
+    // Holds one control socket of the wireless supplicant for each interface.
+    std::string supplicantDirectory = "/run/wpa_supplicant";
+
+    // The DHCP client, and the program that it runs when a lease comes and goes.
+    std::string dhcpClient = "/usr/bin/busybox";
+    // Empty: beside this program's file, or where the program was installed.
+    std::string dhcpHook;
+
+    // The modem-script folders of the four domains. An empty user folder stands for
+    // <home from the password database>/.local/share/modem-scripts.
+    std::string userModemScripts;
+    std::string networkModemScripts = "/net/share/modem-scripts";
+    std::string localModemScripts = "/usr/local/share/modem-scripts";
+    std::string systemModemScripts = "/usr/share/modem-scripts";
+
+    // A BCD version number; nothing: the question fails.
+    std::optional<std::int32_t> systemVersion = 0x1040;
+
+    // Null: the platform's own, chosen at the call.
+    std::shared_ptr<apply::Agent> agent;
+    std::shared_ptr<services::Downloader> downloader;
+    std::shared_ptr<services::Opener> opener;
+    std::shared_ptr<live::NetworkState> networkState;
+};
+
+// The host in force.
+[[nodiscard]] const Host& currentHost();
+
+// Puts a host in force until the end of its scope, then the one before it again.
+class HostOverride {
+  public:
+    explicit HostOverride(Host host);
+    ~HostOverride();
+    HostOverride(const HostOverride&) = delete;
+    HostOverride& operator=(const HostOverride&) = delete;
+
+  private:
+    Host host_;
+    const Host* previous_;
+};
+
+}  // namespace platform
