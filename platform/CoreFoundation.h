@@ -1,12 +1,13 @@
 // Property-list values, strings, URLs and the run loop.
 //
-// Every value is reference-counted. A function whose name contains Create or Copy hands its caller one reference,
-// to be given back with CFRelease; a function whose name contains Get hands out a borrowed value that lives as long
-// as the value it was taken from holds it. Containers retain what is put into them. Retain counts are atomic;
-// everything else is for one thread at a time. Null stands for "no value" only where a function says so.
+// Every value is reference-counted. A function whose name contains Create or Copy hands its caller one
+// reference, to be given back with CFRelease; a function whose name contains Get hands out a borrowed value
+// that lives as long as the value it was taken from holds it. Containers retain what is put into them. Retain
+// counts are atomic; everything else is for one thread at a time. Null stands for "no value" only where a
+// function says so.
 //
-// Strings are UTF-8 inside. Lengths, indices and characters count UTF-16 code units. The system's text encoding is
-// UTF-8, and bytes that are not well-formed UTF-8 make no string.
+// Strings are UTF-8 inside. Lengths, indices and characters count UTF-16 code units. The system's text
+// encoding is UTF-8, and bytes that are not well-formed UTF-8 make no string.
 #pragma once
 
 #include <cstddef>
@@ -61,7 +62,11 @@ using CFRunLoopSourceRef = OpaqueCFRunLoopSource*;
 using CFAllocatorRef = const OpaqueCFAllocator*;
 inline constexpr CFAllocatorRef kCFAllocatorDefault = nullptr;
 
-enum CFComparisonResult : CFIndex { kCFCompareLessThan = -1, kCFCompareEqualTo = 0, kCFCompareGreaterThan = 1 };
+enum CFComparisonResult : CFIndex {
+    kCFCompareLessThan = -1,
+    kCFCompareEqualTo = 0,
+    kCFCompareGreaterThan = 1
+};
 using CFComparatorFunction = CFComparisonResult (*)(const void* lhs, const void* rhs, void* context);
 
 inline constexpr CFIndex kCFNotFound = -1;
@@ -70,7 +75,9 @@ struct CFRange {
     CFIndex location;
     CFIndex length;
 };
-inline CFRange CFRangeMake(CFIndex location, CFIndex length) { return CFRange{location, length}; }
+inline CFRange CFRangeMake(CFIndex location, CFIndex length) {
+    return CFRange{location, length};
+}
 
 // --- Every value ---
 
@@ -81,11 +88,12 @@ void CFRelease(CFTypeRef value);
 // The number of references held, for tests.
 CFIndex CFGetRetainCount(CFTypeRef value);
 CFTypeID CFGetTypeID(CFTypeRef value);
-// Equality by content, through containers; values of different types are unequal, and so are a boolean and a number.
-// The order of a dictionary's entries does not matter. A mutable value can equal an immutable one.
+// Equality by content, through containers; values of different types are unequal, and so are a boolean and a
+// number. The order of a dictionary's entries does not matter. A mutable value can equal an immutable one.
 Boolean CFEqual(CFTypeRef lhs, CFTypeRef rhs);
-// One line of text that tells a person what the value is: a string as it stands, a number in decimal, "true" or
-// "false", data as hexadecimal between angle brackets, a date in ISO 8601, containers as "{key = value; ...}" and
+// One line of text that tells a person what the value is: a string as it stands, a number in decimal, "true"
+// or "false", data as hexadecimal between angle brackets, a date in ISO 8601, containers as "{key = value;
+// ...}" and
 // "(a, b)"; line breaks inside are shown as spaces. Never null.
 CFStringRef CFCopyDescription(CFTypeRef value);
 
@@ -112,19 +120,22 @@ CFStringRef CFStringCreateWithBytes(CFAllocatorRef allocator, const UInt8* bytes
 CFStringRef CFStringCreateWithCharacters(CFAllocatorRef allocator, const UniChar* characters, CFIndex count);
 // printf's conversions %d %i %u %ld %lu %s %c %x %% with flags, width and precision, and %@ for a value (its
 // CFCopyDescription; a null one gives "(null)"). formatOptions is null. Null when the result is not text.
-CFStringRef CFStringCreateWithFormat(CFAllocatorRef allocator, CFDictionaryRef formatOptions, CFStringRef format, ...);
+CFStringRef CFStringCreateWithFormat(CFAllocatorRef allocator, CFDictionaryRef formatOptions,
+                                     CFStringRef format, ...);
 CFStringRef CFStringCreateCopy(CFAllocatorRef allocator, CFStringRef string);
 // maxLength is a hint and may be 0.
 CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef allocator, CFIndex maxLength, CFStringRef string);
 // Null when the range leaves the string or cuts a character of two units.
 CFStringRef CFStringCreateWithSubstring(CFAllocatorRef allocator, CFStringRef string, CFRange range);
-// The pieces of the string between the separators, empty ones included; a string without the separator is one piece.
-CFArrayRef CFStringCreateArrayBySeparatingStrings(CFAllocatorRef allocator, CFStringRef string, CFStringRef separator);
+// The pieces of the string between the separators, empty ones included; a string without the separator is one
+// piece.
+CFArrayRef CFStringCreateArrayBySeparatingStrings(CFAllocatorRef allocator, CFStringRef string,
+                                                  CFStringRef separator);
 CFIndex CFStringGetLength(CFStringRef string);
 // Copies the units of the range, in host byte order, into the buffer, which must have room for them.
 void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer);
-// Copies the text and a final NUL. False, with the buffer's content undefined, when it does not fit in bufferSize
-// bytes or the encoding cannot carry it.
+// Copies the text and a final NUL. False, with the buffer's content undefined, when it does not fit in
+// bufferSize bytes or the encoding cannot carry it.
 Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize, CFStringEncoding encoding);
 // The string's own bytes, NUL-terminated, borrowed until it is changed or released; null when the encoding is
 // neither UTF-8 nor, for a string of ASCII characters only, ASCII or Mac OS Roman.
@@ -140,10 +151,10 @@ void CFStringReplace(CFMutableStringRef string, CFRange range, CFStringRef repla
 void CFStringLowercase(CFMutableStringRef string, const void* locale);
 
 // A constant string, made once per place in the program and never destroyed. The text is a literal in UTF-8.
-#define CFSTR(text)                                                          \
-    ([]() noexcept -> CFStringRef {                                          \
+#define CFSTR(text)                                                           \
+    ([]() noexcept -> CFStringRef {                                           \
         static const CFStringRef constant = CFStringMakeConstant("" text ""); \
-        return constant;                                                     \
+        return constant;                                                      \
     }())
 CFStringRef CFStringMakeConstant(const char* text) noexcept;
 
@@ -158,7 +169,8 @@ inline constexpr CFNumberType kCFNumberLongType = kCFNumberSInt32Type;
 
 CFTypeID CFNumberGetTypeID();
 CFNumberRef CFNumberCreate(CFAllocatorRef allocator, CFNumberType type, const void* value);
-// False when the number cannot be given in the type without loss; the value is then written as far as it goes.
+// False when the number cannot be given in the type without loss; the value is then written as far as it
+// goes.
 Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value);
 // True for a number that holds a real.
 Boolean CFNumberIsFloatType(CFNumberRef number);
@@ -178,7 +190,8 @@ CFTypeID CFDateGetTypeID();
 // --- Dictionaries and arrays ---
 
 // How a container treats what it holds. The only callbacks are the ones below (retain, release, compare by
-// content); for the values of a dictionary null stands for values that are not looked at, not even to retain them.
+// content); for the values of a dictionary null stands for values that are not looked at, not even to retain
+// them.
 struct CFDictionaryKeyCallBacks;
 struct CFDictionaryValueCallBacks;
 struct CFArrayCallBacks;
@@ -186,12 +199,12 @@ extern const CFDictionaryKeyCallBacks kCFTypeDictionaryKeyCallBacks;
 extern const CFDictionaryValueCallBacks kCFTypeDictionaryValueCallBacks;
 extern const CFArrayCallBacks kCFTypeArrayCallBacks;
 
-// A dictionary enumerates its entries in the order in which their keys were first added. Keys may be any values;
-// they are found by content. Copies cost nothing until one of the two is changed.
+// A dictionary enumerates its entries in the order in which their keys were first added. Keys may be any
+// values; they are found by content. Copies cost nothing until one of the two is changed.
 CFTypeID CFDictionaryGetTypeID();
 // Of two equal keys the first one stays. Keys must not be null.
-CFDictionaryRef CFDictionaryCreate(CFAllocatorRef allocator, const void** keys, const void** values, CFIndex count,
-                                   const CFDictionaryKeyCallBacks* keyCallBacks,
+CFDictionaryRef CFDictionaryCreate(CFAllocatorRef allocator, const void** keys, const void** values,
+                                   CFIndex count, const CFDictionaryKeyCallBacks* keyCallBacks,
                                    const CFDictionaryValueCallBacks* valueCallBacks);
 // capacity is a hint and may be 0.
 CFMutableDictionaryRef CFDictionaryCreateMutable(CFAllocatorRef allocator, CFIndex capacity,
@@ -216,7 +229,8 @@ void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key)
 CFTypeID CFArrayGetTypeID();
 CFArrayRef CFArrayCreate(CFAllocatorRef allocator, const void** values, CFIndex count,
                          const CFArrayCallBacks* callBacks);
-CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef allocator, CFIndex capacity, const CFArrayCallBacks* callBacks);
+CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef allocator, CFIndex capacity,
+                                       const CFArrayCallBacks* callBacks);
 CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef allocator, CFIndex capacity, CFArrayRef array);
 CFIndex CFArrayGetCount(CFArrayRef array);
 // The index must be inside the array.
@@ -227,24 +241,26 @@ CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void*
 void CFArrayAppendValue(CFMutableArrayRef array, const void* value);
 void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index);
 // Sorts the range; equal values keep their order.
-void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunction comparator, void* context);
-// Binary search in a sorted range: the index of an equal value, or of the first greater one (which may be the end
-// of the range).
-CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value, CFComparatorFunction comparator,
-                             void* context);
+void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunction comparator,
+                       void* context);
+// Binary search in a sorted range: the index of an equal value, or of the first greater one (which may be the
+// end of the range).
+CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value,
+                             CFComparatorFunction comparator, void* context);
 
 using CFPropertyListMutabilityOptions = CFOptionFlags;
 inline constexpr CFPropertyListMutabilityOptions kCFPropertyListImmutable = 0;
 inline constexpr CFPropertyListMutabilityOptions kCFPropertyListMutableContainersAndLeaves = 2;
-// A copy of the whole value, every container and leaf in it mutable (strings and containers) or immutable as asked.
-// Null when the value is nested too deep or holds something that is not a property-list value.
+// A copy of the whole value, every container and leaf in it mutable (strings and containers) or immutable as
+// asked. Null when the value is nested too deep or holds something that is not a property-list value.
 CFPropertyListRef CFPropertyListCreateDeepCopy(CFAllocatorRef allocator, CFPropertyListRef value,
                                                CFPropertyListMutabilityOptions options);
 
 // --- URLs ---
 
 CFTypeID CFURLGetTypeID();
-// Null when the text is not a URL (RFC 3986: a scheme, and no character that would have to be escaped). base is null.
+// Null when the text is not a URL (RFC 3986: a scheme, and no character that would have to be escaped). base
+// is null.
 CFURLRef CFURLCreateWithString(CFAllocatorRef allocator, CFStringRef text, CFURLRef base);
 CFStringRef CFURLGetString(CFURLRef url);
 
@@ -259,14 +275,15 @@ inline constexpr SInt32 kCFRunLoopRunHandledSource = 4;
 
 // The run loop of the calling thread; it lives as long as the thread. Only the default mode exists.
 CFRunLoopRef CFRunLoopGetCurrent();
-// The loop retains the source until it is removed. Adding a source twice, or removing one that is not there, does
-// nothing.
+// The loop retains the source until it is removed. Adding a source twice, or removing one that is not there,
+// does nothing.
 void CFRunLoopAddSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode);
 void CFRunLoopRemoveSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode);
 // Runs the calling thread's loop until it is stopped or has no source left.
 void CFRunLoopRun();
-// The same for at most that many seconds (0: what is ready now), or until one source was handled when asked so.
+// The same for at most that many seconds (0: what is ready now), or until one source was handled when asked
+// so.
 SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds, Boolean returnAfterSourceHandled);
-// Makes a running loop return; one that does not run returns from its next run at once. Safe from another thread
-// and from a signal handler.
+// Makes a running loop return; one that does not run returns from its next run at once. Safe from another
+// thread and from a signal handler.
 void CFRunLoopStop(CFRunLoopRef loop);

@@ -6,7 +6,7 @@
 inline constexpr OSErr noErr = 0;
 inline constexpr OSErr paramErr = -50;
 inline constexpr OSErr memFullErr = -108;
-inline constexpr OSErr fnfErr = -43;                    // no such folder or file
+inline constexpr OSErr fnfErr = -43;  // no such folder or file
 inline constexpr OSErr ioErr = -36;
 inline constexpr OSErr permErr = -54;
 inline constexpr OSErr coreFoundationUnknownErr = -4960;
@@ -14,8 +14,8 @@ inline constexpr OSErr coreFoundationUnknownErr = -4960;
 // --- System version ---
 
 inline constexpr OSType gestaltSystemVersion = 0x73797376;  // 'sysv'
-// For gestaltSystemVersion a BCD number: 0x1020 is 10.2.0. Another selector, or no answer, is a failure that leaves
-// the response untouched.
+// For gestaltSystemVersion a BCD number: 0x1020 is 10.2.0. Another selector, or no answer, is a failure that
+// leaves the response untouched.
 OSErr Gestalt(OSType selector, SInt32* response);
 
 // --- Folders ---
@@ -39,8 +39,8 @@ inline constexpr SInt16 kLocalDomain = -32765;
 inline constexpr SInt16 kSystemDomain = -32766;
 inline constexpr OSType kModemScriptsFolderType = 0xC46D6F64;
 
-// The folder of that kind in a domain. createFolder must be false. fnfErr when it does not exist, paramErr for an
-// unknown kind or domain; the reference is then untouched.
+// The folder of that kind in a domain. createFolder must be false. fnfErr when it does not exist, paramErr
+// for an unknown kind or domain; the reference is then untouched.
 OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder);
 
 struct OpaqueFSIterator;
@@ -51,11 +51,12 @@ inline constexpr OSErr errFSNoMoreItems = -1417;
 
 // An iterator over the items directly in a folder, ended with FSCloseIterator; null on failure.
 OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator);
-// Up to maximumItems references and names. errFSNoMoreItems marks the last batch, which may hold items. A name that
-// is not UTF-8, or longer than 255 units, is passed over: it could not be named in a location. whichInfo is
-// kFSCatInfoNone; containerChanged, catalogInfos and specs are null; refs and names may be.
-OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems, Boolean* containerChanged,
-                           UInt32 whichInfo, void* catalogInfos, FSRef* refs, void* specs, HFSUniStr255* names);
+// Up to maximumItems references and names. errFSNoMoreItems marks the last batch, which may hold items. A
+// name that is not UTF-8, or longer than 255 units, is passed over: it could not be named in a location.
+// whichInfo is kFSCatInfoNone; containerChanged, catalogInfos and specs are null; refs and names may be.
+OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems,
+                           Boolean* containerChanged, UInt32 whichInfo, void* catalogInfos, FSRef* refs,
+                           void* specs, HFSUniStr255* names);
 OSErr FSCloseIterator(FSIterator iterator);
 
 struct LSItemInfoRecord {
@@ -65,7 +66,8 @@ inline constexpr UInt32 kLSRequestBasicFlagsOnly = 0x4;
 inline constexpr UInt32 kLSItemInfoIsPlainFile = 0x1;
 inline constexpr UInt32 kLSItemInfoIsContainer = 0x8;
 inline constexpr UInt32 kLSItemInfoIsInvisible = 0x40;
-// What the item is; links are followed, and a name that begins with a dot is invisible. fnfErr when it is gone.
+// What the item is; links are followed, and a name that begins with a dot is invisible. fnfErr when it is
+// gone.
 OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInfoRecord* info);
 
 // --- Download ---
@@ -79,15 +81,15 @@ void DisposeHandle(Handle handle);
 long GetHandleSize(Handle handle);
 const char* GetHandleData(Handle handle);
 
-// Fetches an http URL into the buffer, replacing what it holds. No proxy, no redirects, and never longer or larger
-// than the bounds of platform/services/Download.h. 0 for an answer of class 2xx; the HTTP status for every other
-// answer (404, a redirect's 302); a negative value when there was no answer. destination, eventProc and context are
-// null, flags is 0.
+// Fetches an http URL into the buffer, replacing what it holds. No proxy, no redirects, and never longer or
+// larger than the bounds of platform/services/Download.h. 0 for an answer of class 2xx; the HTTP status for
+// every other answer (404, a redirect's 302); a negative value when there was no answer. destination,
+// eventProc and context are null, flags is 0.
 OSStatus URLSimpleDownload(const char* url, const void* destination, Handle buffer, UInt32 flags,
                            const void* eventProc, void* context);
 
 // --- Opening a URL ---
 
-// Opens the URL in the browser of the user who sits at the computer, as that user, and returns without waiting for
-// it. Nothing happens when nobody does (fnfErr). openedURL must be null.
+// Opens the URL in the browser of the user who sits at the computer, as that user, and returns without
+// waiting for it. Nothing happens when nobody does (fnfErr). openedURL must be null.
 OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL);

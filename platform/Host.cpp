@@ -13,13 +13,16 @@ const Host*& inForce() {
 
 }  // namespace
 
-const Host& currentHost() { return *inForce(); }
+const Host& currentHost() {
+    return *inForce();
+}
 
-HostOverride::HostOverride(Host host)
-    : host_(std::move(host)), previous_(std::exchange(inForce(), nullptr)) {
+HostOverride::HostOverride(Host host) : host_(std::move(host)), previous_(std::exchange(inForce(), nullptr)) {
     inForce() = &host_;
 }
 
-HostOverride::~HostOverride() { inForce() = previous_; }
+HostOverride::~HostOverride() {
+    inForce() = previous_;
+}
 
 }  // namespace platform

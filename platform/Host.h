@@ -1,4 +1,5 @@
-// The one seam of the platform: where it finds things on this machine, and the few parts of it that touch the world.
+// The one seam of the platform: where it finds things on this machine, and the few parts of it that touch the
+// world.
 //
 // Production code takes the defaults. A test installs a host of its own for one scope with HostOverride, and
 // everything below the faces uses that one until the scope ends.

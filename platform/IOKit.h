@@ -1,7 +1,7 @@
 // The hardware registry: entries for network interfaces and serial ports, their properties and their parents.
 //
-// Handles are small integers with a reference count of their own; IOObjectRelease drops one reference. An iterator
-// and the entries taken from it are a snapshot of the hardware at the moment the iterator was made.
+// Handles are small integers with a reference count of their own; IOObjectRelease drops one reference. An
+// iterator and the entries taken from it are a snapshot of the hardware at the moment the iterator was made.
 #pragma once
 
 #include "platform/CoreFoundation.h"
@@ -32,17 +32,19 @@ kern_return_t IOMasterPort(mach_port_t bootstrapPort, mach_port_t* masterPort);
 CFMutableDictionaryRef IOServiceMatching(const char* className);
 // Consumes one reference of the matching dictionary, on failure too. Matches by class, or by the pair
 // "IOProviderClass" and "IOSerialBSDClientType". Entries come in a stable order.
-kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryRef matching, io_iterator_t* iterator);
+kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryRef matching,
+                                           io_iterator_t* iterator);
 // The next entry, which the caller releases, or 0 at the end.
 io_object_t IOIteratorNext(io_iterator_t iterator);
 // One property as a value of the caller's, or null.
-CFTypeRef IORegistryEntryCreateCFProperty(io_registry_entry_t entry, CFStringRef key, CFAllocatorRef allocator,
-                                          IOOptionBits options);
+CFTypeRef IORegistryEntryCreateCFProperty(io_registry_entry_t entry, CFStringRef key,
+                                          CFAllocatorRef allocator, IOOptionBits options);
 // All properties as a dictionary of the caller's; null on failure.
 kern_return_t IORegistryEntryCreateCFProperties(io_registry_entry_t entry, CFMutableDictionaryRef* properties,
                                                 CFAllocatorRef allocator, IOOptionBits options);
 // The parent, which the caller releases. plane is kIOServicePlane. The output is 0 on failure.
-kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const char* plane, io_registry_entry_t* parent);
+kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const char* plane,
+                                            io_registry_entry_t* parent);
 // Whether the entry is of the class or of a subclass of it.
 Boolean IOObjectConformsTo(io_object_t object, const char* className);
 kern_return_t IOObjectRelease(io_object_t object);

@@ -51,6 +51,8 @@ void logLine(LogLevel level, std::string_view text) {
 LogCapture::LogCapture(std::function<void(LogLevel, std::string_view)> newSink)
     : previous_(std::exchange(sink(), std::move(newSink))) {}
 
-LogCapture::~LogCapture() { sink() = std::move(previous_); }
+LogCapture::~LogCapture() {
+    sink() = std::move(previous_);
+}
 
 }  // namespace platform

@@ -1,4 +1,5 @@
-// What an operation of the platform layer came to: done, or a status of the store's table with a reason for the log.
+// What an operation of the platform layer came to: done, or a status of the store's table with a reason for
+// the log.
 #pragma once
 
 #include <cerrno>
@@ -15,11 +16,12 @@ class [[nodiscard]] Outcome {
   public:
     // Done.
     Outcome() = default;
-    // Failed with a status other than 0. The reason is one English phrase without a final full stop or line break,
-    // and holds no secret.
+    // Failed with a status other than 0. The reason is one English phrase without a final full stop or line
+    // break, and holds no secret.
     Outcome(int status, std::string reason) : status_(status), reason_(std::move(reason)) {}
 
-    // For a failed system call: 1003 for EACCES, EPERM and EROFS, 1001 for the rest; "<what>: <errno's text>".
+    // For a failed system call: 1003 for EACCES, EPERM and EROFS, 1001 for the rest; "<what>: <errno's
+    // text>".
     static Outcome fromErrno(const std::string& what, int error = errno) {
         const bool noRights = error == EACCES || error == EPERM || error == EROFS;
         return {noRights ? kSCStatusAccessError : kSCStatusFailed,

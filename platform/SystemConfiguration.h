@@ -1,7 +1,7 @@
 // The network preferences store, the live network state and reachability.
 //
-// Every call of the store and of the dynamic store sets the status that SCError returns: 0 on success, else one of
-// the values below.
+// Every call of the store and of the dynamic store sets the status that SCError returns: 0 on success, else
+// one of the values below.
 #pragma once
 
 #include "platform/CoreFoundation.h"
@@ -19,11 +19,11 @@ inline constexpr int kSCStatusNeedLock = 1007;
 inline constexpr int kSCStatusNoStoreSession = 2001;
 inline constexpr int kSCStatusNoStoreServer = 2002;
 inline constexpr int kSCStatusNotifierActive = 2003;
-inline constexpr int kSCStatusNoPrefsSession = 3001;   // the session is null
-inline constexpr int kSCStatusPrefsBusy = 3002;        // another process holds the lock
+inline constexpr int kSCStatusNoPrefsSession = 3001;  // the session is null
+inline constexpr int kSCStatusPrefsBusy = 3002;       // another process holds the lock
 inline constexpr int kSCStatusNoConfigFile = 3003;
 inline constexpr int kSCStatusNoLink = 3004;
-inline constexpr int kSCStatusStale = 3005;            // the file is no longer the one that this session read
+inline constexpr int kSCStatusStale = 3005;  // the file is no longer the one that this session read
 inline constexpr int kSCStatusMaxLink = 3006;
 
 // The status of this thread's last call of the preferences store, the dynamic store or reachability.
@@ -37,35 +37,37 @@ struct OpaqueSCPreferences;
 using SCPreferencesRef = OpaqueSCPreferences*;
 
 // A session on the network preferences as they are on disk now, released with CFRelease. name is for the log;
-// prefsID must be null. Null on failure: 1001 when the file cannot be used (not a property list, too deep, too
-// large, not a regular file), 1003 without the rights, 1002 without a name. Without a file the session holds the
-// first-run tree, in memory until something commits it.
+// prefsID must be null. Null on failure: 1001 when the file cannot be used (not a property list, too deep,
+// too large, not a regular file), 1003 without the rights, 1002 without a name. Without a file the session
+// holds the first-run tree, in memory until something commits it.
 SCPreferencesRef SCPreferencesCreate(CFAllocatorRef allocator, CFStringRef name, CFStringRef prefsID);
-// Takes the store's cross-process lock. False: 3002 when another process holds it (with wait: still holds it after
-// half a minute), 3005 when the file changed since the session read it, 1003, 3001. Locking twice succeeds.
+// Takes the store's cross-process lock. False: 3002 when another process holds it (with wait: still holds it
+// after half a minute), 3005 when the file changed since the session read it, 1003, 3001. Locking twice
+// succeeds.
 Boolean SCPreferencesLock(SCPreferencesRef session, Boolean wait);
 Boolean SCPreferencesUnlock(SCPreferencesRef session);
-// A top-level value, borrowed until the session next changes the tree below this key; null when absent (1004).
+// A top-level value, borrowed until the session next changes the tree below this key; null when absent
+// (1004).
 CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef key);
 Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPropertyListRef value);
-// The dictionary at a path of slash-separated keys ("/Sets/0/Network"); borrowed as above. Links are not followed.
-// Null: 1004 when nothing is there, 1001 when what is there, or on the way, is not a dictionary, 1002 for a
-// malformed path (no leading slash, an empty key).
+// The dictionary at a path of slash-separated keys ("/Sets/0/Network"); borrowed as above. Links are not
+// followed. Null: 1004 when nothing is there, 1001 when what is there, or on the way, is not a dictionary,
+// 1002 for a malformed path (no leading slash, an empty key).
 CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path);
-// Stores the dictionary, as it is now, at the path, making missing dictionaries on the way. 1001 when something on
-// the way is not a dictionary.
+// Stores the dictionary, as it is now, at the path, making missing dictionaries on the way. 1001 when
+// something on the way is not a dictionary.
 Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path, CFDictionaryRef value);
-// The path that the dictionary's "__LINK__" names, borrowed; null: 1004 when the dictionary is absent or is no link,
-// 1001 when something on the way or the link itself has the wrong type.
+// The path that the dictionary's "__LINK__" names, borrowed; null: 1004 when the dictionary is absent or is
+// no link, 1001 when something on the way or the link itself has the wrong type.
 CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path);
 // Removes whatever is at the path. False: 1004 when nothing is there, 1001, 1002.
 Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path);
-// Writes the changed tree, all of it or nothing; an unchanged tree is not written again. False: 3005 when the file
-// is no longer the one that was read, 3002 when another process holds the lock, 1003, 1001.
+// Writes the changed tree, all of it or nothing; an unchanged tree is not written again. False: 3005 when the
+// file is no longer the one that was read, 3002 when another process holds the lock, 1003, 1001.
 Boolean SCPreferencesCommitChanges(SCPreferencesRef session);
-// Makes the committed current location the active configuration and returns when its interfaces are up, have failed,
-// or a bounded wait is over. False: 1001 with the reason in the system log, 1003, 1004 when "CurrentSet" names no
-// location.
+// Makes the committed current location the active configuration and returns when its interfaces are up, have
+// failed, or a bounded wait is over. False: 1001 with the reason in the system log, 1003, 1004 when
+// "CurrentSet" names no location.
 Boolean SCPreferencesApplyChanges(SCPreferencesRef session);
 
 // --- Dynamic store: the live network state ---
@@ -86,25 +88,27 @@ extern const CFStringRef kSCDynamicStoreDomainState;  // "State:"
 extern const CFStringRef kSCDynamicStoreDomainSetup;  // "Setup:"
 extern const CFStringRef kSCEntNetIPv4;               // "IPv4"
 
-// A session on the live state, released with CFRelease. name may be null; callBack and context may be null when no
-// notices are wanted. Null on failure.
-SCDynamicStoreRef SCDynamicStoreCreate(CFAllocatorRef allocator, CFStringRef name, SCDynamicStoreCallBack callBack,
-                                       SCDynamicStoreContext* context);
+// A session on the live state, released with CFRelease. name may be null; callBack and context may be null
+// when no notices are wanted. Null on failure.
+SCDynamicStoreRef SCDynamicStoreCreate(CFAllocatorRef allocator, CFStringRef name,
+                                       SCDynamicStoreCallBack callBack, SCDynamicStoreContext* context);
 // "<domain>/Network/Global/<entity>".
 CFStringRef SCDynamicStoreKeyCreateNetworkGlobalEntity(CFAllocatorRef allocator, CFStringRef domain,
                                                        CFStringRef entity);
 // "<domain>/Network/Service/<serviceID>/<entity>"; without an entity the last piece is left out.
 CFStringRef SCDynamicStoreKeyCreateNetworkServiceEntity(CFAllocatorRef allocator, CFStringRef domain,
                                                         CFStringRef serviceID, CFStringRef entity);
-// The keys that match the whole of a POSIX extended regular expression, sorted by their text; an empty array when
-// none does. Null: 1002 for a malformed expression, 1001.
+// The keys that match the whole of a POSIX extended regular expression, sorted by their text; an empty array
+// when none does. Null: 1002 for a malformed expression, 1001.
 CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef pattern);
 // The value at a key; null with 1004 when there is none.
 CFPropertyListRef SCDynamicStoreCopyValue(SCDynamicStoreRef store, CFStringRef key);
 // Replaces the keys and the key patterns whose changes are reported; either may be null.
 Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef keys, CFArrayRef patterns);
-// A source that calls the session's callback with the keys whose values changed. It retains the session. order is 0.
-CFRunLoopSourceRef SCDynamicStoreCreateRunLoopSource(CFAllocatorRef allocator, SCDynamicStoreRef store, CFIndex order);
+// A source that calls the session's callback with the keys whose values changed. It retains the session.
+// order is 0.
+CFRunLoopSourceRef SCDynamicStoreCreateRunLoopSource(CFAllocatorRef allocator, SCDynamicStoreRef store,
+                                                     CFIndex order);
 
 // --- Reachability ---
 
@@ -113,8 +117,8 @@ inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsReachable = 1U << 1U;
 inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsIsLocalAddress = 1U << 16U;
 inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsIsDirect = 1U << 17U;
 
-// Asks the kernel for a route and sends nothing. True when the question could be answered; the flags then tell the
-// answer. On false they are left as they were.
+// Asks the kernel for a route and sends nothing. True when the question could be answered; the flags then
+// tell the answer. On false they are left as they were.
 Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnectionFlags* flags);
 Boolean SCNetworkCheckReachabilityByAddress(const sockaddr* address, int addressLength,
                                             SCNetworkConnectionFlags* flags);

@@ -25,7 +25,8 @@ struct ManualAddress {
 struct WirelessSettings {
     // "PowerEnabled": nothing when the location does not say.
     std::optional<bool> powerEnabled;
-    // The network to join, as the bytes of its SSID (IEEE 802.11: 1 to 32); nothing keeps the one the card is on.
+    // The network to join, as the bytes of its SSID (IEEE 802.11: 1 to 32); nothing keeps the one the card is
+    // on.
     std::optional<std::string> network;
     // The key as UTF-8 text. Never logged.
     std::optional<std::string> key;
@@ -33,8 +34,8 @@ struct WirelessSettings {
 };
 
 struct InterfacePlan {
-    std::string name;      // the kernel's name
-    bool active = false;   // false: switched off, and nothing below counts
+    std::string name;     // the kernel's name
+    bool active = false;  // false: switched off, and nothing below counts
     IPv4Method method = IPv4Method::none;
     std::vector<ManualAddress> addresses;  // manual only
     IPv4Address router = 0;                // manual only; 0 for none. The default route.
@@ -45,17 +46,17 @@ struct InterfacePlan {
     bool operator==(const InterfacePlan&) const = default;
 };
 
-// In service order: the first active interface is the preferred one. An interface stands here once; of several
-// services for it the first active one counts. Interfaces that are not named are left to the system.
+// In service order: the first active interface is the preferred one. An interface stands here once; of
+// several services for it the first active one counts. Interfaces that are not named are left to the system.
 using Plan = std::vector<InterfacePlan>;
 
-// The plan for the current location of a preferences tree (its root dictionary). Fails with 1004 and an empty plan
-// when "CurrentSet" names no location, and with 1001 when an interface's settings cannot be used: an address that is
-// no dotted quad, a mask with holes, a name that no interface can have.
+// The plan for the current location of a preferences tree (its root dictionary). Fails with 1004 and an empty
+// plan when "CurrentSet" names no location, and with 1001 when an interface's settings cannot be used: an
+// address that is no dotted quad, a mask with holes, a name that no interface can have.
 Outcome makePlan(CFDictionaryRef root, Plan& plan);
 
-// The plan as a property list for the record, with each key replaced by a digest of it, so that a password is kept
-// nowhere but in the preferences; equal plans give equal values.
+// The plan as a property list for the record, with each key replaced by a digest of it, so that a password is
+// kept nowhere but in the preferences; equal plans give equal values.
 [[nodiscard]] CFDictionaryRef copyPlanAsPropertyList(const InterfacePlan& plan);
 
 }  // namespace platform::apply

@@ -20,16 +20,16 @@ struct ParseError {
     std::string reason;      // one English phrase
 };
 
-// The value of a document, every value in it immutable, or null with the error filled in. Strict: well-formed XML in
-// UTF-8, one plist element with one value, dictionaries with a key before each value and no key twice, integers that
-// fit 64 bits, dates in UTC, data in base 64; entities other than the five of XML and character references are
-// refused.
+// The value of a document, every value in it immutable, or null with the error filled in. Strict: well-formed
+// XML in UTF-8, one plist element with one value, dictionaries with a key before each value and no key twice,
+// integers that fit 64 bits, dates in UTC, data in base 64; entities other than the five of XML and character
+// references are refused.
 [[nodiscard]] Owned<CFPropertyListRef> parsePropertyListXML(std::string_view text, ParseError& error);
 
-// The document for a value, in UTF-8, indented with tabs, entries in their own order, ending in a line break; it reads
-// back as an equal value. Nothing when the value holds something that XML cannot carry (a string with a control
-// character other than tab, line feed and carriage return; a surrogate, U+FFFE or U+FFFF), a key that is not a string,
-// a value that is no property-list value, or is nested too deep.
+// The document for a value, in UTF-8, indented with tabs, entries in their own order, ending in a line break;
+// it reads back as an equal value. Nothing when the value holds something that XML cannot carry (a string
+// with a control character other than tab, line feed and carriage return; a surrogate, U+FFFE or U+FFFF), a
+// key that is not a string, a value that is no property-list value, or is nested too deep.
 [[nodiscard]] std::optional<std::string> writePropertyListXML(CFPropertyListRef value);
 
 }  // namespace platform::values

@@ -1,0 +1,156 @@
+#include "app/ArvAssistant.h"
+
+#include "app/Reachability.h"
+#include "app/SetIDFile.h"
+#include "app/Trace.h"
+#include "morecfq/MoreCFQ.h"
+#include "morescf/MoreSCF.h"
+
+namespace {
+
+bool IsNamed(CFStringRef name, CFStringRef wanted) {
+    return CFEqual(name, wanted) != 0;
+}
+
+}  // namespace
+
+OSStatus ArvAssistant::Initialize() {
+    return 0;
+}
+
+OSStatus ArvAssistant::CleanUp() {
+    return 0;
+}
+
+OSStatus ArvAssistant::RememberCurrentSet() {
+    CFQRelease(originalSetID);
+    originalSetID = nullptr;
+    return MoreSCCopyCurrentSet(&originalSetID);
+}
+
+void ArvAssistant::WriteOriginalSetID(const char* path) {
+    const SystemText text(originalSetID);
+    TRACE("Remembering original set: this->originalSetID = %s\n", text.c_str());
+    WriteSetIDFile(path, text.c_str());
+}
+
+OSStatus ArvAssistant::SaveOriginalSet() {
+    traceCurrentSet();
+    const OSStatus err = RememberCurrentSet();
+
+    CFStringRef name = nullptr;
+    MoreSCCopyUserVisibleNameOfSet(originalSetID, &name);
+    if (name == nullptr) {
+        return 0;
+    }
+    const bool isTemporary = IsNamed(name, TemporarySetName());
+    CFQRelease(name);
+    if (!isTemporary) {
+        WriteOriginalSetID(kOriginalSetFile);
+    }
+    return err;
+}
+
+OSStatus ArvAssistant::SaveTemporarySet() {
+    traceCurrentSet();
+    const OSStatus err = RememberCurrentSet();
+
+    CFStringRef name = nullptr;
+    MoreSCCopyUserVisibleNameOfSet(originalSetID, &name);
+    if (name != nullptr && IsNamed(name, TemporarySetName())) {
+        MoreSCRenameSet(originalSetID, KeptSetName());
+        WriteOriginalSetID(kOriginalSetFile);
+    }
+    CFQRelease(name);
+    return err;
+}
+
+OSStatus ArvAssistant::SaveZATSet() {
+    traceCurrentSet();
+    const OSStatus err = RememberCurrentSet();
+    if (originalSetID == nullptr) {
+        return 0;
+    }
+    WriteOriginalSetID(kZATSetFile);
+    return err;
+}
+
+OSStatus ArvAssistant::RestoreOriginalSet() {
+    CFStringRef name = nullptr;
+    MoreSCCopyUserVisibleNameOfSet(originalSetID, &name);
+    if (name == nullptr) {
+        return 0;
+    }
+    const bool leadBack = IsNamed(name, TemporarySetName());
+    CFQRelease(name);
+    return leadBack ? RestoreSetFromFile(kOriginalSetFile) : 0;
+}
+
+OSStatus ArvAssistant::RestoreOriginalSet2() {
+    CFStringRef name = nullptr;
+    MoreSCCopyUserVisibleNameOfSet(originalSetID, &name);
+    if (name == nullptr) {
+        return 0;
+    }
+    const bool leadBack = IsNamed(name, TemporarySetName()) || IsNamed(name, KeptSetName());
+    CFQRelease(name);
+    return leadBack ? RestoreSetFromFile(kZATSetFile) : 0;
+}
+
+// Both ways back name kOriginalSetFile in their trace, whichever file they read: printer-setup applications
+// match these lines.
+OSStatus ArvAssistant::RestoreSetFromFile(const char* path) {
+    if (originalSetID == nullptr) {
+        TRACE("this->originalSet is not defined, so loading it from file: \"%s\"\n", kOriginalSetFile);
+        if (!CopySetIDFromFile(path, &originalSetID)) {
+            TRACE("File \"%s\" doesn't exist, so this->originalSet could not be loaded.\n", kOriginalSetFile);
+        }
+    }
+    TRACE("Activating the original set: \"%s\"\n", SystemText(originalSetID).c_str());
+    return originalSetID == nullptr ? kNoOriginalSetErr : ActivateSet(originalSetID);
+}
+
+OSStatus ArvAssistant::ActivateSet(CFStringRef setID) {
+    traceCurrentSet();
+    const OSStatus err = MoreSCSetCurrentSet(setID);
+    traceCurrentSet();
+    return err;
+}
+
+OSStatus ArvAssistant::Run() {
+    Initialize();
+    ListLocations();
+    CleanupOldTemporarySets();
+    ListLocations();
+    SaveOriginalSet();
+
+    OSStatus status = CreateTemporarySet(nullptr, nullptr, nullptr);
+    if (status == 0) {
+        status = ActivateTemporarySet();
+    }
+    if (status == 0 && IsWirelessPrinterReachable() != 0) {
+        ConfigureWirelessPrinter();
+    }
+
+    // The object remembers the original location, which is not the temporary one, so neither step changes
+    // anything here: leading back is left to the "remove" of a later process.
+    RestoreOriginalSet();
+    DestroyTemporarySet();
+    CleanUp();
+    return status;
+}
+
+OSStatus ArvAssistant::ConfigureWirelessPrinter() {
+    TRACE("Configuring the device\n");
+    OpenConfigurationPage();
+    return WaitForUserToBeDone();
+}
+
+int ArvAssistant::IsWirelessPrinterReachable() {
+    int reachable = IsWirelessPrinterReachableViaSCF(5);
+    if (reachable == 1) {
+        reachable = IsWirelessPrinterReachableViaHTTP(3);
+    }
+    TRACE("Printer is reachable: %s\n", reachable != 0 ? "TRUE" : "FALSE");
+    return reachable;
+}

@@ -1,0 +1,24 @@
+// Whether the printer answers at its fixed set-up address, its configuration page, and the prompt that waits
+// for the user.
+#pragma once
+
+#include "platform/CoreFoundation.h"
+
+// The printer's configuration start page.
+extern char gQF_config_URL1[];
+
+// 1 when the kernel has a route to the printer, else 0. Asks at most maxtries times (once when it is below
+// 1), 30 microseconds apart; sends nothing.
+int IsWirelessPrinterReachableViaSCF(int maxtries);
+
+// 1 when the printer's web server answers a probe for a page that it does not have with HTTP status 404, else
+// 0. Probes at most maxtries times (once when it is below 1), one second apart.
+int IsWirelessPrinterReachableViaHTTP(int maxtries);
+
+// Opens gQF_config_URL1 in the user's browser without waiting for it. A page that cannot be opened is passed
+// over.
+void OpenConfigurationPage();
+
+// Asks on standard output until standard input answers with a line that begins with "y"; always 0. Without
+// such a line it asks for ever, at the end of the input too.
+OSStatus WaitForUserToBeDone();

@@ -1,0 +1,158 @@
+// The front end: one command word a run.
+//
+// A known word gives exit status 0 whatever failed inside it, as the applications that run this tool expect;
+// what happened is in the trace.
+#include <fcntl.h>
+#include <strings.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdio>
+#include <cstring>
+#include <string>
+
+#include "app/ArvAssistant.h"
+
+ArvAssistant assistant;
+
+namespace {
+
+constexpr int kFewestArguments = 2;
+constexpr int kMostArguments = 5;
+constexpr int kPasswordIndex = 4;
+
+bool IsWord(const char* word, const char* wanted) {
+    return std::strcmp(word, wanted) == 0;
+}
+
+void ShowUsage(const char* programName) {
+    std::printf("Usage: %s (create | remove)\n", programName);
+    std::printf("\t %s create : Remembers the current location, creates a new temporary one.\n", programName);
+    std::printf(
+        "\t %s create auto : Remembers the current location, creates a new temporary auto IP location.\n",
+        programName);
+    std::printf("\t %s remove : Removes the new temporary location and restores the original one.\n",
+                programName);
+    std::printf("\n");
+}
+
+// The last clean-up runs when the new location is current: it removes every other one of the temporary name,
+// and the library refuses to delete the current one.
+OSStatus CreateTemporary(char* mode, char* networkName, char* password) {
+    assistant.Initialize();
+    assistant.CleanupOldTemporarySets();
+    assistant.SaveOriginalSet();
+    assistant.CleanupOldTemporarySets();
+    OSStatus err = assistant.CreateTemporarySet(mode, networkName, password);
+    if (err == 0) {
+        err = assistant.ActivateTemporarySet();
+    }
+    assistant.CleanupOldTemporarySets();
+    assistant.CleanUp();
+    return err;
+}
+
+OSStatus RemoveTemporary() {
+    assistant.Initialize();
+    assistant.RestoreOriginalSet();
+    assistant.CleanupOldTemporarySets();
+    assistant.CleanUp();
+    return 0;
+}
+
+OSStatus RemoveTemporary2() {
+    assistant.Initialize();
+    assistant.RestoreOriginalSet2();
+    assistant.CleanupOldTemporarySets();
+    assistant.CleanupOldUserSets();
+    assistant.SaveOriginalSet();
+    assistant.CleanUp();
+    return 0;
+}
+
+OSStatus SaveTemporary() {
+    assistant.CleanupOldUserSets();
+    assistant.SaveTemporarySet();
+    assistant.CleanupOldUserSets();
+    return 0;
+}
+
+OSStatus SaveZAT() {
+    assistant.SaveZATSet();
+    return 0;
+}
+
+// 1 when the first word is a known one, else 0. argv holds argc words, the program's name first.
+int ProcessArguments(int argc, const char** argv) {
+    const auto word = [argc, argv](int index) {
+        return index < argc ? const_cast<char*>(argv[index]) : nullptr;
+    };
+    const char* command = word(1);
+    if (IsWord(command, "create")) {
+        char* mode = word(2);
+        if (mode != nullptr &&
+            (IsWord(mode, "auto") || IsWord(mode, "wirelessAuto") || IsWord(mode, "from_intro"))) {
+            CreateTemporary(mode, word(3), word(kPasswordIndex));
+        } else {
+            CreateTemporary(nullptr, nullptr, nullptr);
+        }
+    } else if (IsWord(command, "remove")) {
+        RemoveTemporary();
+    } else if (IsWord(command, "save")) {
+        SaveTemporary();
+    } else if (IsWord(command, "saveZAT")) {
+        SaveZAT();
+    } else if (IsWord(command, "restoreZAT")) {
+        RemoveTemporary2();
+    } else if (IsWord(command, "test")) {
+        assistant.Run();
+    } else {
+        return 0;
+    }
+    return 1;
+}
+
+// A descriptor that the caller closed would be given to the next file that is opened, and the trace or a
+// message would go into that file.
+void OpenStandardDescriptors() {
+    for (int descriptor = STDIN_FILENO; descriptor <= STDERR_FILENO; ++descriptor) {
+        if (fcntl(descriptor, F_GETFD) < 0) {
+            static_cast<void>(open("/dev/null", O_RDWR | O_NOCTTY));
+        }
+    }
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    OpenStandardDescriptors();
+    std::signal(SIGPIPE, SIG_IGN);
+    umask(S_IRWXG | S_IRWXO);
+
+    const char* programName = argc > 0 ? argv[0] : "location-assistant";
+    if (argc < kFewestArguments || argc > kMostArguments) {
+        ShowUsage(programName);
+        return 1;
+    }
+
+    // Everybody can read the argument list of every process.
+    const char* words[kMostArguments] = {};
+    std::string password;
+    for (int i = 0; i < argc; ++i) {
+        words[i] = argv[i];
+    }
+    if (argc == kMostArguments) {
+        password = argv[kPasswordIndex];
+        explicit_bzero(argv[kPasswordIndex], std::strlen(argv[kPasswordIndex]));
+        words[kPasswordIndex] = password.c_str();
+    }
+
+    const int known = ProcessArguments(argc, words);
+    explicit_bzero(password.data(), password.size());
+    if (known == 0) {
+        ShowUsage(programName);
+        return 1;
+    }
+    return 0;
+}
