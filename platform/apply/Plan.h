@@ -1,6 +1,7 @@
 // What the current location asks of each interface, as a pure function of the preferences tree.
 #pragma once
 
+#include <array>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -13,6 +14,9 @@ namespace platform::apply {
 
 // In network byte order, as in_addr holds it.
 using IPv4Address = std::uint32_t;
+
+// Random bytes that one record's digests are made with.
+using Salt = std::array<std::uint8_t, 16>;
 
 enum class IPv4Method { none, manual, dhcp };
 
@@ -43,6 +47,9 @@ struct InterfacePlan {
     std::vector<IPv4Address> nameServers;
     std::vector<std::string> searchDomains;
     std::optional<WirelessSettings> wireless;  // when the service has an AirPort entity
+    // The interface's place among the active ones, in service order: the default route of 0 is preferred to that of
+    // 1, and all of them to the ones of interfaces that are left to the system. 0 for an interface that is off.
+    unsigned rank = 0;
     bool operator==(const InterfacePlan&) const = default;
 };
 
