@@ -1,0 +1,327 @@
+"""A private laboratory: a machine's network that exists only for one process and dies with it.
+
+A wired and a wireless card with live links, a printer and a DHCP server at their other ends, and own /etc, /run,
+/tmp, /var/lib, /dev and /sys. Nothing in it reaches the machine's own network or files.
+
+A test file ends with `lab.main()`, which moves the whole run into the laboratory.
+"""
+import json
+import os
+import plistlib
+import shlex
+import signal
+import socket
+import subprocess
+import sys
+import threading
+import time
+import unittest
+import urllib.request
+from pathlib import Path
+
+HERE = Path(__file__).resolve().parent
+PROJECT = HERE.parents[1]
+BINARY = Path(os.environ.get("LA_BINARY", PROJECT / "build/release/app/location-assistant")).resolve()
+LAB = Path("/run/lab")
+TOOL = LAB / "bin" / BINARY.name
+STORE = Path("/var/lib/location-assistant/preferences.plist")
+RUNTIME = Path("/run/location-assistant")
+NOBODY = 65534
+UPDATE = "--update" in sys.argv
+FORBID_SKIPS = os.environ.get("LA_FORBID_SKIPS") == "1"
+ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
+    key: value for key, value in os.environ.items() if key.endswith("SAN_OPTIONS")}
+
+# The second card of a kind gets the next number.
+PCI = {"eth": "0000:02:00.0", "wlan": "0000:03:00.0", "en": "0000:00:19.0"}
+DRIVER = {"eth": "e1000e", "wlan": "iwlwifi", "en": "e1000e"}
+
+PREPARE = """
+mount -t tmpfs -o mode=755 tmpfs /run
+mkdir -p {lab}/sys {lab}/made {lab}/bin {lab}/root {lab}/etc/upper {lab}/etc/work {lab}/dev /run/netns
+mount -c --bind /proc/self/fd/{binaries} {lab}/bin
+etc=/etc
+if [ -d {packages}/usr ]; then
+    mount --bind {packages} {lab}/root
+    mount -t overlay -o lowerdir={lab}/root/usr:/usr overlay /usr
+    etc={lab}/root/etc:/etc
+fi
+mount -t overlay -o lowerdir=$etc,upperdir={lab}/etc/upper,workdir={lab}/etc/work overlay /etc
+rm -f /etc/resolv.conf
+[ -s /etc/machine-id ] || echo 0123456789abcdef0123456789abcdef >/etc/machine-id
+mkdir -p /etc/NetworkManager
+mount -t tmpfs -o mode=755 tmpfs /etc/NetworkManager
+mount -t tmpfs -o mode=755 tmpfs /var/lib
+mount -t tmpfs -o mode=1777 tmpfs /tmp
+
+mount -t tmpfs -o mode=755 tmpfs {lab}/dev
+cd {lab}/dev
+for node in null zero full random urandom tty; do
+    touch $node
+    mount --bind /dev/$node $node
+done
+mkdir pts shm
+mount --rbind /dev/pts pts
+mount -t tmpfs -o mode=1777 tmpfs shm
+ln -s pts/ptmx ptmx
+ln -s /proc/self/fd fd
+cd /
+mount --rbind {lab}/dev /dev
+
+mount -t sysfs -o ro sysfs {lab}/sys
+mount -t tmpfs -o mode=755 tmpfs {lab}/made
+mount --bind {lab}/made /sys
+mount -o remount,bind,ro /sys
+
+ip link set lo up
+ip netns add far
+ip -n far link set lo up
+for sysctl in default all; do echo 0 >/proc/sys/net/ipv6/conf/$sysctl/accept_dad; done
+"""
+
+
+def sh(script, **options):
+    return subprocess.run(["sh", "-ec", script], check=True, text=True, capture_output=True, **options).stdout
+
+
+def ip(arguments):
+    return sh("ip " + arguments)
+
+
+def enter():
+    """Goes on in the laboratory: the first call replaces this process by one that is inside."""
+    if os.environ.pop("LA_LABORATORY", None) is None:
+        unshare = ["unshare", "--net", "--mount", "--pid", "--fork", "--mount-proc", "--kill-child"]
+        if os.geteuid() != 0:
+            unshare += ["--user", "--map-root-user"]
+        probe = subprocess.run([*unshare, "true"], capture_output=True, text=True, check=False)
+        if probe.returncode != 0:
+            skip_all("no namespaces here: " + probe.stderr.strip())
+        os.environ["LA_LABORATORY"] = "inside"
+        os.execvp(unshare[0], [*unshare, sys.executable, *sys.argv])
+    assert os.getpid() == 1
+
+    # What lies under a folder that the laboratory hides is held open and put back at its place.
+    hidden = ("/tmp/", "/run/", "/var/lib/")
+    kept = {path: os.open(path, os.O_PATH) for path in (PROJECT, BINARY.parent) if str(path).startswith(hidden)}
+    binaries = os.open(BINARY.parent, os.O_PATH)
+    sh(PREPARE.format(lab=LAB, binaries=binaries, packages=shlex.quote(str(PROJECT / ".lab/root"))),
+       pass_fds=[binaries], cwd="/")
+    for path, descriptor in kept.items():
+        path.mkdir(parents=True, exist_ok=True)
+        sh(f"mount -c --bind /proc/self/fd/{descriptor} {shlex.quote(str(path))}", pass_fds=[descriptor])
+
+
+def skip_all(reason):
+    print("LABORATORY SKIP:", reason)
+    sys.exit(1 if FORBID_SKIPS else 77)
+
+
+def main():
+    enter()
+    arguments = [argument for argument in sys.argv if argument != "--update"]
+    result = unittest.main(module="__main__", argv=arguments, exit=False, verbosity=2).result
+    if not result.wasSuccessful() or (result.skipped and FORBID_SKIPS):
+        sys.exit(1)
+    for test, reason in result.skipped:
+        print("LABORATORY SKIP:", test, reason)
+
+
+def wait_until(condition, seconds=10):
+    deadline = time.monotonic() + seconds
+    while not (value := condition()):
+        if time.monotonic() > deadline:
+            raise TimeoutError(f"not so after {seconds} s")
+        time.sleep(0.01)
+    return value
+
+
+class Lab:
+    """One fresh machine. Only one at a time."""
+
+    def __init__(self, cards=("eth0", "wlan0"), printer="well", dhcp=False):
+        self.transcript = ""
+        self.syslog = []
+        self.daemons = []
+        self.cards = cards
+        Path("/etc/resolv.conf").write_text("nameserver 203.0.113.53\n")
+        listener = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
+        listener.bind("/dev/log")
+        os.chmod("/dev/log", 0o666)
+        self.listener = listener
+        threading.Thread(target=self._listen, daemon=True).start()
+
+        for card in cards:
+            ip(f"link add {card} address 02:00:00:00:00:{ord(card[0]):02x} type veth peer name far-{card} netns far")
+            ip(f"-n far link set far-{card} up")
+        # The machine before the tool comes: both cards in use, the wired one leads out.
+        if "eth0" in cards:
+            ip("-n far addr add 192.168.77.1/24 dev far-eth0")
+            ip("link set eth0 up")
+            ip("addr add 192.168.77.10/24 brd + dev eth0")
+            ip("addr add 192.168.77.11/24 dev eth0")
+            ip("route add default via 192.168.77.1 dev eth0 metric 100")
+        if "wlan0" in cards:
+            ip("-n far addr add 192.0.0.192/24 dev far-wlan0")
+            ip("link set wlan0 up")
+            ip("addr add 10.20.0.7/16 dev wlan0")
+            ip("route add 10.30.0.0/16 via 10.20.0.1 dev wlan0 metric 600")
+            if printer:
+                self.daemon(sys.executable, HERE / "printer.py", printer, LAB / "printer.log", far=True)
+                wait_until(lambda: ":80 " in sh("nsenter --net=/run/netns/far ss -Hltn"))
+        if dhcp:
+            self.daemon("dnsmasq", "--no-daemon", "--conf-file=/dev/null", "--port=0", "--interface=far-eth0",
+                        "--bind-interfaces", "--dhcp-range=192.168.77.50,192.168.77.99,255.255.255.0,1h",
+                        "--dhcp-option=3,192.168.77.1", "--dhcp-option=6,192.168.77.1", "--no-ping",
+                        f"--dhcp-leasefile={LAB}/leases", "--dhcp-authoritative", "--user=root", "--pid-file=",
+                        f"--log-facility={LAB}/dhcp.log", far=True)
+            wait_until(lambda: "DHCP, IP range" in self.file("dhcp.log"))
+        self._make_sysfs()
+        if {"eth0", "wlan0"} & set(cards):
+            wait_until(lambda: all("LOWER_UP" in link["flags"] for link in self.links()))
+
+    def close(self):
+        for process in Path("/proc").glob("[0-9]*"):
+            if process.name != "1":
+                try:
+                    os.kill(int(process.name), signal.SIGKILL)
+                except ProcessLookupError:
+                    pass
+        for process in self.daemons:
+            process.wait()
+        self.listener.shutdown(socket.SHUT_RDWR)
+        sh(f"""
+            for card in {' '.join(self.cards)}; do ip link del $card 2>/dev/null || ip -n far link del far-$card || :; done
+            rm -rf /dev/log {STORE.parent} {RUNTIME} {LAB}/made/* {LAB}/*.log {LAB}/leases
+            find /tmp -xdev -mindepth 1 -not -type d -delete
+        """)
+
+    def _listen(self):
+        while data := self.listener.recv(65536):
+            self.syslog.append(data.decode("utf-8", "replace").split("location-assistant", 1)[-1])
+
+    def _make_sysfs(self):
+        lines = ["mkdir -p class/net class/tty bus/pci/devices bus/pci/drivers devices/virtual/net",
+                 f"ln -s {LAB}/sys/class/net/lo devices/virtual/net/lo",
+                 "ln -s ../../devices/virtual/net/lo class/net/lo"]
+        for card in self.cards:
+            kind = card.rstrip("0123456789")
+            pci, driver = PCI[kind], DRIVER[kind]
+            device, net = f"devices/pci0000:00/{pci}", f"devices/pci0000:00/{pci}/net/{card}"
+            lines += [
+                f"mkdir -p {net} bus/pci/drivers/{driver}",
+                f"for entry in {LAB}/sys/class/net/{card}/*; do ln -s $entry {net}/; done",
+                f"rm -f {net}/device {net}/subsystem {net}/uevent",
+                f"ln -s ../../../{pci} {net}/device",
+                f"ln -s ../../../../../class/net {net}/subsystem",
+                f"printf 'INTERFACE={card}\\nIFINDEX=%s\\n' $(cat {net}/ifindex) >{net}/uevent",
+                f"ln -s ../../../bus/pci {device}/subsystem",
+                f"ln -s ../../../bus/pci/drivers/{driver} {device}/driver",
+                f"ln -s ../../../devices/pci0000:00/{pci} bus/pci/devices/{pci}",
+                f"echo 0x8086 >{device}/vendor",
+                f"printf 'DRIVER={driver}\\nPCI_SLOT_NAME={pci}\\n' >{device}/uevent",
+                f"ln -s ../../devices/pci0000:00/{pci}/net/{card} class/net/{card}"]
+            if kind == "wlan":
+                lines += [f"mkdir -p {net}/wireless {device}/ieee80211/phy0",
+                          f"ln -s ../../ieee80211/phy0 {net}/phy80211", f"echo DEVTYPE=wlan >>{net}/uevent"]
+        sh("\n".join(lines), cwd=LAB / "made")
+
+    def daemon(self, *command, far=False, **options):
+        """Starts a process that ends with this laboratory, at the other end of the cables when far."""
+        prefix = ["nsenter", "--net=/run/netns/far"] if far else []
+        process = subprocess.Popen([*prefix, *map(str, command)], env=ENVIRONMENT, stdin=subprocess.DEVNULL,
+                                   **{"stdout": subprocess.DEVNULL, "stderr": subprocess.DEVNULL} | options)
+        self.daemons.append(process)
+        return process
+
+    def start(self, *words, **options):
+        """The tool as a process; words are strings or bytes."""
+        options = {"env": ENVIRONMENT, "stdin": subprocess.DEVNULL, "stdout": subprocess.PIPE,
+                   "stderr": subprocess.PIPE, "cwd": "/"} | options
+        if "user" in options:
+            options |= {"group": options["user"], "extra_groups": []}
+        return subprocess.Popen(["location-assistant", *words], executable=TOOL, **options)
+
+    def tool(self, *words, typed=None, **options):
+        """Runs the tool to its end, adds it to the transcript and returns (exit status, standard output)."""
+        if typed is not None:
+            options["stdin"] = subprocess.PIPE
+        process = self.start(*words, **options)
+        out, errors = process.communicate(typed, timeout=120)
+        out = (out or b"").decode("utf-8", "surrogateescape")
+        if errors:
+            raise AssertionError(f"on standard error: {errors.decode('utf-8', 'replace')}")
+        shown = [word if isinstance(word, str) else repr(word) for word in words]
+        self.transcript += f"$ {shlex.join(['location-assistant', *shown])}    # exit {process.returncode}\n{out}"
+        if not out.endswith("\n"):
+            self.transcript += "\n"
+        return process.returncode, out
+
+    def links(self):
+        return [link for link in json.loads(ip("-j link")) if link["ifname"] in self.cards]
+
+    def network(self):
+        """All that has to be the same before and after: link states, addresses, routes, name servers."""
+        volatile = ("valid_life_time", "preferred_life_time", "tentative")
+        state = {"resolv.conf": self.file("/etc/resolv.conf"), "links": {}, "addresses": []}
+        for link in json.loads(ip("-j addr")):
+            if link["ifname"] in self.cards:
+                state["links"][link["ifname"]] = "UP" in link["flags"], link["address"], link["mtu"]
+                state["addresses"] += [(link["ifname"], *((key, value) for key, value in address.items()
+                                                         if key not in volatile)) for address in link["addr_info"]]
+        state["routes"] = [json.dumps(route) for family in "46"
+                           for route in json.loads(ip(f"-{family} -j route show table all"))]
+        for key in ("addresses", "routes"):
+            state[key].sort()
+        return state
+
+    def ipv4(self, card):
+        """The card's IPv4 addresses as ADDRESS/PREFIX, or None when it is off."""
+        (link,) = json.loads(ip(f"-j addr show {card}"))
+        if "UP" not in link["flags"]:
+            return None
+        return [f"{each['local']}/{each['prefixlen']}" for each in link["addr_info"] if each["family"] == "inet"]
+
+    def fetch(self, page="/"):
+        """What the printer answers, fetched without anything of the project's."""
+        direct = urllib.request.build_opener(urllib.request.ProxyHandler({}))
+        with direct.open(f"http://192.0.0.192{page}", timeout=5) as answer:
+            return answer.read().decode()
+
+    @staticmethod
+    def file(path):
+        try:
+            return (LAB / path).read_text()
+        except FileNotFoundError:
+            return ""
+
+    @staticmethod
+    def store():
+        with STORE.open("rb") as file:
+            return plistlib.load(file)
+
+
+class LabTest(unittest.TestCase):
+    """A test case with a fresh laboratory, made with `options`, for each test."""
+    options = {}
+    maxDiff = None
+
+    def setUp(self):
+        self.lab = Lab(**self.options)
+        self.addCleanup(self.lab.close)
+
+    def set_names(self):
+        """Names of the locations by ID, and the current one's ID."""
+        tree = self.lab.store()
+        return {key: value.get("UserDefinedName") for key, value in tree["Sets"].items()}, tree["CurrentSet"][6:]
+
+    def assert_golden(self, name):
+        path = HERE / "golden" / (name + ".txt")
+        if UPDATE:
+            path.write_text(self.lab.transcript, encoding="utf-8", errors="surrogateescape")
+        self.assertEqual(path.read_text(encoding="utf-8", errors="surrogateescape"), self.lab.transcript)
+
+
+def needs_other_users(test):
+    return unittest.skipIf(Path("/proc/self/uid_map").read_text().split()[2] == "1",
+                           "only root can be another user here")(test)
