@@ -38,13 +38,13 @@ DRIVER = {"eth": "e1000e", "wlan": "iwlwifi", "en": "e1000e"}
 
 PREPARE = """
 mount -t tmpfs -o mode=755 tmpfs /run
-mkdir -p {lab}/sys {lab}/made {lab}/bin {lab}/root {lab}/etc/upper {lab}/etc/work {lab}/dev /run/netns
+mkdir -p {lab}/sys {lab}/made {lab}/bin {lab}/packages {lab}/etc/upper {lab}/etc/work {lab}/dev /run/netns
 mount -c --bind /proc/self/fd/{binaries} {lab}/bin
 etc=/etc
 if [ -d {packages}/usr ]; then
-    mount --bind {packages} {lab}/root
-    mount -t overlay -o lowerdir={lab}/root/usr:/usr overlay /usr
-    etc={lab}/root/etc:/etc
+    mount --bind {packages} {lab}/packages
+    mount -t overlay -o lowerdir={lab}/packages/usr:/usr overlay /usr
+    etc={lab}/packages/etc:/etc
 fi
 mount -t overlay -o lowerdir=$etc,upperdir={lab}/etc/upper,workdir={lab}/etc/work overlay /etc
 rm -f /etc/resolv.conf
@@ -137,9 +137,10 @@ def wait_until(condition, seconds=10):
 
 
 class Lab:
-    """One fresh machine. Only one at a time."""
+    """One fresh machine; only one at a time. printer is a manner of printer.py or None; dhcp names the card at whose
+    other end a DHCP server answers."""
 
-    def __init__(self, cards=("eth0", "wlan0"), printer="well", dhcp=False):
+    def __init__(self, cards=("eth0", "wlan0"), printer="well", dhcp=None):
         self.transcript = ""
         self.syslog = []
         self.daemons = []
@@ -170,10 +171,11 @@ class Lab:
                 self.daemon(sys.executable, HERE / "printer.py", printer, LAB / "printer.log", far=True)
                 wait_until(lambda: ":80 " in sh("nsenter --net=/run/netns/far ss -Hltn"))
         if dhcp:
-            self.daemon("dnsmasq", "--no-daemon", "--conf-file=/dev/null", "--port=0", "--interface=far-eth0",
-                        "--bind-interfaces", "--dhcp-range=192.168.77.50,192.168.77.99,255.255.255.0,1h",
-                        "--dhcp-option=3,192.168.77.1", "--dhcp-option=6,192.168.77.1", "--no-ping",
-                        f"--dhcp-leasefile={LAB}/leases", "--dhcp-authoritative", "--user=root", "--pid-file=",
+            net, server = ("192.0.0", "192.0.0.192") if dhcp == "wlan0" else ("192.168.77", "192.168.77.1")
+            self.daemon("dnsmasq", "--no-daemon", "--conf-file=/dev/null", "--port=0", f"--interface=far-{dhcp}",
+                        "--bind-interfaces", f"--dhcp-range={net}.50,{net}.99,255.255.255.0,1h",
+                        f"--dhcp-option=3,{server}", f"--dhcp-option=6,{server}", "--no-ping", "--pid-file=",
+                        f"--dhcp-leasefile={LAB}/leases", "--dhcp-authoritative", "--user=root",
                         f"--log-facility={LAB}/dhcp.log", far=True)
             wait_until(lambda: "DHCP, IP range" in self.file("dhcp.log"))
         self._make_sysfs()
@@ -322,6 +324,10 @@ class LabTest(unittest.TestCase):
         self.assertEqual(path.read_text(encoding="utf-8", errors="surrogateescape"), self.lab.transcript)
 
 
+def other_users():
+    """Whether a process here can be another user than root: not in a user namespace of one user."""
+    return Path("/proc/self/uid_map").read_text().split()[2] != "1"
+
+
 def needs_other_users(test):
-    return unittest.skipIf(Path("/proc/self/uid_map").read_text().split()[2] == "1",
-                           "only root can be another user here")(test)
+    return unittest.skipUnless(other_users(), "only root can be another user here")(test)
