@@ -44,7 +44,7 @@ class Object {
 
   protected:
     // A new object starts with one reference, which its creator owns.
-    explicit Object(Type type) noexcept : type_(type) {}
+    constexpr explicit Object(Type type) noexcept : type_(type) {}
 
   private:
     mutable std::atomic<std::int32_t> count_{1};

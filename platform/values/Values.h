@@ -62,10 +62,10 @@ struct Entry {
 // A frozen value is a property-list value without a mutable string or container anywhere inside, so that
 // nothing can change it. What parsePropertyListXML returns is frozen.
 
-// A frozen value equal to the given one: the value itself, retained, when it is frozen, else a copy that shares
-// every part that is. Costs the parts that are not known to be frozen; a container that was found frozen
-// remembers it. Null when the value, or something in it, is no property-list value (keys are strings), or when
-// it is nested deeper than deepestPropertyList.
+// A frozen value equal to the given one: the value itself, retained, when it is frozen, else a copy that
+// shares every part that is. Costs the parts that are not known to be frozen; a container that was found
+// frozen remembers it. Null when the value, or something in it, is no property-list value (keys are strings),
+// or when it is nested deeper than deepestPropertyList.
 [[nodiscard]] Owned<CFPropertyListRef> frozen(CFPropertyListRef value);
 
 // --- Editing in place ---
@@ -78,10 +78,10 @@ struct Entry {
 //     setClaimed(sets, CFSTR("7"), frozen(set));
 //
 // A dictionary is claimed when one single owner holds it, and everything on the way to it is claimed as well.
-// It looks immutable to everybody else, so only the tree's owner may hold claims, and a claim ends when anybody
-// takes a reference to the dictionary or to one above it. Claim anew, from the root, for each change: it costs a
-// look-up a level, plus one copy of the entries (not of what they hold) of each dictionary on the way that
-// somebody else shares.
+// It looks immutable to everybody else, so only the tree's owner may hold claims, and a claim ends when
+// anybody takes a reference to the dictionary or to one above it. Claim anew, from the root, for each change:
+// it costs a look-up a level, plus one copy of the entries (not of what they hold) of each dictionary on the
+// way that somebody else shares.
 
 // Makes the root claimed, replacing it by a new handle on the same entries when others hold it too or it is
 // mutable.

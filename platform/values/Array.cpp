@@ -1,0 +1,111 @@
+#include <algorithm>
+#include <cassert>
+#include <vector>
+
+#include "platform/values/Containers.h"
+#include "platform/values/Scalars.h"
+
+using namespace platform::values;
+
+struct CFArrayCallBacks {};
+
+const CFArrayCallBacks kCFTypeArrayCallBacks{};
+
+namespace {
+
+std::span<const CFTypeRef> itemsIn(CFArrayRef array, CFRange range) {
+    return array->items().subspan(static_cast<std::size_t>(range.location),
+                                  static_cast<std::size_t>(range.length));
+}
+
+}  // namespace
+
+OpaqueCFArray* platform::values::shareStorage(const OpaqueCFArray& array, bool isMutable) {
+    Storage* const storage = array.storage();
+    auto* const handle = new OpaqueCFArray(isMutable, array.retainsValues(), storage);
+    if (storage != nullptr) {
+        storage->retain();
+    }
+    return handle;
+}
+
+std::span<const CFTypeRef> platform::values::itemsOf(CFArrayRef array) noexcept {
+    return array->items();
+}
+
+CFTypeID CFArrayGetTypeID() {
+    return static_cast<CFTypeID>(Type::array);
+}
+
+CFArrayRef CFArrayCreate(CFAllocatorRef, const void** values, CFIndex count,
+                         const CFArrayCallBacks* callBacks) {
+    auto* const array = new OpaqueCFArray(false, callBacks != nullptr, nullptr);
+    for (CFIndex i = 0; i < count; ++i) {
+        array->writable().append(values[i]);
+    }
+    return array;
+}
+
+CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef, CFIndex, const CFArrayCallBacks* callBacks) {
+    return new OpaqueCFArray(true, callBacks != nullptr, nullptr);
+}
+
+CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef, CFIndex, CFArrayRef array) {
+    return shareStorage(*array, true);
+}
+
+CFIndex CFArrayGetCount(CFArrayRef array) {
+    return static_cast<CFIndex>(array->count());
+}
+
+const void* CFArrayGetValueAtIndex(CFArrayRef array, CFIndex index) {
+    return array->items()[static_cast<std::size_t>(index)];
+}
+
+void CFArrayGetValues(CFArrayRef array, CFRange range, const void** values) {
+    std::ranges::copy(itemsIn(array, range), values);
+}
+
+CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void* value) {
+    const std::span<const CFTypeRef> items = itemsIn(array, range);
+    const auto found = std::ranges::find_if(items, [&](CFTypeRef item) { return equalValues(item, value); });
+    return found == items.end() ? kCFNotFound : range.location + (found - items.begin());
+}
+
+void CFArrayAppendValue(CFMutableArrayRef array, const void* value) {
+    assert(array->isMutable());
+    if (array->isMutable()) {
+        array->writable().append(value);
+    }
+}
+
+void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index) {
+    assert(array->isMutable());
+    if (array->isMutable() && index >= 0 && index < CFArrayGetCount(array)) {
+        array->writable().removeItem(static_cast<std::size_t>(index));
+    }
+}
+
+void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunction comparator,
+                       void* context) {
+    assert(array->isMutable());
+    if (!array->isMutable() || range.length < 2) {
+        return;
+    }
+    // The comparator never sees the array half sorted.
+    const std::span<const CFTypeRef> items = itemsIn(array, range);
+    std::vector<CFTypeRef> sorted(items.begin(), items.end());
+    std::ranges::stable_sort(sorted, [&](CFTypeRef lhs, CFTypeRef rhs) {
+        return comparator(lhs, rhs, context) == kCFCompareLessThan;
+    });
+    array->writable().reorder(sorted, static_cast<std::size_t>(range.location));
+}
+
+CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value,
+                             CFComparatorFunction comparator, void* context) {
+    const std::span<const CFTypeRef> items = itemsIn(array, range);
+    const auto found = std::ranges::lower_bound(items, value, [&](CFTypeRef lhs, CFTypeRef rhs) {
+        return comparator(lhs, rhs, context) == kCFCompareLessThan;
+    });
+    return range.location + (found - items.begin());
+}

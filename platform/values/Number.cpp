@@ -1,0 +1,167 @@
+// Numbers, booleans, data and dates.
+#include <charconv>
+#include <chrono>
+#include <cmath>
+#include <cstdio>
+#include <limits>
+
+#include "platform/values/Scalars.h"
+#include "platform/values/Values.h"
+
+using namespace platform::values;
+
+namespace {
+
+constinit Immortal<OpaqueCFBoolean> trueValue(true);
+constinit Immortal<OpaqueCFBoolean> falseValue(false);
+
+// The nearest integer towards zero that the type holds; whether that is the very value.
+bool integerFromReal(double real, std::int64_t& integer) {
+    constexpr double beyond = 9223372036854775808.0;
+    if (std::isnan(real)) {
+        integer = 0;
+        return false;
+    }
+    if (real < -beyond || real >= beyond) {
+        integer =
+            real < 0 ? std::numeric_limits<std::int64_t>::min() : std::numeric_limits<std::int64_t>::max();
+        return false;
+    }
+    integer = static_cast<std::int64_t>(real);
+    return static_cast<double>(integer) == real;
+}
+
+bool realFromInteger(std::int64_t integer, double& real) {
+    std::int64_t back = 0;
+    real = static_cast<double>(integer);
+    return integerFromReal(real, back) && back == integer;
+}
+
+}  // namespace
+
+const CFBooleanRef kCFBooleanTrue = &trueValue.value;
+const CFBooleanRef kCFBooleanFalse = &falseValue.value;
+
+Owned<CFNumberRef> platform::values::makeNumber(std::int64_t value) {
+    return Owned<CFNumberRef>::adopt(new OpaqueCFNumber(value));
+}
+
+Owned<CFNumberRef> platform::values::makeReal(double value) {
+    return Owned<CFNumberRef>::adopt(new OpaqueCFNumber(value));
+}
+
+Owned<CFDateRef> platform::values::makeDate(std::int64_t seconds) {
+    return Owned<CFDateRef>::adopt(new OpaqueCFDate(seconds));
+}
+
+std::int64_t platform::values::secondsOf(CFDateRef date) noexcept {
+    return date->seconds;
+}
+
+std::string platform::values::realText(double value) {
+    if (std::isnan(value)) {
+        return "nan";
+    }
+    char buffer[32];
+    const std::to_chars_result result = std::to_chars(std::begin(buffer), std::end(buffer), value);
+    return {std::begin(buffer), result.ptr};
+}
+
+std::string platform::values::dateText(std::int64_t seconds) {
+    using namespace std::chrono;
+    const sys_seconds time{std::chrono::seconds(seconds)};
+    const sys_days day = floor<days>(time);
+    const year_month_day date(day);
+    const hh_mm_ss clock(time - day);
+    char buffer[64];
+    const int size =
+        std::snprintf(buffer, sizeof buffer, "%04d-%02u-%02uT%02d:%02d:%02dZ", static_cast<int>(date.year()),
+                      static_cast<unsigned>(date.month()), static_cast<unsigned>(date.day()),
+                      static_cast<int>(clock.hours().count()), static_cast<int>(clock.minutes().count()),
+                      static_cast<int>(clock.seconds().count()));
+    return {buffer, static_cast<std::size_t>(size)};
+}
+
+CFTypeID CFNumberGetTypeID() {
+    return static_cast<CFTypeID>(Type::number);
+}
+
+CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* value) {
+    switch (type) {
+        case kCFNumberSInt32Type:
+            return makeNumber(*static_cast<const SInt32*>(value)).take();
+        case kCFNumberSInt64Type:
+            return makeNumber(*static_cast<const std::int64_t*>(value)).take();
+        case kCFNumberFloat64Type:
+            return makeReal(*static_cast<const double*>(value)).take();
+        default:
+            return nullptr;
+    }
+}
+
+Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value) {
+    bool exact = true;
+    if (type == kCFNumberFloat64Type) {
+        double real = 0;
+        if (number->isReal) {
+            real = number->real;
+        } else {
+            exact = realFromInteger(number->integer, real);
+        }
+        *static_cast<double*>(value) = real;
+        return static_cast<Boolean>(exact);
+    }
+    std::int64_t integer = 0;
+    if (number->isReal) {
+        exact = integerFromReal(number->real, integer);
+    } else {
+        integer = number->integer;
+    }
+    if (type == kCFNumberSInt64Type) {
+        *static_cast<std::int64_t*>(value) = integer;
+        return static_cast<Boolean>(exact);
+    }
+    if (type != kCFNumberSInt32Type) {
+        return 0;
+    }
+    using Limits = std::numeric_limits<SInt32>;
+    const bool fits = integer >= Limits::min() && integer <= Limits::max();
+    *static_cast<SInt32*>(value) = fits          ? static_cast<SInt32>(integer)
+                                   : integer < 0 ? Limits::min()
+                                                 : Limits::max();
+    return static_cast<Boolean>(exact && fits);
+}
+
+Boolean CFNumberIsFloatType(CFNumberRef number) {
+    return static_cast<Boolean>(number->isReal);
+}
+
+CFTypeID CFBooleanGetTypeID() {
+    return static_cast<CFTypeID>(Type::boolean);
+}
+
+Boolean CFBooleanGetValue(CFBooleanRef boolean) {
+    return static_cast<Boolean>(boolean->value);
+}
+
+CFTypeID CFDataGetTypeID() {
+    return static_cast<CFTypeID>(Type::data);
+}
+
+CFDataRef CFDataCreate(CFAllocatorRef, const UInt8* bytes, CFIndex length) {
+    return new OpaqueCFData(
+        length > 0 ? std::string(reinterpret_cast<const char*>(bytes), static_cast<std::size_t>(length))
+                   : std::string());
+}
+
+CFIndex CFDataGetLength(CFDataRef data) {
+    return static_cast<CFIndex>(data->bytes.size());
+}
+
+const UInt8* CFDataGetBytePtr(CFDataRef data) {
+    return reinterpret_cast<const UInt8*>(data->bytes.data());
+}
+
+CFTypeID CFDateGetTypeID() {
+    return static_cast<CFTypeID>(Type::date);
+}

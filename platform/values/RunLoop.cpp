@@ -1,0 +1,195 @@
+#include "platform/values/RunLoop.h"
+
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <atomic>
+#include <cerrno>
+#include <chrono>
+#include <cmath>
+#include <memory>
+#include <optional>
+#include <system_error>
+#include <vector>
+
+#include "platform/FileDescriptor.h"
+#include "platform/values/Scalars.h"
+
+using namespace platform::values;
+using platform::FileDescriptor;
+
+struct OpaqueCFRunLoopSource final : Object {
+    OpaqueCFRunLoopSource(int watched, short wanted, std::function<void(short)> callback)
+        : Object(Type::runLoopSource), descriptor(watched), events(wanted), perform(std::move(callback)) {}
+
+    const int descriptor;
+    const short events;
+    const std::function<void(short)> perform;
+};
+
+struct OpaqueCFRunLoop final : Object {
+    using Clock = std::chrono::steady_clock;
+    using Source = Owned<CFRunLoopSourceRef>;
+
+    OpaqueCFRunLoop() : Object(Type::runLoop), wake_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
+        if (!wake_.isOpen()) {
+            throw std::system_error(errno, std::generic_category(), "eventfd");
+        }
+    }
+
+    void add(CFRunLoopSourceRef source) {
+        if (!holds(source)) {
+            sources_.push_back(Source::retained(source));
+        }
+    }
+    void remove(CFRunLoopSourceRef source) {
+        std::erase_if(sources_, [source](const Source& held) { return held.get() == source; });
+    }
+    // Only an atomic flag and a write, so that a signal handler may call it.
+    void stop() noexcept {
+        const int error = errno;
+        isStopped_.store(true);
+        const std::uint64_t one = 1;
+        // A counter that is full wakes the loop just as well.
+        [[maybe_unused]] const ssize_t written = ::write(wake_.get(), &one, sizeof one);
+        errno = error;
+    }
+    // Runs until the deadline, or without one.
+    SInt32 run(std::optional<Clock::time_point> deadline, bool returnAfterSourceHandled);
+
+  private:
+    [[nodiscard]] bool holds(CFRunLoopSourceRef source) const {
+        return std::ranges::any_of(sources_, [source](const Source& held) { return held.get() == source; });
+    }
+    [[nodiscard]] bool takeStop() noexcept { return isStopped_.exchange(false); }
+    bool handleReady(std::optional<Clock::time_point> deadline, bool onlyOne);
+
+    std::vector<Source> sources_;
+    FileDescriptor wake_;
+    std::atomic<bool> isStopped_{false};
+    static_assert(std::atomic<bool>::is_always_lock_free);
+};
+
+namespace {
+
+constinit Immortal<OpaqueCFString> defaultMode(std::string_view("kCFRunLoopDefaultMode"));
+
+bool isDefaultMode(CFStringRef mode) {
+    return mode != nullptr && mode->equals(*kCFRunLoopDefaultMode);
+}
+
+// poll's waiting time, rounded up so that the loop does not spin through the last millisecond.
+int millisecondsUntil(std::optional<OpaqueCFRunLoop::Clock::time_point> deadline) {
+    using std::chrono::milliseconds;
+    if (!deadline.has_value()) {
+        return -1;
+    }
+    const auto left = std::chrono::ceil<milliseconds>(*deadline - OpaqueCFRunLoop::Clock::now());
+    return static_cast<int>(std::clamp(left, milliseconds(0), milliseconds(3'600'000)).count());
+}
+
+}  // namespace
+
+const CFStringRef kCFRunLoopDefaultMode = &defaultMode.value;
+
+// Waits, and calls the sources that are ready; whether there was one.
+bool OpaqueCFRunLoop::handleReady(std::optional<Clock::time_point> deadline, bool onlyOne) {
+    // The callbacks may change the list of sources and drop their own.
+    const std::vector<Source> watched = sources_;
+    std::vector<pollfd> polled;
+    polled.reserve(watched.size() + 1);
+    for (const Source& source : watched) {
+        polled.push_back({source.get()->descriptor, source.get()->events, 0});
+    }
+    polled.push_back({wake_.get(), POLLIN, 0});
+    if (::poll(polled.data(), polled.size(), millisecondsUntil(deadline)) <= 0) {
+        return false;
+    }
+    if (polled.back().revents != 0) {
+        std::uint64_t count = 0;
+        [[maybe_unused]] const ssize_t got = ::read(wake_.get(), &count, sizeof count);
+    }
+    bool handled = false;
+    for (std::size_t i = 0; i < watched.size() && !isStopped_.load() && !(handled && onlyOne); ++i) {
+        const CFRunLoopSourceRef source = watched[i].get();
+        if (polled[i].revents == 0 || !holds(source)) {
+            continue;
+        }
+        if ((polled[i].revents & POLLNVAL) != 0) {
+            remove(source);
+            continue;
+        }
+        source->perform(polled[i].revents);
+        handled = true;
+    }
+    return handled;
+}
+
+SInt32 OpaqueCFRunLoop::run(std::optional<Clock::time_point> deadline, bool returnAfterSourceHandled) {
+    while (true) {
+        if (takeStop()) {
+            return kCFRunLoopRunStopped;
+        }
+        if (sources_.empty()) {
+            return kCFRunLoopRunFinished;
+        }
+        const bool handled = handleReady(deadline, returnAfterSourceHandled);
+        if (takeStop()) {
+            return kCFRunLoopRunStopped;
+        }
+        if (handled && returnAfterSourceHandled) {
+            return kCFRunLoopRunHandledSource;
+        }
+        if (deadline.has_value() && Clock::now() >= *deadline) {
+            return kCFRunLoopRunTimedOut;
+        }
+    }
+}
+
+Owned<CFRunLoopSourceRef> platform::values::makeRunLoopSource(int descriptor, short events,
+                                                              std::function<void(short)> perform) {
+    return Owned<CFRunLoopSourceRef>::adopt(
+        new OpaqueCFRunLoopSource(descriptor, events, std::move(perform)));
+}
+
+CFRunLoopRef CFRunLoopGetCurrent() {
+    thread_local const auto loop = Owned<CFRunLoopRef>::adopt(new OpaqueCFRunLoop);
+    return loop.get();
+}
+
+void CFRunLoopAddSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) {
+    if (isDefaultMode(mode)) {
+        loop->add(source);
+    }
+}
+
+void CFRunLoopRemoveSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) {
+    if (isDefaultMode(mode)) {
+        loop->remove(source);
+    }
+}
+
+void CFRunLoopRun() {
+    CFRunLoopGetCurrent()->run(std::nullopt, false);
+}
+
+SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds, Boolean returnAfterSourceHandled) {
+    if (!isDefaultMode(mode)) {
+        return kCFRunLoopRunFinished;
+    }
+    // More than this is for ever.
+    constexpr CFTimeInterval longest = 1e9;
+    std::optional<OpaqueCFRunLoop::Clock::time_point> deadline;
+    if (!(seconds > longest)) {
+        const std::chrono::duration<double> time(seconds > 0 ? seconds : 0);
+        deadline = OpaqueCFRunLoop::Clock::now() +
+                   std::chrono::duration_cast<OpaqueCFRunLoop::Clock::duration>(time);
+    }
+    return CFRunLoopGetCurrent()->run(deadline, returnAfterSourceHandled != 0);
+}
+
+void CFRunLoopStop(CFRunLoopRef loop) {
+    loop->stop();
+}

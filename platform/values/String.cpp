@@ -1,0 +1,196 @@
+#include <sys/auxv.h>
+
+#include <cassert>
+#include <cstring>
+#include <exception>
+
+#include "platform/values/Scalars.h"
+#include "platform/values/Values.h"
+
+using namespace platform::values;
+
+namespace {
+
+constexpr std::uint64_t firstOdd = 0x9E3779B97F4A7C15U;
+constexpr std::uint64_t secondOdd = 0xD1B54A32D192ED03U;
+
+std::uint64_t multiplyFold(std::uint64_t a, std::uint64_t b) noexcept {
+    __extension__ using Wide = unsigned __int128;
+    const Wide product = static_cast<Wide>(a) * b;
+    return static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
+}
+
+// A different one in every process, so that nobody can write a file whose keys all meet in one place of the
+// index.
+std::uint64_t hashSeed() noexcept {
+    static const std::uint64_t seed = [] {
+        std::uint64_t random = firstOdd;
+        // The kernel hands every program 16 random bytes at its start.
+        if (const unsigned long address = getauxval(AT_RANDOM); address != 0) {
+            std::memcpy(&random, reinterpret_cast<const void*>(address), sizeof random);
+        }
+        return random;
+    }();
+    return seed;
+}
+
+}  // namespace
+
+std::uint32_t platform::values::hashOfText(std::string_view text) noexcept {
+    std::uint64_t state = hashSeed() ^ text.size();
+    while (text.size() > 8) {
+        std::uint64_t word = 0;
+        std::memcpy(&word, text.data(), 8);
+        state = multiplyFold(state ^ word, firstOdd);
+        text.remove_prefix(8);
+    }
+    std::uint64_t last = 0;
+    std::memcpy(&last, text.data(), text.size());
+    state = multiplyFold(state ^ last, secondOdd);
+    const auto hash = static_cast<std::uint32_t>(state ^ (state >> 32));
+    return hash != 0 ? hash : 1;
+}
+
+OpaqueCFString::OpaqueCFString(std::string_view text, TextTraits traits) noexcept
+    : Object(Type::string), traits_(traits), size_(static_cast<std::uint32_t>(text.size())) {
+    char* const bytes = reinterpret_cast<char*>(this + 1);
+    if (!text.empty()) {
+        std::memcpy(bytes, text.data(), text.size());
+    }
+    bytes[text.size()] = '\0';
+    bytes_ = bytes;
+}
+
+const OpaqueCFString* OpaqueCFString::create(std::string_view text, TextTraits traits) {
+    return text.size() <= longestText ? new (Room{text.size()}) OpaqueCFString(text, traits) : nullptr;
+}
+
+std::uint32_t OpaqueCFString::computeHash() const noexcept {
+    const std::uint32_t hash = hashOfText(text());
+    hash_.store(hash, std::memory_order_relaxed);
+    return hash;
+}
+
+void MutableString::assign(std::string text) {
+    const std::optional<TextTraits> traits = scanText(text);
+    if (traits.has_value() && text.size() <= longestText) {
+        text_ = std::move(text);
+        setText(text_, *traits);
+    }
+}
+
+Owned<CFStringRef> platform::values::makeString(std::string_view text) {
+    const std::optional<TextTraits> traits = scanText(text);
+    return Owned<CFStringRef>::adopt(traits.has_value() ? OpaqueCFString::create(text, *traits) : nullptr);
+}
+
+std::string_view platform::values::textOf(CFStringRef string) noexcept {
+    return string->text();
+}
+
+CFTypeID CFStringGetTypeID() {
+    return static_cast<CFTypeID>(Type::string);
+}
+
+CFStringRef CFStringMakeConstant(const char* text) noexcept {
+    const CFStringRef constant = makeString(text).take();
+    if (constant == nullptr) {
+        std::terminate();
+    }
+    return constant;
+}
+
+CFStringRef CFStringCreateCopy(CFAllocatorRef, CFStringRef string) {
+    if (!string->isMutable()) {
+        string->retain();
+        return string;
+    }
+    return OpaqueCFString::create(string->text(), string->traits());
+}
+
+CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef, CFIndex, CFStringRef string) {
+    return new MutableString(std::string(string->text()), string->traits());
+}
+
+CFStringRef CFStringCreateWithSubstring(CFAllocatorRef, CFStringRef string, CFRange range) {
+    const std::string_view text = string->text();
+    if (range.location < 0 || range.length < 0) {
+        return nullptr;
+    }
+    const std::optional<std::size_t> begin = byteOfUnit(text, static_cast<std::size_t>(range.location));
+    if (!begin.has_value()) {
+        return nullptr;
+    }
+    const std::string_view rest = text.substr(*begin);
+    const std::optional<std::size_t> size = byteOfUnit(rest, static_cast<std::size_t>(range.length));
+    return size.has_value() ? makeString(rest.substr(0, *size)).take() : nullptr;
+}
+
+CFArrayRef CFStringCreateArrayBySeparatingStrings(CFAllocatorRef, CFStringRef string, CFStringRef separator) {
+    const CFMutableArrayRef pieces = CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks);
+    std::string_view rest = string->text();
+    const std::string_view wanted = separator->text();
+    for (bool more = true; more;) {
+        const std::size_t end = wanted.empty() ? std::string_view::npos : rest.find(wanted);
+        more = end != std::string_view::npos;
+        const Owned<CFStringRef> piece = makeString(rest.substr(0, end));
+        CFArrayAppendValue(pieces, piece.get());
+        if (more) {
+            rest.remove_prefix(end + wanted.size());
+        }
+    }
+    return pieces;
+}
+
+CFIndex CFStringGetLength(CFStringRef string) {
+    const std::string_view text = string->text();
+    return static_cast<CFIndex>(string->isAscii() ? text.size() : unitCount(text));
+}
+
+void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) {
+    const std::string_view text = string->text();
+    const CFIndex end = range.location + range.length;
+    CFIndex unit = 0;
+    const auto put = [&](char32_t value) {
+        if (unit >= range.location && unit < end) {
+            *buffer++ = static_cast<UniChar>(value);
+        }
+        ++unit;
+    };
+    for (std::size_t position = 0; position < text.size() && unit < end;) {
+        const char32_t codePoint = nextCodePoint(text, position);
+        if (codePoint < 0x10000) {
+            put(codePoint);
+        } else {
+            put(0xD800 + ((codePoint - 0x10000) >> 10));
+            put(0xDC00 + (codePoint & 0x3FF));
+        }
+    }
+}
+
+Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix) {
+    return static_cast<Boolean>(string->text().starts_with(prefix->text()));
+}
+
+CFRange CFStringFind(CFStringRef string, CFStringRef wanted, CFStringCompareFlags) {
+    const std::string_view text = string->text();
+    const std::size_t found = wanted->text().empty() ? std::string_view::npos : text.find(wanted->text());
+    if (found == std::string_view::npos) {
+        return CFRangeMake(kCFNotFound, 0);
+    }
+    return CFRangeMake(static_cast<CFIndex>(unitCount(text.substr(0, found))), CFStringGetLength(wanted));
+}
+
+void CFStringReplace(CFMutableStringRef string, CFRange range, CFStringRef replacement) {
+    assert(string->isMutable());
+    if (!string->isMutable() || range.location < 0 || range.length < 0) {
+        return;
+    }
+    std::string text(string->text());
+    const auto begin = byteOfUnit(text, static_cast<std::size_t>(range.location));
+    const auto end = byteOfUnit(text, static_cast<std::size_t>(range.location + range.length));
+    if (begin.has_value() && end.has_value()) {
+        text.replace(*begin, *end - *begin, replacement->text());
+        static_cast<MutableString*>(string)->assign(std::move(text));
+    }
+}

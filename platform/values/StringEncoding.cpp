@@ -1,0 +1,135 @@
+// Text from and to the encodings of the faces.
+#include <unicode/ucnv.h>
+
+#include <cstring>
+#include <memory>
+#include <vector>
+
+#include "platform/values/Scalars.h"
+#include "platform/values/Values.h"
+
+using namespace platform::values;
+
+namespace {
+
+struct ConverterCloser {
+    void operator()(UConverter* converter) const { ucnv_close(converter); }
+};
+using Converter = std::unique_ptr<UConverter, ConverterCloser>;
+
+// ICU's own table and not one of ours: the encoding has had two meanings of byte 0xDB and a private-use
+// character, and nobody here reads Mac OS Roman often enough to feel the converter being opened. Plain ASCII
+// never comes here.
+Converter openMacRoman() {
+    UErrorCode status = U_ZERO_ERROR;
+    Converter converter(ucnv_open("macintosh", &status));
+    if (U_SUCCESS(status)) {
+        ucnv_setToUCallBack(converter.get(), UCNV_TO_U_CALLBACK_STOP, nullptr, nullptr, nullptr, &status);
+        ucnv_setFromUCallBack(converter.get(), UCNV_FROM_U_CALLBACK_STOP, nullptr, nullptr, nullptr, &status);
+    }
+    return U_SUCCESS(status) ? std::move(converter) : nullptr;
+}
+
+std::vector<UniChar> unitsOf(CFStringRef string) {
+    std::vector<UniChar> units(static_cast<std::size_t>(CFStringGetLength(string)));
+    CFStringGetCharacters(string, CFRangeMake(0, static_cast<CFIndex>(units.size())), units.data());
+    return units;
+}
+
+CFStringRef createFromMacRoman(std::string_view bytes) {
+    const Converter converter = openMacRoman();
+    if (!converter || bytes.size() > OpaqueCFString::longestText) {
+        return nullptr;
+    }
+    std::vector<UChar> units(bytes.size());
+    UErrorCode status = U_ZERO_ERROR;
+    const auto size = static_cast<std::int32_t>(bytes.size());
+    const std::int32_t count =
+        ucnv_toUChars(converter.get(), units.data(), size, bytes.data(), size, &status);
+    if (U_FAILURE(status)) {
+        return nullptr;
+    }
+    return CFStringCreateWithCharacters(nullptr, reinterpret_cast<const UniChar*>(units.data()), count);
+}
+
+bool copyAsMacRoman(CFStringRef string, char* buffer, std::size_t bufferSize) {
+    const Converter converter = openMacRoman();
+    const std::vector<UniChar> units = unitsOf(string);
+    if (!converter || units.size() >= bufferSize) {
+        return false;
+    }
+    UErrorCode status = U_ZERO_ERROR;
+    const std::int32_t size = ucnv_fromUChars(
+        converter.get(), buffer, static_cast<std::int32_t>(units.size()),
+        reinterpret_cast<const UChar*>(units.data()), static_cast<std::int32_t>(units.size()), &status);
+    if (U_FAILURE(status)) {
+        return false;
+    }
+    buffer[size] = '\0';
+    return true;
+}
+
+}  // namespace
+
+CFStringEncoding CFStringGetSystemEncoding() {
+    return kCFStringEncodingUTF8;
+}
+
+CFStringRef CFStringCreateWithCString(CFAllocatorRef allocator, const char* text, CFStringEncoding encoding) {
+    return CFStringCreateWithBytes(allocator, reinterpret_cast<const UInt8*>(text),
+                                   static_cast<CFIndex>(std::strlen(text)), encoding, 0);
+}
+
+CFStringRef CFStringCreateWithBytes(CFAllocatorRef, const UInt8* bytes, CFIndex count,
+                                    CFStringEncoding encoding, Boolean) {
+    const std::string_view text(reinterpret_cast<const char*>(bytes), static_cast<std::size_t>(count));
+    const std::optional<TextTraits> traits = scanText(text);
+    if (traits.has_value() && (*traits & textBeyondAscii) == 0) {
+        return OpaqueCFString::create(text, *traits);
+    }
+    if (encoding == kCFStringEncodingMacRoman) {
+        return createFromMacRoman(text);
+    }
+    if (encoding == kCFStringEncodingUTF8 && traits.has_value()) {
+        return OpaqueCFString::create(text, *traits);
+    }
+    return nullptr;
+}
+
+CFStringRef CFStringCreateWithCharacters(CFAllocatorRef, const UniChar* characters, CFIndex count) {
+    std::string text;
+    text.reserve(static_cast<std::size_t>(count));
+    for (CFIndex i = 0; i < count; ++i) {
+        char32_t codePoint = characters[i];
+        if ((codePoint & 0xF800) == 0xD800) {
+            const bool isPair =
+                codePoint < 0xDC00 && i + 1 < count && (characters[i + 1] & 0xFC00U) == 0xDC00;
+            if (!isPair) {
+                return nullptr;
+            }
+            codePoint = 0x10000 + ((codePoint & 0x3FF) << 10) + (characters[++i] & 0x3FFU);
+        }
+        appendCodePoint(text, codePoint);
+    }
+    return makeString(text).take();
+}
+
+Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize, CFStringEncoding encoding) {
+    if (!string->isAscii() && encoding == kCFStringEncodingMacRoman && bufferSize > 0) {
+        return static_cast<Boolean>(copyAsMacRoman(string, buffer, static_cast<std::size_t>(bufferSize)));
+    }
+    const char* const bytes = CFStringGetCStringPtr(string, encoding);
+    const std::size_t size = string->text().size() + 1;
+    if (bytes == nullptr || bufferSize < 0 || size > static_cast<std::size_t>(bufferSize)) {
+        return 0;
+    }
+    std::memcpy(buffer, bytes, size);
+    return 1;
+}
+
+const char* CFStringGetCStringPtr(CFStringRef string, CFStringEncoding encoding) {
+    const bool fits =
+        encoding == kCFStringEncodingUTF8 ||
+        (string->isAscii() && (encoding == kCFStringEncodingASCII || encoding == kCFStringEncodingMacRoman));
+    return fits ? string->cString() : nullptr;
+}

@@ -1,0 +1,132 @@
+#include <cstdarg>
+#include <cstdio>
+#include <optional>
+
+#include "platform/values/Scalars.h"
+#include "platform/values/Values.h"
+
+using namespace platform::values;
+
+namespace {
+
+struct Conversion {
+    std::string directive;  // as printf takes it, with the widths that came as arguments put in
+    bool isLong = false;
+    char kind = '\0';
+};
+
+// printf on one directive that was put together at run time from parts that are known to be good.
+template <class Argument>
+bool appendFormatted(std::string& text, const std::string& directive, Argument argument) {
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wformat-nonliteral"
+    const int size = std::snprintf(nullptr, 0, directive.c_str(), argument);
+    if (size < 0) {
+        return false;
+    }
+    const std::size_t before = text.size();
+    text.resize(before + static_cast<std::size_t>(size) + 1);
+    std::snprintf(text.data() + before, static_cast<std::size_t>(size) + 1, directive.c_str(), argument);
+#pragma GCC diagnostic pop
+    text.pop_back();
+    return true;
+}
+
+// The arguments of a call, so that they can be taken in more than one place.
+class Arguments {
+  public:
+    explicit Arguments(std::va_list list) { va_copy(list_, list); }
+    ~Arguments() { va_end(list_); }
+    Arguments(const Arguments&) = delete;
+    Arguments& operator=(const Arguments&) = delete;
+    template <class T>
+    T next() {
+        return va_arg(list_, T);
+    }
+
+  private:
+    std::va_list list_;
+};
+
+// Takes one directive from the front of the format, its '%' included.
+std::optional<Conversion> takeConversion(std::string_view& format, Arguments& arguments) {
+    Conversion conversion;
+    const auto take = [&] {
+        const char next = format.empty() ? '\0' : format.front();
+        if (!format.empty()) {
+            format.remove_prefix(1);
+        }
+        return next;
+    };
+    char next = take();
+    conversion.directive.push_back(next);
+    for (next = take();
+         next != '\0' && std::string_view("-+ #0.*123456789").find(next) != std::string_view::npos;
+         next = take()) {
+        if (next == '*') {
+            conversion.directive += std::to_string(arguments.next<int>());
+        } else {
+            conversion.directive.push_back(next);
+        }
+    }
+    if (next == 'l') {
+        conversion.isLong = true;
+        conversion.directive.push_back(next);
+        next = take();
+    }
+    if (next == '\0') {
+        return std::nullopt;
+    }
+    conversion.directive.push_back(next);
+    conversion.kind = next;
+    return conversion;
+}
+
+bool appendConversion(std::string& text, const Conversion& conversion, Arguments& arguments) {
+    const std::string& directive = conversion.directive;
+    switch (conversion.kind) {
+        case 'd':
+        case 'i':
+            return conversion.isLong ? appendFormatted(text, directive, arguments.next<long>())
+                                     : appendFormatted(text, directive, arguments.next<int>());
+        case 'u':
+        case 'x':
+            return conversion.isLong ? appendFormatted(text, directive, arguments.next<unsigned long>())
+                                     : appendFormatted(text, directive, arguments.next<unsigned>());
+        case 'c':
+            return appendFormatted(text, directive, arguments.next<int>());
+        case 's':
+            return appendFormatted(text, directive, arguments.next<const char*>());
+        case '@':
+            text += descriptionOf(arguments.next<CFTypeRef>());
+            return true;
+        case '%':
+            text.push_back('%');
+            return true;
+        default:
+            return false;
+    }
+}
+
+}  // namespace
+
+CFStringRef CFStringCreateWithFormat(CFAllocatorRef, CFDictionaryRef, CFStringRef format, ...) {
+    std::va_list list;
+    va_start(list, format);
+    Arguments arguments(list);
+    va_end(list);
+    std::string text;
+    std::string_view rest = format->text();
+    while (!rest.empty()) {
+        const std::size_t plain = std::min(rest.find('%'), rest.size());
+        text.append(rest.substr(0, plain));
+        rest.remove_prefix(plain);
+        if (!rest.empty()) {
+            const std::optional<Conversion> conversion = takeConversion(rest, arguments);
+            if (!conversion.has_value() || !appendConversion(text, *conversion, arguments)) {
+                return nullptr;
+            }
+        }
+    }
+    return makeString(text).take();
+}

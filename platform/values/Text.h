@@ -1,0 +1,30 @@
+// UTF-8 text, measured in UTF-16 code units where the faces ask for it.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace platform::values {
+
+// What is known of a text from looking at each of its bytes once.
+using TextTraits = std::uint8_t;
+inline constexpr TextTraits textBeyondAscii = 1;
+inline constexpr TextTraits textNeedsEscape = 2;  // holds & < > or a carriage return
+inline constexpr TextTraits textBeyondXml = 4;    // holds a character that no XML document can carry
+
+// Nothing when the bytes are not well-formed UTF-8.
+[[nodiscard]] std::optional<TextTraits> scanText(std::string_view bytes) noexcept;
+
+// The functions below take well-formed UTF-8.
+
+// The code point at the position, which moves behind it.
+[[nodiscard]] char32_t nextCodePoint(std::string_view text, std::size_t& position) noexcept;
+void appendCodePoint(std::string& text, char32_t codePoint);
+[[nodiscard]] std::size_t unitCount(std::string_view text) noexcept;
+// The byte at which the unit begins, or nothing inside a character of two units or beyond the end.
+[[nodiscard]] std::optional<std::size_t> byteOfUnit(std::string_view text, std::size_t unit) noexcept;
+
+}  // namespace platform::values
