@@ -1,0 +1,52 @@
+#include "platform/preferences/FileOperations.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cstdio>
+
+namespace platform::preferences {
+
+int FileOperations::makeDirectory(const std::string& path, mode_t mode) {
+    return ::mkdir(path.c_str(), mode);
+}
+
+int FileOperations::open(const std::string& path, int flags, mode_t mode) {
+    return ::open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, mode);
+}
+
+int FileOperations::setOwner(int descriptor, uid_t user, gid_t group) {
+    return ::fchown(descriptor, user, group);
+}
+
+int FileOperations::setMode(int descriptor, mode_t mode) {
+    return ::fchmod(descriptor, mode);
+}
+
+ssize_t FileOperations::write(int descriptor, std::string_view bytes) {
+    return ::write(descriptor, bytes.data(), bytes.size());
+}
+
+int FileOperations::sync(int descriptor) {
+    return ::fsync(descriptor);
+}
+
+int FileOperations::close(int descriptor) {
+    return ::close(descriptor);
+}
+
+int FileOperations::rename(const std::string& from, const std::string& to) {
+    return ::rename(from.c_str(), to.c_str());
+}
+
+int FileOperations::remove(const std::string& path) {
+    return ::unlink(path.c_str());
+}
+
+FileOperations& systemFileOperations() {
+    static FileOperations operations;
+    return operations;
+}
+
+}  // namespace platform::preferences

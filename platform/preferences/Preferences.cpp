@@ -1,0 +1,156 @@
+// The operations of SystemConfiguration.h on the preferences store.
+#include <string>
+
+#include "platform/Host.h"
+#include "platform/SystemConfiguration.h"
+#include "platform/apply/Apply.h"
+#include "platform/preferences/Session.h"
+#include "platform/preferences/Status.h"
+#include "platform/values/Values.h"
+
+namespace {
+
+using platform::Outcome;
+using platform::preferences::Session;
+using platform::preferences::setStatus;
+using platform::values::as;
+using platform::values::Owned;
+using platform::values::textOf;
+
+Boolean answer(int status) {
+    return static_cast<Boolean>(setStatus(status));
+}
+
+Boolean answer(const Outcome& outcome, const Session& session) {
+    return static_cast<Boolean>(setStatus(outcome, session.name()));
+}
+
+bool isPath(CFStringRef path) {
+    return as<CFStringRef>(path) != nullptr;
+}
+
+// The dictionary at the path, or null with the status set.
+CFDictionaryRef dictionaryAt(SCPreferencesRef reference, CFStringRef path) {
+    Session* const session = Session::from(reference);
+    if (session == nullptr || !isPath(path)) {
+        setStatus(session == nullptr ? kSCStatusNoPrefsSession : kSCStatusInvalidArgument);
+        return nullptr;
+    }
+    CFPropertyListRef value = nullptr;
+    int status = session->tree().find(textOf(path), value);
+    const auto dictionary = as<CFDictionaryRef>(value);
+    if (status == kSCStatusOK && dictionary == nullptr) {
+        status = kSCStatusFailed;
+    }
+    setStatus(status);
+    return dictionary;
+}
+
+}  // namespace
+
+SCPreferencesRef SCPreferencesCreate(CFAllocatorRef /*allocator*/, CFStringRef name, CFStringRef prefsID) {
+    if (as<CFStringRef>(name) == nullptr || prefsID != nullptr) {
+        setStatus(kSCStatusInvalidArgument);
+        return nullptr;
+    }
+    const std::string client(textOf(name));
+    Owned<SCPreferencesRef> session;
+    setStatus(Session::open(client, platform::currentHost().preferencesDirectory,
+                            platform::preferences::systemFileOperations(), session),
+              client);
+    return session.take();
+}
+
+Boolean SCPreferencesLock(SCPreferencesRef session, Boolean wait) {
+    Session* const self = Session::from(session);
+    if (self == nullptr) {
+        return answer(kSCStatusNoPrefsSession);
+    }
+    const std::chrono::milliseconds time = platform::preferences::lockWait;
+    return answer(self->lock(wait != 0 ? time : std::chrono::milliseconds(0)), *self);
+}
+
+Boolean SCPreferencesUnlock(SCPreferencesRef session) {
+    Session* const self = Session::from(session);
+    return self == nullptr ? answer(kSCStatusNoPrefsSession) : answer(self->unlock(), *self);
+}
+
+CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef key) {
+    Session* const self = Session::from(session);
+    if (self == nullptr || as<CFStringRef>(key) == nullptr) {
+        setStatus(self == nullptr ? kSCStatusNoPrefsSession : kSCStatusInvalidArgument);
+        return nullptr;
+    }
+    const CFPropertyListRef value = self->tree().topValue(key);
+    setStatus(value != nullptr ? kSCStatusOK : kSCStatusNoKey);
+    return value;
+}
+
+Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPropertyListRef value) {
+    Session* const self = Session::from(session);
+    if (self == nullptr) {
+        return answer(kSCStatusNoPrefsSession);
+    }
+    const Owned<CFStringRef> ownKey =
+        platform::values::makeString(as<CFStringRef>(key) != nullptr ? textOf(key) : "");
+    const Owned<CFPropertyListRef> frozen =
+        value != nullptr ? platform::values::frozen(value) : Owned<CFPropertyListRef>();
+    if (as<CFStringRef>(key) == nullptr || !ownKey || !frozen) {
+        return answer(kSCStatusInvalidArgument);
+    }
+    self->tree().setTopValue(ownKey.get(), frozen);
+    return answer(kSCStatusOK);
+}
+
+CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path) {
+    return dictionaryAt(session, path);
+}
+
+Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path, CFDictionaryRef value) {
+    Session* const self = Session::from(session);
+    if (self == nullptr) {
+        return answer(kSCStatusNoPrefsSession);
+    }
+    const bool valid = isPath(path) && as<CFDictionaryRef>(value) != nullptr;
+    const Owned<CFPropertyListRef> frozen =
+        valid ? platform::values::frozen(value) : Owned<CFPropertyListRef>();
+    return answer(frozen ? self->tree().set(textOf(path), frozen) : kSCStatusInvalidArgument);
+}
+
+CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path) {
+    CFDictionaryRef const dictionary = dictionaryAt(session, path);
+    if (dictionary == nullptr) {
+        return nullptr;
+    }
+    const CFTypeRef link = CFDictionaryGetValue(dictionary, CFSTR("__LINK__"));
+    const auto target = as<CFStringRef>(link);
+    setStatus(target != nullptr ? kSCStatusOK : link == nullptr ? kSCStatusNoKey : kSCStatusFailed);
+    return target;
+}
+
+Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path) {
+    Session* const self = Session::from(session);
+    if (self == nullptr) {
+        return answer(kSCStatusNoPrefsSession);
+    }
+    return answer(isPath(path) ? self->tree().remove(textOf(path)) : kSCStatusInvalidArgument);
+}
+
+Boolean SCPreferencesCommitChanges(SCPreferencesRef session) {
+    Session* const self = Session::from(session);
+    return self == nullptr ? answer(kSCStatusNoPrefsSession) : answer(self->commit(), *self);
+}
+
+Boolean SCPreferencesApplyChanges(SCPreferencesRef session) {
+    Session* const self = Session::from(session);
+    if (self == nullptr) {
+        return answer(kSCStatusNoPrefsSession);
+    }
+    Owned<CFDictionaryRef> committed;
+    const Outcome loaded = self->loadCommitted(committed);
+    if (!loaded.ok()) {
+        return answer(loaded, *self);
+    }
+    // Every failure of an apply has told its reason to the log from where it happened.
+    return answer(platform::apply::applyTree(committed.get()).status());
+}

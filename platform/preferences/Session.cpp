@@ -1,0 +1,114 @@
+#include "platform/preferences/Session.h"
+
+#include <optional>
+#include <utility>
+
+#include "platform/values/PropertyListXML.h"
+
+namespace platform::preferences {
+
+Session::Session(std::string name, StoreFile file, Snapshot read)
+    : Object(values::Type::preferences),
+      name_(std::move(name)),
+      file_(std::move(file)),
+      onDisk_(std::move(read)),
+      tree_(onDisk_.tree) {}
+
+Outcome Session::open(std::string name, const std::string& directory, FileOperations& operations,
+                      values::Owned<SCPreferencesRef>& session) {
+    StoreFile file(directory, operations);
+    Snapshot snapshot;
+    Outcome done = load(file, snapshot);
+    if (done.ok()) {
+        Object* const object = new Session(std::move(name), std::move(file), std::move(snapshot));
+        session =
+            values::Owned<SCPreferencesRef>::adopt(static_cast<SCPreferencesRef>(static_cast<void*>(object)));
+    }
+    return done;
+}
+
+Session* Session::from(SCPreferencesRef reference) noexcept {
+    auto* const object = static_cast<Object*>(static_cast<void*>(reference));
+    return object != nullptr && object->type() == values::Type::preferences ? static_cast<Session*>(object)
+                                                                            : nullptr;
+}
+
+Outcome Session::checkFresh() const {
+    std::optional<FileIdentity> now;
+    Outcome looked = file_.look(now);
+    if (looked.ok() && now != onDisk_.identity) {
+        return {kSCStatusStale, file_.path() + " was changed by another process"};
+    }
+    return looked;
+}
+
+bool Session::isChanged() const {
+    return tree_.root().get() != onDisk_.tree.get() && CFEqual(tree_.root().get(), onDisk_.tree.get()) == 0;
+}
+
+Outcome Session::lock(std::chrono::milliseconds wait) {
+    if (lock_.isOpen()) {
+        return {};
+    }
+    FileDescriptor lock;
+    Outcome done = file_.lock(wait, lock);
+    if (done.ok()) {
+        done = checkFresh();
+    }
+    if (done.ok()) {
+        lock_ = std::move(lock);
+    }
+    return done;
+}
+
+Outcome Session::unlock() {
+    if (!lock_.isOpen()) {
+        return {kSCStatusNeedLock, "the lock is not held"};
+    }
+    lock_.reset();
+    return {};
+}
+
+Outcome Session::write() {
+    const std::optional<std::string> content = values::writePropertyListXML(tree_.root().get());
+    if (!content) {
+        return {kSCStatusFailed, "the tree holds a value that an XML property list cannot carry"};
+    }
+    if (content->size() > largestPreferencesFile) {
+        return {kSCStatusFailed, "the tree is larger than a preferences file may be"};
+    }
+    std::optional<FileIdentity> identity;
+    Outcome done = file_.replace(*content, identity);
+    if (done.ok()) {
+        onDisk_ = {tree_.root(), identity};
+        remember(file_, onDisk_);
+    } else if (identity) {
+        // In its place, but perhaps not durable: the next commit is not stale, and writes once more.
+        onDisk_.identity = identity;
+    }
+    return done;
+}
+
+Outcome Session::commit(std::chrono::milliseconds wait) {
+    if (onDisk_.identity && !isChanged()) {
+        return checkFresh();
+    }
+    const bool held = lock_.isOpen();
+    Outcome done = held ? checkFresh() : lock(wait);
+    if (done.ok()) {
+        done = write();
+    }
+    if (!held) {
+        lock_.reset();
+    }
+    return done;
+}
+
+Outcome Session::loadCommitted(values::Owned<CFDictionaryRef>& tree) const {
+    Snapshot snapshot;
+    Outcome done = load(file_, snapshot);
+    tree = std::move(snapshot.tree);
+    return done;
+}
+
+}  // namespace platform::preferences

@@ -1,0 +1,68 @@
+// The preferences file and its lock, as bytes: looked at, read, replaced.
+#pragma once
+
+#include <sys/types.h>
+
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/FileDescriptor.h"
+#include "platform/Outcome.h"
+#include "platform/preferences/FileOperations.h"
+
+namespace platform::preferences {
+
+inline constexpr std::size_t largestPreferencesFile = std::size_t{64} << 20U;
+
+// Tells one state of the file from every other. A commit makes a new file, an editor changes the times.
+struct FileIdentity {
+    dev_t device = 0;
+    ino_t inode = 0;
+    off_t size = 0;
+    std::int64_t modified = 0;  // nanoseconds, as is changed
+    std::int64_t changed = 0;
+    bool operator==(const FileIdentity&) const = default;
+};
+
+// "preferences.plist" in one directory, "preferences.lock" beside it, and "preferences.plist.new" while a
+// commit writes. A symbolic link in the place of any of them is refused, wherever it leads: the store of a
+// tool that runs as root has no business elsewhere. So is everything else that is no regular file, and none
+// of it is ever waited for.
+class StoreFile {
+  public:
+    StoreFile(std::string directory, FileOperations& operations);
+
+    [[nodiscard]] const std::string& path() const noexcept { return path_; }
+
+    // The file as it is now; nothing when there is none. Fails when there is none and this process could not
+    // make one.
+    Outcome look(std::optional<FileIdentity>& identity) const;
+    // All of the file, and what it was when it was read. Fails beyond largestPreferencesFile.
+    Outcome read(std::string& content, FileIdentity& identity) const;
+    // Takes the lock, which goes with the descriptor. Makes the directory (0700) and its parents when they
+    // are missing. 3002 when another process keeps it for the whole wait.
+    Outcome lock(std::chrono::milliseconds wait, FileDescriptor& lock);
+    // Puts the content in the file's place, all of it or nothing, on the disk when the call returns. A new
+    // file has mode 0600, a replaced one keeps its mode and owner. The lock must be held. identity is what
+    // the file then is: set as soon as the new content has its place, even when the call fails after that,
+    // and nothing, on success too, when somebody else touched the file at that very moment.
+    Outcome replace(std::string_view content, std::optional<FileIdentity>& identity);
+
+  private:
+    Outcome makeDirectories();
+    Outcome writeTemporary(std::string_view content, std::optional<FileIdentity>& identity);
+    Outcome fill(int descriptor, std::string_view content);
+    Outcome keepOwnership(int descriptor);
+    Outcome syncDirectory();
+
+    std::string directory_;
+    std::string path_;
+    std::string temporaryPath_;
+    FileOperations* operations_;
+};
+
+}  // namespace platform::preferences
