@@ -22,6 +22,7 @@ from pathlib import Path
 HERE = Path(__file__).resolve().parent
 PROJECT = HERE.parents[1]
 BINARY = Path(os.environ.get("LA_BINARY", PROJECT / "build/release/app/location-assistant")).resolve()
+BUILD = Path(os.environ.get("LA_BUILD", BINARY.parents[1])).resolve()
 LAB = Path("/run/lab")
 TOOL = LAB / "bin" / BINARY.name
 STORE = Path("/var/lib/location-assistant/preferences.plist")
@@ -35,6 +36,38 @@ ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
 # The second card of a kind gets the next number.
 PCI = {"eth": "0000:02:00.0", "wlan": "0000:03:00.0", "en": "0000:00:19.0"}
 DRIVER = {"eth": "e1000e", "wlan": "iwlwifi", "en": "e1000e"}
+
+BUS = """<busconfig>
+<type>system</type>
+<listen>unix:path=/run/dbus/system_bus_socket</listen>
+<policy context="default">
+<allow user="*"/><allow own="*"/><allow send_destination="*"/><allow receive_sender="*"/>
+</policy>
+</busconfig>
+"""
+
+NETWORK_MANAGER = """[main]
+plugins=keyfile
+dns=none
+auth-polkit=false
+no-auto-default=*
+"""
+PROFILE = """[connection]
+id={0}
+uuid={1}
+type=ethernet
+interface-name={2}
+[ipv4]
+method=manual
+{3}
+[ipv6]
+method=link-local
+"""
+PROFILES = {
+    "office": ("11111111-2222-4333-8444-555555555555", "eth0",
+               "address1=192.168.77.10/24,192.168.77.1\naddress2=192.168.77.11/24\nroute-metric=100"),
+    "lounge": ("66666666-7777-4888-9999-aaaaaaaaaaaa", "wlan0", "address1=10.20.0.7/16\nroute1=10.30.0.0/16,10.20.0.1"),
+}
 
 PREPARE = """
 mount -t tmpfs -o mode=755 tmpfs /run
@@ -103,7 +136,7 @@ def enter():
 
     # What lies under a folder that the laboratory hides is held open and put back at its place.
     hidden = ("/tmp/", "/run/", "/var/lib/")
-    kept = {path: os.open(path, os.O_PATH) for path in (PROJECT, BINARY.parent) if str(path).startswith(hidden)}
+    kept = {path: os.open(path, os.O_PATH) for path in (PROJECT, BUILD, BINARY.parent) if str(path).startswith(hidden)}
     binaries = os.open(BINARY.parent, os.O_PATH)
     sh(PREPARE.format(lab=LAB, binaries=binaries, packages=shlex.quote(str(PROJECT / ".lab/root"))),
        pass_fds=[binaries], cwd="/")
@@ -138,9 +171,9 @@ def wait_until(condition, seconds=10):
 
 class Lab:
     """One fresh machine; only one at a time. printer is a manner of printer.py or None; dhcp names the card at whose
-    other end a DHCP server answers."""
+    other end a DHCP server answers; with daemon the network before is NetworkManager's work."""
 
-    def __init__(self, cards=("eth0", "wlan0"), printer="well", dhcp=None):
+    def __init__(self, cards=("eth0", "wlan0"), printer="well", dhcp=None, daemon=False):
         self.transcript = ""
         self.syslog = []
         self.daemons = []
@@ -158,18 +191,19 @@ class Lab:
         # The machine before the tool comes: both cards in use, the wired one leads out.
         if "eth0" in cards:
             ip("-n far addr add 192.168.77.1/24 dev far-eth0")
-            ip("link set eth0 up")
-            ip("addr add 192.168.77.10/24 brd + dev eth0")
-            ip("addr add 192.168.77.11/24 dev eth0")
-            ip("route add default via 192.168.77.1 dev eth0 metric 100")
+            if not daemon:
+                ip("link set eth0 up")
+                ip("addr add 192.168.77.10/24 brd + dev eth0")
+                ip("addr add 192.168.77.11/24 dev eth0")
+                ip("route add default via 192.168.77.1 dev eth0 metric 100")
         if "wlan0" in cards:
             ip("-n far addr add 192.0.0.192/24 dev far-wlan0")
-            ip("link set wlan0 up")
-            ip("addr add 10.20.0.7/16 dev wlan0")
-            ip("route add 10.30.0.0/16 via 10.20.0.1 dev wlan0 metric 600")
+            if not daemon:
+                ip("link set wlan0 up")
+                ip("addr add 10.20.0.7/16 dev wlan0")
+                ip("route add 10.30.0.0/16 via 10.20.0.1 dev wlan0 metric 600")
             if printer:
-                self.daemon(sys.executable, HERE / "printer.py", printer, LAB / "printer.log", far=True)
-                wait_until(lambda: ":80 " in sh("nsenter --net=/run/netns/far ss -Hltn"))
+                self.start_printer(printer)
         if dhcp:
             net, server = ("192.0.0", "192.0.0.192") if dhcp == "wlan0" else ("192.168.77", "192.168.77.1")
             self.daemon("dnsmasq", "--no-daemon", "--conf-file=/dev/null", "--port=0", f"--interface=far-{dhcp}",
@@ -179,6 +213,9 @@ class Lab:
                         f"--log-facility={LAB}/dhcp.log", far=True)
             wait_until(lambda: "DHCP, IP range" in self.file("dhcp.log"))
         self._make_sysfs()
+        if daemon:
+            self.start_bus()
+            self.start_network_manager()
         if {"eth0", "wlan0"} & set(cards):
             wait_until(lambda: all("LOWER_UP" in link["flags"] for link in self.links()))
 
@@ -194,7 +231,8 @@ class Lab:
         self.listener.shutdown(socket.SHUT_RDWR)
         sh(f"""
             for card in {' '.join(self.cards)}; do ip link del $card 2>/dev/null || ip -n far link del far-$card || :; done
-            rm -rf /dev/log {STORE.parent} {RUNTIME} {LAB}/made/* {LAB}/*.log {LAB}/leases
+            rm -rf /dev/log {STORE.parent} {RUNTIME} {LAB}/made/* {LAB}/*.log {LAB}/leases /run/dbus
+            rm -rf /etc/NetworkManager/* /run/NetworkManager /var/lib/NetworkManager
             find /tmp -xdev -mindepth 1 -not -type d -delete
         """)
 
@@ -235,6 +273,37 @@ class Lab:
                                    **{"stdout": subprocess.DEVNULL, "stderr": subprocess.DEVNULL} | options)
         self.daemons.append(process)
         return process
+
+    def start_printer(self, manner):
+        self.printer = self.daemon(sys.executable, "-B", HERE / "printer.py", manner, LAB / "printer.log", far=True)
+        wait_until(lambda: ":80 " in sh("nsenter --net=/run/netns/far ss -Hltn"))
+
+    def stop(self, daemon):
+        daemon.kill()
+        daemon.wait()
+
+    def start_bus(self):
+        Path("/run/dbus").mkdir(exist_ok=True)
+        (LAB / "bus.conf").write_text(BUS)
+        self.daemon("dbus-daemon", f"--config-file={LAB}/bus.conf", "--nofork", "--nopidfile")
+        wait_until(Path("/run/dbus/system_bus_socket").exists)
+
+    def start_network_manager(self):
+        folder = Path("/etc/NetworkManager/system-connections")
+        if not folder.exists():
+            folder.mkdir()
+            Path("/etc/NetworkManager/NetworkManager.conf").write_text(NETWORK_MANAGER)
+            for name, (uuid, card, lines) in PROFILES.items():
+                (folder / f"{name}.nmconnection").write_text(PROFILE.format(name, uuid, card, lines))
+                (folder / f"{name}.nmconnection").chmod(0o600)
+        log = (LAB / "networkmanager.log").open("ab")
+        self.network_manager = self.daemon("NetworkManager", "--debug", stdout=log, stderr=log)
+        wait_until(lambda: self.nmcli("-f DEVICE,STATE device").count(":connected\n") >= len(self.cards), 20)
+
+    @staticmethod
+    def nmcli(arguments):
+        return subprocess.run(["nmcli", "-t", *shlex.split(arguments)], capture_output=True, text=True,
+                              env=ENVIRONMENT, check=False).stdout
 
     def start(self, *words, **options):
         """The tool as a process; words are strings or bytes."""

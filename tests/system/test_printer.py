@@ -1,0 +1,81 @@
+#!/usr/bin/env python3
+"""The assisted run: the printer found, the prompt, the browser, and every way in which a printer can misbehave."""
+import re
+import subprocess
+import time
+
+import lab
+
+TYPED = b"n\n\nx\ny\n"
+PROXIES = {f"{name}_proxy": "http://192.0.0.1:1" for name in ("http", "all", "HTTP", "ALL")}
+
+
+class Printer(lab.LabTest):
+    def test_well(self):
+        before = self.lab.network()
+        self.lab.tool("test", typed=TYPED, env=lab.ENVIRONMENT | PROXIES)
+        self.assertEqual(["192.0.0.199/24"], self.lab.ipv4("wlan0"))
+        self.assertEqual(({"0": "Automatic", "1": "kv zat temp set"}, "1"), self.set_names())
+        self.assertEqual("GET /mactestfoo.html HTTP/1.1\n", self.lab.file("printer.log"))
+        self.lab.tool("remove")
+        self.assertEqual(before, self.lab.network())
+        self.assert_golden("test")
+
+    def test_end_of_input(self):
+        run = self.lab.start("test")
+        for _ in range(100_000):
+            last = run.stdout.read(15)
+        self.assertEqual((None, 15), (run.poll(), len(last)))
+        run.kill()
+        run.communicate()
+
+
+class Misbehaving(lab.LabTest):
+    """Three tries, one second apart, and the trace goes on; the result is an HTTP status or a negative one."""
+    options = {"printer": None}
+
+    def probe(self, manner, result):
+        with self.subTest(manner):
+            if manner:
+                self.lab.start_printer(manner)
+            start = time.monotonic()
+            status, trace = self.lab.tool("test", stdin=subprocess.DEVNULL)
+            seconds = time.monotonic() - start
+            tail = trace[trace.index("Looking for the device"):]
+            expected = ["Looking for the device at 192.0.0.192"]
+            for number in range(3):
+                expected += [f"IsWirelessPrinterReachableViaHTTP() try {number}",
+                             "*** Device NOT found (result = RESULT) ****"]
+            expected += ["*** Bailing out (tries = 3) ****", "Printer is reachable: FALSE", "Deleting the temporary set"]
+            self.assertEqual(0, status)
+            self.assertRegex(tail, "^" + re.escape("\n".join(expected)).replace("RESULT", result))
+            self.assertTrue(2 <= seconds < 100, seconds)
+            if manner:
+                self.lab.stop(self.lab.printer)
+            self.lab.tool("remove")
+
+    def test_refused(self):
+        self.probe(None, "-[0-9]+")
+
+    def test_ends_by_itself(self):
+        for manner, result in {"redirect": "302", "big": "(0|-[0-9]+)", "reset": "-[0-9]+"}.items():
+            self.probe(manner, result)
+        self.assertNotIn("moved", self.lab.file("printer.log"))
+
+    def test_silent(self):
+        self.probe("silent", "-[0-9]+")
+
+    def test_endless(self):
+        self.probe("endless", "-[0-9]+")
+
+
+class WithoutCard(lab.LabTest):
+    options = {"cards": ["eth0"]}
+
+    def test_no_airport_card(self):
+        self.lab.tool("test", stdin=subprocess.DEVNULL)
+        self.assert_golden("test_no_airport_card")
+
+
+if __name__ == "__main__":
+    lab.main()
