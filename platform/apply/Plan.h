@@ -47,8 +47,9 @@ struct InterfacePlan {
     std::vector<IPv4Address> nameServers;
     std::vector<std::string> searchDomains;
     std::optional<WirelessSettings> wireless;  // when the service has an AirPort entity
-    // The interface's place among the active ones, in service order: the default route of 0 is preferred to that of
-    // 1, and all of them to the ones of interfaces that are left to the system. 0 for an interface that is off.
+    // The interface's place among the active ones, in service order: the default route of 0 is preferred to
+    // that of 1, and all of them to the ones of interfaces that are left to the system. 0 for an interface
+    // that is off.
     unsigned rank = 0;
     bool operator==(const InterfacePlan&) const = default;
 };
@@ -59,11 +60,19 @@ using Plan = std::vector<InterfacePlan>;
 
 // The plan for the current location of a preferences tree (its root dictionary). Fails with 1004 and an empty
 // plan when "CurrentSet" names no location, and with 1001 when an interface's settings cannot be used: an
-// address that is no dotted quad, a mask with holes, a name that no interface can have.
+// address that is no dotted quad, a mask with holes, a name that no interface or network can have. The plan
+// then holds the interfaces whose settings can be used, so that one bad service does not keep the others from
+// being made so; the bad one is left to the system.
+//
+// A "Manual" entity without addresses, as a new location has it, asks for an interface that is on and has
+// none. An address without a mask gets the one of its class. A serial service ("Type" "PPP") and a service
+// that is not in the order ask for nothing. A service for the device "*" stands for every interface that no
+// other service names, and leaves them to the system.
 Outcome makePlan(CFDictionaryRef root, Plan& plan);
 
-// The plan as a property list for the record, with each key replaced by a digest of it, so that a password is
-// kept nowhere but in the preferences; equal plans give equal values.
-[[nodiscard]] CFDictionaryRef copyPlanAsPropertyList(const InterfacePlan& plan);
+// The plan as a property list for the record. The key is replaced by a short digest of it under the salt:
+// enough to see that it changed, too little to tell it from the thousands of others with the same one. Equal
+// plans give equal values under one salt. The caller owns the value.
+[[nodiscard]] CFDictionaryRef copyPlanAsPropertyList(const InterfacePlan& plan, const Salt& salt);
 
 }  // namespace platform::apply

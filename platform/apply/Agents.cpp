@@ -1,0 +1,29 @@
+#include "platform/apply/Agents.h"
+
+#include <string>
+
+#include "platform/Host.h"
+
+namespace platform::apply {
+
+Outcome chooseAgent(std::shared_ptr<Agent>& agent) {
+    agent = currentHost().agent;
+    if (agent == nullptr) {
+        agent = makeDirectAgent();
+    }
+    return {};
+}
+
+Outcome agentNamed(std::string_view name, std::shared_ptr<Agent>& agent) {
+    agent = currentHost().agent;
+    if (agent != nullptr && agent->name() == name) {
+        return {};
+    }
+    agent = name == "direct" ? makeDirectAgent() : nullptr;
+    if (agent == nullptr) {
+        return {kSCStatusFailed, "there is no agent \"" + std::string(name) + "\" to give it back"};
+    }
+    return {};
+}
+
+}  // namespace platform::apply

@@ -1,0 +1,52 @@
+// The small files of the runtime directory: property lists that tell the next run what this one did.
+#pragma once
+
+#include <chrono>
+#include <string>
+#include <string_view>
+
+#include "platform/CoreFoundation.h"
+#include "platform/FileDescriptor.h"
+#include "platform/Outcome.h"
+#include "platform/values/Object.h"
+
+namespace platform::apply {
+
+inline constexpr std::size_t largestStateFile = std::size_t{16} << 20U;
+
+// Makes the host's runtime directory, mode 0700, when it is not there. Fails when it is no directory, belongs
+// to somebody else, or others may write to it.
+Outcome makeRuntimeDirectory();
+// The path of a file in it.
+[[nodiscard]] std::string runtimePath(std::string_view name);
+
+// The dictionary that a file holds; null, and success, when there is no such file. Links are not followed.
+// Fails for anything that is not a property list with a dictionary, or is larger than largestStateFile.
+Outcome readStateFile(const std::string& path, values::Owned<CFDictionaryRef>& content);
+// All of it or nothing, mode 0600, on the disk when the call returns.
+Outcome writeStateFile(const std::string& path, CFDictionaryRef content);
+// Success when it is not there.
+Outcome removeStateFile(const std::string& path);
+
+// The same two steps for plain content, which the name servers' file shares. mode, uid and gid are set before
+// the file has its name.
+Outcome readWholeFile(const std::string& path, std::string& content);
+struct FileOwnership {
+    unsigned mode = 0600;
+    unsigned user = 0;
+    unsigned group = 0;
+};
+Outcome replaceFile(const std::string& path, std::string_view content, const FileOwnership& ownership);
+// Puts the directory of a path on the disk.
+Outcome syncDirectoryOf(const std::string& path);
+
+// A lock between processes, held until the end of the scope, in a file of its own.
+class StateLock {
+  public:
+    Outcome acquire(const std::string& path, std::chrono::milliseconds bound);
+
+  private:
+    FileDescriptor descriptor_;
+};
+
+}  // namespace platform::apply

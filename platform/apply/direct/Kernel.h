@@ -1,0 +1,103 @@
+// One network interface as the kernel has it: link state, addresses and routes, read, compared and made.
+//
+// An address or a route is kept as the message that the kernel gave for it, in a form that two readings of
+// the same thing have in common (what comes and goes by itself is taken out, the interface's own index is 0),
+// so that nothing of it is lost on the way to the record and back.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Outcome.h"
+#include "platform/apply/Plan.h"
+#include "platform/netlink/Message.h"
+#include "platform/netlink/Socket.h"
+
+namespace platform::apply {
+
+// Marks the routes that this system made; a number that no routing daemon has claimed
+// (/etc/iproute2/rt_protos).
+inline constexpr std::uint8_t ourRouteProtocol = 76;
+
+inline constexpr std::uint32_t forever = 0xFFFFFFFFU;
+
+struct Link {
+    int index = 0;
+    bool up = false;       // switched on
+    bool running = false;  // and with a carrier
+};
+
+struct Address {
+    netlink::Bytes key;  // ifaddrmsg and attributes, without lifetimes
+    std::uint8_t protocol = 0;
+    std::uint32_t valid = forever;  // seconds from the reading on
+    std::uint32_t preferred = forever;
+    // Whether the kernel makes it without being asked, as link-local and router-advertised ones.
+    bool comesByItself = false;
+
+    [[nodiscard]] int family() const noexcept;
+    bool operator==(const Address& other) const noexcept { return key == other.key; }
+};
+
+struct Route {
+    netlink::Bytes key;     // rtmsg and attributes
+    bool preceded = false;  // an equally good route to the same place stood before it
+    bool comesByItself = false;
+    bool isShared = false;     // it needs other interfaces too
+    bool isElsewhere = false;  // it goes through another interface, but from one of this one's addresses
+
+    [[nodiscard]] int family() const noexcept;
+    [[nodiscard]] std::uint8_t protocol() const noexcept;
+    [[nodiscard]] bool hasGateway() const noexcept;
+    bool operator==(const Route& other) const noexcept { return key == other.key; }
+};
+
+struct InterfaceState {
+    std::vector<Address> addresses;  // IPv4, then IPv6, in the kernel's order
+    std::vector<Route> routes;       // every table but the local one
+};
+
+// The message as an address of the interface, or as a route through it (or from one of its addresses);
+// nothing when it belongs to another interface or is none of these.
+[[nodiscard]] std::optional<Address> decodeAddress(const netlink::MessageView& message, int index);
+[[nodiscard]] std::optional<Route> decodeRoute(const netlink::MessageView& message, int index,
+                                               const std::vector<Address>& addresses);
+
+// A manual or leased address with its broadcast address, under the interface's name.
+[[nodiscard]] Address makeAddress(const std::string& interface, const ManualAddress& address);
+// The default route through a router, and, when no address has the router on its own network, the way to it.
+[[nodiscard]] std::vector<Route> makeDefaultRoute(IPv4Address router, unsigned metric,
+                                                  const std::vector<ManualAddress>& addresses);
+
+class Kernel {
+  public:
+    Outcome open() { return socket_.open(); }
+
+    // Nothing, and success, when there is no interface of that name.
+    Outcome findLink(const std::string& name, std::optional<Link>& link);
+    Outcome setUp(const Link& link, bool up);
+    Outcome read(const Link& link, InterfaceState& state);
+
+    // Already there, or already gone, is success. A lifetime other than forever lets the kernel drop the
+    // address.
+    Outcome addAddress(const Link& link, const Address& address);
+    Outcome removeAddress(const Link& link, const Address& address);
+    Outcome addRoute(const Link& link, const Route& route);
+    Outcome removeRoute(const Link& link, const Route& route);
+
+    // Makes the interface's addresses these and no others, touching nothing when they are; IPv4 ones in this
+    // order. What comes by itself is neither wanted nor removed.
+    Outcome makeAddresses(const Link& link, const std::vector<Address>& wanted);
+    // Makes its routes these and no others. With keepConnected the kernel's own routes to the networks of the
+    // interface's addresses stay too.
+    Outcome makeRoutes(const Link& link, const std::vector<Route>& wanted, bool keepConnected);
+
+  private:
+    Outcome dump(std::uint16_t type, int family, std::vector<netlink::OwnedMessage>& messages);
+
+    netlink::Socket socket_;
+};
+
+}  // namespace platform::apply

@@ -1,0 +1,62 @@
+// What a DHCP server lent, and how it is made the interface's configuration.
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <string>
+#include <vector>
+
+#include "platform/Outcome.h"
+#include "platform/apply/Plan.h"
+#include "platform/apply/direct/Kernel.h"
+#include "platform/apply/direct/NameServers.h"
+
+namespace platform::apply {
+
+struct Lease {
+    ManualAddress address;
+    IPv4Address router = 0;  // 0 for none
+    NameService nameService;
+    std::uint32_t seconds = forever;
+    bool operator==(const Lease&) const = default;
+};
+
+using Environment = std::map<std::string, std::string, std::less<>>;
+
+// The lease as the DHCP client tells it in its program's environment. All of it comes from the network and
+// from whoever answers there: an address or a prefix length that no machine can have fails; routers, servers
+// and domains that are none are dropped, and more servers and domains than a resolver reads too.
+Outcome leaseFromEnvironment(const Environment& environment, Lease& lease);
+
+// How the interface's DHCP client was started, for the client's program and for the next run.
+struct DhcpSettings {
+    std::string interface;
+    unsigned rank = 0;
+    std::string clientID;
+    // The location brings servers of its own, and the lease's are not used.
+    bool ignoresServers = false;
+    bool operator==(const DhcpSettings&) const = default;
+};
+
+// Writes the lease into the runtime directory, then makes it so: the address for the lease's time (in place
+// of an earlier lease's), the default route, the name servers.
+Outcome takeLease(const DhcpSettings& settings, const Lease& lease);
+// Undoes that, whatever of it was done.
+Outcome dropLease(const DhcpSettings& settings);
+// Keeps the reason why a lease could not be taken, for the run that waits for it.
+Outcome refuseLease(const std::string& interface, const std::string& reason);
+
+// What the interface's lease has come to.
+struct LeaseState {
+    bool isTaken = false;
+    Lease lease;           // with isTaken, or while it is being made so
+    bool isKnown = false;  // the lease is filled in
+    std::string refusal;   // why the last offer was refused
+};
+Outcome readLease(const std::string& interface, LeaseState& state);
+
+// The kernel's part of a lease.
+[[nodiscard]] Address addressOf(const std::string& interface, const Lease& lease);
+[[nodiscard]] std::vector<Route> routesOf(const Lease& lease, unsigned rank);
+
+}  // namespace platform::apply
