@@ -14,8 +14,8 @@ inline constexpr OSErr coreFoundationUnknownErr = -4960;
 // --- System version ---
 
 inline constexpr OSType gestaltSystemVersion = 0x73797376;  // 'sysv'
-// For gestaltSystemVersion a BCD number: 0x1020 is 10.2.0. Another selector, or no answer, is a failure that
-// leaves the response untouched.
+inline constexpr OSErr gestaltUndefSelectorErr = -5551;     // no such question, or no answer to it
+// For gestaltSystemVersion a BCD number: 0x1020 is 10.2.0. The response is untouched on failure.
 OSErr Gestalt(OSType selector, SInt32* response);
 
 // --- Folders ---
@@ -39,8 +39,9 @@ inline constexpr SInt16 kLocalDomain = -32765;
 inline constexpr SInt16 kSystemDomain = -32766;
 inline constexpr OSType kModemScriptsFolderType = 0xC46D6F64;
 
-// The folder of that kind in a domain. createFolder must be false. fnfErr when it does not exist, paramErr
-// for an unknown kind or domain; the reference is then untouched.
+// The folder of that kind in a domain. createFolder must be false. fnfErr when it does not exist, permErr
+// when it may not be seen, paramErr for an unknown kind or domain; the reference is then untouched. The user
+// is the one who runs the process, and the home is that of the password database.
 OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder);
 
 struct OpaqueFSIterator;
@@ -51,9 +52,10 @@ inline constexpr OSErr errFSNoMoreItems = -1417;
 
 // An iterator over the items directly in a folder, ended with FSCloseIterator; null on failure.
 OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator);
-// Up to maximumItems references and names. errFSNoMoreItems marks the last batch, which may hold items. A
-// name that is not UTF-8, or longer than 255 units, is passed over: it could not be named in a location.
-// whichInfo is kFSCatInfoNone; containerChanged, catalogInfos and specs are null; refs and names may be.
+// Up to maximumItems references and names, in no order. errFSNoMoreItems marks the last batch, which may hold
+// items; what actualItems tells was delivered even when the status is another failure. A name that is not
+// UTF-8, or longer than 255 units, is passed over: it could not be named in a location. whichInfo is
+// kFSCatInfoNone; containerChanged, catalogInfos and specs are null; refs and names may be.
 OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems,
                            Boolean* containerChanged, UInt32 whichInfo, void* catalogInfos, FSRef* refs,
                            void* specs, HFSUniStr255* names);
@@ -66,8 +68,10 @@ inline constexpr UInt32 kLSRequestBasicFlagsOnly = 0x4;
 inline constexpr UInt32 kLSItemInfoIsPlainFile = 0x1;
 inline constexpr UInt32 kLSItemInfoIsContainer = 0x8;
 inline constexpr UInt32 kLSItemInfoIsInvisible = 0x40;
-// What the item is; links are followed, and a name that begins with a dot is invisible. fnfErr when it is
-// gone.
+// What the item is; links are followed, and a name that begins with a dot is invisible. An item that is gone
+// since it was listed, and a link that leads nowhere, are neither a plain file nor a container, and no
+// failure: neither of them may spoil the listing of the folder. permErr and ioErr when the item is there and
+// cannot be looked at.
 OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInfoRecord* info);
 
 // --- Download ---

@@ -1,7 +1,27 @@
 // The hardware registry: entries for network interfaces and serial ports, their properties and their parents.
 //
-// Handles are small integers with a reference count of their own; IOObjectRelease drops one reference. An
-// iterator and the entries taken from it are a snapshot of the hardware at the moment the iterator was made.
+// Handles are small integers. Each one that is handed out is a reference of its own, to be given back with
+// IOObjectRelease; a handle that is not one (0, or given back before) is kIOReturnBadArgument. An iterator
+// and the entries taken from it are a snapshot of the hardware at the moment the iterator was made: a device
+// that is pulled out meanwhile keeps its entry, and fails nobody.
+//
+// Entries and their properties (strings unless told otherwise; what cannot be had is left out):
+// - "IOEthernetInterface", each network interface of Ethernet type with hardware behind it, wireless ones
+//   included: "BSD Name" (the kernel's name, always there).
+//   - Its parent, the controller: "IOMACAddress" (data, 6 bytes: the address that the card was made with,
+//   else
+//     the one in use), "IOClass" (the driver's name, with "AirPort" before it when the card is wireless),
+//     "IOProviderClass" (always there: "IOPCIDevice", "IOUSBDevice", else "IOPlatformDevice").
+//     - The controller's parent, the bus (both data, ASCII with a NUL at the end): "name" (always there; the
+//       bus and the place on it), "AAPL,slot-name" (for PCI: "SLOT-" and the firmware's label for the slot or
+//       the device, else the PCI address); "IOChildIndex" (number, from 0), when one card carries several
+//       ports.
+// - "IOSerialBSDClient", each serial port with hardware behind it, except one that serves as the system's
+//   console: "IOTTYDevice" (the kernel's name), "IOTTYBaseName", "IOSerialBSDClientType", all always there.
+//   The type is "IOModemSerialStream" for a USB modem (base name "usbmodem") and a Bluetooth serial port
+//   (base name "Bluetooth-Modem"), else "IORS232SerialStream" with the kernel's name for a base name.
+//   - Its parent, the device: "Product Name", from USB.
+// A device whose name is not UTF-8 has no entry.
 #pragma once
 
 #include "platform/CoreFoundation.h"
@@ -28,10 +48,12 @@ inline constexpr const char* kIOServicePlane = "IOService";
 
 // The handle through which the registry is asked, to be released with IOObjectRelease.
 kern_return_t IOMasterPort(mach_port_t bootstrapPort, mach_port_t* masterPort);
-// A dictionary that matches every entry of a class; null without memory.
+// A dictionary that matches every entry of a class ("IOProviderClass"); null without memory.
 CFMutableDictionaryRef IOServiceMatching(const char* className);
-// Consumes one reference of the matching dictionary, on failure too. Matches by class, or by the pair
-// "IOProviderClass" and "IOSerialBSDClientType". Entries come in a stable order.
+// Consumes one reference of the matching dictionary, on failure too. Matches the entries of the class under
+// "IOProviderClass" whose properties equal whatever else the dictionary holds; nothing when there is no such
+// class. They come in the order of the kernel's names, numbers in them by value. The output is untouched on
+// failure.
 kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryRef matching,
                                            io_iterator_t* iterator);
 // The next entry, which the caller releases, or 0 at the end.
@@ -45,6 +67,6 @@ kern_return_t IORegistryEntryCreateCFProperties(io_registry_entry_t entry, CFMut
 // The parent, which the caller releases. plane is kIOServicePlane. The output is 0 on failure.
 kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const char* plane,
                                             io_registry_entry_t* parent);
-// Whether the entry is of the class or of a subclass of it.
+// Whether the entry is of the class; no parent is of any.
 Boolean IOObjectConformsTo(io_object_t object, const char* className);
 kern_return_t IOObjectRelease(io_object_t object);

@@ -122,8 +122,10 @@ class SysfsTree {
         describe(controller, "pci", "xhci_hcd");
         const std::string device = controller + "/usb1/" + port;
         describe(controller + "/usb1", "usb", "usb");
+        attribute(controller + "/usb1/idVendor", "1d6b");
         attribute(controller + "/usb1/product", "Host Controller");
         describe(device, "usb", "usb");
+        attribute(device + "/idVendor", "0525");
         if (!product.empty()) {
             attribute(device + "/product", product);
         }

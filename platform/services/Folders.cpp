@@ -1,0 +1,275 @@
+#include <dirent.h>
+#include <pwd.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+#include <cstring>
+#include <iterator>
+#include <map>
+#include <memory>
+#include <new>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "platform/CoreServices.h"
+#include "platform/Host.h"
+#include "platform/values/Values.h"
+
+// A folder being read.
+struct OpaqueFSIterator {
+    struct Closer {
+        void operator()(DIR* directory) const noexcept { closedir(directory); }
+    };
+    std::string path;
+    std::unique_ptr<DIR, Closer> directory;
+};
+
+namespace platform::services {
+namespace {
+
+OSErr errorFor(int error) {
+    switch (error) {
+        case ENOENT:
+        case ENOTDIR:
+            return fnfErr;
+        case EACCES:
+        case EPERM:
+            return permErr;
+        case ENOMEM:
+            return memFullErr;
+        default:
+            return ioErr;
+    }
+}
+
+// No exception may pass the face, and nothing but a lack of memory is thrown here.
+template <class Status, class Operation>
+Status guarded(Operation operation) noexcept {
+    try {
+        return operation();
+    } catch (...) {
+        return memFullErr;
+    }
+}
+
+// The paths that references name. They are never dropped, because nobody gives a reference back.
+class Paths {
+  public:
+    FSRef referenceTo(const std::string& path) {
+        const auto [place, isNew] = numbers_.try_emplace(path, paths_.size());
+        if (isNew) {
+            paths_.push_back(&place->first);
+        }
+        const Content content{mark, place->second};
+        FSRef reference{};
+        std::memcpy(reference.hidden, &content, sizeof content);
+        return reference;
+    }
+    // Null for a reference that was not made here.
+    [[nodiscard]] const std::string* pathOf(const FSRef& reference) const {
+        Content content{};
+        std::memcpy(&content, reference.hidden, sizeof content);
+        return content.mark == mark && content.number < paths_.size() ? paths_[content.number] : nullptr;
+    }
+
+  private:
+    struct Content {
+        std::uint64_t mark;
+        std::uint64_t number;
+    };
+    // Tells a reference from memory that never became one.
+    static constexpr std::uint64_t mark = 0x6C612066736F6264;
+
+    std::map<std::string, std::uint64_t> numbers_;
+    std::vector<const std::string*> paths_;
+};
+
+Paths& paths() {
+    static Paths ofThisProcess;
+    return ofThisProcess;
+}
+
+std::optional<std::string> homeOfUser() {
+    passwd record{};
+    passwd* found = nullptr;
+    std::vector<char> buffer(4096);
+    constexpr std::size_t largest = 1U << 20;
+    int error;
+    while ((error = getpwuid_r(getuid(), &record, buffer.data(), buffer.size(), &found)) == ERANGE &&
+           buffer.size() < largest) {
+        buffer.resize(buffer.size() * 2);
+    }
+    if (error != 0 || found == nullptr || record.pw_dir == nullptr || record.pw_dir[0] != '/') {
+        return std::nullopt;
+    }
+    return std::string(record.pw_dir);
+}
+
+OSErr findModemScripts(SInt16 domain, std::string& path) {
+    const Host& host = currentHost();
+    switch (domain) {
+        case kUserDomain:
+            path = host.userModemScripts;
+            if (path.empty()) {
+                const auto home = homeOfUser();
+                if (!home) {
+                    return fnfErr;
+                }
+                path = *home + "/.local/share/modem-scripts";
+            }
+            return noErr;
+        case kNetworkDomain:
+            path = host.networkModemScripts;
+            return noErr;
+        case kLocalDomain:
+            path = host.localModemScripts;
+            return noErr;
+        case kSystemDomain:
+            path = host.systemModemScripts;
+            return noErr;
+        default:
+            return paramErr;
+    }
+}
+
+// The open iterators; one that is not here was closed, or never was one.
+std::map<FSIterator, std::unique_ptr<OpaqueFSIterator>>& iterators() {
+    static std::map<FSIterator, std::unique_ptr<OpaqueFSIterator>> open;
+    return open;
+}
+
+// False for a name that a file of names cannot hold.
+bool toUnicode(std::string_view name, HFSUniStr255& unicode) {
+    const values::Owned<CFStringRef> string = values::makeString(name);
+    const CFIndex length = string ? CFStringGetLength(string.get()) : 0;
+    if (length == 0 || length > static_cast<CFIndex>(std::size(unicode.unicode))) {
+        return false;
+    }
+    unicode.length = static_cast<UInt16>(length);
+    CFStringGetCharacters(string.get(), CFRangeMake(0, length), unicode.unicode);
+    return true;
+}
+
+// The next item that can be named; noErr, errFSNoMoreItems, or a failure.
+OSErr nextItem(OpaqueFSIterator& iterator, std::string& name, HFSUniStr255& unicode) {
+    for (;;) {
+        errno = 0;
+        const dirent* entry = readdir(iterator.directory.get());
+        if (entry == nullptr) {
+            return errno == 0 ? errFSNoMoreItems : errorFor(errno);
+        }
+        name = entry->d_name;
+        if (name != "." && name != ".." && toUnicode(name, unicode)) {
+            return noErr;
+        }
+    }
+}
+
+}  // namespace
+}  // namespace platform::services
+
+using namespace platform::services;
+
+OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder) {
+    if (folderType != kModemScriptsFolderType || createFolder != 0 || folder == nullptr) {
+        return paramErr;
+    }
+    return guarded<OSErr>([domain, folder]() -> OSErr {
+        std::string path;
+        if (const OSErr err = findModemScripts(domain, path); err != noErr) {
+            return err;
+        }
+        struct stat status {};
+        if (stat(path.c_str(), &status) != 0) {
+            return errorFor(errno);
+        }
+        if (!S_ISDIR(status.st_mode)) {
+            return fnfErr;
+        }
+        *folder = paths().referenceTo(path);
+        return noErr;
+    });
+}
+
+OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) {
+    if (iterator == nullptr) {
+        return paramErr;
+    }
+    *iterator = nullptr;
+    const std::string* path = folder == nullptr ? nullptr : paths().pathOf(*folder);
+    if (path == nullptr || flags != kFSIterateFlat) {
+        return paramErr;
+    }
+    return guarded<OSErr>([path, iterator]() -> OSErr {
+        auto made = std::make_unique<OpaqueFSIterator>();
+        made->path = *path;
+        made->directory.reset(opendir(path->c_str()));
+        if (!made->directory) {
+            return errorFor(errno);
+        }
+        const FSIterator handle = made.get();
+        iterators().emplace(handle, std::move(made));
+        *iterator = handle;
+        return noErr;
+    });
+}
+
+OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems,
+                           Boolean* containerChanged, UInt32 whichInfo, void* catalogInfos, FSRef* refs,
+                           void* specs, HFSUniStr255* names) {
+    if (actualItems == nullptr) {
+        return paramErr;
+    }
+    *actualItems = 0;
+    if (iterators().count(iterator) == 0 || maximumItems == 0 || containerChanged != nullptr ||
+        whichInfo != kFSCatInfoNone || catalogInfos != nullptr || specs != nullptr) {
+        return paramErr;
+    }
+    return guarded<OSErr>([=]() -> OSErr {
+        std::string name;
+        HFSUniStr255 unicode{};
+        while (*actualItems < maximumItems) {
+            if (const OSErr err = nextItem(*iterator, name, unicode); err != noErr) {
+                return err;
+            }
+            if (refs != nullptr) {
+                refs[*actualItems] = paths().referenceTo(iterator->path + "/" + name);
+            }
+            if (names != nullptr) {
+                names[*actualItems] = unicode;
+            }
+            ++*actualItems;
+        }
+        return noErr;
+    });
+}
+
+OSErr FSCloseIterator(FSIterator iterator) {
+    return iterators().erase(iterator) != 0 ? noErr : paramErr;
+}
+
+OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInfoRecord* info) {
+    const std::string* path = item == nullptr ? nullptr : paths().pathOf(*item);
+    if (path == nullptr || requestedInfo != kLSRequestBasicFlagsOnly || info == nullptr) {
+        return paramErr;
+    }
+    UInt32 flags = 0;
+    struct stat status {};
+    if (stat(path->c_str(), &status) == 0) {
+        flags |= S_ISREG(status.st_mode) ? kLSItemInfoIsPlainFile : 0;
+        flags |= S_ISDIR(status.st_mode) ? kLSItemInfoIsContainer : 0;
+    } else if (errno != ENOENT && errno != ENOTDIR && errno != ELOOP) {
+        return errorFor(errno);
+    }
+    const std::size_t slash = path->rfind('/');
+    if (slash != std::string::npos && path->compare(slash + 1, 1, ".") == 0) {
+        flags |= kLSItemInfoIsInvisible;
+    }
+    info->flags = flags;
+    return noErr;
+}

@@ -1,0 +1,14 @@
+#include "platform/CoreServices.h"
+#include "platform/Host.h"
+
+OSErr Gestalt(OSType selector, SInt32* response) {
+    if (response == nullptr) {
+        return paramErr;
+    }
+    const std::optional<std::int32_t>& version = platform::currentHost().systemVersion;
+    if (selector != gestaltSystemVersion || !version) {
+        return gestaltUndefSelectorErr;
+    }
+    *response = *version;
+    return noErr;
+}
