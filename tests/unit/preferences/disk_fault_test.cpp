@@ -1,0 +1,189 @@
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <map>
+#include <set>
+
+#include "platform/preferences/Session.h"
+#include "tests/unit/preferences/Fixture.h"
+
+namespace preferences_test {
+namespace {
+
+using platform::Outcome;
+using platform::preferences::FileOperations;
+using platform::preferences::Session;
+
+struct Crash {};
+
+// Fails one step, or stops before it and loses what was written and not synced, as a power cut may.
+class FaultyOperations : public FileOperations {
+  public:
+    int failAt = -1;
+    int crashAt = -1;
+    int error = EIO;
+    int steps = 0;
+    int syncs = 0;
+    std::string failed;
+    std::size_t longestWrite = 7;
+
+    int makeDirectory(const std::string& path, mode_t mode) override {
+        return fails("mkdir") ? -1 : FileOperations::makeDirectory(path, mode);
+    }
+    int open(const std::string& path, int flags, mode_t mode) override {
+        if (fails("open")) {
+            return -1;
+        }
+        const int descriptor = FileOperations::open(path, flags, mode);
+        names_[descriptor] = path;
+        return descriptor;
+    }
+    int setOwner(int descriptor, uid_t user, gid_t group) override {
+        return fails("chown") ? -1 : FileOperations::setOwner(descriptor, user, group);
+    }
+    int setMode(int descriptor, mode_t mode) override {
+        return fails("chmod") ? -1 : FileOperations::setMode(descriptor, mode);
+    }
+    ssize_t write(int descriptor, std::string_view bytes) override {
+        if (fails("write")) {
+            return -1;
+        }
+        unsynced_.insert(names_[descriptor]);
+        return FileOperations::write(descriptor, bytes.substr(0, std::max(bytes.size() / 2, longestWrite)));
+    }
+    int sync(int descriptor) override {
+        if (fails("fsync")) {
+            return -1;
+        }
+        ++syncs;
+        unsynced_.erase(names_[descriptor]);
+        return FileOperations::sync(descriptor);
+    }
+    int close(int descriptor) override {
+        const bool failing = fails("close");
+        const int result = FileOperations::close(descriptor);
+        return failing ? -1 : result;
+    }
+    int rename(const std::string& from, const std::string& to) override {
+        if (fails("rename")) {
+            return -1;
+        }
+        if (unsynced_.erase(from) != 0) {
+            unsynced_.insert(to);
+        }
+        return FileOperations::rename(from, to);
+    }
+    int remove(const std::string& path) override {
+        return fails("unlink") ? -1 : FileOperations::remove(path);
+    }
+
+  private:
+    bool fails(const char* what) {
+        const int step = steps++;
+        if (step == crashAt) {
+            for (const std::string& path : unsynced_) {
+                std::filesystem::resize_file(path, 0);
+            }
+            throw Crash();
+        }
+        if (step == failAt) {
+            failed = what;
+            errno = error;
+            return true;
+        }
+        return false;
+    }
+
+    std::map<int, std::string> names_;
+    std::set<std::string> unsynced_;
+};
+
+class DiskFaultTest : public StoreTest {
+  protected:
+    // A store with one location, and a session that changes its name.
+    SessionRef begin(FaultyOperations& operations, bool withStore) {
+        std::filesystem::remove_all(store);
+        if (withStore) {
+            makeStore();
+            // Another mode than a new file's, so that keeping it is a step of its own.
+            std::filesystem::permissions(file, std::filesystem::perms(0640));
+        }
+        SessionRef session;
+        EXPECT_TRUE(Session::open("tester", store, operations, session).ok());
+        EXPECT_TRUE(set(session, "/Sets/1", "new"));
+        operations.steps = 0;
+        return session;
+    }
+    [[nodiscard]] bool leftovers() const { return std::filesystem::exists(file + ".new"); }
+};
+
+TEST_F(DiskFaultTest, ACommitIsTwoSyncsAndIgnoresShortWrites) {
+    FaultyOperations operations;
+    const SessionRef session = begin(operations, true);
+    EXPECT_TRUE(commit(session));
+    EXPECT_EQ(operations.syncs, 2);
+    (void)directory.write("store/preferences.plist", contentOf(file));
+    EXPECT_EQ(nameAt(open(), "/Sets/1"), "new");
+}
+
+TEST_F(DiskFaultTest, AfterAnyFailingStepTheFileIsTheOldOneOrTheNewOne) {
+    for (const bool withStore : {true, false}) {
+        for (const int error : {EIO, ENOSPC, EROFS}) {
+            std::set<std::string> failed;
+            bool done = false;
+            for (int step = 0; !done; ++step) {
+                FaultyOperations operations;
+                const SessionRef session = begin(operations, withStore);
+                operations.failAt = step;
+                operations.error = error;
+                done = commit(session);
+                SCOPED_TRACE(operations.failed + " at step " + std::to_string(step));
+                failed.insert(operations.failed);
+                if (!done) {
+                    EXPECT_EQ(SCError(), error == EROFS ? 1003 : 1001);
+                    EXPECT_FALSE(log.empty());
+                    EXPECT_EQ(nameAt(session, "/Sets/1"), "new");
+                    const std::string onDisk = nameAt(open(), "/Sets/1");
+                    EXPECT_TRUE(onDisk == "new" || onDisk == (withStore ? "one" : "-")) << onDisk;
+                    EXPECT_TRUE(commit(session)) << "the same again, on a disk that is well";
+                }
+                EXPECT_FALSE(leftovers());
+                EXPECT_EQ(nameAt(open(), "/Sets/1"), "new");
+            }
+            failed.erase("");
+            std::set<std::string> expected = {"open", "write", "fsync", "close", "rename", "unlink"};
+            expected.insert(withStore ? "chmod" : "mkdir");
+            EXPECT_EQ(failed, expected);
+        }
+    }
+}
+
+TEST_F(DiskFaultTest, AfterAPowerCutAtAnyStepTheFileIsTheOldOneOrTheNewOne) {
+    for (const bool withStore : {true, false}) {
+        int crashes = 0;
+        for (bool done = false; !done; ++crashes) {
+            FaultyOperations operations;
+            SessionRef session = begin(operations, withStore);
+            operations.crashAt = crashes;
+            try {
+                done = commit(session);
+            } catch (const Crash&) {
+            }
+            SCOPED_TRACE("step " + std::to_string(crashes));
+            session = {};
+            session = open();
+            ASSERT_TRUE(session);
+            const std::string onDisk = nameAt(session, "/Sets/1");
+            EXPECT_TRUE(onDisk == "new" || onDisk == (withStore ? "one" : "-")) << onDisk;
+            ASSERT_TRUE(set(session, "/Sets/1", "next") && commit(session));
+            EXPECT_FALSE(leftovers());
+            EXPECT_EQ(nameAt(open(), "/Sets/1"), "next");
+        }
+        EXPECT_GT(crashes, 9);
+    }
+}
+
+}  // namespace
+}  // namespace preferences_test

@@ -1,0 +1,185 @@
+#include "platform/preferences/Session.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <deque>
+#include <filesystem>
+
+#include "tests/unit/preferences/Fixture.h"
+#include "tests/unit/support/Child.h"
+
+namespace preferences_test {
+namespace {
+
+using platform::preferences::FileOperations;
+using platform::preferences::Session;
+
+using SessionTest = StoreTest;
+
+TEST_F(SessionTest, ChangesReachOthersAtTheCommit) {
+    makeStore();
+    SessionRef session = open();
+    ASSERT_TRUE(set(session, "/Sets/2", "two"));
+    EXPECT_EQ(nameAt(open(), "/Sets/2"), "-");
+    EXPECT_EQ(contentOf(file), smallTree);
+    ASSERT_TRUE(commit(session));
+    EXPECT_EQ(nameAt(open(), "/Sets/1"), "one");
+    EXPECT_EQ(nameAt(open(), "/Sets/2"), "two");
+    ASSERT_TRUE(set(session, "/Sets/3", "three") && commit(session));
+    EXPECT_EQ(nameAt(open(), "/Sets/3"), "three");
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(store), {}), 2);
+}
+
+TEST_F(SessionTest, AnUnchangedTreeIsNotWrittenAgain) {
+    makeStore();
+    const ino_t inode = statusOf(file).st_ino;
+    SessionRef session = open();
+    EXPECT_TRUE(commit(session));
+    ASSERT_TRUE(set(session, "/Sets/1", "other"));
+    ASSERT_TRUE(set(session, "/New/a", "other"));
+    ASSERT_TRUE(set(session, "/Sets/1", "one"));
+    ASSERT_TRUE(SCPreferencesPathRemoveValue(session.get(), CFSTR("/New")));
+    EXPECT_TRUE(commit(session));
+    EXPECT_EQ(statusOf(file).st_ino, inode);
+    EXPECT_EQ(contentOf(file), smallTree);
+}
+
+TEST_F(SessionTest, AFileThatSomebodyElseChangedIsNotOverwritten) {
+    const std::function<void()> changes[] = {
+        [] {
+            SessionRef other = open();
+            ASSERT_TRUE(set(other, "/Sets/9", "theirs") && commit(other));
+        },
+        [this] { (void)directory.write("store/preferences.plist", std::string(smallTree) + "\n"); },
+        [this] { std::filesystem::remove(file); },
+    };
+    for (const auto& change : changes) {
+        makeStore();
+        SessionRef session = open();
+        SessionRef reader = open();
+        ASSERT_TRUE(set(session, "/Sets/2", "ours"));
+        change();
+        const std::string content = contentOf(file);
+        EXPECT_FALSE(commit(session));
+        EXPECT_EQ(SCError(), 3005);
+        EXPECT_FALSE(SCPreferencesLock(session.get(), 0));
+        EXPECT_EQ(SCError(), 3005);
+        EXPECT_FALSE(SCPreferencesUnlock(session.get()));
+        EXPECT_FALSE(commit(reader)) << "there is nothing to write, but what it would apply is old";
+        EXPECT_EQ(nameAt(session, "/Sets/2"), "ours");
+        EXPECT_EQ(contentOf(file), content);
+    }
+}
+
+TEST_F(SessionTest, AFileThatAppearsAfterAFirstRunSessionBeganIsNotOverwritten) {
+    SessionRef first = open();
+    SessionRef second = open();
+    ASSERT_TRUE(commit(first));
+    ASSERT_TRUE(set(second, "/Sets/2", "ours"));
+    EXPECT_FALSE(commit(second));
+    EXPECT_EQ(SCError(), 3005);
+}
+
+TEST_F(SessionTest, ATreeThatXMLCannotCarryIsNotCommitted) {
+    makeStore();
+    SessionRef session = open();
+    ASSERT_TRUE(set(session, "/Sets/2", "a\x01z"));
+    EXPECT_FALSE(commit(session));
+    EXPECT_EQ(SCError(), 1001);
+    EXPECT_TRUE(logHas("XML"));
+    EXPECT_EQ(contentOf(file), smallTree);
+    EXPECT_EQ(nameAt(session, "/Sets/2"), "a\x01z");
+    ASSERT_TRUE(set(session, "/Sets/2", "a\tz\n&<>\"'\xF0\x9F\x98\x80") && commit(session));
+    (void)directory.write("store/preferences.plist", contentOf(file));
+    EXPECT_EQ(nameAt(open(), "/Sets/2"), "a\tz\n&<>\"'\xF0\x9F\x98\x80");
+}
+
+TEST_F(SessionTest, TheLockKeepsOthersOut) {
+    makeStore();
+    SessionRef session = open();
+    EXPECT_FALSE(SCPreferencesUnlock(session.get()));
+    EXPECT_EQ(SCError(), 1007);
+    EXPECT_TRUE(SCPreferencesLock(session.get(), 0));
+    EXPECT_TRUE(SCPreferencesLock(session.get(), 1));
+    const auto tryAsOther = [] {
+        SessionRef other = open();
+        const bool locked = SCPreferencesLock(other.get(), 0) != 0;
+        const int lockStatus = SCError();
+        (void)set(other, "/Sets/2", "theirs");
+        const int commitStatus = Session::from(other.get())->commit(std::chrono::milliseconds(20)).status();
+        return !locked && lockStatus == 3002 && commitStatus == 3002 ? 0 : 1;
+    };
+    EXPECT_EQ(testing_support::Child(tryAsOther).wait(), 0);
+    EXPECT_EQ(tryAsOther(), 0) << "another session of the same process";
+    ASSERT_TRUE(set(session, "/Sets/3", "three") && commit(session));
+    EXPECT_EQ(testing_support::Child(tryAsOther).wait(), 0) << "a commit keeps the lock";
+    session = {};
+    session = open();
+    EXPECT_TRUE(SCPreferencesLock(session.get(), 0)) << "the lock ended with the session";
+    EXPECT_TRUE(SCPreferencesUnlock(session.get()));
+}
+
+TEST_F(SessionTest, ManyProcessesLoseNothing) {
+    makeStore();
+    constexpr int processes = 4;
+    constexpr int rounds = 20;
+    std::deque<testing_support::Child> children;
+    for (int process = 0; process < processes; ++process) {
+        children.emplace_back([process] {
+            for (int done = 0; done < rounds;) {
+                SessionRef session = open();
+                const std::string path = "/Sets/p" + std::to_string(process) + "-" + std::to_string(done);
+                if (!session || !set(session, path, "x")) {
+                    return 1;
+                }
+                if (commit(session)) {
+                    ++done;
+                } else if (SCError() != 3005) {
+                    return 2;
+                }
+            }
+            return 0;
+        });
+    }
+    for (auto& child : children) {
+        EXPECT_EQ(child.wait(), 0);
+    }
+    SessionRef session = open();
+    EXPECT_EQ(CFDictionaryGetCount(SCPreferencesPathGetValue(session.get(), CFSTR("/Sets"))),
+              processes * rounds + 1);
+}
+
+TEST_F(SessionTest, AnUnchangedFileIsNotReadAgain) {
+    class CountingOperations : public FileOperations {
+      public:
+        int opened = 0;
+        int open(const std::string& path, int flags, mode_t mode) override {
+            opened += path.ends_with(".plist") ? 1 : 0;
+            return FileOperations::open(path, flags, mode);
+        }
+    } operations;
+    makeStore();
+    const auto openCounted = [&] {
+        SessionRef session;
+        EXPECT_TRUE(Session::open("tester", store, operations, session).ok());
+        return session;
+    };
+    SessionRef session = openCounted();
+    EXPECT_EQ(operations.opened, 1);
+    session = openCounted();
+    ASSERT_TRUE(set(session, "/Sets/2", "two") && commit(session));
+    session = openCounted();
+    EXPECT_EQ(nameAt(session, "/Sets/2"), "two");
+    EXPECT_EQ(operations.opened, 1);
+    EXPECT_EQ(testing_support::Child([] {
+                  SessionRef other = open();
+                  return set(other, "/Sets/2", "TWO") && commit(other) ? 0 : 1;
+              }).wait(),
+              0);
+    EXPECT_EQ(nameAt(openCounted(), "/Sets/2"), "TWO");
+    EXPECT_EQ(operations.opened, 2);
+}
+
+}  // namespace
+}  // namespace preferences_test
