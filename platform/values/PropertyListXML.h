@@ -28,8 +28,9 @@ struct ParseError {
 
 // The document for a value, in UTF-8, indented with tabs, entries in their own order, ending in a line break;
 // it reads back as an equal value. Nothing when the value holds something that XML cannot carry (a string
-// with a control character other than tab, line feed and carriage return; a surrogate, U+FFFE or U+FFFF), a
-// key that is not a string, a value that is no property-list value, or is nested too deep.
+// with a control character other than tab, line feed and carriage return, or with U+FFFE or U+FFFF), a date
+// outside the years 0 to 9999, a key that is not a string, a value that is no property-list value, or is
+// nested too deep.
 [[nodiscard]] std::optional<std::string> writePropertyListXML(CFPropertyListRef value);
 
 }  // namespace platform::values

@@ -255,12 +255,15 @@ class Reader {
     void refuse(const char* reason) {
         if (reason_ == nullptr) {
             reason_ = reason;
+            // Stopped, the parser tells the place behind what it was stopped at.
+            refusedAt_ = XML_GetCurrentByteIndex(parser_);
             XML_StopParser(parser_, XML_FALSE);
         }
     }
 
     // Null when nothing was refused here.
     [[nodiscard]] const char* reason() const { return reason_; }
+    [[nodiscard]] XML_Index refusedAt() const { return refusedAt_; }
     [[nodiscard]] Owned<CFPropertyListRef> takeValue() {
         const auto value = Owned<CFPropertyListRef>::adopt(values_.back());
         values_.pop_back();
@@ -282,6 +285,7 @@ class Reader {
 
     XML_Parser parser_;
     const char* reason_ = nullptr;
+    XML_Index refusedAt_ = 0;
     // The containers that are open, plist first, and the values (and keys) in them that are complete.
     std::vector<Level> levels_;
     std::vector<CFTypeRef> values_;
@@ -448,16 +452,24 @@ Reader& readerOf(void* context) {
     return *static_cast<Reader*>(context);
 }
 
+// A parser that was told to stop still reports the end of an element like <a/>.
+
 void XMLCALL onStart(void* context, const char* name, const char** attributes) {
-    readerOf(context).start(name, attributes);
+    if (Reader& reader = readerOf(context); reader.reason() == nullptr) {
+        reader.start(name, attributes);
+    }
 }
 
 void XMLCALL onEnd(void* context, const char*) {
-    readerOf(context).end();
+    if (Reader& reader = readerOf(context); reader.reason() == nullptr) {
+        reader.end();
+    }
 }
 
 void XMLCALL onCharacters(void* context, const char* text, int size) {
-    readerOf(context).characters({text, static_cast<std::size_t>(size)});
+    if (Reader& reader = readerOf(context); reader.reason() == nullptr) {
+        reader.characters({text, static_cast<std::size_t>(size)});
+    }
 }
 
 void XMLCALL onDoctype(void* context, const char* name, const char*, const char*, int hasInternalSubset) {
@@ -512,10 +524,10 @@ Owned<CFPropertyListRef> parsePropertyListXML(std::string_view text, ParseError&
     if (XML_Parse(parser.get(), text.data(), static_cast<int>(text.size()), XML_TRUE) == XML_STATUS_OK) {
         return reader.takeValue();
     }
-    const std::string reason =
-        reader.reason() != nullptr ? reader.reason() : XML_ErrorString(XML_GetErrorCode(parser.get()));
-    error =
-        errorAt(text, static_cast<std::size_t>(std::max(0L, XML_GetCurrentByteIndex(parser.get()))), reason);
+    const bool isRefused = reader.reason() != nullptr;
+    const XML_Index place = isRefused ? reader.refusedAt() : XML_GetCurrentByteIndex(parser.get());
+    error = errorAt(text, static_cast<std::size_t>(std::max<XML_Index>(0, place)),
+                    isRefused ? reader.reason() : XML_ErrorString(XML_GetErrorCode(parser.get())));
     return {};
 }
 

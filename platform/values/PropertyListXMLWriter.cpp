@@ -27,6 +27,7 @@ class Writer {
     bool writeDictionary(CFDictionaryRef dictionary, std::size_t depth);
     bool writeArray(CFArrayRef array, std::size_t depth);
     void writeNumber(CFNumberRef number);
+    bool writeDate(std::int64_t seconds);
     void writeData(std::string_view bytes, std::size_t depth);
 };
 
@@ -134,6 +135,19 @@ void Writer::writeData(std::string_view bytes, std::size_t depth) {
     text += "</data>\n";
 }
 
+bool Writer::writeDate(std::int64_t seconds) {
+    // Four digits carry the years 0 to 9999.
+    constexpr std::int64_t first = -62'167'219'200;
+    constexpr std::int64_t last = 253'402'300'799;
+    if (seconds < first || seconds > last) {
+        return false;
+    }
+    text += "<date>";
+    text += dateText(seconds);
+    text += "</date>\n";
+    return true;
+}
+
 bool Writer::write(CFTypeRef value, std::size_t depth) {
     indent(depth);
     switch (static_cast<const Object*>(value)->type()) {
@@ -158,10 +172,7 @@ bool Writer::write(CFTypeRef value, std::size_t depth) {
             writeData(static_cast<CFDataRef>(value)->bytes, depth);
             return true;
         case Type::date:
-            text += "<date>";
-            text += dateText(static_cast<CFDateRef>(value)->seconds);
-            text += "</date>\n";
-            return true;
+            return writeDate(static_cast<CFDateRef>(value)->seconds);
         case Type::url:
         case Type::runLoop:
         case Type::runLoopSource:

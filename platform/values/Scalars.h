@@ -142,7 +142,7 @@ union Immortal {
     T value;
 };
 
-// A date as property lists and people write it, "2004-02-29T12:30:00Z"; years are 0 to 9999.
+// A date as property lists and people write it, "2004-02-29T12:30:00Z".
 [[nodiscard]] std::string dateText(std::int64_t seconds);
 // The shortest decimal that reads back as the same number, "inf", "-inf" or "nan".
 [[nodiscard]] std::string realText(double value);

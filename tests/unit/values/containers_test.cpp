@@ -1,0 +1,198 @@
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <random>
+#include <vector>
+
+#include "tests/unit/values/Values.h"
+
+using namespace values_test;
+
+namespace {
+
+std::string text(CFTypeRef value) {
+    return descriptionOf(value);
+}
+
+TEST(Dictionary, KeepsOrderAndReferences) {
+    const auto dictionary = mutableDictionary();
+    const auto key = str("b");
+    const auto value = makeNumber(1);
+    CFDictionarySetValue(dictionary.get(), key.get(), value.get());
+    EXPECT_EQ(CFGetRetainCount(value.get()), 2);
+    CFDictionarySetValue(dictionary.get(), CFSTR("a"), CFSTR("first"));
+    CFDictionaryAddValue(dictionary.get(), CFSTR("a"), CFSTR("not taken"));
+    CFDictionarySetValue(dictionary.get(), CFSTR("b"), CFSTR("replaced in place"));
+    EXPECT_EQ(CFGetRetainCount(value.get()), 1);
+    EXPECT_EQ(text(dictionary.get()), "{b = replaced in place; a = first}");
+    CFDictionaryRemoveValue(dictionary.get(), CFSTR("b"));
+    CFDictionaryRemoveValue(dictionary.get(), CFSTR("absent"));
+    EXPECT_EQ(CFGetRetainCount(key.get()), 1);
+    CFDictionarySetValue(dictionary.get(), CFSTR("b"), CFSTR("last"));
+    EXPECT_EQ(text(dictionary.get()), "{a = first; b = last}");
+
+    const void* keys[] = {CFSTR("k"), CFSTR("l"), key.get()};
+    const void* values[] = {CFSTR("1"), CFSTR("2"), CFSTR("3")};
+    keys[2] = keys[0];
+    const auto fixed = Owned<CFDictionaryRef>::adopt(CFDictionaryCreate(
+        nullptr, keys, values, 3, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
+    EXPECT_EQ(text(fixed.get()), "{k = 1; l = 2}");
+}
+
+TEST(Dictionary, TakesAnyKeyAndOutlivesItsChange) {
+    const auto dictionary = mutableDictionary();
+    const auto number = makeNumber(7);
+    const auto real = makeReal(7);
+    const auto array = parsed("<array><string>x</string></array>");
+    CFDictionarySetValue(dictionary.get(), number.get(), CFSTR("number"));
+    CFDictionarySetValue(dictionary.get(), array.get(), CFSTR("array"));
+    CFDictionarySetValue(dictionary.get(), kCFBooleanTrue, CFSTR("boolean"));
+    EXPECT_EQ(text(CFDictionaryGetValue(dictionary.get(), real.get())), "number");
+    EXPECT_EQ(text(CFDictionaryGetValue(dictionary.get(), parsed("<array><string>x</string></array>").get())),
+              "array");
+    const auto key = Owned<CFMutableStringRef>::adopt(CFStringCreateMutableCopy(nullptr, 0, CFSTR("key")));
+    CFDictionarySetValue(dictionary.get(), key.get(), CFSTR("string"));
+    CFStringReplace(key.get(), CFRangeMake(0, 3), CFSTR("other"));
+    EXPECT_EQ(text(CFDictionaryGetValue(dictionary.get(), CFSTR("key"))), "string");
+}
+
+TEST(Dictionary, HoldsValuesThatItDoesNotLookAt) {
+    int target = 0;
+    const auto dictionary = Owned<CFMutableDictionaryRef>::adopt(
+        CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks, nullptr));
+    CFDictionarySetValue(dictionary.get(), CFSTR("pointer"), &target);
+    CFDictionarySetValue(dictionary.get(), CFSTR("null"), nullptr);
+    const void* value = &value;
+    EXPECT_TRUE(CFDictionaryGetValueIfPresent(dictionary.get(), CFSTR("null"), &value));
+    EXPECT_EQ(value, nullptr);
+    EXPECT_EQ(CFDictionaryGetValue(dictionary.get(), CFSTR("pointer")), &target);
+    const auto copy =
+        Owned<CFMutableDictionaryRef>::adopt(CFDictionaryCreateMutableCopy(nullptr, 0, dictionary.get()));
+    CFDictionaryRemoveValue(copy.get(), CFSTR("pointer"));
+    EXPECT_EQ(CFDictionaryGetCount(dictionary.get()), 2);
+    EXPECT_FALSE(writePropertyListXML(dictionary.get()).has_value());
+    EXPECT_FALSE(frozen(dictionary.get()));
+}
+
+// Against a model, through growth, index, holes and copies that must not see each other's changes.
+TEST(Dictionary, BehavesAsAModelThroughRandomChanges) {
+    std::mt19937 generator(4);
+    const auto random = [&] { return static_cast<unsigned>(generator()); };
+    for (const unsigned keyCount : {5U, 20U, 400U}) {
+        std::vector<Owned<CFNumberRef>> keys;
+        for (unsigned i = 0; i < keyCount; ++i) {
+            keys.push_back(makeNumber(i));
+        }
+        auto dictionary = mutableDictionary();
+        std::vector<unsigned> model;
+        std::vector<std::pair<Owned<CFMutableDictionaryRef>, std::vector<unsigned>>> copies;
+        for (int step = 0; step < 6000; ++step) {
+            const unsigned key = random() % keyCount;
+            const auto place = std::ranges::find(model, key);
+            if (random() % 100 < (step / 1000 % 2 == 0 ? 70U : 30U)) {
+                CFDictionarySetValue(dictionary.get(), keys[key].get(), keys[key].get());
+                if (place == model.end()) {
+                    model.push_back(key);
+                }
+            } else {
+                CFDictionaryRemoveValue(dictionary.get(), keys[key].get());
+                if (place != model.end()) {
+                    model.erase(place);
+                }
+            }
+            ASSERT_EQ(CFDictionaryGetCount(dictionary.get()), static_cast<CFIndex>(model.size()));
+            const unsigned asked = random() % keyCount;
+            ASSERT_EQ(CFDictionaryContainsKey(dictionary.get(), keys[asked].get()) != 0,
+                      std::ranges::find(model, asked) != model.end());
+            if (step % 500 == 0) {
+                copies.emplace_back(dictionary, model);
+                dictionary = Owned<CFMutableDictionaryRef>::adopt(
+                    CFDictionaryCreateMutableCopy(nullptr, 0, dictionary.get()));
+            }
+        }
+        copies.emplace_back(dictionary, model);
+        for (const auto& [copy, expected] : copies) {
+            std::vector<unsigned> found;
+            for (const Entry& entry : entriesOf(copy.get())) {
+                found.push_back(static_cast<unsigned>(std::stoul(text(entry.key))));
+            }
+            EXPECT_EQ(found, expected);
+        }
+    }
+}
+
+TEST(Array, ChangesCopiesApartAndFindsByContent) {
+    const auto array = mutableArray();
+    for (const char* item : {"a", "b", "c", "b"}) {
+        CFArrayAppendValue(array.get(), str(item).get());
+    }
+    const auto copy = Owned<CFMutableArrayRef>::adopt(CFArrayCreateMutableCopy(nullptr, 0, array.get()));
+    CFArrayRemoveValueAtIndex(copy.get(), 1);
+    CFArrayAppendValue(copy.get(), CFSTR("d"));
+    EXPECT_EQ(text(array.get()), "(a, b, c, b)");
+    EXPECT_EQ(text(copy.get()), "(a, c, b, d)");
+    EXPECT_EQ(CFArrayGetFirstIndexOfValue(array.get(), CFRangeMake(2, 2), CFSTR("b")), 3);
+    EXPECT_EQ(CFArrayGetFirstIndexOfValue(array.get(), CFRangeMake(2, 1), CFSTR("b")), kCFNotFound);
+}
+
+CFComparisonResult compareLengths(const void* lhs, const void* rhs, void* calls) {
+    ++*static_cast<int*>(calls);
+    const CFIndex left = CFStringGetLength(static_cast<CFStringRef>(lhs));
+    const CFIndex right = CFStringGetLength(static_cast<CFStringRef>(rhs));
+    return left < right ? kCFCompareLessThan : left > right ? kCFCompareGreaterThan : kCFCompareEqualTo;
+}
+
+TEST(Array, SortsStablyAndSearchesInARange) {
+    const auto array = mutableArray();
+    for (const char* item : {"zzzz", "ccc", "bb", "aaa", "dd", "a", "zz"}) {
+        CFArrayAppendValue(array.get(), str(item).get());
+    }
+    const auto before = Owned<CFMutableArrayRef>::adopt(CFArrayCreateMutableCopy(nullptr, 0, array.get()));
+    int calls = 0;
+    CFArraySortValues(array.get(), CFRangeMake(1, 5), compareLengths, &calls);
+    EXPECT_EQ(text(array.get()), "(zzzz, a, bb, dd, ccc, aaa, zz)");
+    EXPECT_EQ(text(before.get()), "(zzzz, ccc, bb, aaa, dd, a, zz)");
+    EXPECT_GT(calls, 0);
+    const auto search = [&](const char* wanted) {
+        return CFArrayBSearchValues(array.get(), CFRangeMake(1, 5), str(wanted).get(), compareLengths,
+                                    &calls);
+    };
+    EXPECT_EQ(search("xxx"), 4);
+    EXPECT_EQ(search(""), 1);
+    EXPECT_EQ(search("xxxx"), 6);
+}
+
+TEST(Values, AreEqualByContent) {
+    const auto left = parsed(
+        "<dict><key>a</key><array><integer>1</integer><true/></array><key>b</key><data>AAE=</data></dict>");
+    const auto swapped =
+        parsed("<dict><key>b</key><data>AAE=</data><key>a</key><array><real>1</real><true/></array></dict>");
+    EXPECT_TRUE(CFEqual(left.get(), swapped.get()));
+    for (const char* other : {
+             "<dict><key>a</key><array><integer>1</integer><integer>1</integer></array><key>b</key>"
+             "<data>AAE=</data></dict>",
+             "<dict><key>a</key><array><integer>1</integer><true/></array></dict>",
+             "<dict><key>a</key><array><integer>1</integer><true/></array><key>c</key><data>AAE=</data></"
+             "dict>",
+             "<array/>",
+         }) {
+        EXPECT_FALSE(CFEqual(left.get(), parsed(other).get())) << other;
+    }
+    const auto copy = Owned<CFPropertyListRef>::adopt(
+        CFPropertyListCreateDeepCopy(nullptr, left.get(), kCFPropertyListMutableContainersAndLeaves));
+    EXPECT_TRUE(CFEqual(left.get(), copy.get()));
+}
+
+TEST(Values, SurviveBeingNestedVeryDeep) {
+    const auto deep = nestedArrays(100'000);
+    const auto twin = nestedArrays(100'000);
+    EXPECT_TRUE(CFEqual(deep.get(), twin.get()));
+    EXPECT_FALSE(CFEqual(deep.get(), nestedArrays(99'999).get()));
+    EXPECT_FALSE(frozen(deep.get()));
+    EXPECT_EQ(CFPropertyListCreateDeepCopy(nullptr, deep.get(), kCFPropertyListMutableContainersAndLeaves),
+              nullptr);
+    EXPECT_FALSE(writePropertyListXML(deep.get()).has_value());
+    EXPECT_LT(text(deep.get()).size(), 2000U);
+}
+
+}  // namespace

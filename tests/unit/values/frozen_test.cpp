@@ -1,0 +1,132 @@
+#include <gtest/gtest.h>
+
+#include "tests/unit/values/Values.h"
+
+using namespace values_test;
+
+namespace {
+
+constexpr const char* treeText =
+    "<dict>"
+    "<key>Sets</key><dict><key>0</key><dict><key>Name</key><string>a</string></dict>"
+    "<key>1</key><dict><key>Name</key><string>b</string></dict></dict>"
+    "<key>CurrentSet</key><string>/Sets/0</string>"
+    "</dict>";
+
+CFDictionaryRef childOf(CFDictionaryRef parent, CFStringRef key) {
+    return as<CFDictionaryRef>(CFDictionaryGetValue(parent, key));
+}
+
+TEST(Frozen, IsARetainOfWhatNobodyCanChange) {
+    const auto tree = parsed(treeText);
+    EXPECT_EQ(frozen(tree.get()).get(), tree.get());
+    const auto copy = Owned<CFPropertyListRef>::adopt(
+        CFPropertyListCreateDeepCopy(nullptr, tree.get(), kCFPropertyListImmutable));
+    EXPECT_EQ(copy.get(), tree.get());
+    const auto built = nestedArrays(deepestPropertyList);
+    EXPECT_EQ(frozen(built.get()).get(), built.get());
+    EXPECT_FALSE(frozen(nestedArrays(deepestPropertyList + 1).get()));
+}
+
+TEST(Frozen, FindsTheMutablePartHoweverDeepAndSharesTheRest) {
+    const auto tree = parsedAs<CFDictionaryRef>(treeText);
+    const auto name = Owned<CFMutableStringRef>::adopt(CFStringCreateMutableCopy(nullptr, 0, CFSTR("c")));
+    CFTypeRef item = name.get();
+    const auto holder = Owned<CFArrayRef>::adopt(CFArrayCreate(nullptr, &item, 1, &kCFTypeArrayCallBacks));
+    const auto root =
+        Owned<CFMutableDictionaryRef>::adopt(CFDictionaryCreateMutableCopy(nullptr, 0, tree.get()));
+    CFDictionarySetValue(root.get(), CFSTR("New"), holder.get());
+
+    const auto copy = frozen(root.get());
+    const auto* const dictionary = as<CFDictionaryRef>(copy.get());
+    ASSERT_NE(dictionary, nullptr);
+    EXPECT_TRUE(CFEqual(copy.get(), root.get()));
+    EXPECT_EQ(childOf(dictionary, CFSTR("Sets")), childOf(tree.get(), CFSTR("Sets")));
+    CFStringReplace(name.get(), CFRangeMake(0, 1), CFSTR("changed"));
+    CFDictionaryRemoveValue(root.get(), CFSTR("Sets"));
+    EXPECT_EQ(descriptionOf(copy.get()),
+              "{Sets = {0 = {Name = a}; 1 = {Name = b}}; CurrentSet = /Sets/0; New = (c)}");
+    EXPECT_EQ(frozen(copy.get()).get(), copy.get());
+}
+
+TEST(Frozen, RefusesWhatIsNoPropertyList) {
+    const auto dictionary = mutableDictionary();
+    CFDictionarySetValue(dictionary.get(), makeNumber(1).get(), CFSTR("key is no string"));
+    EXPECT_FALSE(frozen(dictionary.get()));
+    const auto array = mutableArray();
+    const auto url =
+        Owned<CFURLRef>::adopt(CFURLCreateWithString(nullptr, CFSTR("http://192.0.0.192/"), nullptr));
+    CFArrayAppendValue(array.get(), url.get());
+    EXPECT_FALSE(frozen(array.get()));
+    for (const CFPropertyListMutabilityOptions options :
+         {kCFPropertyListImmutable, kCFPropertyListMutableContainersAndLeaves}) {
+        EXPECT_EQ(CFPropertyListCreateDeepCopy(nullptr, array.get(), options), nullptr);
+    }
+}
+
+TEST(Frozen, DeepMutableCopyIsApartThroughout) {
+    const auto tree = parsedAs<CFDictionaryRef>(treeText);
+    const auto copy = Owned<CFDictionaryRef>::adopt(static_cast<CFDictionaryRef>(
+        CFPropertyListCreateDeepCopy(nullptr, tree.get(), kCFPropertyListMutableContainersAndLeaves)));
+    auto* const sets = const_cast<CFMutableDictionaryRef>(childOf(copy.get(), CFSTR("Sets")));
+    auto* const set = const_cast<CFMutableDictionaryRef>(childOf(sets, CFSTR("0")));
+    auto* const name =
+        const_cast<CFMutableStringRef>(as<CFStringRef>(CFDictionaryGetValue(set, CFSTR("Name"))));
+    CFStringReplace(name, CFRangeMake(0, 1), CFSTR("changed"));
+    CFDictionaryRemoveValue(sets, CFSTR("1"));
+    EXPECT_EQ(descriptionOf(copy.get()), "{Sets = {0 = {Name = changed}}; CurrentSet = /Sets/0}");
+    EXPECT_TRUE(CFEqual(tree.get(), parsed(treeText).get()));
+}
+
+TEST(Claim, WritesInPlaceWhatNobodyElseHolds) {
+    auto root = parsedAs<CFDictionaryRef>(treeText);
+    const CFDictionaryRef handle = root.get();
+    const CFDictionaryRef sets = childOf(handle, CFSTR("Sets"));
+    const CFDictionaryRef set = childOf(sets, CFSTR("1"));
+    claim(root);
+    setClaimed(claimedChild(claimedChild(root.get(), CFSTR("Sets")), CFSTR("1")), CFSTR("Name"),
+               frozen(CFSTR("new")));
+    EXPECT_EQ(root.get(), handle);
+    EXPECT_EQ(childOf(root.get(), CFSTR("Sets")), sets);
+    EXPECT_EQ(childOf(sets, CFSTR("1")), set);
+    removeClaimed(claimedChild(root.get(), CFSTR("Sets")), CFSTR("0"));
+    EXPECT_EQ(descriptionOf(root.get()), "{Sets = {1 = {Name = new}}; CurrentSet = /Sets/0}");
+    EXPECT_EQ(claimedChild(root.get(), CFSTR("CurrentSet")), nullptr);
+    EXPECT_EQ(claimedChild(root.get(), CFSTR("absent")), nullptr);
+}
+
+// Whoever holds the root, an inner dictionary, or a copy of either sees no change.
+TEST(Claim, LeavesEveryHolderItsValue) {
+    const auto change = [](Owned<CFDictionaryRef>& root) {
+        claim(root);
+        setClaimed(claimedChild(claimedChild(root.get(), CFSTR("Sets")), CFSTR("0")), CFSTR("Name"),
+                   frozen(CFSTR("new")));
+        removeClaimed(claimedChild(root.get(), CFSTR("Sets")), CFSTR("1"));
+    };
+    const auto holdRoot = [](CFDictionaryRef root) { return Owned<CFDictionaryRef>::retained(root); };
+    const auto holdSets = [](CFDictionaryRef root) {
+        return Owned<CFDictionaryRef>::retained(childOf(root, CFSTR("Sets")));
+    };
+    const auto holdSet = [](CFDictionaryRef root) {
+        return Owned<CFDictionaryRef>::retained(childOf(childOf(root, CFSTR("Sets")), CFSTR("0")));
+    };
+    const auto copyRoot = [](CFDictionaryRef root) {
+        return Owned<CFDictionaryRef>::adopt(CFDictionaryCreateMutableCopy(nullptr, 0, root));
+    };
+    const auto copySets = [](CFDictionaryRef root) {
+        return Owned<CFDictionaryRef>::adopt(
+            CFDictionaryCreateMutableCopy(nullptr, 0, childOf(root, CFSTR("Sets"))));
+    };
+    using Hold = Owned<CFDictionaryRef> (*)(CFDictionaryRef);
+    for (const Hold hold : {Hold(holdRoot), Hold(holdSets), Hold(holdSet), Hold(copyRoot), Hold(copySets)}) {
+        auto root = parsedAs<CFDictionaryRef>(treeText);
+        const auto held = hold(root.get());
+        const std::string before = descriptionOf(held.get());
+        change(root);
+        change(root);
+        EXPECT_EQ(descriptionOf(held.get()), before);
+        EXPECT_EQ(descriptionOf(root.get()), "{Sets = {0 = {Name = new}}; CurrentSet = /Sets/0}");
+    }
+}
+
+}  // namespace
