@@ -85,9 +85,17 @@ void DisposeHandle(Handle handle);
 long GetHandleSize(Handle handle);
 const char* GetHandleData(Handle handle);
 
+inline constexpr OSStatus kURLInvalidURLError = -30773;  // or a host that is not a numeric address
+inline constexpr OSStatus kURLUnsupportedSchemeError = -30774;
+inline constexpr OSStatus kURLUnreachableError = -30790;      // refused, no route, no network
+inline constexpr OSStatus kURLTimedOutError = -30791;         // the server was silent, or the answer too slow
+inline constexpr OSStatus kURLConnectionLostError = -30792;   // broken off before the answer was complete
+inline constexpr OSStatus kURLMalformedAnswerError = -30793;  // what came is not HTTP
+inline constexpr OSStatus kURLAnswerTooLargeError = -30794;
 // Fetches an http URL into the buffer, replacing what it holds. No proxy, no redirects, and never longer or
 // larger than the bounds of platform/services/Download.h. 0 for an answer of class 2xx; the HTTP status for
-// every other answer (404, a redirect's 302); a negative value when there was no answer. destination,
+// every other answer (404, a redirect's 302), whatever its body; a negative value when there was no answer,
+// or a 2xx did not arrive whole, with the reason in the log. Only a 2xx fills the buffer. destination,
 // eventProc and context are null, flags is 0.
 OSStatus URLSimpleDownload(const char* url, const void* destination, Handle buffer, UInt32 flags,
                            const void* eventProc, void* context);
