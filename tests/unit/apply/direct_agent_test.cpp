@@ -1,0 +1,256 @@
+#include <gtest/gtest.h>
+
+#include <array>
+#include <chrono>
+#include <fstream>
+#include <iostream>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/Host.h"
+#include "platform/Log.h"
+#include "platform/apply/Agents.h"
+#include "platform/apply/StateFile.h"
+#include "tests/unit/support/PrivateNetwork.h"
+#include "tests/unit/support/TemporaryDirectory.h"
+
+namespace platform::apply {
+namespace {
+
+using testing_support::PrivateNetwork;
+using testing_support::PrivateNetworkTest;
+using testing_support::shell;
+using testing_support::TemporaryDirectory;
+
+IPv4Address address(unsigned a, unsigned b, unsigned c, unsigned d) {
+    return a | (b << 8U) | (c << 16U) | (d << 24U);
+}
+
+InterfacePlan printerPlan(const std::string& interface) {
+    InterfacePlan plan;
+    plan.name = interface;
+    plan.active = true;
+    plan.method = IPv4Method::manual;
+    plan.addresses = {{address(192, 0, 0, 199), 24}};
+    plan.router = address(192, 0, 0, 192);
+    return plan;
+}
+
+InterfacePlan offPlan(const std::string& interface) {
+    InterfacePlan plan;
+    plan.name = interface;
+    return plan;
+}
+
+// Everything that ip tells of the interfaces, but what counts by itself (lifetimes, link-local addresses
+// being tried).
+std::string machineState() {
+    std::string state = shell(
+        "ip addr show | grep -v -e valid_lft -e 'scope link' | sed -e 's/ qdisc.*//' -e 's/[A-Z]*-[A-Z]*,//' "
+        "-e 's/,LOWER_UP//' -e 's/,M-DOWN//'");
+    state += shell("ip -4 route show table all | grep -v 'table local' || true");
+    state += shell(
+        "ip -6 route show table all | grep -v -e 'proto kernel' -e 'table local' -e 'proto ra' || true");
+    state += shell("cat /etc/resolv.conf 2>/dev/null || true");
+    return state;
+}
+
+class DirectAgentTest : public PrivateNetworkTest {
+  protected:
+    // Two cards, each with the other end of its cable up.
+    static void makeCards() {
+        for (const char* n : {"0", "1"}) {
+            const std::string card = std::string("card") + n;
+            shell("ip link add " + card + " type veth peer name far" + n + " && ip link set far" + n + " up");
+        }
+    }
+
+    static void run(const std::function<void()>& body) {
+        PrivateNetwork::run([&body] {
+            const TemporaryDirectory folder;
+            Host host;
+            host.runtimeDirectory = folder.at("run");
+            host.dhcpHook = LA_DHCP_HOOK;
+            const HostOverride override(host);
+            const LogCapture log(
+                [](LogLevel, std::string_view text) { std::cout << "log: " << text << "\n"; });
+            ASSERT_TRUE(makeRuntimeDirectory().ok());
+            makeCards();
+            body();
+        });
+    }
+};
+
+void expectOk(const Outcome& outcome) {
+    EXPECT_TRUE(outcome.ok()) << outcome.reason();
+}
+
+struct Earlier {
+    const char* name;
+    const char* commands;
+};
+
+TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
+    static const Earlier earlierStates[] = {
+        {"idle", "true"},
+        {"down with an address", "ip addr add 10.1.0.5/24 dev card0"},
+        {"several addresses, secondary ones, labels and scopes",
+         "ip addr add 10.1.0.5/24 brd + dev card0; ip addr add 10.1.0.6/24 dev card0 label card0:x;"
+         "ip addr add 10.2.0.1/16 dev card0; ip addr add 10.3.0.1 peer 10.3.0.2 dev card0;"
+         "ip addr add 169.254.7.7/16 scope link dev card0; ip link set card0 up"},
+        {"static IPv6",
+         "ip link set card0 up; ip -6 addr add 2001:db8::5/64 dev card0 nodad;"
+         "ip -6 route add default via 2001:db8::1 dev card0 metric 77"},
+        {"IPv6 off", "echo 1 > /proc/sys/net/ipv6/conf/card0/disable_ipv6; ip link set card0 up"},
+        {"routes with metrics, tables, sources and types",
+         "ip addr add 10.1.0.5/24 dev card0; ip addr add 10.1.0.6/24 dev card0; ip link set card0 up;"
+         "ip route add default via 10.1.0.1 dev card0 metric 100; ip route add default via 10.1.0.2 dev "
+         "card0 metric 200;"
+         "ip route add 10.9.0.0/16 via 10.1.0.3 src 10.1.0.6 mtu 1300;"
+         "ip route add 10.8.0.0/16 dev card0 scope link table 42; ip route add 10.7.0.0/16 via 10.5.5.5 dev "
+         "card0 onlink"},
+        {"a connected route that was taken away",
+         "ip addr add 10.1.0.5/24 dev card0; ip link set card0 up; ip route del 10.1.0.0/24 dev card0"},
+        {"default routes of the same metric, this card's last",
+         "ip addr add 10.1.0.5/24 dev card0; ip addr add 10.2.0.5/24 dev card1; ip link set card0 up; ip "
+         "link set card1 up;"
+         "ip route add default via 10.2.0.1; ip route append default via 10.1.0.1"},
+        {"default routes of the same metric, this card's first",
+         "ip addr add 10.1.0.5/24 dev card0; ip addr add 10.2.0.5/24 dev card1; ip link set card0 up; ip "
+         "link set card1 up;"
+         "ip route add default via 10.1.0.1; ip route append default via 10.2.0.1"},
+        {"a route over both cards",
+         "ip addr add 10.1.0.5/24 dev card0; ip addr add 10.2.0.5/24 dev card1; ip link set card0 up; ip "
+         "link set card1 up;"
+         "ip route add default nexthop via 10.1.0.1 nexthop via 10.2.0.1"},
+        {"a route of the other card from this one's address",
+         "ip addr add 10.1.0.5/24 dev card0; ip addr add 10.2.0.5/24 dev card1; ip link set card0 up; ip "
+         "link set card1 up;"
+         "ip route add 10.9.0.0/16 via 10.2.0.1 src 10.1.0.5"},
+    };
+    for (const Earlier& earlier : earlierStates) {
+        SCOPED_TRACE(earlier.name);
+        run([&earlier] {
+            shell(earlier.commands);
+            const std::string before = machineState();
+            const auto agent = makeDirectAgent();
+            const std::vector<std::string> cards{"card0", "card1", "missing"};
+            std::vector<Captured> captured;
+            expectOk(agent->capture(cards, captured));
+            ASSERT_EQ(2U, captured.size());
+            InterfacePlan plan = printerPlan("card0");
+            plan.nameServers = {address(192, 0, 0, 53)};
+            expectOk(agent->takeOver(plan, captured[0]));
+            expectOk(agent->takeOver(offPlan("card1"), captured[1]));
+            const std::string made = machineState();
+            EXPECT_NE(before, made);
+            EXPECT_EQ("192.0.0.199/24 \n",
+                      shell("ip -br -4 addr show dev card0 | tr -s ' ' | cut -d' ' -f3-"));
+            EXPECT_EQ("192.0.0.192 dev card0 src 192.0.0.199 uid 0 \n    cache \n",
+                      shell("ip route get 192.0.0.192"));
+            EXPECT_EQ("default via 192.0.0.192 dev card0 proto 76 \n", shell("ip route show default"));
+            EXPECT_EQ("", shell("ip -br addr show up dev card1"));
+            expectOk(agent->takeOver(plan, captured[0]));
+            expectOk(agent->takeOver(offPlan("card1"), captured[1]));
+            EXPECT_EQ(made, machineState());
+            for (const Captured& one : captured) {
+                expectOk(agent->giveBack(one));
+                expectOk(agent->giveBack(one));
+            }
+            EXPECT_EQ(before, machineState());
+        });
+    }
+}
+
+// A DHCP server in a network of its own at the far end of card0's cable. It ends with the test's namespaces.
+class DhcpServer {
+  public:
+    explicit DhcpServer(const std::string& options =
+                            "--dhcp-option=3,10.50.0.1 --dhcp-option=6,10.50.0.53 "
+                            "--dhcp-option=15,example.org") {
+        std::array<int, 2> gate{};
+        std::array<int, 2> ready{};
+        EXPECT_EQ(0, pipe(gate.data()));
+        EXPECT_EQ(0, pipe(ready.data()));
+        const pid_t child = fork();
+        if (child == 0) {
+            char go = 0;
+            const std::string command =
+                "ip addr add 10.50.0.1/24 dev far0; ip link set lo up; ip link set far0 up;"
+                "exec dnsmasq --no-daemon --conf-file=/dev/null --port=0 --interface=far0 --bind-interfaces"
+                " --dhcp-range=10.50.0.10,10.50.0.10,255.255.255.0,1h --dhcp-leasefile=/var/leases --no-ping"
+                " --dhcp-authoritative --log-dhcp --user=root --pid-file= " +
+                options + " >/var/dnsmasq.log 2>&1";
+            if (unshare(CLONE_NEWNET) == 0 && write(ready[1], "r", 1) == 1 && read(gate[0], &go, 1) == 1) {
+                execl("/bin/sh", "sh", "-c", command.c_str(), nullptr);
+            }
+            _exit(1);
+        }
+        char isReady = 0;
+        EXPECT_EQ(1, read(ready[0], &isReady, 1));
+        shell("ip link set far0 netns " + std::to_string(child));
+        EXPECT_EQ(1, write(gate[1], "g", 1));
+    }
+    // What the server was asked for, one word each ("DHCPDISCOVER", ...).
+    static std::vector<std::string> messages() {
+        std::ifstream log("/var/dnsmasq.log");
+        std::vector<std::string> found;
+        for (std::string line; std::getline(log, line);) {
+            for (const char* message : {"DHCPDISCOVER", "DHCPREQUEST", "DHCPRELEASE", "DHCPACK"}) {
+                if (line.find(message) != std::string::npos) {
+                    found.emplace_back(message);
+                }
+            }
+        }
+        return found;
+    }
+};
+
+TEST_F(DirectAgentTest, TakesALeaseAndGivesItBack) {
+    if (!testing_support::hasProgram("dnsmasq") || !testing_support::hasProgram("busybox")) {
+        GTEST_SKIP() << "needs dnsmasq and busybox";
+    }
+    run([] {
+        shell(
+            "echo 'nameserver 9.9.9.9' > /run/real; ln -s /run/real /etc/resolv.conf; ip link set card0 up");
+        const DhcpServer server;
+        const std::string before = machineState();
+        const auto agent = makeDirectAgent();
+        const std::vector<std::string> cards{"card0"};
+        std::vector<Captured> captured;
+        expectOk(agent->capture(cards, captured));
+        ASSERT_EQ(1U, captured.size());
+        InterfacePlan plan;
+        plan.name = "card0";
+        plan.active = true;
+        plan.method = IPv4Method::dhcp;
+        plan.dhcpClientID = "a client";
+        expectOk(agent->takeOver(plan, captured[0]));
+        EXPECT_EQ("10.50.0.10/24 \n", shell("ip -br -4 addr show dev card0 | tr -s ' ' | cut -d' ' -f3-"));
+        EXPECT_EQ("default via 10.50.0.1 dev card0 proto 76 \n", shell("ip route show default"));
+        EXPECT_EQ("search example.org\nnameserver 10.50.0.53\n", shell("grep -v '^#' /etc/resolv.conf"));
+        expectOk(agent->takeOver(plan, captured[0]));
+        EXPECT_EQ((std::vector<std::string>{"DHCPDISCOVER", "DHCPREQUEST", "DHCPACK"}),
+                  DhcpServer::messages());
+
+        InterfacePlan none = plan;
+        none.method = IPv4Method::none;
+        expectOk(agent->takeOver(none, captured[0]));
+        EXPECT_EQ("", shell("ip -4 addr show dev card0"));
+        EXPECT_EQ("nameserver 9.9.9.9\n", shell("cat /etc/resolv.conf"));
+        expectOk(agent->takeOver(plan, captured[0]));
+        EXPECT_EQ((std::vector<std::string>{"DHCPDISCOVER", "DHCPREQUEST", "DHCPACK", "DHCPRELEASE",
+                                            "DHCPDISCOVER", "DHCPREQUEST", "DHCPACK"}),
+                  DhcpServer::messages());
+        expectOk(agent->giveBack(captured[0]));
+        EXPECT_EQ("DHCPRELEASE", DhcpServer::messages().back());
+        EXPECT_EQ(before, machineState());
+        EXPECT_EQ("/run/real\n", shell("readlink /etc/resolv.conf"));
+        EXPECT_EQ("", shell("grep -l '[u]dhcpc' /proc/[0-9]*/cmdline 2>/dev/null || true"));
+    });
+}
+
+}  // namespace
+}  // namespace platform::apply

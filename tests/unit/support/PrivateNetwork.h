@@ -1,0 +1,128 @@
+// Runs test code in namespaces of its own: users, network, processes and mounts, with empty /etc, /run and
+// /var, so that nothing it does to addresses, name servers or processes reaches the machine. All of it ends
+// with the code.
+#pragma once
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <array>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <functional>
+#include <string>
+
+namespace testing_support {
+
+// Runs a command line and gives back what it printed; a failure is a failure of the test.
+inline std::string shell(const std::string& command) {
+    std::string output;
+    FILE* const pipe = popen((command + " 2>&1").c_str(), "re");
+    if (pipe == nullptr) {
+        ADD_FAILURE() << "cannot run " << command;
+        return output;
+    }
+    std::array<char, 4096> piece{};
+    while (const std::size_t size = fread(piece.data(), 1, piece.size(), pipe)) {
+        output.append(piece.data(), size);
+    }
+    EXPECT_EQ(0, pclose(pipe)) << command << "\n" << output;
+    return output;
+}
+
+inline bool hasProgram(const std::string& name) {
+    return std::system(("command -v " + name + " >/dev/null 2>&1").c_str()) == 0;
+}
+
+class PrivateNetwork {
+  public:
+    // True when namespaces can be made here. Otherwise the test is to skip, which LA_FORBID_SKIPS=1 forbids.
+    static bool isAvailable() {
+        const pid_t child = fork();
+        if (child == 0) {
+            _exit(enter() && access("/proc/sys/net/ipv4", F_OK) == 0 ? 0 : 1);
+        }
+        int status = 1;
+        waitpid(child, &status, 0);
+        return status == 0 && hasProgram("ip");
+    }
+
+    // The body's failures are the test's. Its process is the first one of its namespace.
+    static void run(const std::function<void()>& body) {
+        std::fflush(nullptr);
+        const pid_t between = fork();
+        if (between == 0) {
+            prctl(PR_SET_PDEATHSIG, SIGKILL);
+            if (!enter()) {
+                std::printf("cannot enter private namespaces\n");
+                std::fflush(nullptr);
+                _exit(2);
+            }
+            const pid_t child = fork();
+            if (child == 0) {
+                prctl(PR_SET_PDEATHSIG, SIGKILL);
+                mount("proc", "/proc", "proc", 0, nullptr);
+                shell("ip link set lo up");
+                body();
+                std::fflush(nullptr);
+                _exit(testing::Test::HasFailure() ? 1 : 0);
+            }
+            int status = 1;
+            waitpid(child, &status, 0);
+            _exit(WIFEXITED(status) ? WEXITSTATUS(status) : 3);
+        }
+        int status = 1;
+        waitpid(between, &status, 0);
+        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0)
+            << "the part of the test in its own namespaces failed, see above (" << status << ")";
+    }
+
+  private:
+    static bool write(const char* path, const std::string& text) {
+        const int file = open(path, O_WRONLY | O_CREAT | O_CLOEXEC, 0644);
+        const bool done =
+            file >= 0 && ::write(file, text.data(), text.size()) == static_cast<ssize_t>(text.size());
+        close(file);
+        return done;
+    }
+
+    static bool enter() {
+        const uid_t user = geteuid();
+        const gid_t group = getegid();
+        if (unshare(CLONE_NEWUSER | CLONE_NEWNET | CLONE_NEWNS | CLONE_NEWPID) != 0 ||
+            !write("/proc/self/setgroups", "deny") ||
+            !write("/proc/self/uid_map", "0 " + std::to_string(user) + " 1") ||
+            !write("/proc/self/gid_map", "0 " + std::to_string(group) + " 1") ||
+            mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0) {
+            return false;
+        }
+        for (const char* folder : {"/etc", "/run", "/var"}) {
+            if (mount("tmpfs", folder, "tmpfs", 0, "mode=755") != 0) {
+                return false;
+            }
+        }
+        return write("/etc/passwd", "root:x:0:0:root:/root:/bin/sh\n") && write("/etc/group", "root:x:0:\n");
+    }
+};
+
+class PrivateNetworkTest : public testing::Test {
+  protected:
+    void SetUp() override {
+        static const bool isAvailable = PrivateNetwork::isAvailable();
+        if (!isAvailable) {
+            if (const char* forbidden = std::getenv("LA_FORBID_SKIPS");
+                forbidden != nullptr && *forbidden == '1') {
+                FAIL() << "no private namespaces here, and skips are forbidden";
+            }
+            GTEST_SKIP() << "needs user, network and mount namespaces, and ip";
+        }
+    }
+};
+
+}  // namespace testing_support
