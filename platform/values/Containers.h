@@ -26,9 +26,9 @@ class Storage {
     Storage& operator=(const Storage&) = delete;
 
     [[nodiscard]] static Storage* create(Shape shape, bool retainsValues, std::size_t capacity);
-    // Takes over the references that the items hold; frozenLevels as below.
-    [[nodiscard]] static Storage* adopt(Shape shape, std::span<const CFTypeRef> slots,
-                                        std::uint16_t frozenLevels);
+    // With these items (for a dictionary key, value, key, value, ...), which are retained.
+    [[nodiscard]] static Storage* create(Shape shape, std::span<const CFTypeRef> slots,
+                                         std::uint16_t frozenLevels);
     void retain() noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
     void release() noexcept;
     // Storage with this content and room for one more item that nobody else holds; consumes a reference.
@@ -37,7 +37,10 @@ class Storage {
     [[nodiscard]] std::size_t count() const noexcept { return live_; }
     [[nodiscard]] bool retainsValues() const noexcept { return retainsValues_; }
 
-    [[nodiscard]] std::span<const CFTypeRef> items() const noexcept { return {slots(), used_}; }
+    // The items, with the holes and keys of a dictionary.
+    [[nodiscard]] std::span<const CFTypeRef> slots() const noexcept { return {firstSlot(), used_ * width()}; }
+
+    [[nodiscard]] std::span<const CFTypeRef> items() const noexcept { return slots(); }
     void append(CFTypeRef value);
     void removeItem(std::size_t position);
     void reorder(std::span<const CFTypeRef> items, std::size_t position) noexcept;
@@ -47,12 +50,15 @@ class Storage {
     [[nodiscard]] std::span<const Entry> entries();
     // The position of the entry, or absent.
     [[nodiscard]] std::size_t find(CFTypeRef key);
-    [[nodiscard]] CFTypeRef valueAt(std::size_t position) const noexcept { return slots()[2 * position + 1]; }
+    [[nodiscard]] CFTypeRef valueAt(std::size_t position) const noexcept {
+        return firstSlot()[2 * position + 1];
+    }
     // The key must not be there.
     void addEntry(CFTypeRef key, CFTypeRef value);
     void replaceValue(std::size_t position, CFTypeRef value);
     void removeEntry(std::size_t position);
-    // Whether no two keys are equal; for storage that was adopted with keys nobody has compared.
+    // Whether no two keys are the same object; for keys of which each text is one object, and which nobody
+    // has compared yet.
     [[nodiscard]] bool hasDistinctKeys();
 
     // How many containers are nested here, this one included, when everything inside is known to be frozen;
@@ -65,8 +71,8 @@ class Storage {
         : shape_(shape), retainsValues_(retainsValues), capacity_(capacity) {}
     ~Storage() = default;
 
-    [[nodiscard]] CFTypeRef* slots() noexcept { return reinterpret_cast<CFTypeRef*>(this + 1); }
-    [[nodiscard]] const CFTypeRef* slots() const noexcept {
+    [[nodiscard]] CFTypeRef* firstSlot() noexcept { return reinterpret_cast<CFTypeRef*>(this + 1); }
+    [[nodiscard]] const CFTypeRef* firstSlot() const noexcept {
         return reinterpret_cast<const CFTypeRef*>(this + 1);
     }
     [[nodiscard]] std::size_t width() const noexcept { return static_cast<std::size_t>(shape_); }
@@ -87,10 +93,12 @@ class Storage {
     std::uint32_t used_ = 0;
     std::uint32_t live_ = 0;
     std::uint32_t capacity_;
-    // Open addressing: positions from 1, 0 for a free place. Holes stay in it until it is built anew.
-    std::uint32_t* index_ = nullptr;
-    // While it waits for its destruction.
-    Storage* nextDoomed_ = nullptr;
+    union {
+        // Open addressing: positions from 1, 0 for a free place. Holes stay in it until it is built anew.
+        std::uint32_t* index_ = nullptr;
+        // While the storage waits for its destruction.
+        Storage* nextDoomed_;
+    };
 };
 
 // What the two kinds of handles have in common.

@@ -15,7 +15,7 @@ enum class Copying { frozen, allMutable };
 
 Owned<CFTypeRef> copyDeep(CFTypeRef value, Copying how, int depth);
 
-// References to copies of a container's items, until a storage takes them over.
+// References to copies of a container's items, until a storage has its own.
 class Slots {
   public:
     explicit Slots(std::size_t count) { slots_.reserve(count); }
@@ -29,11 +29,6 @@ class Slots {
 
     void add(Owned<CFTypeRef> value) { slots_.push_back(value.take()); }
     [[nodiscard]] std::span<const CFTypeRef> get() const { return slots_; }
-    [[nodiscard]] Storage* intoStorage(Storage::Shape shape, std::uint16_t frozenLevels) {
-        Storage* const storage = Storage::adopt(shape, slots_, frozenLevels);
-        slots_.clear();
-        return storage;
-    }
 
   private:
     std::vector<CFTypeRef> slots_;
@@ -78,11 +73,12 @@ Owned<CFTypeRef> copyContainer(const Handle& container, Storage::Shape shape, Co
         copies.add(std::move(copy));
     }
     if (isMutable) {
-        return Owned<CFTypeRef>::adopt(new Handle(true, true, copies.intoStorage(shape, 0)));
+        return Owned<CFTypeRef>::adopt(new Handle(true, true, Storage::create(shape, copies.get(), 0)));
     }
     const auto frozenLevels = static_cast<std::uint16_t>(levels + 1);
     if (!isSame) {
-        return Owned<CFTypeRef>::adopt(new Handle(false, true, copies.intoStorage(shape, frozenLevels)));
+        return Owned<CFTypeRef>::adopt(
+            new Handle(false, true, Storage::create(shape, copies.get(), frozenLevels)));
     }
     container.storage()->setFrozenLevels(frozenLevels);
     if (!container.isMutable()) {

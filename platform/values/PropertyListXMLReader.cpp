@@ -168,86 +168,72 @@ std::optional<std::string> bytesFromBase64(std::string_view text) {
     return size == 0 ? std::optional(std::move(bytes)) : std::nullopt;
 }
 
-// Each text of a document is one string, however often it is there: that saves making it again, and lets keys
-// be compared by address.
-class StringPool {
+// Each distinct value of a document is made once, containers included: the services of a preferences file
+// repeat each other's defaults, and what is there a thousand times is then compared a thousand times instead
+// of made. It also lets keys and items be compared by address.
+class ValuePool {
   public:
-    StringPool() : places_(1024) {}
+    ValuePool() : places_(1024) {}
 
-    // Null when the text is not well-formed.
-    [[nodiscard]] CFStringRef copy(std::string_view text) {
-        if (text.size() > longestPooled) {
-            return makeString(text).take();
-        }
-        const std::uint32_t hash = hashOfText(text);
+    // The pooled value with the hash that isSame(CFTypeRef) accepts, or the one that make() hands over; null
+    // when make does not. Borrowed; the pool holds it.
+    template <class IsSame, class Make>
+    [[nodiscard]] CFTypeRef get(std::uint32_t hash, IsSame isSame, Make make) {
         std::size_t place = hash & (places_.size() - 1);
-        for (; places_[place]; place = (place + 1) & (places_.size() - 1)) {
-            const CFStringRef pooled = places_[place].get();
-            if (pooled->hash() == hash && pooled->text() == text) {
-                pooled->retain();
-                return pooled;
+        for (; places_[place].value; place = (place + 1) & (places_.size() - 1)) {
+            if (places_[place].hash == hash && isSame(places_[place].value.get())) {
+                return places_[place].value.get();
             }
         }
-        Owned<CFStringRef> made = makeString(text);
-        if (!made) {
-            return nullptr;
-        }
-        places_[place] = made;
-        if (++count_ * 2 > places_.size()) {
+        places_[place] = {hash, Owned<CFTypeRef>::adopt(make())};
+        const CFTypeRef made = places_[place].value.get();
+        if (made != nullptr && ++count_ * 2 > places_.size()) {
             grow();
         }
-        return made.take();
+        return made;
+    }
+
+    // The same for one of the opaque types, from what tells its values apart. Types get hashes of their own.
+    template <class Ref, class IsSame, class Make>
+    [[nodiscard]] CFTypeRef getTyped(std::string_view bytes, IsSame isSame, Make make) {
+        return get(
+            hashOfText(bytes) + static_cast<std::uint32_t>(typeOf<Ref>),
+            [&](CFTypeRef value) { return as<Ref>(value) != nullptr && isSame(*static_cast<Ref>(value)); },
+            make);
     }
 
   private:
-    static constexpr std::size_t longestPooled = 128;
+    struct Place {
+        std::uint32_t hash = 0;
+        Owned<CFTypeRef> value;
+    };
 
     void grow() {
-        std::vector<Owned<CFStringRef>> larger(places_.size() * 2);
-        for (Owned<CFStringRef>& string : places_) {
-            if (string) {
-                std::size_t place = string.get()->hash() & (larger.size() - 1);
-                while (larger[place]) {
+        std::vector<Place> larger(places_.size() * 2);
+        for (Place& old : places_) {
+            if (old.value) {
+                std::size_t place = old.hash & (larger.size() - 1);
+                while (larger[place].value) {
                     place = (place + 1) & (larger.size() - 1);
                 }
-                larger[place] = std::move(string);
+                larger[place] = std::move(old);
             }
         }
         places_ = std::move(larger);
     }
 
-    std::vector<Owned<CFStringRef>> places_;
+    std::vector<Place> places_;
     std::size_t count_ = 0;
 };
 
-// Small integers, each made once.
-class NumberPool {
-  public:
-    [[nodiscard]] CFNumberRef copy(std::int64_t value) {
-        if (value < 0 || value >= static_cast<std::int64_t>(numbers_.size())) {
-            return makeNumber(value).take();
-        }
-        Owned<CFNumberRef>& number = numbers_[static_cast<std::size_t>(value)];
-        if (!number) {
-            number = makeNumber(value);
-        }
-        return Owned<CFNumberRef>(number).take();
-    }
-
-  private:
-    std::array<Owned<CFNumberRef>, 256> numbers_;
-};
+template <class T>
+std::string_view bytesOf(const T& value) {
+    return {reinterpret_cast<const char*>(&value), sizeof value};
+}
 
 class Reader {
   public:
     explicit Reader(XML_Parser parser) : parser_(parser) {}
-    ~Reader() {
-        for (const CFTypeRef value : values_) {
-            CFRelease(value);
-        }
-    }
-    Reader(const Reader&) = delete;
-    Reader& operator=(const Reader&) = delete;
 
     void start(const char* name, const char** attributes);
     void end();
@@ -264,10 +250,8 @@ class Reader {
     // Null when nothing was refused here.
     [[nodiscard]] const char* reason() const { return reason_; }
     [[nodiscard]] XML_Index refusedAt() const { return refusedAt_; }
-    [[nodiscard]] Owned<CFPropertyListRef> takeValue() {
-        const auto value = Owned<CFPropertyListRef>::adopt(values_.back());
-        values_.pop_back();
-        return value;
+    [[nodiscard]] Owned<CFPropertyListRef> value() const {
+        return Owned<CFPropertyListRef>::retained(values_.back());
     }
 
   private:
@@ -278,7 +262,10 @@ class Reader {
     };
 
     void add(CFTypeRef value, int frozenLevels);
+    template <class Handle>
+    [[nodiscard]] CFTypeRef containerOf(std::span<const CFTypeRef> slots, std::uint16_t frozenLevels);
     void endContainer();
+    [[nodiscard]] CFTypeRef leafOf(std::string_view text);
     void endLeaf();
     // Whether the next thing in the innermost dictionary must be a key.
     [[nodiscard]] bool wantsKey() const { return (values_.size() - levels_.back().firstValue) % 2 == 0; }
@@ -286,14 +273,14 @@ class Reader {
     XML_Parser parser_;
     const char* reason_ = nullptr;
     XML_Index refusedAt_ = 0;
-    // The containers that are open, plist first, and the values (and keys) in them that are complete.
+    // The containers that are open, plist first, and the values (and keys) in them that are complete, all
+    // held by the pool.
     std::vector<Level> levels_;
     std::vector<CFTypeRef> values_;
     // The leaf that is open, unknown when none is, and its text.
     Element leaf_ = Element::unknown;
     std::string text_;
-    StringPool strings_;
-    NumberPool numbers_;
+    ValuePool pool_;
 };
 
 void Reader::start(const char* name, const char** attributes) {
@@ -363,11 +350,29 @@ void Reader::end() {
     }
 }
 
-// Takes over a reference; null stands for text that is no such value.
 void Reader::add(CFTypeRef value, int frozenLevels) {
     values_.push_back(value);
     Level& level = levels_.back();
     level.frozenLevels = std::max(level.frozenLevels, static_cast<std::uint16_t>(frozenLevels + 1));
+}
+
+// Null when a key is there twice.
+template <class Handle>
+CFTypeRef Reader::containerOf(std::span<const CFTypeRef> slots, std::uint16_t frozenLevels) {
+    constexpr bool isDictionary = std::is_same_v<Handle, OpaqueCFDictionary>;
+    constexpr auto shape = isDictionary ? Storage::Shape::dictionary : Storage::Shape::array;
+    const auto isSame = [&](const Handle& pooled) {
+        const Storage* const storage = pooled.storage();
+        return std::ranges::equal(storage != nullptr ? storage->slots() : std::span<const CFTypeRef>(),
+                                  slots);
+    };
+    const auto make = [&]() -> const Handle* {
+        Storage* const storage = slots.empty() ? nullptr : Storage::create(shape, slots, frozenLevels);
+        auto made = Owned<const Handle*>::adopt(new Handle(false, true, storage));
+        return isDictionary && storage != nullptr && !storage->hasDistinctKeys() ? nullptr : made.take();
+    };
+    return pool_.getTyped<const Handle*>({reinterpret_cast<const char*>(slots.data()), slots.size_bytes()},
+                                         isSame, make);
 }
 
 void Reader::endContainer() {
@@ -378,72 +383,103 @@ void Reader::endContainer() {
         return;
     }
     const std::span<const CFTypeRef> slots = std::span<const CFTypeRef>(values_).subspan(level.firstValue);
-    Storage* const storage =
-        slots.empty() ? nullptr
-                      : Storage::adopt(isDictionary ? Storage::Shape::dictionary : Storage::Shape::array,
-                                       slots, level.frozenLevels);
+    const CFTypeRef container = isDictionary ? containerOf<OpaqueCFDictionary>(slots, level.frozenLevels)
+                                             : containerOf<OpaqueCFArray>(slots, level.frozenLevels);
+    if (container == nullptr) {
+        refuse("a dictionary with the same key twice");
+        return;
+    }
     values_.resize(level.firstValue);
     levels_.pop_back();
-    if (isDictionary) {
-        add(new OpaqueCFDictionary(false, true, storage), level.frozenLevels);
-        if (storage != nullptr && !storage->hasDistinctKeys()) {
-            refuse("a dictionary with the same key twice");
-        }
-    } else {
-        add(new OpaqueCFArray(false, true, storage), level.frozenLevels);
-    }
+    add(container, level.frozenLevels);
 }
 
-void Reader::endLeaf() {
-    CFTypeRef value = nullptr;
-    const char* fault = nullptr;
+// The value of the leaf that is open, or null when the text is none.
+CFTypeRef Reader::leafOf(std::string_view text) {
     switch (leaf_) {
         case Element::key:
         case Element::string:
-            value = strings_.copy(text_);
-            fault = "text that is too long";
-            break;
-        case Element::integer:
-            if (const auto number = numberFrom<std::int64_t>(text_)) {
-                value = numbers_.copy(*number);
-            }
-            fault = "an integer that is none or does not fit 64 bits";
-            break;
-        case Element::real:
-            if (const auto number = numberFrom<double>(text_)) {
-                value = makeReal(*number).take();
-            }
-            fault = "a real that is none or is out of range";
-            break;
+            return pool_.getTyped<CFStringRef>(
+                text, [&](const OpaqueCFString& pooled) { return pooled.text() == text; },
+                [&] { return makeString(text).take(); });
+        case Element::integer: {
+            const auto number = numberFrom<std::int64_t>(text);
+            return !number ? nullptr
+                           : pool_.getTyped<CFNumberRef>(
+                                 bytesOf(*number),
+                                 [&](const OpaqueCFNumber& pooled) {
+                                     return !pooled.isReal && pooled.integer == *number;
+                                 },
+                                 [&] { return makeNumber(*number).take(); });
+        }
+        case Element::real: {
+            const auto number = numberFrom<double>(text);
+            return !number ? nullptr
+                           : pool_.getTyped<CFNumberRef>(
+                                 bytesOf(*number),
+                                 [&](const OpaqueCFNumber& pooled) {
+                                     return pooled.isReal && bytesOf(pooled.real) == bytesOf(*number);
+                                 },
+                                 [&] { return makeReal(*number).take(); });
+        }
         case Element::trueValue:
+            return text.empty() ? kCFBooleanTrue : nullptr;
         case Element::falseValue:
-            if (text_.empty()) {
-                value = CFRetain(leaf_ == Element::trueValue ? kCFBooleanTrue : kCFBooleanFalse);
-            }
-            fault = "a boolean with text in it";
-            break;
-        case Element::data:
-            if (auto bytes = bytesFromBase64(text_)) {
-                value = new OpaqueCFData(std::move(*bytes));
-            }
-            fault = "data that is not base 64";
-            break;
-        case Element::date:
-            if (const auto seconds = secondsFrom(text_)) {
-                value = makeDate(*seconds).take();
-            }
-            fault = "a date that is none";
-            break;
+            return text.empty() ? kCFBooleanFalse : nullptr;
+        case Element::data: {
+            auto bytes = bytesFromBase64(text);
+            return !bytes ? nullptr
+                          : pool_.getTyped<CFDataRef>(
+                                *bytes, [&](const OpaqueCFData& pooled) { return pooled.bytes == *bytes; },
+                                [&] { return new OpaqueCFData(std::move(*bytes)); });
+        }
+        case Element::date: {
+            const auto seconds = secondsFrom(text);
+            return !seconds ? nullptr
+                            : pool_.getTyped<CFDateRef>(
+                                  bytesOf(*seconds),
+                                  [&](const OpaqueCFDate& pooled) { return pooled.seconds == *seconds; },
+                                  [&] { return makeDate(*seconds).take(); });
+        }
         case Element::unknown:
         case Element::plist:
         case Element::dict:
         case Element::array:
             break;
     }
-    leaf_ = Element::unknown;
+    return nullptr;
+}
+
+const char* faultOf(Element leaf) {
+    switch (leaf) {
+        case Element::integer:
+            return "an integer that is none or does not fit 64 bits";
+        case Element::real:
+            return "a real that is none or is out of range";
+        case Element::trueValue:
+        case Element::falseValue:
+            return "a boolean with text in it";
+        case Element::data:
+            return "data that is not base 64";
+        case Element::date:
+            return "a date that is none";
+        case Element::key:
+        case Element::string:
+        case Element::unknown:
+        case Element::plist:
+        case Element::dict:
+        case Element::array:
+            break;
+    }
+    return "text that is too long";
+}
+
+void Reader::endLeaf() {
+    const CFTypeRef value = leafOf(text_);
     if (value == nullptr) {
-        refuse(fault);
+        refuse(faultOf(leaf_));
     } else {
+        leaf_ = Element::unknown;
         add(value, 0);
     }
 }
@@ -522,7 +558,7 @@ Owned<CFPropertyListRef> parsePropertyListXML(std::string_view text, ParseError&
     XML_SetSkippedEntityHandler(parser.get(), onSkippedEntity);
     XML_SetXmlDeclHandler(parser.get(), onDeclaration);
     if (XML_Parse(parser.get(), text.data(), static_cast<int>(text.size()), XML_TRUE) == XML_STATUS_OK) {
-        return reader.takeValue();
+        return reader.value();
     }
     const bool isRefused = reader.reason() != nullptr;
     const XML_Index place = isRefused ? reader.refusedAt() : XML_GetCurrentByteIndex(parser.get());

@@ -27,10 +27,10 @@ Storage* Storage::create(Shape shape, bool retainsValues, std::size_t capacity) 
     return ::new (::operator new(size)) Storage(shape, retainsValues, static_cast<std::uint32_t>(capacity));
 }
 
-Storage* Storage::adopt(Shape shape, std::span<const CFTypeRef> slots, std::uint16_t frozenLevels) {
+Storage* Storage::create(Shape shape, std::span<const CFTypeRef> slots, std::uint16_t frozenLevels) {
     const std::size_t count = slots.size() / static_cast<std::size_t>(shape);
     Storage* const storage = create(shape, true, count);
-    std::memcpy(storage->slots(), slots.data(), slots.size_bytes());
+    std::ranges::transform(slots, storage->firstSlot(), CFRetain);
     storage->used_ = storage->live_ = static_cast<std::uint32_t>(count);
     storage->frozenLevels_ = frozenLevels;
     return storage;
@@ -41,6 +41,7 @@ void Storage::release() noexcept {
         return;
     }
     if (destructionDepth >= deepestDestruction) {
+        dropIndex();
         nextDoomed_ = doomed;
         doomed = this;
         return;
@@ -50,6 +51,7 @@ void Storage::release() noexcept {
     while (destructionDepth == 1 && doomed != nullptr) {
         Storage* const next = doomed;
         doomed = next->nextDoomed_;
+        next->index_ = nullptr;
         destroy(next);
     }
     --destructionDepth;
@@ -63,7 +65,7 @@ void Storage::destroy(Storage* storage) noexcept {
 }
 
 void Storage::releaseContent() noexcept {
-    CFTypeRef* const slot = slots();
+    CFTypeRef* const slot = firstSlot();
     const std::size_t step = width();
     for (std::size_t i = 0; i < used_ * step; i += step) {
         const CFTypeRef value = slot[i + step - 1];
@@ -81,8 +83,8 @@ void Storage::releaseContent() noexcept {
 
 Storage* Storage::copy(std::size_t capacity) const {
     Storage* const storage = create(shape_, retainsValues_, std::max<std::size_t>(capacity, live_));
-    CFTypeRef* to = storage->slots();
-    const CFTypeRef* const from = slots();
+    CFTypeRef* to = storage->firstSlot();
+    const CFTypeRef* const from = firstSlot();
     const std::size_t step = width();
     for (std::size_t i = 0; i < used_ * step; i += step) {
         if (shape_ == Shape::dictionary) {
@@ -117,7 +119,7 @@ Storage* Storage::writable() {
     // The references move along with the items.
     fillHoles();
     Storage* const larger = create(shape_, retainsValues_, roomy);
-    std::memcpy(larger->slots(), slots(), live_ * width() * sizeof(CFTypeRef));
+    std::memcpy(larger->firstSlot(), firstSlot(), live_ * width() * sizeof(CFTypeRef));
     larger->used_ = larger->live_ = live_;
     larger->frozenLevels_ = frozenLevels_;
     used_ = live_ = 0;
@@ -135,13 +137,13 @@ void Storage::noteValue(CFTypeRef value) noexcept {
 }
 
 void Storage::append(CFTypeRef value) {
-    slots()[used_++] = retainsValues_ ? CFRetain(value) : value;
+    firstSlot()[used_++] = retainsValues_ ? CFRetain(value) : value;
     ++live_;
     noteValue(value);
 }
 
 void Storage::removeItem(std::size_t position) {
-    CFTypeRef* const slot = slots() + position;
+    CFTypeRef* const slot = firstSlot() + position;
     const CFTypeRef removed = *slot;
     std::memmove(slot, slot + 1, (used_ - position - 1) * sizeof(CFTypeRef));
     --used_;
@@ -152,21 +154,21 @@ void Storage::removeItem(std::size_t position) {
 }
 
 void Storage::reorder(std::span<const CFTypeRef> items, std::size_t position) noexcept {
-    std::ranges::copy(items, slots() + position);
+    std::ranges::copy(items, firstSlot() + position);
 }
 
 std::span<const Entry> Storage::entries() {
     static_assert(sizeof(Entry) == 2 * sizeof(CFTypeRef) && alignof(Entry) == alignof(CFTypeRef));
     fillHoles();
-    return {reinterpret_cast<const Entry*>(slots()), live_};
+    return {reinterpret_cast<const Entry*>(firstSlot()), live_};
 }
 
 void Storage::fillHoles() noexcept {
     if (live_ == used_) {
         return;
     }
-    CFTypeRef* to = slots();
-    for (CFTypeRef* from = slots(); from != slots() + used_ * 2UL; from += 2) {
+    CFTypeRef* to = firstSlot();
+    for (CFTypeRef* from = firstSlot(); from != firstSlot() + used_ * 2UL; from += 2) {
         if (from[0] != nullptr) {
             to[0] = from[0];
             to[1] = from[1];
@@ -188,7 +190,7 @@ void Storage::dropIndex() noexcept {
 
 void Storage::enterIntoIndex(std::uint32_t position) noexcept {
     const std::size_t mask = indexSize() - 1;
-    std::size_t place = hashOfValue(slots()[position * 2UL]) & mask;
+    std::size_t place = hashOfValue(firstSlot()[position * 2UL]) & mask;
     while (index_[place] != 0) {
         place = (place + 1) & mask;
     }
@@ -206,7 +208,7 @@ void Storage::buildIndex() {
 }
 
 std::size_t Storage::find(CFTypeRef key) {
-    const CFTypeRef* const slot = slots();
+    const CFTypeRef* const slot = firstSlot();
     if (used_ <= linearLimit) {
         for (std::size_t position = 0; position < used_; ++position) {
             if (slot[position * 2] == key) {
@@ -239,11 +241,11 @@ std::size_t Storage::find(CFTypeRef key) {
 }
 
 bool Storage::hasDistinctKeys() {
-    const CFTypeRef* const slot = slots();
+    const CFTypeRef* const slot = firstSlot();
     if (used_ <= linearLimit) {
         for (std::size_t later = 1; later < used_; ++later) {
             for (std::size_t earlier = 0; earlier < later; ++earlier) {
-                if (equalValues(slot[earlier * 2], slot[later * 2])) {
+                if (slot[earlier * 2] == slot[later * 2]) {
                     return false;
                 }
             }
@@ -261,7 +263,7 @@ bool Storage::hasDistinctKeys() {
 void Storage::addEntry(CFTypeRef key, CFTypeRef value) {
     // A key that somebody could still change would be lost in the index.
     const auto* const text = as<CFStringRef>(key);
-    CFTypeRef* const slot = slots() + used_ * 2UL;
+    CFTypeRef* const slot = firstSlot() + used_ * 2UL;
     slot[0] = text != nullptr ? CFStringCreateCopy(nullptr, text) : CFRetain(key);
     slot[1] = retainsValues_ ? CFRetain(value) : value;
     if (index_ != nullptr) {
@@ -276,7 +278,7 @@ void Storage::addEntry(CFTypeRef key, CFTypeRef value) {
 }
 
 void Storage::replaceValue(std::size_t position, CFTypeRef value) {
-    CFTypeRef& slot = slots()[position * 2 + 1];
+    CFTypeRef& slot = firstSlot()[position * 2 + 1];
     const CFTypeRef replaced = slot;
     slot = retainsValues_ ? CFRetain(value) : value;
     noteValue(value);
@@ -286,7 +288,7 @@ void Storage::replaceValue(std::size_t position, CFTypeRef value) {
 }
 
 void Storage::removeEntry(std::size_t position) {
-    CFTypeRef* const slot = slots() + position * 2;
+    CFTypeRef* const slot = firstSlot() + position * 2;
     const CFTypeRef key = slot[0];
     const CFTypeRef value = slot[1];
     slot[0] = slot[1] = nullptr;
