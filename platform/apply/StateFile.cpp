@@ -123,7 +123,7 @@ Outcome syncDirectoryOf(const std::string& path) {
 }
 
 Outcome replaceFile(const std::string& path, std::string_view content, const FileOwnership& ownership) {
-    const std::string temporary = path + ".la-new";
+    const std::string temporary = temporaryFor(path);
     // One that a crash left behind; every writer of a path holds that path's lock.
     (void)::unlink(temporary.c_str());
     FileDescriptor file(
@@ -160,7 +160,12 @@ Outcome writeStateFile(const std::string& path, CFDictionaryRef content) {
     return replaceFile(path, *text, {0600, ::geteuid(), ::getegid()});
 }
 
+std::string temporaryFor(const std::string& path) {
+    return path + ".la-new";
+}
+
 Outcome removeStateFile(const std::string& path) {
+    (void)::unlink(temporaryFor(path).c_str());
     if (::unlink(path.c_str()) != 0) {
         return errno == ENOENT ? Outcome() : Outcome::fromErrno("cannot remove " + path);
     }

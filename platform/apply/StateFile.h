@@ -25,7 +25,7 @@ Outcome makeRuntimeDirectory();
 Outcome readStateFile(const std::string& path, values::Owned<CFDictionaryRef>& content);
 // All of it or nothing, mode 0600, on the disk when the call returns.
 Outcome writeStateFile(const std::string& path, CFDictionaryRef content);
-// Success when it is not there.
+// Success when it is not there. What a writer that was ended half-way left beside it goes too.
 Outcome removeStateFile(const std::string& path);
 
 // The same two steps for plain content, which the name servers' file shares. mode, uid and gid are set before
@@ -36,6 +36,8 @@ struct FileOwnership {
     unsigned user = 0;
     unsigned group = 0;
 };
+// Where that is prepared, in the same directory.
+[[nodiscard]] std::string temporaryFor(const std::string& path);
 Outcome replaceFile(const std::string& path, std::string_view content, const FileOwnership& ownership);
 // Puts the directory of a path on the disk.
 Outcome syncDirectoryOf(const std::string& path);

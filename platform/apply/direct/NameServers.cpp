@@ -85,7 +85,7 @@ Outcome makeFileState(const std::string& path, const FileState& state) {
             break;
     }
     // By way of a second link, because making a link does not replace a file.
-    const std::string temporary = path + ".la-new";
+    const std::string temporary = temporaryFor(path);
     (void)::unlink(temporary.c_str());
     if (::symlink(state.content.c_str(), temporary.c_str()) != 0 ||
         ::rename(temporary.c_str(), path.c_str()) != 0) {
@@ -226,6 +226,7 @@ bool isOurs(const FileState& now, const State& state) {
 }
 
 Outcome giveFileBack(const std::string& path, const FileState& now, const State& state) {
+    (void)::unlink(temporaryFor(path).c_str());
     if (!isOurs(now, state) && !(now == *state.before)) {
         logLine(LogLevel::notice, path + " was written by somebody else meanwhile and stays as it is");
     } else if (!(now == *state.before)) {

@@ -5,6 +5,7 @@
 #include <fstream>
 #include <iostream>
 #include <memory>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -12,7 +13,10 @@
 #include "platform/Host.h"
 #include "platform/Log.h"
 #include "platform/apply/Agents.h"
+#include "platform/apply/Apply.h"
 #include "platform/apply/StateFile.h"
+#include "tests/unit/apply/Trees.h"
+#include "tests/unit/support/Interrupted.h"
 #include "tests/unit/support/PrivateNetwork.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
@@ -44,17 +48,35 @@ InterfacePlan offPlan(const std::string& interface) {
     return plan;
 }
 
-// Everything that ip tells of the interfaces, but what counts by itself (lifetimes, link-local addresses
-// being tried).
+// Everything that ip tells of the interfaces, but what counts or comes by itself: lifetimes, carriers,
+// link-local and router-advertised things.
 std::string machineState() {
-    std::string state = shell(
-        "ip addr show | grep -v -e valid_lft -e 'scope link' | sed -e 's/ qdisc.*//' -e 's/[A-Z]*-[A-Z]*,//' "
-        "-e 's/,LOWER_UP//' -e 's/,M-DOWN//'");
-    state += shell("ip -4 route show table all | grep -v 'table local' || true");
-    state += shell(
-        "ip -6 route show table all | grep -v -e 'proto kernel' -e 'table local' -e 'proto ra' || true");
-    state += shell("cat /etc/resolv.conf 2>/dev/null || true");
+    std::istringstream all(
+        shell("ip addr show; ip -4 route show table all; ip -6 route show table all;"
+              "cat /etc/resolv.conf; stat -c '%A %u %N' /etc/resolv.conf; ls /etc || true"));
+    std::string state;
+    for (std::string line; std::getline(all, line);) {
+        const auto has = [&line](const char* text) { return line.find(text) != std::string::npos; };
+        if (has("valid_lft") || has("scope link \n") || has("inet6 fe80") || has("table local") ||
+            has("proto ra") || (has("proto kernel") && has("::"))) {
+            continue;
+        }
+        for (const char* word : {"NO-CARRIER,", ",LOWER_UP", ",M-DOWN", " linkdown"}) {
+            if (const std::size_t at = line.find(word); at != std::string::npos) {
+                line.erase(at, std::string(word).size());
+            }
+        }
+        state += line.substr(0, line.find(" qdisc")) + "\n";
+    }
     return state;
+}
+
+std::string addressesOf(const std::string& interface) {
+    return shell("ip -br -4 addr show dev " + interface + " 2>/dev/null | tr -s ' ' | cut -d' ' -f3-");
+}
+
+std::string defaultRoutes() {
+    return shell("ip route show default | sed 's/ linkdown//'");
 }
 
 class DirectAgentTest : public PrivateNetworkTest {
@@ -69,6 +91,7 @@ class DirectAgentTest : public PrivateNetworkTest {
 
     static void run(const std::function<void()>& body) {
         PrivateNetwork::run([&body] {
+            setenv("TMPDIR", "/run", 1);
             const TemporaryDirectory folder;
             Host host;
             host.runtimeDirectory = folder.at("run");
@@ -146,11 +169,10 @@ TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
             expectOk(agent->takeOver(offPlan("card1"), captured[1]));
             const std::string made = machineState();
             EXPECT_NE(before, made);
-            EXPECT_EQ("192.0.0.199/24 \n",
-                      shell("ip -br -4 addr show dev card0 | tr -s ' ' | cut -d' ' -f3-"));
+            EXPECT_EQ("192.0.0.199/24 \n", addressesOf("card0"));
             EXPECT_EQ("192.0.0.192 dev card0 src 192.0.0.199 uid 0 \n    cache \n",
                       shell("ip route get 192.0.0.192"));
-            EXPECT_EQ("default via 192.0.0.192 dev card0 proto 76 \n", shell("ip route show default"));
+            EXPECT_EQ("default via 192.0.0.192 dev card0 proto 76 \n", defaultRoutes());
             EXPECT_EQ("", shell("ip -br addr show up dev card1"));
             expectOk(agent->takeOver(plan, captured[0]));
             expectOk(agent->takeOver(offPlan("card1"), captured[1]));
@@ -160,6 +182,90 @@ TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
                 expectOk(agent->giveBack(one));
             }
             EXPECT_EQ(before, machineState());
+        });
+    }
+}
+
+// The process ends before every single step of going there and of coming back; the next run comes back at
+// once, or goes on and then comes back.
+TEST_F(DirectAgentTest, AProcessThatEndsAnywhereLeavesTheWayBack) {
+    for (const bool isGoingOn : {true, false}) {
+        run([isGoingOn] {
+            shell(
+                "ip addr add 10.1.0.5/24 dev card0; ip addr add 10.1.0.6/24 dev card0; ip link set card0 up;"
+                "ip addr add 10.2.0.5/24 dev card1; ip link set card1 up; ip route add default via 10.1.0.1 "
+                "metric 9;"
+                "ip route append default via 10.2.0.1 metric 9; ip -6 addr add 2001:db8::5/64 dev card0 "
+                "nodad;"
+                "echo nameserver 9.9.9.9 > /etc/resolv.conf");
+            const std::string before = machineState();
+            Service card0 = fixedService("card0");
+            card0.entries +=
+                "<key>DNS</key><dict><key>ServerAddresses</key><array><string>10.0.0.53</string></array></"
+                "dict>";
+            const auto there = makeTree({{"card1", switchedOff}, card0});
+            const auto back = makeTree({});
+            expectOk(applyTree(there.get()));
+            const std::string made = machineState();
+            expectOk(applyTree(back.get()));
+            for (const bool isGoing : {true, false}) {
+                bool wasEnded = true;
+                int step = 0;
+                for (; wasEnded && !testing::Test::HasFailure(); ++step) {
+                    SCOPED_TRACE((isGoing ? "going, step " : "coming back, step ") + std::to_string(step));
+                    if (!isGoing) {
+                        expectOk(applyTree(there.get()));
+                    }
+                    wasEnded = testing_support::endBeforeStep(
+                        step, [&] { (void)applyTree(isGoing ? there.get() : back.get()); });
+                    if (isGoingOn) {
+                        expectOk(applyTree(isGoing ? there.get() : back.get()));
+                        EXPECT_EQ(isGoing ? made : before, machineState());
+                    }
+                    expectOk(applyTree(back.get()));
+                    EXPECT_EQ(before, machineState());
+                    EXPECT_EQ("", shell("ls " + currentHost().runtimeDirectory +
+                                        " | grep -v -e lock$ -e new$ || true"));
+                }
+                EXPECT_GT(step, 30);
+            }
+        });
+    }
+}
+
+TEST_F(DirectAgentTest, LeavesAnInterfaceThatSomebodyElseTookOver) {
+    struct Row {
+        const char* what;
+        bool isOff;
+        const char* theirs;
+        const char* addresses;  // at the end
+        const char* routes;
+    };
+    static const Row rows[] = {
+        {"nothing", false, "true", "10.1.0.5/24 \n", "default via 10.1.0.1 dev card0 \n"},
+        {"another address instead", false,
+         "ip addr flush dev card0; ip addr add 10.7.0.1/24 dev card0; ip route add default via 10.7.0.9",
+         "10.7.0.1/24 \n", "default via 10.7.0.9 dev card0 \n"},
+        {"another address beside ours", false, "ip addr add 10.7.0.1/24 dev card0", "10.7.0.1/24 \n", ""},
+        {"switched on", true, "ip link set card0 up", "", ""},
+        {"switched off", false, "ip link set card0 down", "10.1.0.5/24 \n",
+         "default via 10.1.0.1 dev card0 \n"},
+        {"pulled out", false, "ip link del card0", "", ""},
+        {"pulled out and put in again", false,
+         "ip link del card0; ip link add dummy0 type veth; ip link add card0 type veth peer name far0",
+         "10.1.0.5/24 \n", "default via 10.1.0.1 dev card0 \n"},
+    };
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.what);
+        run([&row] {
+            shell(
+                "ip addr add 10.1.0.5/24 dev card0; ip link set card0 up; ip route add default via 10.1.0.1");
+            const auto there = makeTree({row.isOff ? Service{"card0", switchedOff} : fixedService("card0")});
+            expectOk(applyTree(there.get()));
+            shell(row.theirs);
+            expectOk(applyTree(makeTree({}).get()));
+            EXPECT_EQ(row.addresses, addressesOf("card0"));
+            EXPECT_EQ(row.routes, defaultRoutes());
         });
     }
 }
@@ -228,8 +334,8 @@ TEST_F(DirectAgentTest, TakesALeaseAndGivesItBack) {
         plan.method = IPv4Method::dhcp;
         plan.dhcpClientID = "a client";
         expectOk(agent->takeOver(plan, captured[0]));
-        EXPECT_EQ("10.50.0.10/24 \n", shell("ip -br -4 addr show dev card0 | tr -s ' ' | cut -d' ' -f3-"));
-        EXPECT_EQ("default via 10.50.0.1 dev card0 proto 76 \n", shell("ip route show default"));
+        EXPECT_EQ("10.50.0.10/24 \n", addressesOf("card0"));
+        EXPECT_EQ("default via 10.50.0.1 dev card0 proto 76 \n", defaultRoutes());
         EXPECT_EQ("search example.org\nnameserver 10.50.0.53\n", shell("grep -v '^#' /etc/resolv.conf"));
         expectOk(agent->takeOver(plan, captured[0]));
         EXPECT_EQ((std::vector<std::string>{"DHCPDISCOVER", "DHCPREQUEST", "DHCPACK"}),
