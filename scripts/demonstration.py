@@ -120,8 +120,12 @@ def main():
     one.back()
 
     one = Demonstration("The whole cycle in one run, with a question to the user")
+    one.machine.start_desktop()
     say("Answered with n, an empty line, x and y")
     one.assisted("n", "", "x", "y")
+    say("What the browser of the user at the computer was told")
+    one.expect(lab.wait_until(lambda: one.machine.file("/tmp/browser") or not lab.other_users()), "a page opened")
+    show("cat /tmp/browser" if lab.other_users() else "echo 'nothing: only root can be another user here'")
     one.back()
 
 

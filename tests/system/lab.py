@@ -28,6 +28,7 @@ TOOL = LAB / "bin" / BINARY.name
 STORE = Path("/var/lib/location-assistant/preferences.plist")
 RUNTIME = Path("/run/location-assistant")
 NOBODY = 65534
+RESIDENT = 4242  # the user who sits at the computer
 UPDATE = "--update" in sys.argv
 FORBID_SKIPS = os.environ.get("LA_FORBID_SKIPS") == "1"
 ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
@@ -72,15 +73,22 @@ PROFILES = {
 PREPARE = """
 mount -t tmpfs -o mode=755 tmpfs /run
 mkdir -p {lab}/sys {lab}/made {lab}/bin {lab}/packages {lab}/etc/upper {lab}/etc/work {lab}/dev /run/netns
+mkdir -p {lab}/usr/bin
 mount -c --bind /proc/self/fd/{binaries} {lab}/bin
-etc=/etc
+cat >{lab}/usr/bin/xdg-open <<'END'
+#!/bin/sh
+echo "$(id -un) opens $*" >>/tmp/browser
+END
+chmod 755 {lab}/usr/bin/xdg-open
+usr=/usr etc=/etc
 if [ -d {packages}/usr ]; then
     mount --bind {packages} {lab}/packages
-    mount -t overlay -o lowerdir={lab}/packages/usr:/usr overlay /usr
-    etc={lab}/packages/etc:/etc
+    usr={lab}/packages/usr:/usr etc={lab}/packages/etc:/etc
 fi
+mount -t overlay -o lowerdir={lab}/usr:$usr overlay /usr
 mount -t overlay -o lowerdir=$etc,upperdir={lab}/etc/upper,workdir={lab}/etc/work overlay /etc
 rm -f /etc/resolv.conf
+echo 'resident:x:{resident}:{resident}::/:/bin/sh' >>/etc/passwd
 [ -s /etc/machine-id ] || echo 0123456789abcdef0123456789abcdef >/etc/machine-id
 mkdir -p /etc/NetworkManager
 mount -t tmpfs -o mode=755 tmpfs /etc/NetworkManager
@@ -138,7 +146,7 @@ def enter():
     hidden = ("/tmp/", "/run/", "/var/lib/")
     kept = {path: os.open(path, os.O_PATH) for path in (PROJECT, BUILD, BINARY.parent) if str(path).startswith(hidden)}
     binaries = os.open(BINARY.parent, os.O_PATH)
-    sh(PREPARE.format(lab=LAB, binaries=binaries, packages=shlex.quote(str(PROJECT / ".lab/root"))),
+    sh(PREPARE.format(lab=LAB, binaries=binaries, resident=RESIDENT, packages=shlex.quote(str(PROJECT / ".lab/root"))),
        pass_fds=[binaries], cwd="/")
     for path, descriptor in kept.items():
         path.mkdir(parents=True, exist_ok=True)
@@ -241,7 +249,8 @@ class Lab:
             self.syslog.append(data.decode("utf-8", "replace").split("location-assistant", 1)[-1])
 
     def _make_sysfs(self):
-        lines = ["mkdir -p class/net class/tty bus/pci/devices bus/pci/drivers devices/virtual/net",
+        lines = ["mkdir -p class/net class/tty bus/pci/devices bus/pci/drivers bus/pci/slots/3 devices/virtual/net",
+                 "echo 0000:02:00 >bus/pci/slots/3/address",
                  f"ln -s {LAB}/sys/class/net/lo devices/virtual/net/lo",
                  "ln -s ../../devices/virtual/net/lo class/net/lo"]
         for card in self.cards:
@@ -287,6 +296,15 @@ class Lab:
         (LAB / "bus.conf").write_text(BUS)
         self.daemon("dbus-daemon", f"--config-file={LAB}/bus.conf", "--nofork", "--nopidfile")
         wait_until(Path("/run/dbus/system_bus_socket").exists)
+
+    def start_desktop(self):
+        """Lets the resident sit at the computer; what their browser is told goes to /tmp/browser."""
+        if not Path("/run/dbus/system_bus_socket").exists():
+            self.start_bus()
+        manager = self.daemon(BUILD / "tests/system/login_manager", "/run/dbus/system_bus_socket", RESIDENT,
+                              stdout=subprocess.PIPE)
+        if manager.stdout.readline() != b"ready\n":
+            raise RuntimeError("no login manager")
 
     def start_network_manager(self):
         folder = Path("/etc/NetworkManager/system-connections")

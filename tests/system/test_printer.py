@@ -13,10 +13,14 @@ PROXIES = {f"{name}_proxy": "http://192.0.0.1:1" for name in ("http", "all", "HT
 class Printer(lab.LabTest):
     def test_well(self):
         before = self.lab.network()
+        self.lab.start_desktop()
         self.lab.tool("test", typed=TYPED, env=lab.ENVIRONMENT | PROXIES)
         self.assertEqual(["192.0.0.199/24"], self.lab.ipv4("wlan0"))
         self.assertEqual(({"0": "Automatic", "1": "kv zat temp set"}, "1"), self.set_names())
         self.assertEqual("GET /mactestfoo.html HTTP/1.1\n", self.lab.file("printer.log"))
+        if lab.other_users():
+            opened = "resident opens http://192.0.0.192/dot11_config_start.htm\n"
+            lab.wait_until(lambda: self.lab.file("/tmp/browser") == opened)
         self.lab.tool("remove")
         self.assertEqual(before, self.lab.network())
         self.assert_golden("test")
