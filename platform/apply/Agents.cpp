@@ -8,10 +8,15 @@ namespace platform::apply {
 
 Outcome chooseAgent(std::shared_ptr<Agent>& agent) {
     agent = currentHost().agent;
-    if (agent == nullptr) {
-        agent = makeDirectAgent();
+    if (agent != nullptr) {
+        return {};
     }
-    return {};
+    bool running = false;
+    const Outcome outcome = isNetworkManagerRunning(running);
+    if (outcome.ok()) {
+        agent = running ? makeNetworkManagerAgent() : makeDirectAgent();
+    }
+    return outcome;
 }
 
 Outcome agentNamed(std::string_view name, std::shared_ptr<Agent>& agent) {
@@ -19,7 +24,9 @@ Outcome agentNamed(std::string_view name, std::shared_ptr<Agent>& agent) {
     if (agent != nullptr && agent->name() == name) {
         return {};
     }
-    agent = name == "direct" ? makeDirectAgent() : nullptr;
+    agent = name == "direct"           ? makeDirectAgent()
+            : name == "networkmanager" ? makeNetworkManagerAgent()
+                                       : nullptr;
     if (agent == nullptr) {
         return {kSCStatusFailed, "there is no agent \"" + std::string(name) + "\" to give it back"};
     }

@@ -1,0 +1,251 @@
+#include "platform/apply/networkmanager/Bus.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <system_error>
+#include <utility>
+
+#include "platform/Host.h"
+
+namespace platform::apply {
+namespace {
+
+constexpr const char* propertiesInterface = "org.freedesktop.DBus.Properties";
+constexpr std::size_t longestText = 300;
+
+std::uint64_t microseconds(Clock::duration duration) {
+    const auto count = std::chrono::duration_cast<std::chrono::microseconds>(duration).count();
+    return static_cast<std::uint64_t>(std::max<std::int64_t>(count, 0));
+}
+
+// A D-Bus address keeps only these as they are; every other byte is escaped.
+std::string addressOf(const std::string& path) {
+    static constexpr const char* digits = "0123456789abcdef";
+    std::string address = "unix:path=";
+    for (const char c : path) {
+        const auto byte = static_cast<unsigned char>(c);
+        if (std::isalnum(byte) != 0 || std::strchr("-_/.\\*", c) != nullptr) {
+            address += c;
+        } else {
+            address += {'%', digits[byte >> 4U], digits[byte & 15U]};
+        }
+    }
+    return address;
+}
+
+class Error {
+  public:
+    Error() = default;
+    ~Error() { sd_bus_error_free(&error_); }
+    Error(const Error&) = delete;
+    Error& operator=(const Error&) = delete;
+    sd_bus_error* out() noexcept { return &error_; }
+    [[nodiscard]] const sd_bus_error& get() const noexcept { return error_; }
+
+  private:
+    sd_bus_error error_ = SD_BUS_ERROR_NULL;
+};
+
+Outcome fromBus(const std::string& what, int result) {
+    return platform::apply::fromBus(what, result, SD_BUS_ERROR_NULL, {});
+}
+
+int forwardSignal(sd_bus_message* message, void* context, sd_bus_error* /*error*/) {
+    (*static_cast<Bus::Handler*>(context))(sd_bus_message_get_path(message), message);
+    return 0;
+}
+
+int noteOwner(sd_bus_message* message, void* left, sd_bus_error* /*error*/) {
+    const char* before = nullptr;
+    if (sd_bus_message_read(message, "sss", nullptr, &before, nullptr) >= 0 && *before != '\0') {
+        *static_cast<bool*>(left) = true;
+    }
+    return 0;
+}
+
+}  // namespace
+
+Outcome fromBus(const std::string& what, int result, const sd_bus_error& error, std::string_view secret) {
+    const bool named = error.name != nullptr;
+    std::string reason = what + ": ";
+    if (named && sd_bus_error_has_name(&error, SD_BUS_ERROR_NO_REPLY) != 0 && result == -ETIMEDOUT) {
+        reason += "no answer in " + std::to_string(callBound.count()) + " s";
+    } else if (named) {
+        const std::string_view text = error.message == nullptr ? "" : error.message;
+        const bool isSafe = secret.empty() || text.find(secret) == std::string_view::npos;
+        reason += error.name;
+        if (isSafe && !text.empty()) {
+            reason.append(": ").append(text.substr(0, longestText));
+        }
+    } else {
+        reason += std::generic_category().message(-result);
+    }
+    const bool noRights = result == -EACCES || result == -EPERM ||
+                          (named && std::string_view(error.name).ends_with(".PermissionDenied"));
+    return {noRights ? kSCStatusAccessError : kSCStatusFailed, reason};
+}
+
+Bus::~Bus() = default;
+
+Outcome Bus::process(Clock::time_point deadline, bool& inTime) {
+    int result = sd_bus_process(bus_.get(), nullptr);
+    inTime = true;
+    if (result == 0) {
+        const Clock::duration remaining = deadline - Clock::now();
+        inTime = remaining > Clock::duration::zero();
+        result = inTime ? sd_bus_wait(bus_.get(), microseconds(remaining)) : 0;
+    }
+    // A signal that this process caught is no failure of the bus.
+    return result < 0 && result != -EINTR ? fromBus("the system bus", result) : Outcome();
+}
+
+Outcome Bus::connect(const std::string& service, bool& found) {
+    const std::string what = "connecting to the system bus";
+    const Clock::time_point deadline = Clock::now() + connectBound;
+    service_ = service;
+    ownerSlot_.reset();
+    ownerLeft_ = false;
+    sd_bus* made = nullptr;
+    int result = sd_bus_new(&made);
+    bus_.reset(made);
+    if (result >= 0) {
+        result = sd_bus_set_address(made, addressOf(currentHost().systemBusSocket).c_str());
+    }
+    if (result >= 0) {
+        result = sd_bus_set_bus_client(made, 1);
+    }
+    if (result >= 0) {
+        result = sd_bus_set_method_call_timeout(made, microseconds(callBound));
+    }
+    if (result >= 0) {
+        result = sd_bus_start(made);
+    }
+    found = result != -ENOENT;
+    if (!found) {
+        bus_.reset();
+        return {};
+    }
+    while (result >= 0 && (result = sd_bus_is_ready(made)) == 0) {
+        bool inTime = false;
+        const Outcome outcome = process(deadline, inTime);
+        if (!outcome.ok()) {
+            return outcome;
+        }
+        if (!inTime) {
+            return {kSCStatusFailed, what + ": no answer in " + std::to_string(connectBound.count()) + " s"};
+        }
+    }
+    if (result >= 0) {
+        sd_bus_slot* slot = nullptr;
+        const std::string rule =
+            "type='signal',sender='org.freedesktop.DBus',interface='org.freedesktop.DBus',"
+            "member='NameOwnerChanged',arg0='" +
+            service_ + "'";
+        result = sd_bus_add_match_async(made, &slot, rule.c_str(), noteOwner, nullptr, &ownerLeft_);
+        ownerSlot_.reset(slot);
+    }
+    return result < 0 ? fromBus(what, result) : Outcome();
+}
+
+Outcome Bus::hasOwner(bool& owned) {
+    const int result = sd_bus_get_name_creds(bus_.get(), service_.c_str(), 0, nullptr);
+    owned = result >= 0;
+    return result >= 0 || result == -ENXIO ? Outcome()
+                                           : fromBus("asking for the owner of " + service_, result);
+}
+
+Outcome Bus::call(const Call& call, Message& reply, std::string* errorName) {
+    sd_bus_message* made = nullptr;
+    int result = bus_ == nullptr
+                     ? -ENOTCONN
+                     : sd_bus_message_new_method_call(bus_.get(), &made, service_.c_str(), call.path.c_str(),
+                                                      call.interface.c_str(), call.member);
+    const Message message(made);
+    if (result >= 0) {
+        result = sd_bus_message_set_auto_start(made, 0);
+    }
+    if (result >= 0 && !call.secret.empty()) {
+        result = sd_bus_message_sensitive(made);
+    }
+    if (result >= 0 && call.arguments) {
+        result = call.arguments(made);
+    }
+    Error error;
+    sd_bus_message* answer = nullptr;
+    if (result >= 0) {
+        result = sd_bus_call(bus_.get(), made, microseconds(callBound), error.out(), &answer);
+    }
+    reply.reset(answer);
+    if (errorName != nullptr) {
+        *errorName = error.get().name == nullptr ? "" : error.get().name;
+    }
+    return result < 0 ? fromBus(call.member, result, error.get(), call.secret) : Outcome();
+}
+
+Outcome Bus::readProperties(const std::string& path, const std::string& interface, Dictionary& properties,
+                            std::string* error) {
+    Message reply;
+    const Outcome outcome =
+        call({path,
+              propertiesInterface,
+              "GetAll",
+              [&interface](sd_bus_message* m) { return sd_bus_message_append(m, "s", interface.c_str()); },
+              {}},
+             reply, error);
+    properties.clear();
+    if (!outcome.ok()) {
+        return outcome;
+    }
+    const int result = readDictionary(reply.get(), properties);
+    return result < 0 ? fromBus("the properties of " + path, result) : Outcome();
+}
+
+Outcome Bus::setProperty(const std::string& path, const std::string& interface, const char* property,
+                         const Value& value) {
+    Message reply;
+    const Outcome outcome = call({path,
+                                  propertiesInterface,
+                                  "Set",
+                                  [&](sd_bus_message* m) {
+                                      const int result =
+                                          sd_bus_message_append(m, "ss", interface.c_str(), property);
+                                      return result < 0 ? result : appendVariant(m, value);
+                                  },
+                                  {}},
+                                 reply);
+    return outcome.ok() ? outcome
+                        : Outcome(outcome.status(), std::string(property) + ": " + outcome.reason());
+}
+
+Outcome Bus::watch(const std::string& interface, const std::string& member, Handler handler,
+                   std::unique_ptr<Watch>& watch) {
+    watch = std::make_unique<Watch>(Watch{std::move(handler), nullptr});
+    sd_bus_slot* slot = nullptr;
+    // Not waited for: the bus takes requests in order, and this one comes before any call made later.
+    const int result =
+        sd_bus_match_signal_async(bus_.get(), &slot, service_.c_str(), nullptr, interface.c_str(),
+                                  member.c_str(), forwardSignal, nullptr, &watch->handler);
+    watch->slot.reset(slot);
+    return result < 0 ? fromBus("listening to " + member, result) : Outcome();
+}
+
+Outcome Bus::waitUntil(const std::function<bool()>& condition, Clock::time_point deadline,
+                       const Outcome& late) {
+    while (!condition()) {
+        bool inTime = false;
+        const Outcome outcome = process(deadline, inTime);
+        if (!outcome.ok()) {
+            return outcome;
+        }
+        if (ownerLeft_) {
+            return {kSCStatusFailed, service_ + " left the bus while it was waited for"};
+        }
+        if (!inTime) {
+            return late;
+        }
+    }
+    return {};
+}
+
+}  // namespace platform::apply

@@ -1,0 +1,98 @@
+// The system bus, with a bound on every wait.
+//
+// The bus may be mute, the daemon may be stopped, and either may be killed while we wait. Client libraries
+// then hang for minutes; here every step ends within its own bound: connecting one second, a call five.
+#pragma once
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <string>
+#include <string_view>
+
+#include "platform/Outcome.h"
+#include "platform/apply/networkmanager/Value.h"
+
+namespace platform::apply {
+
+using Clock = std::chrono::steady_clock;
+
+inline constexpr std::chrono::seconds connectBound{1};
+inline constexpr std::chrono::seconds callBound{5};
+
+struct SlotUnref {
+    void operator()(sd_bus_slot* slot) const noexcept { sd_bus_slot_unref(slot); }
+};
+using Slot = std::unique_ptr<sd_bus_slot, SlotUnref>;
+
+// Writes a call's arguments; returns what sd-bus returned.
+using Arguments = std::function<int(sd_bus_message*)>;
+
+class Bus {
+  public:
+    // Nothing is open: every operation fails until connect has succeeded.
+    Bus() = default;
+    ~Bus();
+    Bus(const Bus&) = delete;
+    Bus& operator=(const Bus&) = delete;
+
+    // Connects to the host's system bus, whatever the environment says. found is false, and the outcome
+    // success, when there is no such socket. Calls go to the service of this name from then on.
+    Outcome connect(const std::string& service, bool& found);
+    // Whether anybody owns the service's name. Never starts it.
+    Outcome hasOwner(bool& owned);
+
+    // One method call. A secret that the arguments hold never comes back in the reason. error, when given,
+    // gets the name of a D-Bus error, or becomes empty.
+    struct Call {
+        std::string path;
+        std::string interface;
+        const char* member = nullptr;
+        Arguments arguments;
+        std::string_view secret;
+    };
+    Outcome call(const Call& call, Message& reply, std::string* error = nullptr);
+
+    // All properties of an interface of an object; of a type that Value does not know: left out.
+    Outcome readProperties(const std::string& path, const std::string& interface, Dictionary& properties,
+                           std::string* error = nullptr);
+    Outcome setProperty(const std::string& path, const std::string& interface, const char* property,
+                        const Value& value);
+
+    // Hands the service's signals of this name to the function while the slot lives. The message is read from
+    // its start. What is sent after a call that is made later is not missed.
+    using Handler = std::function<void(const char* path, sd_bus_message* message)>;
+    struct Watch {
+        Handler handler;
+        Slot slot;
+    };
+    Outcome watch(const std::string& interface, const std::string& member, Handler handler,
+                  std::unique_ptr<Watch>& watch);
+
+    // Handles signals until the condition holds. Fails when the service left the bus, with `late` when the
+    // deadline came first.
+    Outcome waitUntil(const std::function<bool()>& condition, Clock::time_point deadline,
+                      const Outcome& late);
+
+  private:
+    Outcome process(Clock::time_point deadline, bool& inTime);
+
+    struct BusUnref {
+        void operator()(sd_bus* bus) const noexcept {
+            // Without a flush, which could wait for a bus that reads nothing.
+            sd_bus_close(bus);
+            sd_bus_unref(bus);
+        }
+    };
+    std::string service_;
+    std::unique_ptr<sd_bus, BusUnref> bus_;
+    Slot ownerSlot_;
+    bool ownerLeft_ = false;
+};
+
+// What sd-bus or the other side says, as an outcome: "<what>: <the error's name>: <its message>". The rights
+// that are missing give 1003, everything else 1001.
+[[nodiscard]] Outcome fromBus(const std::string& what, int result, const sd_bus_error& error,
+                              std::string_view secret);
+
+}  // namespace platform::apply

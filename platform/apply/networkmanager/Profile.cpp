@@ -1,0 +1,271 @@
+#include "platform/apply/networkmanager/Profile.h"
+
+#include <arpa/inet.h>
+
+#include <algorithm>
+#include <array>
+#include <cctype>
+#include <cstdio>
+
+#include "platform/apply/Digest.h"
+
+namespace platform::apply {
+namespace {
+
+constexpr const char* tagKey = "location-assistant.interface";
+constexpr const char* earlierKey = "location-assistant.earlier";
+constexpr const char* autoconnectKey = "location-assistant.autoconnect";
+constexpr const char* radioKey = "location-assistant.radio";
+constexpr const char* none = "none";
+
+constexpr std::int32_t dhcpSeconds = 20;
+// Higher than a person's: the largest there is.
+constexpr std::int32_t highestPriority = 999;
+
+constexpr std::array<const char*, 3> wirelessSectionNames = {"802-11-wireless", "802-11-wireless-security",
+                                                             "802-1x"};
+
+enum class Security { open, wep, wpa };
+
+bool isHexadecimal(const std::string& text) {
+    return std::all_of(text.begin(), text.end(), [](unsigned char c) { return std::isxdigit(c) != 0; });
+}
+
+bool isPrintable(const std::string& text) {
+    return std::all_of(text.begin(), text.end(), [](unsigned char c) { return c >= 0x20 && c < 0x7F; });
+}
+
+bool fitsWEP(const std::string& key) {
+    return ((key.size() == 5 || key.size() == 13) && isPrintable(key)) ||
+           ((key.size() == 10 || key.size() == 26) && isHexadecimal(key));
+}
+
+bool fitsWPA(const std::string& key) {
+    return (key.size() >= 8 && key.size() <= 63) || (key.size() == 64 && isHexadecimal(key));
+}
+
+std::string dotted(IPv4Address address) {
+    std::array<char, INET_ADDRSTRLEN> text{};
+    ::inet_ntop(AF_INET, &address, text.data(), text.size());
+    return text.data();
+}
+
+// As the octets of type 0, which stands for free text: the plain form has words with a meaning of their own.
+std::string clientIDOctets(const std::string& clientID) {
+    std::string octets = "00";
+    for (const char c : clientID) {
+        std::array<char, 4> octet{};
+        std::snprintf(octet.data(), octet.size(), ":%02x",
+                      static_cast<unsigned>(static_cast<unsigned char>(c)));
+        octets += octet.data();
+    }
+    return octets;
+}
+
+Dictionary makeIPv4(const InterfacePlan& plan) {
+    const bool manual = plan.method == IPv4Method::manual && !plan.addresses.empty();
+    if (!manual && plan.method != IPv4Method::dhcp) {
+        return {{"method", {std::string("disabled")}}};
+    }
+    Dictionary ipv4 = {{"method", {std::string(manual ? "manual" : "auto")}},
+                       {"may-fail", {false}},
+                       // Below every metric that the daemon gives by itself.
+                       {"route-metric", {std::int64_t{plan.rank} + 1}}};
+    if (manual) {
+        std::vector<Dictionary> addresses;
+        for (const ManualAddress& address : plan.addresses) {
+            addresses.push_back(
+                {{"address", {dotted(address.address)}}, {"prefix", {std::uint32_t{address.prefixLength}}}});
+        }
+        ipv4["address-data"] = {std::move(addresses)};
+        if (plan.router != 0) {
+            ipv4["gateway"] = {dotted(plan.router)};
+        }
+    } else {
+        ipv4["dhcp-timeout"] = {dhcpSeconds};
+        if (!plan.dhcpClientID.empty()) {
+            ipv4["dhcp-client-id"] = {clientIDOctets(plan.dhcpClientID)};
+        }
+    }
+    if (!plan.nameServers.empty()) {
+        ipv4["dns"] = {std::vector<std::uint32_t>(plan.nameServers.begin(), plan.nameServers.end())};
+        if (!manual) {
+            ipv4["ignore-auto-dns"] = {true};
+        }
+    }
+    if (!plan.searchDomains.empty()) {
+        ipv4["dns-search"] = {plan.searchDomains};
+    }
+    return ipv4;
+}
+
+Outcome chooseSecurity(const std::optional<std::string>& key, const AccessPoint* seen, Security& security) {
+    const auto refuse = [](const char* reason) { return Outcome(kSCStatusFailed, reason); };
+    if (seen == nullptr) {
+        if (key && !fitsWEP(*key) && !fitsWPA(*key)) {
+            return refuse("the network's key has no form that a key can have");
+        }
+        // A key of 10 hexadecimal digits could be both; the older networks are the ones that need it.
+        security = !key ? Security::open : fitsWEP(*key) ? Security::wep : Security::wpa;
+        return {};
+    }
+    if (seen->protectedAccess && !seen->preSharedKey) {
+        return refuse("the network asks each user for a name and a password, which a location does not hold");
+    }
+    security = seen->protectedAccess ? Security::wpa : seen->privacy ? Security::wep : Security::open;
+    if (security == Security::open) {
+        return {};
+    }
+    if (!key) {
+        return refuse("the network asks for a key and the location holds none");
+    }
+    if (security == Security::wep ? !fitsWEP(*key) : !fitsWPA(*key)) {
+        return refuse(
+            security == Security::wep
+                ? "the key fits no WEP network, whose keys have 5 or 13 characters or 10 or 26 digits"
+                : "the key fits no WPA network, whose keys have 8 to 63 characters or 64 digits");
+    }
+    return {};
+}
+
+Outcome makeWireless(const WirelessSettings& settings, const WirelessFacts& facts, Sections& profile) {
+    const bool isOnIt = !facts.current.empty() && networkOf(facts.current) == settings.network;
+    if (!settings.network || (isOnIt && !settings.key)) {
+        if (facts.current.empty()) {
+            return {kSCStatusFailed, "the card is on no network and the location names none"};
+        }
+        profile.insert(facts.current.begin(), facts.current.end());
+        return {};
+    }
+    const auto strongest =
+        std::max_element(facts.seen.begin(), facts.seen.end(),
+                         [](const AccessPoint& a, const AccessPoint& b) { return a.strength < b.strength; });
+    const AccessPoint* const seen = strongest == facts.seen.end() ? nullptr : &*strongest;
+    Security security{};
+    const Outcome outcome = chooseSecurity(settings.key, seen, security);
+    if (!outcome.ok()) {
+        return outcome;
+    }
+    const bool adHoc = seen == nullptr ? facts.canAdHoc : seen->adHoc;
+    Dictionary wireless = {{"ssid", {Bytes(settings.network->begin(), settings.network->end())}},
+                           {"mode", {std::string(adHoc ? "adhoc" : "infrastructure")}}};
+    if (seen == nullptr && !adHoc) {
+        // It may be one that does not announce its name and has to be asked for.
+        wireless["hidden"] = {true};
+    }
+    profile["802-11-wireless"] = std::move(wireless);
+    switch (security) {
+        case Security::open:
+            break;
+        case Security::wep:
+            profile["802-11-wireless-security"] = {{"key-mgmt", {std::string("none")}},
+                                                   {"wep-key-type", {std::uint32_t{1}}},
+                                                   {"wep-key0", {*settings.key}}};
+            break;
+        case Security::wpa:
+            profile["802-11-wireless-security"] = {{"key-mgmt", {std::string("wpa-psk")}},
+                                                   {"psk", {*settings.key}}};
+            if (adHoc) {
+                // All that a network without an access point can agree on.
+                profile["802-11-wireless-security"].insert(
+                    {{"proto", {Texts{"rsn"}}}, {"pairwise", {Texts{"ccmp"}}}, {"group", {Texts{"ccmp"}}}});
+            }
+            break;
+    }
+    return {};
+}
+
+const TextMap* userData(const Sections& profile) {
+    const auto user = profile.find("user");
+    if (user == profile.end()) {
+        return nullptr;
+    }
+    const auto data = user->second.find("data");
+    return data == user->second.end() ? nullptr : std::get_if<TextMap>(&data->second.content);
+}
+
+}  // namespace
+
+std::string profileUUID(const std::string& interface) {
+    // Two fixed keys, drawn once, are the name space.
+    static constexpr std::array<std::uint8_t, 16> high = {0x8e, 0x1f, 0x5c, 0x73, 0x0a, 0xd2, 0x44, 0x9b,
+                                                          0xb6, 0x31, 0xe7, 0x90, 0x2d, 0x6f, 0x58, 0xc4};
+    static constexpr std::array<std::uint8_t, 16> low = {0x35, 0xa9, 0x0e, 0x62, 0xf1, 0x87, 0x4d, 0xcb,
+                                                         0x13, 0x7c, 0xd8, 0x56, 0x9f, 0x20, 0xe4, 0xbd};
+    const std::uint64_t first = sipHash(high, interface);
+    const std::uint64_t second = sipHash(low, interface);
+    std::array<char, 37> text{};
+    // Version 8, made in a way of its own, and the usual variant.
+    std::snprintf(text.data(), text.size(), "%08x-%04x-8%03x-%04x-%012llx",
+                  static_cast<unsigned>(first >> 32U), static_cast<unsigned>((first >> 16U) & 0xFFFFU),
+                  static_cast<unsigned>(first & 0xFFFU),
+                  static_cast<unsigned>(0x8000U | ((second >> 48U) & 0x3FFFU)),
+                  static_cast<unsigned long long>(second & 0xFFFFFFFFFFFFU));
+    return text.data();
+}
+
+bool isOurs(const Sections& profile) {
+    const TextMap* const data = userData(profile);
+    return data != nullptr && data->find(tagKey) != data->end();
+}
+
+ProfileNote noteOf(const Sections& profile) {
+    const TextMap* const data = userData(profile);
+    const auto text = [data](const char* key) {
+        const auto found = data == nullptr ? TextMap::const_iterator() : data->find(key);
+        return data == nullptr || found == data->end() ? std::string() : found->second;
+    };
+    const std::string earlier = text(earlierKey);
+    return {earlier == none ? "" : earlier, text(autoconnectKey) != "no", text(radioKey) != "no"};
+}
+
+Sections wirelessSections(const Sections& profile) {
+    Sections wireless;
+    for (const char* const name : wirelessSectionNames) {
+        if (const auto found = profile.find(name); found != profile.end()) {
+            wireless.insert(*found);
+        }
+    }
+    if (const auto found = wireless.find("802-11-wireless"); found != wireless.end()) {
+        found->second.erase("seen-bssids");
+    }
+    return wireless;
+}
+
+std::string networkOf(const Sections& profile) {
+    const auto wireless = profile.find("802-11-wireless");
+    const auto ssid = wireless == profile.end() ? std::nullopt : valueOf<Bytes>(wireless->second, "ssid");
+    return ssid ? std::string(ssid->begin(), ssid->end()) : std::string();
+}
+
+Outcome makeProfile(const InterfacePlan& plan, const WirelessFacts* facts, const ProfileNote& note,
+                    Sections& profile) {
+    profile.clear();
+    const bool wireless = facts != nullptr;
+    if (wireless) {
+        const Outcome outcome = makeWireless(plan.wireless.value_or(WirelessSettings()), *facts, profile);
+        if (!outcome.ok()) {
+            return outcome;
+        }
+    } else {
+        profile["802-3-ethernet"] = {};
+    }
+    profile["connection"] = {{"id", {"location-assistant " + plan.name}},
+                             {"uuid", {profileUUID(plan.name)}},
+                             {"type", {std::string(wireless ? "802-11-wireless" : "802-3-ethernet")}},
+                             {"interface-name", {plan.name}},
+                             {"autoconnect", {true}},
+                             {"autoconnect-priority", {highestPriority}},
+                             // For ever: after a few failures the daemon would turn to another profile.
+                             {"autoconnect-retries", {std::int32_t{0}}}};
+    profile["ipv4"] = makeIPv4(plan);
+    profile["ipv6"] = {{"method", {std::string("disabled")}}};
+    profile["user"] = {{"data",
+                        {TextMap{{tagKey, plan.name},
+                                 {earlierKey, note.earlier.empty() ? none : note.earlier},
+                                 {autoconnectKey, note.autoconnect ? "yes" : "no"},
+                                 {radioKey, note.radio ? "yes" : "no"}}}}};
+    return {};
+}
+
+}  // namespace platform::apply

@@ -1,0 +1,57 @@
+// The temporary profile for one interface: what NetworkManager is told to do, as a pure function of the plan
+// and of what the card sees.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Outcome.h"
+#include "platform/apply/Plan.h"
+#include "platform/apply/networkmanager/Value.h"
+
+namespace platform::apply {
+
+// What was there before the profile, kept in the profile itself too: whoever finds the profile finds the way
+// back.
+struct ProfileNote {
+    std::string earlier;  // the UUID of the profile that was active; empty for none
+    bool autoconnect = true;
+    bool radio = true;
+    bool operator==(const ProfileNote&) const = default;
+};
+
+// One access point, or one cell of a network without one, as the scan shows it.
+struct AccessPoint {
+    bool adHoc = false;
+    bool privacy = false;          // something is encrypted
+    bool protectedAccess = false;  // announces WPA or RSN
+    bool preSharedKey = false;     // and takes a key for all
+    unsigned strength = 0;         // in percent
+};
+
+struct WirelessFacts {
+    bool canAdHoc = false;
+    std::vector<AccessPoint> seen;  // that have the wanted network's name
+    // The sections about the wireless link of the profile that the card is on, with their secrets; empty when
+    // it is on none.
+    Sections current;
+};
+
+// The same for the same interface, always.
+[[nodiscard]] std::string profileUUID(const std::string& interface);
+// Decides what is ours: a name or an UUID can be anybody's.
+[[nodiscard]] bool isOurs(const Sections& profile);
+// The note in one of our profiles.
+[[nodiscard]] ProfileNote noteOf(const Sections& profile);
+// The sections about the wireless link, without what the daemon only remembers.
+[[nodiscard]] Sections wirelessSections(const Sections& profile);
+// The bytes of the network's name in a profile; empty when it has none.
+[[nodiscard]] std::string networkOf(const Sections& profile);
+
+// The profile for an active interface. facts is null for a wired card. Fails with 1001 when the key does not
+// fit the network, or when a card is to keep its network and has none. No reason holds the key.
+Outcome makeProfile(const InterfacePlan& plan, const WirelessFacts* facts, const ProfileNote& note,
+                    Sections& profile);
+
+}  // namespace platform::apply
