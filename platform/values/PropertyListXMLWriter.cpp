@@ -1,4 +1,5 @@
 #include <charconv>
+#include <cstring>
 
 #include "platform/values/Containers.h"
 #include "platform/values/PropertyListXML.h"
@@ -15,111 +16,157 @@ constexpr std::string_view header =
     "<plist version=\"1.0\">\n";
 constexpr std::string_view footer = "</plist>\n";
 
-class Writer {
+// A document is written twice: to nowhere, which tells its size, and into a string of that size. Letting the
+// string grow would cost more than the first pass, most of it in memory that is new each time.
+class Measure {
   public:
-    // False when the value cannot be written; the text is then of no use.
-    [[nodiscard]] bool write(CFTypeRef value, std::size_t depth);
-    std::string text{header};
+    void put(char) noexcept { ++size_; }
+    void put(std::string_view piece) noexcept { size_ += piece.size(); }
+    void indent(std::size_t depth) noexcept { size_ += depth; }
+    [[nodiscard]] std::size_t size() const noexcept { return size_; }
 
   private:
-    void indent(std::size_t depth) { text.append(depth, '\t'); }
+    std::size_t size_ = 0;
+};
+
+class Fill {
+  public:
+    // The text must be as large as everything that is going to be put.
+    explicit Fill(std::string& text) : at_(text.data()) {}
+    void put(char character) noexcept { *at_++ = character; }
+    void put(std::string_view piece) noexcept {
+        std::memcpy(at_, piece.data(), piece.size());
+        at_ += piece.size();
+    }
+    void indent(std::size_t depth) noexcept {
+        std::memset(at_, '\t', depth);
+        at_ += depth;
+    }
+
+  private:
+    char* at_;
+};
+
+template <class Output>
+class Writer {
+  public:
+    explicit Writer(Output& to) : output_(to) {}
+    // False when the value cannot be written; the output is then of no use.
+    [[nodiscard]] bool writeDocument(CFTypeRef value) {
+        output_.put(header);
+        const bool written = write(value, 0);
+        output_.put(footer);
+        return written;
+    }
+
+  private:
+    [[nodiscard]] bool write(CFTypeRef value, std::size_t depth);
     bool writeText(std::string_view open, CFStringRef string, std::string_view close);
     bool writeDictionary(CFDictionaryRef dictionary, std::size_t depth);
     bool writeArray(CFArrayRef array, std::size_t depth);
     void writeNumber(CFNumberRef number);
     bool writeDate(std::int64_t seconds);
     void writeData(std::string_view bytes, std::size_t depth);
+
+    Output& output_;
 };
 
-bool Writer::writeText(std::string_view open, CFStringRef string, std::string_view close) {
+template <class Output>
+bool Writer<Output>::writeText(std::string_view open, CFStringRef string, std::string_view close) {
     const TextTraits traits = string->traits();
     if ((traits & textBeyondXml) != 0) {
         return false;
     }
-    text += open;
+    output_.put(open);
     if ((traits & textNeedsEscape) == 0) {
-        text += string->text();
+        output_.put(string->text());
     } else {
         for (const char character : string->text()) {
             switch (character) {
                 case '&':
-                    text += "&amp;";
+                    output_.put("&amp;");
                     break;
                 case '<':
-                    text += "&lt;";
+                    output_.put("&lt;");
                     break;
                 case '>':
-                    text += "&gt;";
+                    output_.put("&gt;");
                     break;
                 case '\r':
                     // As it stands a reader would take it for a line feed.
-                    text += "&#13;";
+                    output_.put("&#13;");
                     break;
                 default:
-                    text.push_back(character);
+                    output_.put(character);
             }
         }
     }
-    text += close;
+    output_.put(close);
     return true;
 }
 
-bool Writer::writeDictionary(CFDictionaryRef dictionary, std::size_t depth) {
+template <class Output>
+bool Writer<Output>::writeDictionary(CFDictionaryRef dictionary, std::size_t depth) {
     if (dictionary->count() == 0) {
-        text += "<dict/>\n";
+        output_.put("<dict/>\n");
         return true;
     }
-    text += "<dict>\n";
+    output_.put("<dict>\n");
     for (const Entry& entry : entriesOf(dictionary)) {
         const auto* const key = as<CFStringRef>(entry.key);
-        indent(depth + 1);
+        output_.indent(depth + 1);
         if (key == nullptr || !writeText("<key>", key, "</key>\n") || !write(entry.value, depth + 1)) {
             return false;
         }
     }
-    indent(depth);
-    text += "</dict>\n";
+    output_.indent(depth);
+    output_.put("</dict>\n");
     return true;
 }
 
-bool Writer::writeArray(CFArrayRef array, std::size_t depth) {
+template <class Output>
+bool Writer<Output>::writeArray(CFArrayRef array, std::size_t depth) {
     if (array->count() == 0) {
-        text += "<array/>\n";
+        output_.put("<array/>\n");
         return true;
     }
-    text += "<array>\n";
+    output_.put("<array>\n");
     for (const CFTypeRef item : array->items()) {
         if (!write(item, depth + 1)) {
             return false;
         }
     }
-    indent(depth);
-    text += "</array>\n";
+    output_.indent(depth);
+    output_.put("</array>\n");
     return true;
 }
 
-void Writer::writeNumber(CFNumberRef number) {
+template <class Output>
+void Writer<Output>::writeNumber(CFNumberRef number) {
     if (number->isReal) {
-        text += "<real>";
-        text += realText(number->real);
-        text += "</real>\n";
+        output_.put("<real>");
+        output_.put(realText(number->real));
+        output_.put("</real>\n");
         return;
     }
     char digits[24];
     const std::to_chars_result result = std::to_chars(std::begin(digits), std::end(digits), number->integer);
-    text += "<integer>";
-    text.append(std::begin(digits), result.ptr);
-    text += "</integer>\n";
+    output_.put("<integer>");
+    output_.put({std::begin(digits), result.ptr});
+    output_.put("</integer>\n");
 }
 
-void Writer::writeData(std::string_view bytes, std::size_t depth) {
+template <class Output>
+void Writer<Output>::writeData(std::string_view bytes, std::size_t depth) {
     constexpr std::string_view alphabet = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
     constexpr std::size_t bytesInLine = 51;
-    text += "<data>\n";
+    output_.put("<data>\n");
     for (std::size_t start = 0; start < bytes.size(); start += 3) {
         if (start % bytesInLine == 0) {
-            text += start == 0 ? "" : "\n";
-            indent(depth);
+            if (start > 0) {
+                output_.put('\n');
+            }
+            output_.indent(depth);
         }
         const std::string_view group = bytes.substr(start, 3);
         std::uint32_t bits = 0;
@@ -127,29 +174,33 @@ void Writer::writeData(std::string_view bytes, std::size_t depth) {
             bits = (bits << 8) | (i < group.size() ? static_cast<unsigned char>(group[i]) : 0U);
         }
         for (std::size_t i = 0; i < 4; ++i) {
-            text.push_back(i <= group.size() ? alphabet[(bits >> (18 - 6 * i)) & 0x3F] : '=');
+            output_.put(i <= group.size() ? alphabet[(bits >> (18 - 6 * i)) & 0x3F] : '=');
         }
     }
-    text += bytes.empty() ? "" : "\n";
-    indent(depth);
-    text += "</data>\n";
+    if (!bytes.empty()) {
+        output_.put('\n');
+    }
+    output_.indent(depth);
+    output_.put("</data>\n");
 }
 
-bool Writer::writeDate(std::int64_t seconds) {
+template <class Output>
+bool Writer<Output>::writeDate(std::int64_t seconds) {
     // Four digits carry the years 0 to 9999.
     constexpr std::int64_t first = -62'167'219'200;
     constexpr std::int64_t last = 253'402'300'799;
     if (seconds < first || seconds > last) {
         return false;
     }
-    text += "<date>";
-    text += dateText(seconds);
-    text += "</date>\n";
+    output_.put("<date>");
+    output_.put(dateText(seconds));
+    output_.put("</date>\n");
     return true;
 }
 
-bool Writer::write(CFTypeRef value, std::size_t depth) {
-    indent(depth);
+template <class Output>
+bool Writer<Output>::write(CFTypeRef value, std::size_t depth) {
+    output_.indent(depth);
     switch (static_cast<const Object*>(value)->type()) {
         case Type::string:
             return writeText("<string>", static_cast<CFStringRef>(value), "</string>\n");
@@ -166,7 +217,7 @@ bool Writer::write(CFTypeRef value, std::size_t depth) {
             writeNumber(static_cast<CFNumberRef>(value));
             return true;
         case Type::boolean:
-            text += static_cast<CFBooleanRef>(value)->value ? "<true/>\n" : "<false/>\n";
+            output_.put(static_cast<CFBooleanRef>(value)->value ? "<true/>\n" : "<false/>\n");
             return true;
         case Type::data:
             writeData(static_cast<CFDataRef>(value)->bytes, depth);
@@ -186,12 +237,13 @@ bool Writer::write(CFTypeRef value, std::size_t depth) {
 }  // namespace
 
 std::optional<std::string> writePropertyListXML(CFPropertyListRef value) {
-    Writer writer;
-    if (!writer.write(value, 0)) {
+    Measure measure;
+    if (!Writer(measure).writeDocument(value)) {
         return std::nullopt;
     }
-    writer.text += footer;
-    return std::move(writer.text);
+    std::string text(measure.size(), '\0');
+    Fill fill(text);
+    return Writer(fill).writeDocument(value) ? std::optional(std::move(text)) : std::nullopt;
 }
 
 }  // namespace platform::values

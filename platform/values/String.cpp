@@ -20,33 +20,40 @@ std::uint64_t multiplyFold(std::uint64_t a, std::uint64_t b) noexcept {
     return static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
 }
 
-// A different one in every process, so that nobody can write a file whose keys all meet in one place of the
-// index.
-std::uint64_t hashSeed() noexcept {
-    static const std::uint64_t seed = [] {
-        std::uint64_t random = firstOdd;
-        // The kernel hands every program 16 random bytes at its start.
-        if (const unsigned long address = getauxval(AT_RANDOM); address != 0) {
-            std::memcpy(&random, reinterpret_cast<const void*>(address), sizeof random);
-        }
-        return random;
-    }();
-    return seed;
+template <class Word>
+std::uint64_t wordAt(const char* bytes) noexcept {
+    Word word = 0;
+    std::memcpy(&word, bytes, sizeof word);
+    return word;
+}
+
+// Up to eight bytes as one number; which of them go where matters as little as that some do so twice.
+std::uint64_t shortWord(std::string_view bytes) noexcept {
+    const char* const end = bytes.data() + bytes.size();
+    if (bytes.size() >= 4) {
+        return wordAt<std::uint32_t>(bytes.data()) << 32 | wordAt<std::uint32_t>(end - 4);
+    }
+    if (bytes.size() >= 2) {
+        return wordAt<std::uint16_t>(bytes.data()) << 16 | wordAt<std::uint16_t>(end - 2);
+    }
+    return bytes.empty() ? 0 : wordAt<std::uint8_t>(bytes.data());
 }
 
 }  // namespace
 
 std::uint32_t platform::values::hashOfText(std::string_view text) noexcept {
-    std::uint64_t state = hashSeed() ^ text.size();
+    // A different one in every process, from the random bytes that the kernel hands each program at its
+    // start, so that nobody can write a file whose keys all meet in one place of the index.
+    static const std::uint64_t seed = [] {
+        const unsigned long address = getauxval(AT_RANDOM);
+        return address != 0 ? wordAt<std::uint64_t>(reinterpret_cast<const char*>(address)) : firstOdd;
+    }();
+    std::uint64_t state = seed ^ text.size();
     while (text.size() > 8) {
-        std::uint64_t word = 0;
-        std::memcpy(&word, text.data(), 8);
-        state = multiplyFold(state ^ word, firstOdd);
+        state = multiplyFold(state ^ wordAt<std::uint64_t>(text.data()), firstOdd);
         text.remove_prefix(8);
     }
-    std::uint64_t last = 0;
-    std::memcpy(&last, text.data(), text.size());
-    state = multiplyFold(state ^ last, secondOdd);
+    state = multiplyFold(state ^ shortWord(text), secondOdd);
     const auto hash = static_cast<std::uint32_t>(state ^ (state >> 32));
     return hash != 0 ? hash : 1;
 }
