@@ -1,0 +1,303 @@
+#include <fcntl.h>
+#include <grp.h>
+#include <poll.h>
+#include <pwd.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <optional>
+#include <string_view>
+#include <utility>
+
+#include "platform/FileDescriptor.h"
+#include "platform/Host.h"
+#include "platform/Log.h"
+#include "platform/services/Bus.h"
+#include "platform/services/DesktopSession.h"
+#include "platform/services/Opener.h"
+
+namespace platform::services {
+namespace {
+
+constexpr std::chrono::milliseconds findingBound{1500};
+constexpr std::chrono::milliseconds handOverBound{1500};
+// Asking the user's service manager is a part of handing over, and may fail.
+constexpr std::chrono::milliseconds askingBound{1000};
+// The end of a child that hangs on its way to the program, in seconds.
+constexpr unsigned lifetimeBeforeProgram = 10;
+
+struct User {
+    uid_t id = 0;
+    gid_t group = 0;
+    std::string name;
+    std::string home;
+    std::string shell;
+};
+
+std::optional<User> userWithId(uid_t id) {
+    passwd record{};
+    passwd* found = nullptr;
+    std::vector<char> buffer(64 * 1024);
+    if (getpwuid_r(id, &record, buffer.data(), buffer.size(), &found) != 0 || found == nullptr) {
+        return std::nullopt;
+    }
+    return User{id, found->pw_gid, found->pw_name, found->pw_dir, found->pw_shell};
+}
+
+// What a program has to know to show itself on the display and to find the user's choice of a browser.
+bool belongsToDisplay(std::string_view name) {
+    constexpr std::array<std::string_view, 14> names = {
+        "DISPLAY",
+        "WAYLAND_DISPLAY",
+        "XAUTHORITY",
+        "XDG_SESSION_TYPE",
+        "XDG_CURRENT_DESKTOP",
+        "XDG_SESSION_DESKTOP",
+        "XDG_DATA_DIRS",
+        "XDG_CONFIG_DIRS",
+        "DESKTOP_SESSION",
+        "GNOME_DESKTOP_SESSION_ID",
+        "KDE_FULL_SESSION",
+        "KDE_SESSION_VERSION",
+        "LANG",
+        "LANGUAGE",
+    };
+    return std::find(names.begin(), names.end(), name) != names.end();
+}
+
+// What the user's service manager has in its environment about the display; empty when it does not answer.
+std::vector<std::string> displayEnvironment(const std::string& busSocket) {
+    std::vector<std::string> environment;
+    std::string reason;
+    const auto bus = Bus::connect(busSocket, Clock::now() + askingBound, reason);
+    if (!bus) {
+        return environment;
+    }
+    const Message answer = bus->read({"org.freedesktop.systemd1", "/org/freedesktop/systemd1",
+                                      "org.freedesktop.systemd1.Manager", "Environment", "as"},
+                                     reason);
+    if (!answer || sd_bus_message_enter_container(answer.get(), SD_BUS_TYPE_ARRAY, "s") <= 0) {
+        return environment;
+    }
+    const char* entry = nullptr;
+    while (sd_bus_message_read(answer.get(), "s", &entry) > 0) {
+        const std::string_view text = entry;
+        if (belongsToDisplay(text.substr(0, text.find('=')))) {
+            environment.emplace_back(text);
+        }
+    }
+    return environment;
+}
+
+bool names(const std::string& entry, std::string_view name) {
+    return entry.size() > name.size() && entry.starts_with(name) && entry[name.size()] == '=';
+}
+
+std::vector<std::string> environmentFor(const User& user, const DesktopSession& session,
+                                        const std::string& runtimeRoot) {
+    const std::string runtime = runtimeRoot + "/" + std::to_string(user.id);
+    std::vector<std::string> environment = displayEnvironment(runtime + "/bus");
+    const auto isSet = [&environment](std::string_view name) {
+        return std::any_of(environment.begin(), environment.end(),
+                           [name](const std::string& entry) { return names(entry, name); });
+    };
+    if (!isSet("DISPLAY") && !isSet("WAYLAND_DISPLAY") && !session.display.empty()) {
+        environment.push_back("DISPLAY=" + session.display);
+    }
+    if (!isSet("XDG_SESSION_TYPE")) {
+        environment.push_back("XDG_SESSION_TYPE=" + session.type);
+    }
+    environment.push_back("HOME=" + user.home);
+    environment.push_back("USER=" + user.name);
+    environment.push_back("LOGNAME=" + user.name);
+    environment.push_back("SHELL=" + user.shell);
+    environment.emplace_back("PATH=/usr/local/bin:/usr/bin:/bin");
+    environment.push_back("XDG_RUNTIME_DIR=" + runtime);
+    environment.push_back("DBUS_SESSION_BUS_ADDRESS=unix:path=" + runtime + "/bus");
+    return environment;
+}
+
+std::vector<char*> pointersTo(std::vector<std::string>& strings) {
+    std::vector<char*> pointers;
+    pointers.reserve(strings.size() + 1);
+    for (std::string& string : strings) {
+        pointers.push_back(string.data());
+    }
+    pointers.push_back(nullptr);
+    return pointers;
+}
+
+// Becomes the user for good.
+bool become(const User& user) {
+    if (geteuid() == 0 &&
+        (initgroups(user.name.c_str(), user.group) != 0 ||
+         setresgid(user.group, user.group, user.group) != 0 || setresuid(user.id, user.id, user.id) != 0)) {
+        return false;
+    }
+    uid_t real = 0;
+    uid_t effective = 0;
+    uid_t saved = 0;
+    return getresuid(&real, &effective, &saved) == 0 && real == user.id && effective == user.id &&
+           saved == user.id && setuid(0) != 0;
+}
+
+// Standard input and output lead nowhere, the report is descriptor 3, and there are no others.
+bool arrangeDescriptors(int report) {
+    constexpr int place = 3;
+    // Out of the way first: in a process without standard streams it may be one of 0 to 2.
+    const int aside = fcntl(report, F_DUPFD_CLOEXEC, place + 1);
+    const int nowhere = open("/dev/null", O_RDWR);
+    if (aside < 0 || nowhere < 0 || dup2(nowhere, 0) < 0 || dup2(nowhere, 1) < 0 || dup2(nowhere, 2) < 0 ||
+        dup3(aside, place, O_CLOEXEC) < 0) {
+        return false;
+    }
+    return close_range(place + 1, ~0U, 0) == 0;
+}
+
+void restoreSignals() {
+    for (int signal = 1; signal < NSIG; ++signal) {
+        // Those that cannot be changed, or belong to the C library, refuse, which is as well.
+        static_cast<void>(std::signal(signal, SIG_DFL));
+    }
+    sigset_t none;
+    sigemptyset(&none);
+    sigprocmask(SIG_SETMASK, &none, nullptr);
+}
+
+// Each status on the way to the program: noErr right before it, so that an end without a word is a failure.
+void report(OSStatus status) {
+    static_cast<void>(!write(3, &status, sizeof status));
+}
+
+// In the child; returns only when no program could be run.
+OSStatus runProgram(const Desktop& desktop, const User& user, const DesktopSession& session,
+                    const std::string& url) {
+    restoreSignals();
+    alarm(lifetimeBeforeProgram);
+    if (!become(user)) {
+        return permErr;
+    }
+    std::vector<std::string> environment = environmentFor(user, session, desktop.runtimeRoot);
+    if (chdir(user.home.c_str()) != 0 && chdir("/") != 0) {
+        return ioErr;
+    }
+    umask(022);
+    alarm(0);
+    report(noErr);
+    int error = ENOENT;
+    for (std::vector<std::string> arguments : desktop.programs) {
+        arguments.push_back(url);
+        execve(arguments.front().c_str(), pointersTo(arguments).data(), pointersTo(environment).data());
+        error = error == ENOENT ? errno : error;
+    }
+    return error == ENOENT ? fnfErr : error == EACCES ? permErr : ioErr;
+}
+
+// What the child said last before it became the program, or ended.
+OSStatus lastReport(int reports) {
+    const Clock::time_point deadline = Clock::now() + handOverBound;
+    OSStatus last = ioErr;
+    for (;;) {
+        const auto left =
+            std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now()).count();
+        pollfd waiting{reports, POLLIN, 0};
+        const int ready = left <= 0 ? 0 : poll(&waiting, 1, static_cast<int>(left));
+        if (ready < 0 && errno == EINTR) {
+            continue;
+        }
+        OSStatus status = noErr;
+        if (ready <= 0) {
+            return ioErr;
+        }
+        if (read(reports, &status, sizeof status) != static_cast<ssize_t>(sizeof status)) {
+            return last;
+        }
+        last = status;
+    }
+}
+
+OSStatus handOver(const Desktop& desktop, const User& user, const DesktopSession& session,
+                  const std::string& url) {
+    std::array<int, 2> ends{-1, -1};
+    if (pipe2(ends.data(), O_CLOEXEC) != 0) {
+        return ioErr;
+    }
+    const FileDescriptor reports(ends[0]);
+    FileDescriptor reporter(ends[1]);
+    const pid_t child = fork();
+    if (child < 0) {
+        return ioErr;
+    }
+    if (child == 0) {
+        // The program is the child of a child that ends at once, so that nobody has to wait for it.
+        setsid();
+        if (fork() != 0) {
+            _exit(0);
+        }
+        OSStatus status = ioErr;
+        try {
+            if (arrangeDescriptors(reporter.get())) {
+                status = runProgram(desktop, user, session, url);
+                report(status);
+            }
+        } catch (...) {
+            // The silence tells.
+        }
+        _exit(127);
+    }
+    reporter.reset();
+    while (waitpid(child, nullptr, 0) < 0 && errno == EINTR) {
+    }
+    return lastReport(reports.get());
+}
+
+OSStatus failed(OSStatus status, const std::string& reason) {
+    logLine(LogLevel::notice, "opening a page: " + reason);
+    return status;
+}
+
+class DesktopOpener : public Opener {
+  public:
+    explicit DesktopOpener(Desktop desktop) : desktop_(std::move(desktop)) {}
+
+    OSStatus open(const std::string& url) override {
+        std::string reason;
+        const auto session =
+            findDesktopSession(currentHost().systemBusSocket, Clock::now() + findingBound, reason);
+        if (!session) {
+            return failed(fnfErr, reason);
+        }
+        if (session->user == 0) {
+            return failed(permErr, "root sits at the computer, and no browser runs as root");
+        }
+        if (geteuid() != 0 && geteuid() != session->user) {
+            return failed(permErr, "another user sits at the computer");
+        }
+        const auto user = userWithId(session->user);
+        if (!user) {
+            return failed(fnfErr, "there is no user " + std::to_string(session->user));
+        }
+        const OSStatus err = handOver(desktop_, *user, *session, url);
+        if (err != noErr) {
+            return failed(err,
+                          "the desktop's opening program could not be run (" + std::to_string(err) + ")");
+        }
+        return noErr;
+    }
+
+  private:
+    Desktop desktop_;
+};
+
+}  // namespace
+
+std::shared_ptr<Opener> makeDesktopOpener(Desktop desktop) {
+    return std::make_shared<DesktopOpener>(std::move(desktop));
+}
+
+}  // namespace platform::services
