@@ -23,7 +23,7 @@
 // A folder being read.
 struct OpaqueFSIterator {
     struct Closer {
-        void operator()(DIR* directory) const noexcept { closedir(directory); }
+        void operator()(DIR* open) const noexcept { closedir(open); }
     };
     std::string path;
     std::unique_ptr<DIR, Closer> directory;

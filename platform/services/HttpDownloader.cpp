@@ -1,5 +1,6 @@
 #include <algorithm>
 #include <array>
+#include <boost/asio/buffer.hpp>
 #include <boost/asio/io_context.hpp>
 #include <boost/asio/ip/address.hpp>
 #include <boost/asio/ip/tcp.hpp>
@@ -172,6 +173,10 @@ class Transfer {
         });
     }
     Error readHeader() {
+        const Error error = readHeaderOnce();
+        return error && mendStatusLine() ? readHeaderOnce() : error;
+    }
+    Error readHeaderOnce() {
         parser_.emplace();
         parser_->header_limit(static_cast<std::uint32_t>(bounds_.headerBytes));
         // A large body announced must not hide the status; readBody looks at the length.
@@ -179,6 +184,21 @@ class Transfer {
         return await(end_, [this](auto handler) {
             http::async_read_header(socket_, buffer_, *parser_, std::move(handler));
         });
+    }
+    // The servers in small devices end the line right behind the status; the parser insists on the blank that
+    // belongs there even without a reason.
+    bool mendStatusLine() {
+        constexpr std::string_view example = "HTTP/1.0 404";
+        const auto held = buffer_.cdata();
+        std::string text(static_cast<const char*>(held.data()), held.size());
+        if (text.size() <= example.size() || text.size() == buffer_.max_size() ||
+            !text.starts_with("HTTP/1.") || text[example.size()] != '\r') {
+            return false;
+        }
+        text.insert(example.size(), 1, ' ');
+        buffer_.clear();
+        buffer_.commit(asio::buffer_copy(buffer_.prepare(text.size()), asio::buffer(text)));
+        return true;
     }
     Error readBody(std::string& body) {
         if (parser_->content_length().value_or(0) > bounds_.bodyBytes) {

@@ -102,7 +102,8 @@ class DesktopTest : public testing::Test {
     }
     // A program that tells how it was run.
     [[nodiscard]] std::string recorder() const {
-        return "{ id -u; id -g; id -G; pwd; printf '%s\\n' \"$@\"; readlink /proc/self/fd/0; ls /proc/self/fd "
+        return "{ id -u; id -g; id -G; pwd; printf '%s\\n' \"$@\"; readlink /proc/self/fd/0; ls "
+               "/proc/self/fd "
                "| "
                "tr '\\n' ' '; echo; grep SigIgn /proc/$$/status; umask; env | sort; } > " +
                desktop.record() + ".part && mv " + desktop.record() + ".part " + desktop.record() + "\n";
