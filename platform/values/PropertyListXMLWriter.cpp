@@ -3,18 +3,12 @@
 
 #include "platform/values/Containers.h"
 #include "platform/values/PropertyListXML.h"
+#include "platform/values/PropertyListXMLForms.h"
 #include "platform/values/Scalars.h"
 
 namespace platform::values {
 
 namespace {
-
-constexpr std::string_view header =
-    "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
-    "<!DOCTYPE plist PUBLIC \"-//Apple//DTD PLIST 1.0//EN\" "
-    "\"http://www.apple.com/DTDs/PropertyList-1.0.dtd\">\n"
-    "<plist version=\"1.0\">\n";
-constexpr std::string_view footer = "</plist>\n";
 
 // A document is written twice: to nowhere, which tells its size, and into a string of that size. Letting the
 // string grow would cost more than the first pass, most of it in memory that is new each time.
@@ -53,9 +47,12 @@ class Writer {
     explicit Writer(Output& to) : output_(to) {}
     // False when the value cannot be written; the output is then of no use.
     [[nodiscard]] bool writeDocument(CFTypeRef value) {
-        output_.put(header);
+        for (const std::string_view piece : {xmlDeclaration, documentType, plistStart}) {
+            output_.put(piece);
+            output_.put('\n');
+        }
         const bool written = write(value, 0);
-        output_.put(footer);
+        output_.put("</plist>\n");
         return written;
     }
 
