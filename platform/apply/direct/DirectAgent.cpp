@@ -14,6 +14,7 @@
 #include "platform/apply/direct/Kernel.h"
 #include "platform/apply/direct/NameServers.h"
 #include "platform/apply/direct/Snapshot.h"
+#include "platform/apply/direct/Supplicant.h"
 
 namespace platform::apply {
 namespace {
@@ -23,6 +24,7 @@ using std::chrono::steady_clock;
 // An interface without a carrier by then keeps its settings and gets no more of our time: the cable or the
 // radio may come later.
 constexpr std::chrono::milliseconds carrierTime{5000};
+constexpr std::chrono::seconds joinTime{20};
 constexpr std::chrono::seconds leaseTime{20};
 constexpr std::chrono::milliseconds lookAgain{20};
 // What is left at least to an address whose own DHCP client renews it.
@@ -58,6 +60,10 @@ bool isOff(const InterfacePlan& plan) {
     return !plan.active || (plan.wireless && plan.wireless->powerEnabled == false);
 }
 
+bool joinsNetwork(const InterfacePlan& plan) {
+    return !isOff(plan) && plan.wireless && plan.wireless->network;
+}
+
 std::vector<Address> manualAddresses(const InterfacePlan& plan) {
     std::vector<Address> addresses;
     for (const ManualAddress& address : plan.addresses) {
@@ -88,8 +94,11 @@ class DirectAgent : public Agent {
             if (!done.ok() || !link) {
                 continue;
             }
-            Snapshot snapshot{link->up, isIPv6Disabled(interface), {}, secondsSinceStart()};
+            Snapshot snapshot{link->up, isIPv6Disabled(interface), {}, {}, secondsSinceStart()};
             done = kernel.read(*link, snapshot.state);
+            if (done.ok()) {
+                done = readKnownNetworks(interface, snapshot.networks);
+            }
             captured.push_back({interface, encodeSnapshot(snapshot)});
         }
         return done;
@@ -111,7 +120,8 @@ class Way {
     [[nodiscard]] bool isThere() const noexcept { return link_.has_value(); }
 
     Outcome switchOff();
-    Outcome switchOn(const InterfacePlan& plan);
+    // mayStay: the card may be on the plan's wireless network already.
+    Outcome switchOn(const InterfacePlan& plan, bool mayStay);
     Outcome restore(const Snapshot& before);
     Outcome removeOurs(const Notes& notes, const Snapshot& before);
     // Whether somebody else has configured the interface since: it has addresses that it neither had nor got
@@ -166,8 +176,7 @@ Outcome Way::switchOff() {
     return steps.first();
 }
 
-Outcome Way::switchOn(const InterfacePlan& plan) {
-    const auto deadline = steady_clock::now() + leaseTime;
+Outcome Way::switchOn(const InterfacePlan& plan, bool mayStay) {
     std::vector<Address> addresses = manualAddresses(plan);
     std::vector<Route> routes = makeDefaultRoute(plan.router, plan.rank, plan.addresses);
     if (plan.method == IPv4Method::dhcp) {
@@ -196,6 +205,11 @@ Outcome Way::switchOn(const InterfacePlan& plan) {
     if (done.ok() && plan.method != IPv4Method::dhcp) {
         done = bringNameServers(interface_, plan.rank, {plan.nameServers, plan.searchDomains});
     }
+    // Behind the settings, which stand whether the card gets onto the network or not.
+    if (done.ok() && joinsNetwork(plan)) {
+        done = joinNetwork(interface_, *plan.wireless, mayStay, steady_clock::now() + joinTime);
+    }
+    const auto deadline = steady_clock::now() + leaseTime;
     if (done.ok()) {
         done = awaitCarrier();
     }
@@ -310,7 +324,7 @@ Outcome Way::compare(const Snapshot& before) {
     return {};
 }
 
-Outcome DirectAgent::takeOver(const InterfacePlan& plan, const Captured& /*before*/) {
+Outcome DirectAgent::takeOver(const InterfacePlan& plan, const Captured& before) {
     Way way(plan.name);
     Outcome done = way.open();
     if (!done.ok()) {
@@ -319,21 +333,31 @@ Outcome DirectAgent::takeOver(const InterfacePlan& plan, const Captured& /*befor
     if (!way.isThere()) {
         return isOff(plan) ? Outcome() : Outcome(kSCStatusFailed, "there is no such interface");
     }
-    std::optional<Notes> earlier;
-    done = readNotes(plan.name, earlier);
-    Notes notes{Notes::Phase::going, isOff(plan),
-                isOff(plan) ? std::vector<Address>() : manualAddresses(plan)};
-    if (done.ok()) {
-        if (earlier) {
-            // A run that ended half-way may have left some of these.
-            for (const Address& address : earlier->addresses) {
-                if (!contains(notes.addresses, address)) {
-                    notes.addresses.push_back(address);
-                }
-            }
-        }
-        done = writeNotes(plan.name, notes);
+    std::optional<Notes> found;
+    done = readNotes(plan.name, found);
+    if (!done.ok()) {
+        return done;
     }
+    const Notes earlier = found.value_or(Notes{});
+    const bool mayStay = joinsNetwork(plan) && earlier.joined && earlier.phase == Notes::Phase::made &&
+                         isSameNetwork(*earlier.joined, *plan.wireless);
+    Notes made{Notes::Phase::made, isOff(plan), {}, {}};
+    if (!isOff(plan)) {
+        made.addresses = manualAddresses(plan);
+    }
+    if (joinsNetwork(plan)) {
+        made.joined = mayStay ? earlier.joined : makeJoinedNetwork(*plan.wireless);
+    }
+    // On the way everything counts as ours that is to be, or that an earlier run may have left.
+    Notes going = made;
+    going.phase = Notes::Phase::going;
+    going.joined = made.joined ? made.joined : earlier.joined;
+    for (const Address& address : earlier.addresses) {
+        if (!contains(going.addresses, address)) {
+            going.addresses.push_back(address);
+        }
+    }
+    done = writeNotes(plan.name, going);
     std::optional<DhcpSettings> client;
     if (done.ok()) {
         done = readDhcpSettings(plan.name, client);
@@ -343,19 +367,14 @@ Outcome DirectAgent::takeOver(const InterfacePlan& plan, const Captured& /*befor
         // While the address is still there, so that the server hears of it.
         done = stopDhcpClient(plan.name);
     }
-    if (done.ok()) {
-        done = isOff(plan) ? way.switchOff() : way.switchOn(plan);
-    }
-    if (done.ok() && !isOff(plan) && plan.wireless && plan.wireless->network) {
-        done = Outcome(kSCStatusFailed,
-                       "joining a wireless network needs NetworkManager or a wireless supplicant");
+    if (done.ok() && earlier.joined && !joinsNetwork(plan)) {
+        const std::optional<Snapshot> snapshot = decodeSnapshot(before.state.get());
+        done = leaveNetwork(plan.name, snapshot ? snapshot->networks : std::nullopt);
     }
     if (done.ok()) {
-        notes.phase = Notes::Phase::made;
-        notes.addresses = isOff(plan) ? std::vector<Address>() : manualAddresses(plan);
-        done = writeNotes(plan.name, notes);
+        done = isOff(plan) ? way.switchOff() : way.switchOn(plan, mayStay);
     }
-    return done;
+    return done.ok() ? writeNotes(plan.name, made) : done;
 }
 
 Outcome DirectAgent::giveBack(const Captured& before) {
@@ -372,6 +391,9 @@ Outcome DirectAgent::giveBack(const Captured& before) {
     Steps steps;
     steps.take(stopDhcpClient(interface));
     steps.take(bringNameServers(interface, 0, {}));
+    if (notes->joined) {
+        steps.take(leaveNetwork(interface, snapshot->networks));
+    }
     Way way(interface);
     if (steps.take(way.open()) && way.isThere()) {
         bool taken = false;

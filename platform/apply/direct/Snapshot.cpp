@@ -1,12 +1,13 @@
 #include "platform/apply/direct/Snapshot.h"
 
 #include <fcntl.h>
-#include <sys/stat.h>
+#include <sys/random.h>
 #include <unistd.h>
 
 #include <algorithm>
 
 #include "platform/FileDescriptor.h"
+#include "platform/apply/Digest.h"
 #include "platform/apply/Properties.h"
 #include "platform/apply/StateFile.h"
 
@@ -90,7 +91,38 @@ bool decodeList(CFDictionaryRef dictionary, CFStringRef key, std::vector<T>& lis
     return true;
 }
 
+values::Owned<CFDataRef> encodeNumbers(const std::vector<int>& numbers) {
+    return makeData(std::as_bytes(std::span(numbers)));
+}
+
+std::vector<int> decodeNumbers(CFDictionaryRef dictionary, CFStringRef key) {
+    std::vector<int> numbers;
+    if (const auto data = dataIn(dictionary, key)) {
+        numbers.resize(data->size() / sizeof(int));
+        std::copy_n(data->begin(), numbers.size() * sizeof(int),
+                    std::as_writable_bytes(std::span(numbers)).begin());
+    }
+    return numbers;
+}
+
+std::uint32_t checkOf(const WirelessSettings& settings, const Salt& salt) {
+    const std::string text = settings.network.value_or("") + '\0' + settings.key.value_or("");
+    return static_cast<std::uint32_t>(sipHash(salt, text) & 0xFFFFU);
+}
+
 }  // namespace
+
+JoinedNetwork makeJoinedNetwork(const WirelessSettings& settings) {
+    JoinedNetwork joined;
+    // Without random bytes the check is still right, only easier to guess from.
+    (void)!::getrandom(joined.salt.data(), joined.salt.size(), 0);
+    joined.check = checkOf(settings, joined.salt);
+    return joined;
+}
+
+bool isSameNetwork(const JoinedNetwork& joined, const WirelessSettings& settings) {
+    return joined.check == checkOf(settings, joined.salt);
+}
 
 values::Owned<CFDictionaryRef> encodeSnapshot(const Snapshot& snapshot) {
     ArrayBuilder addresses;
@@ -109,6 +141,10 @@ values::Owned<CFDictionaryRef> encodeSnapshot(const Snapshot& snapshot) {
     if (snapshot.ipv6Disabled) {
         dictionary.setBoolean(CFSTR("IPv6Disabled"), *snapshot.ipv6Disabled);
     }
+    if (snapshot.networks) {
+        dictionary.set(CFSTR("Networks"), encodeNumbers(snapshot.networks->all).get())
+            .set(CFSTR("EnabledNetworks"), encodeNumbers(snapshot.networks->enabled).get());
+    }
     return dictionary.take();
 }
 
@@ -124,6 +160,10 @@ std::optional<Snapshot> decodeSnapshot(CFDictionaryRef dictionary) {
     snapshot.up = *up;
     snapshot.takenAt = *takenAt;
     snapshot.ipv6Disabled = booleanIn(dictionary, CFSTR("IPv6Disabled"));
+    if (dataIn(dictionary, CFSTR("Networks"))) {
+        snapshot.networks = KnownNetworks{decodeNumbers(dictionary, CFSTR("Networks")),
+                                          decodeNumbers(dictionary, CFSTR("EnabledNetworks"))};
+    }
     return snapshot;
 }
 
@@ -160,6 +200,13 @@ Outcome readNotes(const std::string& interface, std::optional<Notes>& notes) {
     }
     found.phase = static_cast<Notes::Phase>(*phase);
     found.off = *off;
+    const auto salt = dataIn(file.get(), CFSTR("NetworkSalt"));
+    const auto check = integerIn(file.get(), CFSTR("NetworkCheck"));
+    if (salt && check && salt->size() == sizeof(Salt)) {
+        found.joined.emplace().check = static_cast<std::uint32_t>(*check);
+        std::transform(salt->begin(), salt->end(), found.joined->salt.begin(),
+                       [](std::byte b) { return std::to_integer<std::uint8_t>(b); });
+    }
     notes = std::move(found);
     return {};
 }
@@ -173,6 +220,10 @@ Outcome writeNotes(const std::string& interface, const Notes& notes) {
     file.setInteger(CFSTR("Phase"), static_cast<int>(notes.phase))
         .setBoolean(CFSTR("Off"), notes.off)
         .set(CFSTR("Addresses"), addresses.get());
+    if (notes.joined) {
+        file.setData(CFSTR("NetworkSalt"), std::as_bytes(std::span(notes.joined->salt)))
+            .setInteger(CFSTR("NetworkCheck"), notes.joined->check);
+    }
     return writeStateFile(notesPath(interface), file.take().get());
 }
 
