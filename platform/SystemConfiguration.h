@@ -38,21 +38,25 @@ using SCPreferencesRef = OpaqueSCPreferences*;
 
 // A session on the network preferences as they are on disk now, released with CFRelease. name is for the log;
 // prefsID must be null. Null on failure: 1001 when the file cannot be used (not a property list, too deep,
-// too large, not a regular file), 1003 without the rights, 1002 without a name. Without a file the session
-// holds the first-run tree, in memory until something commits it.
+// too large, a symbolic link or anything else that is not a regular file), 1003 without the rights, 1002
+// without a name. Without a file the session holds the first-run tree, in memory until something commits it,
+// and whoever could not make the file is refused with 1003.
 SCPreferencesRef SCPreferencesCreate(CFAllocatorRef allocator, CFStringRef name, CFStringRef prefsID);
 // Takes the store's cross-process lock. False: 3002 when another process holds it (with wait: still holds it
 // after half a minute), 3005 when the file changed since the session read it, 1003, 3001. Locking twice
 // succeeds.
 Boolean SCPreferencesLock(SCPreferencesRef session, Boolean wait);
+// False with 1007 when the session does not hold the lock, which also ends with the session.
 Boolean SCPreferencesUnlock(SCPreferencesRef session);
 // A top-level value, borrowed until the session next changes the tree below this key; null when absent
 // (1004).
 CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef key);
+// Stores the value, as it is now. 1002 for a value that is no property list or is nested too deep, as in the
+// next ones.
 Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPropertyListRef value);
 // The dictionary at a path of slash-separated keys ("/Sets/0/Network"); borrowed as above. Links are not
-// followed. Null: 1004 when nothing is there, 1001 when what is there, or on the way, is not a dictionary,
-// 1002 for a malformed path (no leading slash, an empty key).
+// followed; "/" is the whole tree. Null: 1004 when nothing is there, 1001 when what is there, or on the way, is
+// not a dictionary, 1002 for a malformed path (no leading slash, an empty key).
 CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path);
 // Stores the dictionary, as it is now, at the path, making missing dictionaries on the way. 1001 when
 // something on the way is not a dictionary.
@@ -63,9 +67,10 @@ CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path)
 // Removes whatever is at the path. False: 1004 when nothing is there, 1001, 1002.
 Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path);
 // Writes the changed tree, all of it or nothing; an unchanged tree is not written again. False: 3005 when the
-// file is no longer the one that was read, 3002 when another process holds the lock, 1003, 1001.
+// file is no longer the one that was read, 3002 when another process holds the lock for ten seconds, 1003, 1001
+// (among other reasons when the tree holds a string that XML cannot carry). The session keeps its changes then.
 Boolean SCPreferencesCommitChanges(SCPreferencesRef session);
-// Makes the committed current location the active configuration and returns when its interfaces are up, have
+// Makes the current location, as it is committed now, the active configuration and returns when its interfaces are up, have
 // failed, or a bounded wait is over. False: 1001 with the reason in the system log, 1003, 1004 when
 // "CurrentSet" names no location.
 Boolean SCPreferencesApplyChanges(SCPreferencesRef session);
@@ -88,8 +93,10 @@ extern const CFStringRef kSCDynamicStoreDomainState;  // "State:"
 extern const CFStringRef kSCDynamicStoreDomainSetup;  // "Setup:"
 extern const CFStringRef kSCEntNetIPv4;               // "IPv4"
 
-// A session on the live state, released with CFRelease. name may be null; callBack and context may be null
-// when no notices are wanted. Null on failure.
+// A session on the live state, released with CFRelease. name, which is for the log, may be null; callBack and
+// context may be null when no notices are wanted. The state is computed when it is asked for, from the kernel
+// and from the committed preferences; the keys are "State:/Network/Global/IPv4" and, for what is switched on in
+// the current location, "Setup:/Network/Global/<entity>" and "Setup:/Network/Service/<serviceID>/<entity>".
 SCDynamicStoreRef SCDynamicStoreCreate(CFAllocatorRef allocator, CFStringRef name,
                                        SCDynamicStoreCallBack callBack, SCDynamicStoreContext* context);
 // "<domain>/Network/Global/<entity>".
@@ -99,14 +106,21 @@ CFStringRef SCDynamicStoreKeyCreateNetworkGlobalEntity(CFAllocatorRef allocator,
 CFStringRef SCDynamicStoreKeyCreateNetworkServiceEntity(CFAllocatorRef allocator, CFStringRef domain,
                                                         CFStringRef serviceID, CFStringRef entity);
 // The keys that match the whole of a POSIX extended regular expression, sorted by their text; an empty array
-// when none does. Null: 1002 for a malformed expression, 1001.
+// when none does. Null: 1002 for a malformed expression, 1001 or 1003 when the state cannot be read.
 CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef pattern);
-// The value at a key; null with 1004 when there is none.
+// The value at a key; null with 1004 when there is none, 1001 or 1003 when it cannot be read.
+//
+// "State:/Network/Global/IPv4" is there while there is a default route: "PrimaryInterface", the interface's
+// name; "Router", a dotted quad, when the route has one; "PrimaryService", the ID of the first service of the
+// current location that names the interface, if one does.
 CFPropertyListRef SCDynamicStoreCopyValue(SCDynamicStoreRef store, CFStringRef key);
-// Replaces the keys and the key patterns whose changes are reported; either may be null.
+// Replaces the keys and the key patterns whose changes are reported, from now on; either may be null. False:
+// 1002 when something in them is no string or a pattern is malformed, 1001 or 1003 when the state cannot be
+// read; nothing is replaced then.
 Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef keys, CFArrayRef patterns);
-// A source that calls the session's callback with the keys whose values changed. It retains the session.
-// order is 0.
+// A source that calls the session's callback with the keys whose values changed. Changes that come within a few
+// hundredths of a second are reported at once, and a value that is again what it was is not reported. The source
+// retains the session. order is 0. Null on failure.
 CFRunLoopSourceRef SCDynamicStoreCreateRunLoopSource(CFAllocatorRef allocator, SCDynamicStoreRef store,
                                                      CFIndex order);
 
@@ -117,8 +131,13 @@ inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsReachable = 1U << 1U;
 inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsIsLocalAddress = 1U << 16U;
 inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsIsDirect = 1U << 17U;
 
-// Asks the kernel for a route and sends nothing. True when the question could be answered; the flags then
-// tell the answer. On false they are left as they were.
+// Asks the kernel for a route, and sends nothing. True when the question could be answered; the flags then tell
+// the answer, 0 when there is no route that leads anywhere: reachable for a unicast route or an address of this
+// computer, with "local" for the latter and "direct" when no gateway is on the way. On false (1002: no address
+// of IPv4 or IPv6, or a length that is too small for it; 1001) they are left as they were.
+//
+// A name that is not an address in figures is looked up first, as every program does, which may well send
+// something and take its time; one that has no address is not reachable.
 Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnectionFlags* flags);
 Boolean SCNetworkCheckReachabilityByAddress(const sockaddr* address, int addressLength,
                                             SCNetworkConnectionFlags* flags);

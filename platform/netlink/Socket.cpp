@@ -149,10 +149,11 @@ Outcome Socket::ask(Message message, OwnedMessage& answer, std::initializer_list
     }
 }
 
-Outcome Socket::dump(const Message& message, std::vector<OwnedMessage>& answers) {
+Outcome Socket::dump(const Message& message, std::vector<OwnedMessage>& answers,
+                     std::initializer_list<int> tolerated) {
     bool interrupted = true;
     for (int attempt = 0; attempt < dumpTries && interrupted; ++attempt) {
-        Outcome done = dumpOnce(message, answers, interrupted);
+        Outcome done = dumpOnce(message, answers, tolerated, interrupted);
         if (!done.ok()) {
             answers.clear();
             return done;
@@ -163,7 +164,8 @@ Outcome Socket::dump(const Message& message, std::vector<OwnedMessage>& answers)
     return {};
 }
 
-Outcome Socket::dumpOnce(Message message, std::vector<OwnedMessage>& answers, bool& interrupted) {
+Outcome Socket::dumpOnce(Message message, std::vector<OwnedMessage>& answers,
+                         std::initializer_list<int> tolerated, bool& interrupted) {
     answers.clear();
     interrupted = false;
     Outcome sent = send(message);
@@ -189,12 +191,13 @@ Outcome Socket::dumpOnce(Message message, std::vector<OwnedMessage>& answers, bo
             }
             interrupted = interrupted || (part->flags() & NLM_F_DUMP_INTR) != 0;
             if (part->type() == NLMSG_ERROR) {
-                return outcomeOfError(*part, {});
+                return outcomeOfError(*part, tolerated);
             }
             if (part->type() == NLMSG_DONE) {
-                const auto error = valueFrom<std::int32_t>(part->payload());
-                return error && *error < 0 ? Outcome::fromErrno("the kernel ended a netlink dump", -*error)
-                                           : Outcome();
+                const int error = -valueFrom<std::int32_t>(part->payload()).value_or(0);
+                const bool isFine =
+                    error <= 0 || std::find(tolerated.begin(), tolerated.end(), error) != tolerated.end();
+                return isFine ? Outcome() : Outcome::fromErrno("the kernel ended a netlink dump", error);
             }
             OwnedMessage& owned = answers.emplace_back();
             owned.header.nlmsg_type = part->type();

@@ -37,8 +37,10 @@ class Socket {
     // The one message that answers a request (RTM_GETLINK for one link, RTM_GETROUTE for one destination). An
     // error in `tolerated` leaves the answer with type 0.
     Outcome ask(Message message, OwnedMessage& answer, std::initializer_list<int> tolerated = {});
-    // Everything that a dump request lists. A dump that a change ran into is taken again, a few times.
-    Outcome dump(const Message& message, std::vector<OwnedMessage>& answers);
+    // Everything that a dump request lists; nothing after an error in `tolerated`. A dump that a change ran
+    // into is taken again, a few times.
+    Outcome dump(const Message& message, std::vector<OwnedMessage>& answers,
+                 std::initializer_list<int> tolerated = {});
 
     // For a socket with groups: reads what is there without waiting, one datagram a call. received tells
     // whether there was one. overrun: the kernel dropped notices, so what is known has to be looked up anew.
@@ -47,7 +49,8 @@ class Socket {
   private:
     Outcome send(Message& message);
     Outcome receive(std::chrono::steady_clock::time_point deadline, Bytes& datagram);
-    Outcome dumpOnce(Message message, std::vector<OwnedMessage>& answers, bool& interrupted);
+    Outcome dumpOnce(Message message, std::vector<OwnedMessage>& answers,
+                     std::initializer_list<int> tolerated, bool& interrupted);
 
     FileDescriptor descriptor_;
     std::uint32_t sequence_ = 0;

@@ -1,0 +1,126 @@
+#include "platform/live/ChangeWatch.h"
+
+#include <sys/epoll.h>
+#include <sys/inotify.h>
+#include <sys/timerfd.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+
+namespace platform::live {
+namespace {
+
+constexpr std::uint32_t fileEvents =
+    IN_MOVED_TO | IN_MOVED_FROM | IN_CLOSE_WRITE | IN_CREATE | IN_DELETE | IN_DELETE_SELF | IN_MOVE_SELF;
+
+// More than a path has folders that could come one after the other meanwhile.
+constexpr int mostWatchTries = 64;
+
+bool addTo(int poll, int descriptor) {
+    epoll_event event{};
+    event.events = EPOLLIN;
+    event.data.fd = descriptor;
+    return ::epoll_ctl(poll, EPOLL_CTL_ADD, descriptor, &event) == 0 || errno == EEXIST;
+}
+
+}  // namespace
+
+Outcome ChangeWatch::open(NetworkState& state, const std::string& preferencesDirectory) {
+    Outcome done = state.subscribe(notices_);
+    if (!done.ok()) {
+        return done;
+    }
+    directory_ = preferencesDirectory;
+    poll_.reset(::epoll_create1(EPOLL_CLOEXEC));
+    timer_.reset(::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC));
+    files_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
+    if (!poll_.isOpen() || !timer_.isOpen() || !files_.isOpen() || !addTo(poll_.get(), timer_.get()) ||
+        !addTo(poll_.get(), notices_->descriptor()) || !addTo(poll_.get(), files_.get())) {
+        return Outcome::fromErrno("cannot watch for changes");
+    }
+    watchPreferences();
+    return {};
+}
+
+// Watches the directory or, while it is missing, the nearest one above it. False when the one below that has
+// come meanwhile, so that nobody would tell of it.
+bool ChangeWatch::watchNearest() {
+    std::string path = directory_;
+    std::string missing;
+    while (::inotify_add_watch(files_.get(), path.c_str(), fileEvents | IN_ONLYDIR) < 0) {
+        const std::size_t slash = path.find_last_of('/');
+        if (errno != ENOENT || slash == std::string::npos || path == "/") {
+            return true;
+        }
+        missing = path;
+        path = slash == 0 ? "/" : path.substr(0, slash);
+    }
+    return missing.empty() || ::access(missing.c_str(), F_OK) != 0;
+}
+
+// Watching a directory again is nothing new to the kernel, so this may be called whenever it may have come or
+// gone.
+void ChangeWatch::watchPreferences() {
+    for (int tries = 0; tries < mostWatchTries && !watchNearest(); ++tries) {
+    }
+}
+
+bool ChangeWatch::drainPreferences() {
+    bool any = false;
+    alignas(inotify_event) char events[4096];
+    while (::read(files_.get(), events, sizeof events) > 0) {
+        any = true;
+    }
+    if (any) {
+        watchPreferences();
+    }
+    return any;
+}
+
+// Takes the sources of news out of the poll set rather than masking them: an overrun would be reported even
+// so.
+void ChangeWatch::listen(bool on) {
+    pacing_ = on ? Pacing::listening : Pacing::pausing;
+    for (const int source : {notices_->descriptor(), files_.get()}) {
+        if (on) {
+            (void)addTo(poll_.get(), source);
+        } else {
+            (void)::epoll_ctl(poll_.get(), EPOLL_CTL_DEL, source, nullptr);
+        }
+    }
+}
+
+void ChangeWatch::startTimer(std::chrono::milliseconds time) {
+    itimerspec setting{};
+    setting.it_value.tv_sec = time.count() / 1000;
+    setting.it_value.tv_nsec = time.count() % 1000 * 1'000'000;
+    (void)::timerfd_settime(timer_.get(), 0, &setting, nullptr);
+}
+
+bool ChangeWatch::takeTimer() {
+    std::uint64_t expirations = 0;
+    return ::read(timer_.get(), &expirations, sizeof expirations) == sizeof expirations;
+}
+
+bool ChangeWatch::take() {
+    const bool isPauseOver = takeTimer();
+    if (pacing_ == Pacing::pausing && !isPauseOver) {
+        return false;
+    }
+    const bool kernelNews = notices_->drain();
+    const bool fileNews = drainPreferences();
+    const bool news = kernelNews || fileNews;
+    listen(!news);
+    if (news) {
+        startTimer(pause);
+    }
+    return news || isPauseOver;
+}
+
+void ChangeWatch::retryLater() {
+    listen(false);
+    startTimer(longPause);
+}
+
+}  // namespace platform::live

@@ -1,0 +1,198 @@
+#include "platform/live/LiveView.h"
+
+#include <arpa/inet.h>
+
+#include <algorithm>
+#include <optional>
+#include <utility>
+
+#include "platform/preferences/Store.h"
+#include "platform/values/Values.h"
+
+namespace platform::live {
+namespace {
+
+using values::as;
+using values::entriesOf;
+using values::textOf;
+
+constexpr std::string_view globalPrefix = "Setup:/Network/Global/";
+constexpr std::string_view servicePrefix = "Setup:/Network/Service/";
+constexpr std::string_view globalIPv4Key = "State:/Network/Global/IPv4";
+
+CFDictionaryRef dictionaryIn(CFDictionaryRef dictionary, CFTypeRef key) {
+    return dictionary != nullptr ? as<CFDictionaryRef>(CFDictionaryGetValue(dictionary, key)) : nullptr;
+}
+
+bool isActive(CFDictionaryRef dictionary) {
+    return CFDictionaryContainsKey(dictionary, CFSTR("__INACTIVE__")) == 0;
+}
+
+CFDictionaryRef entityIn(CFDictionaryRef container, std::string_view protocol) {
+    const values::Owned<CFStringRef> key = values::makeString(protocol);
+    CFDictionaryRef const entity = key ? dictionaryIn(container, key.get()) : nullptr;
+    return entity != nullptr && isActive(entity) ? entity : nullptr;
+}
+
+void addEntityKeys(const std::string& prefix, CFDictionaryRef container, std::vector<std::string>& keys) {
+    for (const values::Entry& entry : entriesOf(container)) {
+        const auto entity = as<CFDictionaryRef>(entry.value);
+        if (entity != nullptr && isActive(entity)) {
+            keys.push_back(prefix + std::string(textOf(as<CFStringRef>(entry.key))));
+        }
+    }
+}
+
+void setText(CFMutableDictionaryRef dictionary, CFStringRef key, std::string_view text) {
+    if (const values::Owned<CFStringRef> value = values::makeString(text)) {
+        CFDictionarySetValue(dictionary, key, value.get());
+    }
+}
+
+std::string dottedQuad(const in_addr& address) {
+    char text[INET_ADDRSTRLEN] = {};
+    return ::inet_ntop(AF_INET, &address, text, sizeof text) != nullptr ? text : "";
+}
+
+}  // namespace
+
+LiveView::LiveView(NetworkState& state) : state_(&state) {
+    values::Owned<CFDictionaryRef> root;
+    loaded_ = preferences::loadCommittedTree(root);
+    tree_ = preferences::Tree(std::move(root));
+}
+
+CFDictionaryRef LiveView::network() const {
+    CFPropertyListRef location = nullptr;
+    const auto path =
+        loaded_.ok() ? as<CFStringRef>(tree_.topValue(CFSTR("CurrentSet"))) : CFStringRef(nullptr);
+    if (path == nullptr || tree_.find(textOf(path), location) != kSCStatusOK) {
+        return nullptr;
+    }
+    return dictionaryIn(as<CFDictionaryRef>(location), CFSTR("Network"));
+}
+
+CFDictionaryRef LiveView::serviceBehind(CFTypeRef link) const {
+    const auto dictionary = as<CFDictionaryRef>(link);
+    const auto path = dictionary != nullptr
+                          ? as<CFStringRef>(CFDictionaryGetValue(dictionary, CFSTR("__LINK__")))
+                          : CFStringRef(nullptr);
+    CFPropertyListRef service = nullptr;
+    if (path == nullptr || tree_.find(textOf(path), service) != kSCStatusOK) {
+        return nullptr;
+    }
+    const auto content = as<CFDictionaryRef>(service);
+    return content != nullptr && isActive(content) ? content : nullptr;
+}
+
+std::vector<LiveView::Service> LiveView::services() const {
+    std::vector<Service> services;
+    if (CFDictionaryRef const links = dictionaryIn(network(), CFSTR("Service"))) {
+        for (const values::Entry& entry : entriesOf(links)) {
+            if (CFDictionaryRef const content = serviceBehind(entry.value)) {
+                services.push_back({std::string(textOf(as<CFStringRef>(entry.key))), content});
+            }
+        }
+    }
+    return services;
+}
+
+std::vector<std::string> LiveView::serviceOrder() const {
+    std::vector<std::string> order;
+    CFDictionaryRef const global = dictionaryIn(dictionaryIn(network(), CFSTR("Global")), CFSTR("IPv4"));
+    const auto ids = global != nullptr ? as<CFArrayRef>(CFDictionaryGetValue(global, CFSTR("ServiceOrder")))
+                                       : CFArrayRef(nullptr);
+    if (ids != nullptr) {
+        for (const CFTypeRef id : values::itemsOf(ids)) {
+            if (const auto text = as<CFStringRef>(id)) {
+                order.emplace_back(textOf(text));
+            }
+        }
+    }
+    return order;
+}
+
+std::string LiveView::serviceNaming(const std::string& interface) const {
+    std::vector<std::string> found;
+    for (const Service& service : services()) {
+        CFDictionaryRef const entity = entityIn(service.content, "Interface");
+        const auto name = entity != nullptr
+                              ? as<CFStringRef>(CFDictionaryGetValue(entity, CFSTR("DeviceName")))
+                              : CFStringRef(nullptr);
+        if (name != nullptr && textOf(name) == interface) {
+            found.push_back(service.id);
+        }
+    }
+    if (found.size() > 1) {
+        const std::vector<std::string> order = serviceOrder();
+        const auto first = std::ranges::find_first_of(order, found);
+        return first != order.end() ? *first : found.front();
+    }
+    return found.empty() ? std::string() : found.front();
+}
+
+Outcome LiveView::globalIPv4(Value& value) const {
+    std::optional<PrimaryRoute> route;
+    Outcome done = state_->primaryRoute(route);
+    if (!done.ok() || !route) {
+        return done;
+    }
+    CFMutableDictionaryRef const dictionary = CFDictionaryCreateMutable(
+        kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
+    value = Value::adopt(dictionary);
+    setText(dictionary, CFSTR("PrimaryInterface"), route->interface);
+    if (route->router) {
+        setText(dictionary, CFSTR("Router"), dottedQuad(*route->router));
+    }
+    const std::string service = serviceNaming(route->interface);
+    if (!service.empty()) {
+        setText(dictionary, CFSTR("PrimaryService"), service);
+    }
+    return {};
+}
+
+Outcome LiveView::value(std::string_view key, Value& value) const {
+    value = {};
+    if (key == globalIPv4Key) {
+        return globalIPv4(value);
+    }
+    if (key.starts_with(globalPrefix)) {
+        key.remove_prefix(globalPrefix.size());
+        value = Value::retained(entityIn(dictionaryIn(network(), CFSTR("Global")), key));
+        return loaded_;
+    }
+    if (key.starts_with(servicePrefix)) {
+        key.remove_prefix(servicePrefix.size());
+        const std::size_t slash = key.find('/');
+        const values::Owned<CFStringRef> id = values::makeString(key.substr(0, slash));
+        CFDictionaryRef const links = dictionaryIn(network(), CFSTR("Service"));
+        if (slash != std::string_view::npos && id && links != nullptr) {
+            value = Value::retained(
+                entityIn(serviceBehind(CFDictionaryGetValue(links, id.get())), key.substr(slash + 1)));
+        }
+        return loaded_;
+    }
+    return {};
+}
+
+Outcome LiveView::keys(std::vector<std::string>& keys) const {
+    keys.clear();
+    std::optional<PrimaryRoute> route;
+    Outcome done = loaded_.ok() ? state_->primaryRoute(route) : loaded_;
+    if (!done.ok()) {
+        return done;
+    }
+    if (route) {
+        keys.emplace_back(globalIPv4Key);
+    }
+    if (CFDictionaryRef const globals = dictionaryIn(network(), CFSTR("Global"))) {
+        addEntityKeys(std::string(globalPrefix), globals, keys);
+    }
+    for (const Service& service : services()) {
+        addEntityKeys(std::string(servicePrefix) + service.id + "/", service.content, keys);
+    }
+    std::ranges::sort(keys);
+    return {};
+}
+
+}  // namespace platform::live

@@ -1,0 +1,73 @@
+// What the kernel knows of the network now: the seam between the live state and the machine.
+#pragma once
+
+#include <netinet/in.h>
+
+#include <array>
+#include <cstddef>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/Outcome.h"
+
+namespace platform::live {
+
+// The interface that the computer's traffic leaves by.
+struct PrimaryRoute {
+    std::string interface;
+    std::optional<in_addr> router;  // nothing when the route has none
+    bool operator==(const PrimaryRoute& other) const noexcept {
+        return interface == other.interface && router.has_value() == other.router.has_value() &&
+               (!router || router->s_addr == other.router->s_addr);
+    }
+};
+
+// An address to ask for. The first 4 or all 16 bytes, in network byte order, by the family.
+struct Destination {
+    int family = AF_INET;  // or AF_INET6
+    std::array<std::byte, 16> address{};
+    unsigned interfaceIndex = 0;  // the scope of a link-local address; 0 for none
+};
+
+// How packets for an address travel.
+struct Route {
+    bool isReachable = false;  // the rest is false without it
+    bool isLocal = false;      // the address is one of this computer's own
+    bool isDirect = false;     // no gateway on the way
+};
+
+// One subscription to the news that something may have changed.
+class Notices {
+  public:
+    Notices() = default;
+    Notices(const Notices&) = delete;
+    Notices& operator=(const Notices&) = delete;
+    virtual ~Notices() = default;
+
+    // Readable while there is news.
+    [[nodiscard]] virtual int descriptor() const noexcept = 0;
+    // Takes away what is there, without waiting and a bounded amount of it a call. Whether there was any;
+    // whoever was told so has to look at the state anew.
+    virtual bool drain() = 0;
+};
+
+class NetworkState {
+  public:
+    NetworkState() = default;
+    NetworkState(const NetworkState&) = delete;
+    NetworkState& operator=(const NetworkState&) = delete;
+    virtual ~NetworkState() = default;
+
+    // The default route of IPv4 with the lowest metric, over an interface that is up; nothing without one.
+    virtual Outcome primaryRoute(std::optional<PrimaryRoute>& route) = 0;
+    // Fails only when the question could not be asked; having no route is an answer.
+    virtual Outcome routeTo(const Destination& destination, Route& route) = 0;
+    // From then on no change of the primary route goes without news.
+    virtual Outcome subscribe(std::unique_ptr<Notices>& notices) = 0;
+};
+
+// The one of the host in force, or the kernel's own.
+[[nodiscard]] std::shared_ptr<NetworkState> currentNetworkState();
+
+}  // namespace platform::live

@@ -1,0 +1,116 @@
+// The reachability operations of SystemConfiguration.h.
+#include <netdb.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+
+#include <cstring>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/SystemConfiguration.h"
+#include "platform/live/NetworkState.h"
+#include "platform/preferences/Status.h"
+
+namespace {
+
+using platform::Outcome;
+using platform::live::Destination;
+using platform::live::Route;
+using platform::preferences::setStatus;
+
+constexpr const char* who = "reachability";
+
+SCNetworkConnectionFlags flagsOf(const Route& route) {
+    return (route.isReachable ? kSCNetworkFlagsReachable : 0) |
+           (route.isLocal ? kSCNetworkFlagsIsLocalAddress : 0) |
+           (route.isDirect ? kSCNetworkFlagsIsDirect : 0);
+}
+
+std::optional<Destination> destinationOf(const sockaddr* address, std::size_t length) {
+    Destination destination;
+    sa_family_t family = AF_UNSPEC;
+    if (address == nullptr || length < sizeof family) {
+        return std::nullopt;
+    }
+    std::memcpy(&family, &address->sa_family, sizeof family);
+    destination.family = family;
+    if (family == AF_INET && length >= sizeof(sockaddr_in)) {
+        sockaddr_in in{};
+        std::memcpy(&in, address, sizeof in);
+        std::memcpy(destination.address.data(), &in.sin_addr, sizeof in.sin_addr);
+        return destination;
+    }
+    if (family == AF_INET6 && length >= sizeof(sockaddr_in6)) {
+        sockaddr_in6 in{};
+        std::memcpy(&in, address, sizeof in);
+        std::memcpy(destination.address.data(), &in.sin6_addr, sizeof in.sin6_addr);
+        destination.interfaceIndex = in.sin6_scope_id;
+        return destination;
+    }
+    return std::nullopt;
+}
+
+using AddressList = std::unique_ptr<addrinfo, decltype(&::freeaddrinfo)>;
+
+// getaddrinfo's own status.
+int resolve(const char* name, int flags, AddressList& list) {
+    addrinfo hints{};
+    hints.ai_flags = flags;
+    hints.ai_socktype = SOCK_STREAM;
+    addrinfo* found = nullptr;
+    const int status = ::getaddrinfo(name, nullptr, &hints, &found);
+    list.reset(status == 0 ? found : nullptr);
+    return status;
+}
+
+// The first address of the list that can be reached tells the answer.
+Outcome askForAny(const AddressList& list, Route& route) {
+    Outcome done;
+    for (const addrinfo* entry = list.get(); entry != nullptr && done.ok() && !route.isReachable;
+         entry = entry->ai_next) {
+        if (const auto destination = destinationOf(entry->ai_addr, entry->ai_addrlen)) {
+            done = platform::live::currentNetworkState()->routeTo(*destination, route);
+        }
+    }
+    return done;
+}
+
+}  // namespace
+
+Boolean SCNetworkCheckReachabilityByAddress(const sockaddr* address, int addressLength,
+                                            SCNetworkConnectionFlags* flags) {
+    const auto length = static_cast<std::size_t>(addressLength < 0 ? 0 : addressLength);
+    const std::optional<Destination> destination = destinationOf(address, length);
+    if (!destination || flags == nullptr) {
+        return static_cast<Boolean>(setStatus(kSCStatusInvalidArgument));
+    }
+    Route route;
+    const bool done = setStatus(platform::live::currentNetworkState()->routeTo(*destination, route), who);
+    if (done) {
+        *flags = flagsOf(route);
+    }
+    return static_cast<Boolean>(done);
+}
+
+Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnectionFlags* flags) {
+    if (nodename == nullptr || *nodename == '\0' || flags == nullptr) {
+        return static_cast<Boolean>(setStatus(kSCStatusInvalidArgument));
+    }
+    AddressList list(nullptr, &::freeaddrinfo);
+    int status = resolve(nodename, AI_NUMERICHOST, list);
+    if (status == EAI_NONAME) {
+        status = resolve(nodename, 0, list);
+    }
+    if (status != 0 && status != EAI_NONAME) {
+        const Outcome failed(kSCStatusFailed,
+                             std::string("cannot look up ") + nodename + ": " + ::gai_strerror(status));
+        return static_cast<Boolean>(setStatus(failed, who));
+    }
+    Route route;
+    const bool done = setStatus(askForAny(list, route), who);
+    if (done) {
+        *flags = flagsOf(route);
+    }
+    return static_cast<Boolean>(done);
+}

@@ -1,0 +1,155 @@
+#include "platform/live/Routes.h"
+
+#include <net/if.h>
+
+#include <algorithm>
+
+namespace platform::live {
+namespace {
+
+using netlink::Attribute;
+using netlink::Attributes;
+using netlink::ByteView;
+using netlink::Message;
+using netlink::MessageView;
+using netlink::valueFrom;
+
+constexpr unsigned brokenHop = RTNH_F_DEAD | RTNH_F_LINKDOWN;
+
+ByteView addressOf(const Destination& destination) {
+    return ByteView(destination.address)
+        .first(destination.family == AF_INET6 ? sizeof(in6_addr) : sizeof(in_addr));
+}
+
+struct NextHop {
+    int interfaceIndex = 0;
+    std::optional<in_addr> gateway;
+};
+
+std::optional<in_addr> gatewayIn(const Attributes& attributes) {
+    const std::optional<Attribute> gateway = attributes.find(RTA_GATEWAY);
+    return gateway ? valueFrom<in_addr>(gateway->payload) : std::nullopt;
+}
+
+// A row of next hops: each a header with a length of its own, and attributes.
+std::optional<NextHop> workingHopIn(ByteView hops) {
+    while (const auto header = valueFrom<rtnexthop>(hops)) {
+        const std::size_t length = header->rtnh_len;
+        if (length < sizeof(rtnexthop) || length > hops.size()) {
+            return std::nullopt;
+        }
+        if ((header->rtnh_flags & brokenHop) == 0) {
+            const Attributes attributes(hops.subspan(sizeof(rtnexthop), length - sizeof(rtnexthop)));
+            return NextHop{header->rtnh_ifindex, gatewayIn(attributes)};
+        }
+        hops = hops.subspan(std::min((length + 3U) & ~std::size_t{3U}, hops.size()));
+    }
+    return std::nullopt;
+}
+
+std::optional<NextHop> hopIn(const rtmsg& route, const Attributes& attributes) {
+    if (const std::optional<Attribute> several = attributes.find(RTA_MULTIPATH)) {
+        return workingHopIn(several->payload);
+    }
+    const std::optional<Attribute> interface = attributes.find(RTA_OIF);
+    const std::optional<std::uint32_t> index = interface ? interface->u32() : std::nullopt;
+    if (!index || (route.rtm_flags & brokenHop) != 0) {
+        return std::nullopt;
+    }
+    return NextHop{static_cast<int>(*index), gatewayIn(attributes)};
+}
+
+std::uint32_t tableOf(const rtmsg& route, const Attributes& attributes) {
+    const std::optional<Attribute> table = attributes.find(RTA_TABLE);
+    return table && table->u32() ? *table->u32() : route.rtm_table;
+}
+
+bool refuses(unsigned char type) {
+    return type == RTN_UNREACHABLE || type == RTN_BLACKHOLE || type == RTN_PROHIBIT;
+}
+
+// A route that refuses has interface 0.
+std::optional<DefaultRoute> defaultRouteIn(const MessageView& message) {
+    const auto route = message.family<rtmsg>();
+    if (message.type() != RTM_NEWROUTE || !route || route->rtm_family != AF_INET || route->rtm_dst_len != 0 ||
+        route->rtm_tos != 0) {
+        return std::nullopt;
+    }
+    const Attributes attributes = message.attributes<rtmsg>();
+    std::optional<NextHop> hop = NextHop{};
+    if (route->rtm_type == RTN_UNICAST) {
+        hop = hopIn(*route, attributes);
+    } else if (!refuses(route->rtm_type)) {
+        return std::nullopt;
+    }
+    if (!hop || tableOf(*route, attributes) != RT_TABLE_MAIN) {
+        return std::nullopt;
+    }
+    const std::optional<Attribute> metric = attributes.find(RTA_PRIORITY);
+    return DefaultRoute{hop->interfaceIndex, hop->gateway, metric ? metric->u32().value_or(0) : 0};
+}
+
+}  // namespace
+
+Message askForRoutes() {
+    rtmsg route{};
+    route.rtm_family = AF_INET;
+    route.rtm_table = RT_TABLE_MAIN;
+    return {RTM_GETROUTE, NLM_F_REQUEST | NLM_F_DUMP, route};
+}
+
+Message askForLink(int index) {
+    ifinfomsg link{};
+    link.ifi_family = AF_UNSPEC;
+    link.ifi_index = index;
+    return {RTM_GETLINK, NLM_F_REQUEST | NLM_F_ACK, link};
+}
+
+Message askForRouteTo(const Destination& destination) {
+    const ByteView address = addressOf(destination);
+    rtmsg route{};
+    route.rtm_family = static_cast<unsigned char>(destination.family);
+    route.rtm_dst_len = static_cast<unsigned char>(address.size() * 8);
+    Message message(RTM_GETROUTE, NLM_F_REQUEST | NLM_F_ACK, route);
+    message.add(RTA_DST, address);
+    if (destination.interfaceIndex != 0) {
+        message.addValue(RTA_OIF, destination.interfaceIndex);
+    }
+    return message;
+}
+
+std::vector<DefaultRoute> defaultRoutesIn(std::span<const netlink::OwnedMessage> answers) {
+    std::vector<DefaultRoute> routes;
+    for (const netlink::OwnedMessage& answer : answers) {
+        if (const std::optional<DefaultRoute> route = defaultRouteIn(answer.view())) {
+            routes.push_back(*route);
+        }
+    }
+    std::ranges::stable_sort(routes, {}, &DefaultRoute::metric);
+    routes.erase(std::ranges::find(routes, 0, &DefaultRoute::interfaceIndex), routes.end());
+    return routes;
+}
+
+std::optional<Link> linkIn(const MessageView& answer) {
+    const auto link = answer.family<ifinfomsg>();
+    const std::optional<Attribute> name = answer.attributes<ifinfomsg>().find(IFLA_IFNAME);
+    if (answer.type() != RTM_NEWLINK || !link || !name) {
+        return std::nullopt;
+    }
+    return Link{std::string(name->text()), (link->ifi_flags & static_cast<unsigned>(IFF_UP)) != 0};
+}
+
+Route routeIn(const MessageView& answer) {
+    const auto header = answer.family<rtmsg>();
+    if (answer.type() != RTM_NEWROUTE || !header) {
+        return {};
+    }
+    const Attributes attributes = answer.attributes<rtmsg>();
+    Route route;
+    route.isLocal = header->rtm_type == RTN_LOCAL;
+    route.isReachable = route.isLocal || header->rtm_type == RTN_UNICAST;
+    route.isDirect = route.isReachable && !attributes.find(RTA_GATEWAY) && !attributes.find(RTA_VIA);
+    return route;
+}
+
+}  // namespace platform::live

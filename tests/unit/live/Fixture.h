@@ -1,0 +1,182 @@
+// A live state made of a store in a temporary directory and a network that the test makes up.
+#pragma once
+
+#include <gtest/gtest.h>
+#include <sys/eventfd.h>
+#include <unistd.h>
+
+#include <cstdint>
+#include <filesystem>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "platform/FileDescriptor.h"
+#include "platform/Host.h"
+#include "platform/Log.h"
+#include "platform/SystemConfiguration.h"
+#include "platform/live/NetworkState.h"
+#include "platform/values/Values.h"
+#include "tests/unit/support/TemporaryDirectory.h"
+
+namespace live_test {
+
+using platform::Outcome;
+using platform::live::Destination;
+using platform::live::PrimaryRoute;
+using platform::live::Route;
+using platform::values::Owned;
+
+inline PrimaryRoute routeOver(std::string interface, std::uint32_t router = 0) {
+    PrimaryRoute route{std::move(interface), std::nullopt};
+    if (router != 0) {
+        route.router = in_addr{htonl(router)};
+    }
+    return route;
+}
+
+class FakeNetworkState : public platform::live::NetworkState {
+  public:
+    std::optional<PrimaryRoute> primary;
+    Route answer;
+    bool isFailing = false;
+    int looks = 0;
+    int subscriptions = 0;
+    std::vector<Destination> asked;
+
+    void change(std::optional<PrimaryRoute> route) {
+        primary = std::move(route);
+        const std::uint64_t one = 1;
+        EXPECT_EQ(write(news_.get(), &one, sizeof one), static_cast<ssize_t>(sizeof one));
+    }
+
+    Outcome primaryRoute(std::optional<PrimaryRoute>& route) override {
+        ++looks;
+        route = primary;
+        return outcome();
+    }
+    Outcome routeTo(const Destination& destination, Route& route) override {
+        asked.push_back(destination);
+        route = answer;
+        return outcome();
+    }
+    Outcome subscribe(std::unique_ptr<platform::live::Notices>& notices) override {
+        ++subscriptions;
+        notices = std::make_unique<FakeNotices>(dup(news_.get()));
+        return outcome();
+    }
+
+  private:
+    class FakeNotices : public platform::live::Notices {
+      public:
+        explicit FakeNotices(int news) : news_(news) {}
+        [[nodiscard]] int descriptor() const noexcept override { return news_.get(); }
+        bool drain() override {
+            std::uint64_t count = 0;
+            return read(news_.get(), &count, sizeof count) > 0;
+        }
+
+      private:
+        platform::FileDescriptor news_;
+    };
+
+    [[nodiscard]] Outcome outcome() const {
+        return isFailing ? Outcome(kSCStatusFailed, "told to fail") : Outcome();
+    }
+
+    platform::FileDescriptor news_{eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)};
+};
+
+using StoreRef = Owned<SCDynamicStoreRef>;
+
+inline Owned<CFStringRef> text(std::string_view bytes) {
+    return platform::values::makeString(bytes);
+}
+
+inline Owned<CFArrayRef> arrayOf(const std::vector<std::string_view>& texts) {
+    CFMutableArrayRef const array = CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks);
+    for (const std::string_view item : texts) {
+        CFArrayAppendValue(array, text(item).get());
+    }
+    return Owned<CFArrayRef>::adopt(array);
+}
+
+// The value at a key as one line, or "status <n>".
+inline std::string valueAt(SCDynamicStoreRef store, std::string_view key) {
+    const auto value = Owned<CFPropertyListRef>::adopt(SCDynamicStoreCopyValue(store, text(key).get()));
+    return value ? platform::values::descriptionOf(value.get()) : "status " + std::to_string(SCError());
+}
+
+constexpr std::string_view globalKey = "State:/Network/Global/IPv4";
+
+// Records what a session's callback is told: "<key> = <value>".
+class Watcher {
+  public:
+    explicit Watcher(const std::vector<std::string_view>& keys,
+                     const std::vector<std::string_view>& patterns = {}) {
+        SCDynamicStoreContext context{0, this, nullptr, nullptr, nullptr};
+        store = StoreRef::adopt(SCDynamicStoreCreate(nullptr, CFSTR("watcher"), &Watcher::changed, &context));
+        EXPECT_TRUE(
+            SCDynamicStoreSetNotificationKeys(store.get(), arrayOf(keys).get(), arrayOf(patterns).get()));
+        source_ =
+            Owned<CFRunLoopSourceRef>::adopt(SCDynamicStoreCreateRunLoopSource(nullptr, store.get(), 0));
+        EXPECT_TRUE(source_);
+        CFRunLoopAddSource(CFRunLoopGetCurrent(), source_.get(), kCFRunLoopDefaultMode);
+    }
+    ~Watcher() { CFRunLoopRemoveSource(CFRunLoopGetCurrent(), source_.get(), kCFRunLoopDefaultMode); }
+    Watcher(const Watcher&) = delete;
+    Watcher& operator=(const Watcher&) = delete;
+
+    // Runs the loop until this many notices have come; then, for a moment, to see whether more do.
+    void waitFor(std::size_t count, double seconds = 10) {
+        for (double waited = 0; notices.size() < count && waited < seconds; waited += 0.01) {
+            CFRunLoopRunInMode(kCFRunLoopDefaultMode, 0.01, 0);
+        }
+        CFRunLoopRunInMode(kCFRunLoopDefaultMode, 0.1, 0);
+    }
+
+    StoreRef store;
+    std::vector<std::string> notices;
+    std::size_t calls = 0;
+
+  private:
+    static void changed(SCDynamicStoreRef store, CFArrayRef keys, void* info) {
+        Watcher& self = *static_cast<Watcher*>(info);
+        ++self.calls;
+        for (const CFTypeRef key : platform::values::itemsOf(keys)) {
+            const std::string name = platform::values::descriptionOf(key);
+            self.notices.push_back(name + " = " + valueAt(store, name));
+        }
+    }
+
+    Owned<CFRunLoopSourceRef> source_;
+};
+
+class LiveTest : public testing::Test {
+  protected:
+    [[nodiscard]] platform::Host makeHost() const {
+        platform::Host made;
+        made.preferencesDirectory = directory.at("store");
+        made.networkState = network;
+        return made;
+    }
+    void writePreferences(std::string_view plist) const {
+        (void)directory.write("store/new.plist", plist);
+        std::filesystem::rename(directory.at("store/new.plist"), directory.at("store/preferences.plist"));
+    }
+    static StoreRef openStore() {
+        return StoreRef::adopt(SCDynamicStoreCreate(nullptr, CFSTR("tester"), nullptr, nullptr));
+    }
+
+    testing_support::TemporaryDirectory directory;
+    std::shared_ptr<FakeNetworkState> network = std::make_shared<FakeNetworkState>();
+    std::vector<std::string> log;
+    platform::HostOverride host{makeHost()};
+    platform::LogCapture capture{
+        [this](platform::LogLevel /*level*/, std::string_view line) { log.emplace_back(line); }};
+};
+
+}  // namespace live_test

@@ -1,0 +1,207 @@
+// The live state on a real kernel, in a network namespace of the test's own.
+#include <arpa/inet.h>
+#include <netinet/in.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include "tests/unit/live/Fixture.h"
+#include "tests/unit/support/PrivateNetwork.h"
+
+namespace live_test {
+namespace {
+
+using testing_support::shell;
+
+class KernelNetworkTest : public testing_support::PrivateNetworkTest {
+  protected:
+    // The body in a namespace with two pairs of links, of which card0 and card1 carry addresses.
+    static void run(const std::function<void()>& body) {
+        testing_support::PrivateNetwork::run([&body] {
+            const testing_support::TemporaryDirectory directory;
+            platform::Host made;
+            made.preferencesDirectory = directory.at("store");
+            const platform::HostOverride host(made);
+            for (const char* card : {"0", "1"}) {
+                const std::string number = card;
+                shell("ip link add card" + number + " type veth peer name other" + number);
+                shell("ip link set other" + number + " up && ip link set card" + number + " up");
+                shell("ip address add 10.0." + number + ".2/24 dev card" + number);
+            }
+            body();
+        });
+    }
+
+    static std::string now() { return valueAt(openStore().get(), globalKey); }
+    static StoreRef openStore() {
+        return StoreRef::adopt(SCDynamicStoreCreate(nullptr, CFSTR("tester"), nullptr, nullptr));
+    }
+};
+
+std::string overCard(const std::string& card, const std::string& router = "") {
+    return "{PrimaryInterface = card" + card + (router.empty() ? "" : "; Router = " + router) + "}";
+}
+
+TEST_F(KernelNetworkTest, TheGlobalStateFollowsTheDefaultRoute) {
+    run([] {
+        const struct {
+            const char* command;
+            std::string state;
+        } steps[] = {
+            {"true", "status 1004"},
+            {"ip route add default via 10.0.1.1 dev card1 metric 200", overCard("1", "10.0.1.1")},
+            {"ip route add default dev card0 metric 100", overCard("0")},
+            {"ip route add default via 10.0.1.7 metric 300", overCard("0")},
+            {"ip route add default via 10.0.1.9 table 99", overCard("0")},
+            {"ip link set other0 down", overCard("1", "10.0.1.1")},
+            {"ip link set other0 up", overCard("0")},
+            {"ip link set card0 down", overCard("1", "10.0.1.1")},
+            {"ip link set card1 name card5", overCard("5", "10.0.1.1")},
+            {"ip route add blackhole default metric 7", "status 1004"},
+            {"ip route del blackhole default metric 7", overCard("5", "10.0.1.1")},
+            {"ip link del card5", "status 1004"},
+        };
+        Watcher watcher({globalKey});
+        std::string before = "status 1004";
+        for (const auto& step : steps) {
+            SCOPED_TRACE(step.command);
+            watcher.notices.clear();
+            shell(step.command);
+            watcher.waitFor(before == step.state ? 0 : 1);
+            EXPECT_EQ(now(), step.state);
+            if (before != step.state) {
+                ASSERT_FALSE(watcher.notices.empty());
+                EXPECT_EQ(watcher.notices.back(), std::string(globalKey) + " = " + step.state);
+            } else {
+                EXPECT_TRUE(watcher.notices.empty());
+            }
+            before = step.state;
+        }
+    });
+}
+
+TEST_F(KernelNetworkTest, ARouteThatGoesWithItsAddressIsNoticed) {
+    run([] {
+        shell("ip address add 10.0.0.50/32 dev card0 && ip route add default dev card0 src 10.0.0.50");
+        Watcher watcher({globalKey});
+        shell("ip address del 10.0.0.50/32 dev card0");
+        watcher.waitFor(1);
+        EXPECT_EQ(watcher.notices, std::vector<std::string>{std::string(globalKey) + " = status 1004"});
+    });
+}
+
+// What the kernel could not deliver to our sockets for want of room.
+unsigned long droppedNotices() {
+    std::ifstream table("/proc/net/netlink");
+    std::string line;
+    unsigned long dropped = 0;
+    std::getline(table, line);
+    while (std::getline(table, line)) {
+        std::istringstream fields(line);
+        std::string sk, eth, pid, groups, rmem, wmem, dump, locks;
+        unsigned long drops = 0;
+        fields >> sk >> eth >> pid >> groups >> rmem >> wmem >> dump >> locks >> drops;
+        dropped += drops;
+    }
+    return dropped;
+}
+
+void writeBurst(const std::string& path, int changes) {
+    std::ofstream batch(path);
+    for (int i = 0; i < changes; i += 2) {
+        const std::string address =
+            "10.7." + std::to_string(i / 200 % 250) + "." + std::to_string(i % 200 + 1) + "/24 dev card1\n";
+        batch << "address add " << address << "address del " << address;
+    }
+    batch << "route del default\nroute add default via 10.0.1.1\n";
+}
+
+TEST_F(KernelNetworkTest, TenThousandChangesUnreadAreSurvived) {
+    run([] {
+        shell("ip route add default via 10.0.0.1");
+        Watcher watcher({globalKey});
+        const testing_support::TemporaryDirectory directory;
+        writeBurst(directory.at("batch"), 10000);
+        shell("ip -batch " + directory.at("batch"));
+        EXPECT_GT(droppedNotices(), 0U) << "the socket was not overrun, so this shows nothing";
+        watcher.waitFor(1);
+        EXPECT_EQ(watcher.calls, 1U);
+        EXPECT_EQ(watcher.notices,
+                  std::vector<std::string>{std::string(globalKey) + " = " + overCard("1", "10.0.1.1")});
+        shell("ip route del default");
+        watcher.waitFor(2);
+        EXPECT_EQ(watcher.notices.back(), std::string(globalKey) + " = status 1004");
+    });
+}
+
+TEST_F(KernelNetworkTest, TenThousandChangesWhileWatchingEndRight) {
+    run([] {
+        shell("ip route add default via 10.0.0.1");
+        Watcher watcher({globalKey});
+        const testing_support::TemporaryDirectory directory;
+        writeBurst(directory.at("batch"), 10000);
+        FILE* const burst = popen(("ip -batch " + directory.at("batch")).c_str(), "re");
+        ASSERT_NE(burst, nullptr);
+        watcher.waitFor(1, 60);
+        EXPECT_EQ(pclose(burst), 0);
+        watcher.waitFor(0);
+        ASSERT_FALSE(watcher.notices.empty());
+        EXPECT_EQ(watcher.notices.back(), std::string(globalKey) + " = " + overCard("1", "10.0.1.1"));
+    });
+}
+
+TEST_F(KernelNetworkTest, ReachabilityIsTheKernelsAnswer) {
+    run([] {
+        shell(
+            "ip route add 172.16.0.0/24 via 10.0.0.1 && ip route add unreachable 172.16.1.0/24 && "
+            "ip route add blackhole 172.16.2.0/24 && ip route add prohibit 172.16.3.0/24 && "
+            "ip address add fd00::2/64 dev card0 nodad && ip -6 route add fd01::/64 via fd00::1 && "
+            "ip -6 route add unreachable fd02::/64 && ip -6 route add blackhole fd03::/64");
+        const struct {
+            const char* name;
+            SCNetworkConnectionFlags flags;
+        } rows[] = {
+            {"10.0.0.1", 0x20002},
+            {"10.0.0.2", 0x30002},
+            {"127.0.0.1", 0x30002},
+            {"172.16.0.9", 2},
+            {"172.16.1.9", 0},
+            {"172.16.2.9", 0},
+            {"172.16.3.9", 0},
+            {"192.0.2.1", 0},
+            {"10.0.0.255", 0},
+            {"240.0.0.1", 0},
+            {"224.0.0.1", 0},
+            {"fd00::1", 0x20002},
+            {"fd00::2", 0x30002},
+            {"::1", 0x30002},
+            {"fd01::1", 2},
+            {"fd02::1", 0},
+            {"fd03::1", 0},
+            {"2001:db8::1", 0},
+            {"fe80::1%card0", 0x20002},
+        };
+        for (const auto& row : rows) {
+            SCNetworkConnectionFlags flags = 77;
+            EXPECT_TRUE(SCNetworkCheckReachabilityByName(row.name, &flags)) << row.name;
+            EXPECT_EQ(flags, row.flags) << row.name;
+        }
+        sockaddr_in printer{};
+        printer.sin_family = AF_INET;
+        printer.sin_port = 80;
+        inet_pton(AF_INET, "10.0.1.192", &printer.sin_addr);
+        SCNetworkConnectionFlags flags = 0;
+        EXPECT_TRUE(
+            SCNetworkCheckReachabilityByAddress(reinterpret_cast<const sockaddr*>(&printer), 16, &flags));
+        EXPECT_EQ(flags, 0x20002U);
+        shell("ip link set card1 down");
+        EXPECT_TRUE(
+            SCNetworkCheckReachabilityByAddress(reinterpret_cast<const sockaddr*>(&printer), 16, &flags));
+        EXPECT_EQ(flags, 0U);
+    });
+}
+
+}  // namespace
+}  // namespace live_test

@@ -1,0 +1,239 @@
+// Bytes captured from a kernel of the 6.18 series in a network namespace; v0 is link 3 and v2 is link 5.
+#include "platform/live/Routes.h"
+
+#include <arpa/inet.h>
+#include <gtest/gtest.h>
+
+#include <cstring>
+#include <string>
+#include <string_view>
+
+namespace live_test {
+namespace {
+
+using platform::live::DefaultRoute;
+using platform::live::defaultRoutesIn;
+using platform::live::Destination;
+using platform::live::linkIn;
+using platform::live::routeIn;
+using platform::netlink::Bytes;
+using platform::netlink::ByteView;
+using platform::netlink::MessageView;
+using platform::netlink::OwnedMessage;
+
+Bytes bytesOf(std::string_view hex) {
+    Bytes bytes;
+    for (std::size_t i = 0; i + 1 < hex.size(); i += 2) {
+        bytes.push_back(static_cast<std::byte>(std::stoi(std::string(hex.substr(i, 2)), nullptr, 16)));
+    }
+    return bytes;
+}
+
+std::string hexOf(ByteView bytes) {
+    static constexpr char digits[] = "0123456789abcdef";
+    std::string hex;
+    for (const std::byte byte : bytes) {
+        hex += digits[std::to_integer<unsigned>(byte) >> 4U];
+        hex += digits[std::to_integer<unsigned>(byte) & 15U];
+    }
+    return hex;
+}
+
+std::vector<OwnedMessage> messagesIn(ByteView datagram) {
+    std::vector<OwnedMessage> messages;
+    while (const auto view = platform::netlink::takeMessage(datagram)) {
+        OwnedMessage& message = messages.emplace_back();
+        message.header.nlmsg_type = view->type();
+        message.payload.assign(view->payload().begin(), view->payload().end());
+    }
+    return messages;
+}
+
+std::string describe(const std::vector<DefaultRoute>& routes) {
+    std::string text;
+    for (const DefaultRoute& route : routes) {
+        text += "link " + std::to_string(route.interfaceIndex) + " metric " + std::to_string(route.metric);
+        if (route.gateway) {
+            char address[INET_ADDRSTRLEN];
+            text += std::string(" via ") + inet_ntop(AF_INET, &*route.gateway, address, sizeof address);
+        }
+        text += "; ";
+    }
+    return text;
+}
+
+// default via 10.0.0.9 dev v2 table 77
+constexpr std::string_view otherTable =
+    "340000001800220001000000c65e0000020000004d0300010000000008000f004d000000080005000a000009080004000500000"
+    "0";
+// unreachable default metric 10
+constexpr std::string_view refusing =
+    "2c0000001800220001000000c65e000002000000fe0300070000000008000f00fe000000080006000a000000";
+// default metric 20 nexthop via 10.0.0.1 dev v2 nexthop via 192.0.0.1 dev v0
+constexpr std::string_view twoHops =
+    "500000001800220001000000c65e000002000000fe0300010000000008000f00fe000000080006001400000024000900"
+    "1000000005000000080005000a000001100000000300000008000500c0000001";
+// default dev v2 scope link metric 50
+constexpr std::string_view direct =
+    "340000001800220001000000c65e000002000000fe03fd010000000008000f00fe0000000800060032000000080004000500000"
+    "0";
+// default via 192.0.0.192 dev v0 metric 100
+constexpr std::string_view viaRouter =
+    "3c0000001800220001000000c65e000002000000fe0300010000000008000f00fe000000080006006400000008000500c00000c0"
+    "0800040003000000";
+// 10.0.0.0/24 dev v2 proto kernel scope link src 10.0.0.2
+constexpr std::string_view connected =
+    "3c0000001800220001000000c65e000002180000fe02fd010000000008000f00fe000000080001000a000000080007000a000002"
+    "0800040005000000";
+
+std::string joined(std::initializer_list<std::string_view> parts) {
+    std::string all;
+    for (const std::string_view part : parts) {
+        all += part;
+    }
+    return all;
+}
+
+// With the next hop's (or the route's) flags set in the captured bytes.
+std::string with(std::string_view message, std::size_t byte, std::string_view hex) {
+    std::string changed(message);
+    return changed.replace(byte * 2, hex.size(), hex);
+}
+
+TEST(RoutesTest, DefaultRoutesComeInTheKernelsOrder) {
+    const struct {
+        const char* what;
+        std::string dump;
+        std::string_view routes;
+    } rows[] = {
+        {"the lowest metric first, whatever the order of the dump",
+         joined({viaRouter, otherTable, connected, direct, twoHops}),
+         "link 5 metric 20 via 10.0.0.1; link 5 metric 50; link 3 metric 100 via 192.0.0.192; "},
+        {"of equal metrics the first one", joined({direct, with(viaRouter, 40, "32000000")}),
+         "link 5 metric 50; link 3 metric 50 via 192.0.0.192; "},
+        {"behind one that refuses there is none", joined({viaRouter, refusing}), ""},
+        {"before it there are", joined({with(direct, 40, "09000000"), viaRouter, refusing}),
+         "link 5 metric 9; "},
+        {"a first hop without carrier", with(twoHops, 50, "10"), "link 3 metric 20 via 192.0.0.1; "},
+        {"two dead hops", with(with(twoHops, 50, "01"), 66, "01"), ""},
+        {"a dead route", with(direct, 24, "01000000"), ""},
+        {"a route without carrier", with(direct, 24, "10000000"), ""},
+        {"for one kind of traffic only", with(direct, 19, "10"), ""},
+        {"a hop with a length of its own making", with(twoHops, 48, "0000"), ""},
+        {"a hop that is longer than the row", with(twoHops, 48, "ff00"), ""},
+        {"nothing", "", ""},
+    };
+    for (const auto& row : rows) {
+        EXPECT_EQ(describe(defaultRoutesIn(messagesIn(bytesOf(row.dump)))), row.routes) << row.what;
+    }
+}
+
+TEST(RoutesTest, WhatIsCutShortIsNotReadBeyondItsEnd) {
+    const Bytes dump = bytesOf(joined({twoHops, viaRouter}));
+    const std::string whole = describe(defaultRoutesIn(messagesIn(dump)));
+    for (std::size_t length = 0; length < dump.size(); ++length) {
+        const Bytes cut(dump.begin(), dump.begin() + static_cast<std::ptrdiff_t>(length));
+        EXPECT_TRUE(whole.starts_with(describe(defaultRoutesIn(messagesIn(cut))))) << length;
+    }
+    for (std::size_t size = 0; size < dump.size() - NLMSG_HDRLEN; ++size) {
+        nlmsghdr header{};
+        header.nlmsg_type = RTM_NEWROUTE;
+        const Bytes payload(dump.begin() + NLMSG_HDRLEN,
+                            dump.begin() + static_cast<std::ptrdiff_t>(NLMSG_HDRLEN + size));
+        (void)routeIn(MessageView(header, payload));
+        header.nlmsg_type = RTM_NEWLINK;
+        (void)linkIn(MessageView(header, payload));
+    }
+}
+
+TEST(RoutesTest, OnlyUnicastAndLocalRoutesReachAnything) {
+    const struct {
+        std::string_view line;
+        std::string_view answer;
+        bool isReachable, isLocal, isDirect;
+    } rows[] = {
+        {"192.0.0.192 dev v0 src 192.0.0.199 uid 0",
+         "680000001800000001000000c65e000002200000fe0000010002000008000f00fe00000008000100c00000c008000400030"
+         "0"
+         "000008000700c00000c7080019000000000024000c000200000000000000000000000000000000000000000000000000000"
+         "0"
+         "00000000",
+         true, false, true},
+        {"local 192.0.0.199 dev lo src 192.0.0.199 uid 0",
+         "680000001800000001000000c65e000002200000fe0000020002008008000f00fe00000008000100c00000c708000400010"
+         "0"
+         "000008000700c00000c7080019000000000024000c000100000000000000000000000000000000000000000000000000000"
+         "0"
+         "00000000",
+         true, true, true},
+        {"broadcast 192.0.0.255 dev v0 src 192.0.0.199 uid 0",
+         "680000001800000001000000c65e000002200000fe0000030002009008000f00fe00000008000100c00000ff08000400030"
+         "0"
+         "000008000700c00000c7080019000000000024000c000200000000000000000000000000000000000000000000000000000"
+         "0"
+         "00000000",
+         false, false, false},
+        {"fe80::1 dev v1 metric 256",
+         "880000001800000001000000c65e00000a808000fe0200010000000008000f00fe00000014000100fe80000000000000000"
+         "0"
+         "00000000000114000200000000000000000000000000000000000800060000010000080004000200000024000c000200000"
+         "0"
+         "000000000000000000000000000000000000000000000000000000000500140000000000",
+         true, false, true},
+        {"default via 192.0.0.192 dev v0", viaRouter, true, false, false},
+        {"unreachable default", refusing, false, false, false},
+        {"an error (-101) instead",
+         "380000000200000001000000c65e00009bffffff240000001a0005000100000000000000022000000000000000000000"
+         "08000100c6336407",
+         false, false, false},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.line);
+        const std::vector<OwnedMessage> messages = messagesIn(bytesOf(row.answer));
+        ASSERT_EQ(messages.size(), 1U);
+        const auto route = routeIn(messages[0].view());
+        EXPECT_EQ(route.isReachable, row.isReachable);
+        EXPECT_EQ(route.isLocal, row.isLocal);
+        EXPECT_EQ(route.isDirect, row.isDirect);
+    }
+}
+
+TEST(RoutesTest, ALinkHasANameAndIsUpOrNot) {
+    // The head of the answer for v0, up; its length corrected.
+    constexpr std::string_view up =
+        "280000001000000001000000c65e0000000001000300000043100100000000000700030076300000";
+    for (const bool isUp : {true, false}) {
+        const std::string bytes = isUp ? std::string(up) : with(up, 24, "42100100");
+        const std::vector<OwnedMessage> messages = messagesIn(bytesOf(bytes));
+        ASSERT_EQ(messages.size(), 1U);
+        const auto link = linkIn(messages[0].view());
+        ASSERT_TRUE(link);
+        EXPECT_EQ(link->name, "v0");
+        EXPECT_EQ(link->isUp, isUp);
+    }
+}
+
+TEST(RoutesTest, QuestionsAreWhatTheKernelExpects) {
+    Destination printer;
+    std::memcpy(printer.address.data(), "\xC0\0\0\xC0", 4);
+    EXPECT_EQ(hexOf(platform::live::askForRouteTo(printer).bytes()),
+              "240000001a0005000000000000000000022000000000000000000000"
+              "08000100c00000c0");
+    Destination neighbour;
+    neighbour.family = AF_INET6;
+    neighbour.interfaceIndex = 3;
+    ASSERT_EQ(inet_pton(AF_INET6, "fe80::1", neighbour.address.data()), 1);
+    EXPECT_EQ(hexOf(platform::live::askForRouteTo(neighbour).bytes()),
+              "380000001a00050000000000000000000a8000000000000000000000"
+              "14000100fe800000000000000000000000000001"
+              "0800040003000000");
+    EXPECT_EQ(hexOf(platform::live::askForRoutes().bytes()),
+              "1c0000001a0001030000000000000000"
+              "02000000fe00000000000000");
+    EXPECT_EQ(hexOf(platform::live::askForLink(7).bytes()),
+              "20000000120005000000000000000000000000000700000000000000"
+              "00000000");
+}
+
+}  // namespace
+}  // namespace live_test
