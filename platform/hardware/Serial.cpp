@@ -75,6 +75,10 @@ std::vector<EntryRef> scanSerial(const std::string& sysfsRoot) {
     const std::vector<std::string> consoles = activeConsoles(*root);
     for (const std::string& name : namesIn(*root + "/class/tty")) {
         const std::string node = *root + "/class/tty/" + name;
+        // Most terminals have no hardware, and asking is cheaper than following every link on the way.
+        if (!exists(node + "/device")) {
+            continue;
+        }
         const auto device = resolved(node + "/device");
         constexpr std::string_view noUart = "0";
         if (!device || readAttribute(node + "/type") == noUart ||

@@ -1,6 +1,7 @@
 // A server on loopback that treats each connection as a test wants it to.
 #pragma once
 
+#include <arpa/inet.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -22,21 +23,18 @@ class LoopbackServer {
     // talk gets each connection in turn, after the request's header was read into it.
     using Talk = std::function<void(int connection, const std::string& request)>;
 
-    explicit LoopbackServer(Talk talk, bool overIPv6 = false)
-        : listener_(socket(overIPv6 ? AF_INET6 : AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-        sockaddr_in four{};
-        sockaddr_in6 six{};
-        four.sin_family = AF_INET;
-        four.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        six.sin6_family = AF_INET6;
-        six.sin6_addr = in6addr_loopback;
-        auto* address = overIPv6 ? reinterpret_cast<sockaddr*>(&six) : reinterpret_cast<sockaddr*>(&four);
-        socklen_t length = overIPv6 ? sizeof six : sizeof four;
-        if (bind(listener_.get(), address, length) != 0 || listen(listener_.get(), 8) != 0 ||
-            getsockname(listener_.get(), address, &length) != 0) {
+    explicit LoopbackServer(Talk talk, const char* address = "::ffff:127.0.0.1")
+        : listener_(socket(AF_INET6, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+        sockaddr_in6 place{};
+        place.sin6_family = AF_INET6;
+        auto* generic = reinterpret_cast<sockaddr*>(&place);
+        socklen_t length = sizeof place;
+        if (inet_pton(AF_INET6, address, &place.sin6_addr) != 1 ||
+            bind(listener_.get(), generic, length) != 0 || listen(listener_.get(), 8) != 0 ||
+            getsockname(listener_.get(), generic, &length) != 0) {
             throw std::runtime_error("no server on loopback");
         }
-        port_ = ntohs(overIPv6 ? six.sin6_port : four.sin_port);
+        port_ = ntohs(place.sin6_port);
         thread_ = std::thread([this, talk = std::move(talk)] { serve(talk); });
     }
     ~LoopbackServer() {

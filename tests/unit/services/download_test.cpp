@@ -191,7 +191,7 @@ TEST_F(Download, TalksIPv6AndDropsTheFragment) {
             request = received;
             LoopbackServer::say(connection, "HTTP/1.1 200 OK\r\nContent-Length: 2\r\n\r\nv6");
         },
-        true);
+        "::1");
     EXPECT_EQ(fetch("HTTP://[::1]:" + std::to_string(server.port()) + "?a=b#c"), 0);
     EXPECT_EQ(content(), "v6");
     EXPECT_TRUE(request.starts_with("GET /?a=b HTTP/1.1\r\n")) << request;

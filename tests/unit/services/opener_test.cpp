@@ -114,8 +114,8 @@ class DesktopTest : public testing::Test {
 };
 
 TEST_F(DesktopTest, RunsTheProgramAsTheUserWithACleanEnvironment) {
-    const auto session = desktop.serve(
-        {}, {"DISPLAY=:3", "XAUTHORITY=/run/x", "LD_PRELOAD=/evil.so", "PATH=/evil", "DISPLAYS=no"});
+    const auto session = desktop.serve({.environment = {"DISPLAY=:3", "XAUTHORITY=/run/x",
+                                                        "LD_PRELOAD=/evil.so", "PATH=/evil", "DISPLAYS=no"}});
     setenv("DISPLAY", ":99", 1);
     setenv("SECRET", "of root", 1);
     const auto previous = std::signal(SIGPIPE, SIG_IGN);
@@ -158,7 +158,7 @@ TEST_F(DesktopTest, RunsTheProgramAsTheUserWithACleanEnvironment) {
 TEST_F(DesktopTest, TakesTheSessionsDisplayWhenTheUsersManagerIsSilent) {
     const auto session = desktop.serve({});
     platform::services::Desktop on = desktop.withProgram(recorder());
-    on.runtimeRoot = desktop.directory().at("elsewhere");
+    on.runtimeRoot = desktop.at("elsewhere");
     std::filesystem::create_directories(on.runtimeRoot + "/65534");
     const MuteBus bus(on.runtimeRoot + "/65534/bus");
     EXPECT_EQ(openOn(on, desktop.systemBus()), 0);
@@ -205,23 +205,19 @@ TEST_F(DesktopTest, OpensNothingWithoutAUsersDesktop) {
         EXPECT_NE(log[0].find(reason), std::string::npos) << log[0];
     }
     EXPECT_EQ(openOn(on, desktop.systemBus()), fnfErr) << "no login manager";
-    EXPECT_EQ(openOn(on, desktop.directory().at("no bus")), fnfErr);
+    EXPECT_EQ(openOn(on, desktop.at("no bus")), fnfErr);
     EXPECT_NE(access(desktop.record().c_str(), F_OK), 0);
 }
 
 TEST_F(DesktopTest, ReportsAProgramThatCannotBeRun) {
     const auto session = desktop.serve({});
-    EXPECT_EQ(
-        openOn({desktop.runtimeRoot(), {{desktop.directory().at("not-installed")}}}, desktop.systemBus()),
-        fnfErr);
-    EXPECT_EQ(openOn({desktop.runtimeRoot(), {{desktop.directory().write("not-executable", "")}}},
-                     desktop.systemBus()),
-              permErr);
+    EXPECT_EQ(openOn({desktop.runtimeRoot(), {{desktop.at("not-installed")}}}, desktop.systemBus()), fnfErr);
+    EXPECT_EQ(openOn({desktop.runtimeRoot(), {{desktop.systemBus()}}}, desktop.systemBus()), permErr);
 }
 
 TEST_F(DesktopTest, GivesUpOnASystemBusThatIsMute) {
-    const MuteBus bus(desktop.directory().at("mute"));
-    EXPECT_EQ(openOn(desktop.withProgram(""), desktop.directory().at("mute")), fnfErr);
+    const MuteBus bus(desktop.at("mute"));
+    EXPECT_EQ(openOn(desktop.withProgram(""), desktop.at("mute")), fnfErr);
     ASSERT_EQ(log.size(), 1U);
     EXPECT_NE(log[0].find("timed out"), std::string::npos) << log[0];
 }
