@@ -73,18 +73,18 @@ std::optional<std::int64_t> secondsFrom(std::string_view text) {
     return midnight + *hours * 3600LL + *minutes * 60LL + *seconds;
 }
 
-constexpr std::array<std::int8_t, 256> makeBase64Values() {
-    std::array<std::int8_t, 256> values{};
+constexpr std::array<std::int16_t, 256> makeBase64Values() {
+    std::array<std::int16_t, 256> values{};
     values.fill(-1);
     constexpr std::string_view alphabet = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
     for (std::size_t i = 0; i < alphabet.size(); ++i) {
-        values[static_cast<unsigned char>(alphabet[i])] = static_cast<std::int8_t>(i);
+        values[static_cast<unsigned char>(alphabet[i])] = static_cast<std::int16_t>(i);
     }
     return values;
 }
 
 std::optional<std::string> bytesFromBase64(std::string_view text) {
-    static constexpr std::array<std::int8_t, 256> values = makeBase64Values();
+    static constexpr std::array<std::int16_t, 256> values = makeBase64Values();
     std::string bytes;
     bytes.reserve(text.size() / 4 * 3);
     std::uint32_t group = 0;

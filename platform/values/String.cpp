@@ -1,4 +1,4 @@
-#include <sys/auxv.h>
+#include <sys/random.h>
 
 #include <cassert>
 #include <cstring>
@@ -42,11 +42,11 @@ std::uint64_t shortWord(std::string_view bytes) noexcept {
 }  // namespace
 
 std::uint32_t platform::values::hashOfText(std::string_view text) noexcept {
-    // A different one in every process, from the random bytes that the kernel hands each program at its
-    // start, so that nobody can write a file whose keys all meet in one place of the index.
+    // A different one in every process, so that nobody can write a file whose keys all meet in one place of
+    // the index.
     static const std::uint64_t seed = [] {
-        const unsigned long address = getauxval(AT_RANDOM);
-        return address != 0 ? wordAt<std::uint64_t>(reinterpret_cast<const char*>(address)) : firstOdd;
+        std::uint64_t random = firstOdd;
+        return ::getrandom(&random, sizeof random, GRND_NONBLOCK) == sizeof random ? random : firstOdd;
     }();
     std::uint64_t state = seed ^ text.size();
     while (text.size() > 8) {

@@ -32,20 +32,17 @@ bool appendFormatted(std::string& text, const std::string& directive, Argument a
     return true;
 }
 
-// The arguments of a call, so that they can be taken in more than one place.
+// The arguments of a call, which must outlive it, so that they can be taken in more than one place.
 class Arguments {
   public:
-    explicit Arguments(std::va_list list) { va_copy(list_, list); }
-    ~Arguments() { va_end(list_); }
-    Arguments(const Arguments&) = delete;
-    Arguments& operator=(const Arguments&) = delete;
+    explicit Arguments(std::va_list* list) : list_(list) {}
     template <class T>
     T next() {
-        return va_arg(list_, T);
+        return va_arg(*list_, T);
     }
 
   private:
-    std::va_list list_;
+    std::va_list* list_;
 };
 
 // Takes one directive from the front of the format, its '%' included.
@@ -108,25 +105,28 @@ bool appendConversion(std::string& text, const Conversion& conversion, Arguments
     }
 }
 
+std::optional<std::string> formatted(std::string_view format, Arguments arguments) {
+    std::string text;
+    while (!format.empty()) {
+        const std::size_t plain = std::min(format.find('%'), format.size());
+        text.append(format.substr(0, plain));
+        format.remove_prefix(plain);
+        if (!format.empty()) {
+            const std::optional<Conversion> conversion = takeConversion(format, arguments);
+            if (!conversion.has_value() || !appendConversion(text, *conversion, arguments)) {
+                return std::nullopt;
+            }
+        }
+    }
+    return text;
+}
+
 }  // namespace
 
 CFStringRef CFStringCreateWithFormat(CFAllocatorRef, CFDictionaryRef, CFStringRef format, ...) {
     std::va_list list;
     va_start(list, format);
-    Arguments arguments(list);
+    const std::optional<std::string> text = formatted(format->text(), Arguments(&list));
     va_end(list);
-    std::string text;
-    std::string_view rest = format->text();
-    while (!rest.empty()) {
-        const std::size_t plain = std::min(rest.find('%'), rest.size());
-        text.append(rest.substr(0, plain));
-        rest.remove_prefix(plain);
-        if (!rest.empty()) {
-            const std::optional<Conversion> conversion = takeConversion(rest, arguments);
-            if (!conversion.has_value() || !appendConversion(text, *conversion, arguments)) {
-                return nullptr;
-            }
-        }
-    }
-    return makeString(text).take();
+    return text.has_value() ? makeString(*text).take() : nullptr;
 }
