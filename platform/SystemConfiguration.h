@@ -55,8 +55,8 @@ CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef ke
 // next ones.
 Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPropertyListRef value);
 // The dictionary at a path of slash-separated keys ("/Sets/0/Network"); borrowed as above. Links are not
-// followed; "/" is the whole tree. Null: 1004 when nothing is there, 1001 when what is there, or on the way, is
-// not a dictionary, 1002 for a malformed path (no leading slash, an empty key).
+// followed; "/" is the whole tree. Null: 1004 when nothing is there, 1001 when what is there, or on the way,
+// is not a dictionary, 1002 for a malformed path (no leading slash, an empty key).
 CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path);
 // Stores the dictionary, as it is now, at the path, making missing dictionaries on the way. 1001 when
 // something on the way is not a dictionary.
@@ -66,13 +66,14 @@ Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path, CF
 CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path);
 // Removes whatever is at the path. False: 1004 when nothing is there, 1001, 1002.
 Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path);
-// Writes the changed tree, all of it or nothing; an unchanged tree is not written again. False: 3005 when the
-// file is no longer the one that was read, 3002 when another process holds the lock for ten seconds, 1003, 1001
-// (among other reasons when the tree holds a string that XML cannot carry). The session keeps its changes then.
+// Writes the changed tree, all of it or nothing; an unchanged tree is not written again. False: 3005 when
+// the file is no longer the one that was read, 3002 when another process holds the lock for ten seconds,
+// 1003, 1001 (among other reasons when the tree holds a string that XML cannot carry). The session keeps its
+// changes then.
 Boolean SCPreferencesCommitChanges(SCPreferencesRef session);
-// Makes the current location, as it is committed now, the active configuration and returns when its interfaces are up, have
-// failed, or a bounded wait is over. False: 1001 with the reason in the system log, 1003, 1004 when
-// "CurrentSet" names no location.
+// Makes the current location, as it is committed now, the active configuration and returns when its
+// interfaces are up, have failed, or a bounded wait is over. False: 1001 with the reason in the system log,
+// 1003, 1004 when "CurrentSet" names no location.
 Boolean SCPreferencesApplyChanges(SCPreferencesRef session);
 
 // --- Dynamic store: the live network state ---
@@ -93,10 +94,11 @@ extern const CFStringRef kSCDynamicStoreDomainState;  // "State:"
 extern const CFStringRef kSCDynamicStoreDomainSetup;  // "Setup:"
 extern const CFStringRef kSCEntNetIPv4;               // "IPv4"
 
-// A session on the live state, released with CFRelease. name, which is for the log, may be null; callBack and
-// context may be null when no notices are wanted. The state is computed when it is asked for, from the kernel
-// and from the committed preferences; the keys are "State:/Network/Global/IPv4" and, for what is switched on in
-// the current location, "Setup:/Network/Global/<entity>" and "Setup:/Network/Service/<serviceID>/<entity>".
+// A session on the live state, released with CFRelease. name, which is for the log, may be null; callBack
+// and context may be null when no notices are wanted. The state is computed when it is asked for, from the
+// kernel and from the committed preferences; the keys are "State:/Network/Global/IPv4" and, for what is
+// switched on in the current location, "Setup:/Network/Global/<entity>" and
+// "Setup:/Network/Service/<serviceID>/<entity>".
 SCDynamicStoreRef SCDynamicStoreCreate(CFAllocatorRef allocator, CFStringRef name,
                                        SCDynamicStoreCallBack callBack, SCDynamicStoreContext* context);
 // "<domain>/Network/Global/<entity>".
@@ -118,9 +120,9 @@ CFPropertyListRef SCDynamicStoreCopyValue(SCDynamicStoreRef store, CFStringRef k
 // 1002 when something in them is no string or a pattern is malformed, 1001 or 1003 when the state cannot be
 // read; nothing is replaced then.
 Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef keys, CFArrayRef patterns);
-// A source that calls the session's callback with the keys whose values changed. Changes that come within a few
-// hundredths of a second are reported at once, and a value that is again what it was is not reported. The source
-// retains the session. order is 0. Null on failure.
+// A source that calls the session's callback with the keys whose values changed. Changes that come within a
+// few hundredths of a second are reported at once, and a value that is again what it was is not reported.
+// The source retains the session. order is 0. Null on failure.
 CFRunLoopSourceRef SCDynamicStoreCreateRunLoopSource(CFAllocatorRef allocator, SCDynamicStoreRef store,
                                                      CFIndex order);
 
@@ -131,10 +133,10 @@ inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsReachable = 1U << 1U;
 inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsIsLocalAddress = 1U << 16U;
 inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsIsDirect = 1U << 17U;
 
-// Asks the kernel for a route, and sends nothing. True when the question could be answered; the flags then tell
-// the answer, 0 when there is no route that leads anywhere: reachable for a unicast route or an address of this
-// computer, with "local" for the latter and "direct" when no gateway is on the way. On false (1002: no address
-// of IPv4 or IPv6, or a length that is too small for it; 1001) they are left as they were.
+// Asks the kernel for a route, and sends nothing. True when the question could be answered; the flags then
+// tell the answer, 0 when there is no route that leads anywhere: reachable for a unicast route or an address
+// of this computer, with "local" for the latter and "direct" when no gateway is on the way. On false (1002:
+// no address of IPv4 or IPv6, or a length that is too small for it; 1001) they are left as they were.
 //
 // A name that is not an address in figures is looked up first, as every program does, which may well send
 // something and take its time; one that has no address is not reachable.
