@@ -1,4 +1,5 @@
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <array>
 #include <chrono>
@@ -15,6 +16,8 @@
 #include "platform/apply/Agents.h"
 #include "platform/apply/Apply.h"
 #include "platform/apply/StateFile.h"
+#include "platform/apply/direct/Supplicant.h"
+#include "tests/unit/apply/StandInSupplicant.h"
 #include "tests/unit/apply/Trees.h"
 #include "tests/unit/support/Interrupted.h"
 #include "tests/unit/support/PrivateNetwork.h"
@@ -270,10 +273,24 @@ TEST_F(DirectAgentTest, LeavesAnInterfaceThatSomebodyElseTookOver) {
     }
 }
 
+// The command for a daemon: installed, or unpacked for the laboratory by scripts/install-dependencies. Empty
+// when it is neither.
+std::string commandFor(const std::string& name) {
+    if (testing_support::hasProgram(name)) {
+        return name;
+    }
+    const std::string usr = LA_LABORATORY "/usr";
+    const std::string program = usr + "/sbin/" + name;
+    return access(program.c_str(), X_OK) != 0
+               ? ""
+               : "env LD_LIBRARY_PATH=" + usr + "/lib/" LA_LIBRARY_ARCHITECTURE " " + program;
+}
+
 // A DHCP server in a network of its own at the far end of card0's cable. It ends with the test's namespaces.
 class DhcpServer {
   public:
-    explicit DhcpServer(const std::string& options =
+    explicit DhcpServer(const std::string& dnsmasq,
+                        const std::string& options =
                             "--dhcp-option=3,10.50.0.1 --dhcp-option=6,10.50.0.53 "
                             "--dhcp-option=15,example.org") {
         std::array<int, 2> gate{};
@@ -285,7 +302,9 @@ class DhcpServer {
             char go = 0;
             const std::string command =
                 "ip addr add 10.50.0.1/24 dev far0; ip link set lo up; ip link set far0 up;"
-                "exec dnsmasq --no-daemon --conf-file=/dev/null --port=0 --interface=far0 --bind-interfaces"
+                "exec " +
+                dnsmasq +
+                " --no-daemon --conf-file=/dev/null --port=0 --interface=far0 --bind-interfaces"
                 " --dhcp-range=10.50.0.10,10.50.0.10,255.255.255.0,1h --dhcp-leasefile=/var/leases --no-ping"
                 " --dhcp-authoritative --log-dhcp --user=root --pid-file= " +
                 options + " >/var/dnsmasq.log 2>&1";
@@ -315,13 +334,15 @@ class DhcpServer {
 };
 
 TEST_F(DirectAgentTest, TakesALeaseAndGivesItBack) {
-    if (!testing_support::hasProgram("dnsmasq") || !testing_support::hasProgram("busybox")) {
-        GTEST_SKIP() << "needs dnsmasq and busybox";
+    const std::string dnsmasq = commandFor("dnsmasq");
+    if (dnsmasq.empty() || !testing_support::hasProgram("busybox")) {
+        testing_support::skip("needs dnsmasq and busybox");
+        return;
     }
-    run([] {
+    run([&dnsmasq] {
         shell(
             "echo 'nameserver 9.9.9.9' > /run/real; ln -s /run/real /etc/resolv.conf; ip link set card0 up");
-        const DhcpServer server;
+        const DhcpServer server(dnsmasq);
         const std::string before = machineState();
         const auto agent = makeDirectAgent();
         const std::vector<std::string> cards{"card0"};
@@ -355,6 +376,99 @@ TEST_F(DirectAgentTest, TakesALeaseAndGivesItBack) {
         EXPECT_EQ(before, machineState());
         EXPECT_EQ("/run/real\n", shell("readlink /etc/resolv.conf"));
         EXPECT_EQ("", shell("grep -l '[u]dhcpc' /proc/[0-9]*/cmdline 2>/dev/null || true"));
+    });
+}
+
+TEST_F(DirectAgentTest, ALeaseThatCannotBeHadFailsAndIsUndone) {
+    run([] {
+        const std::string before = machineState();
+        Host host = currentHost();
+        host.dhcpHook = "/bin/false";
+        host.dhcpClient = "/bin/false";
+        const HostOverride override(host);
+        const auto there =
+            makeTree({{"card0", "<key>IPv4</key><dict><key>ConfigMethod</key><string>DHCP</string></dict>"}});
+        const Outcome outcome = applyTree(there.get());
+        EXPECT_EQ(kSCStatusFailed, outcome.status());
+        EXPECT_EQ("the DHCP client ended before it had a lease", outcome.reason());
+        expectOk(applyTree(makeTree({}).get()));
+        EXPECT_EQ(before, machineState());
+    });
+}
+
+Service printerNetwork() {
+    Service service = fixedService("card0");
+    service.entries +=
+        "<key>AirPort</key><dict><key>PreferredNetwork</key><string>printer</string><key>AuthPassword</key>"
+        "<data>AEMAQQBOAEEAUgBZAEMAQQBOAEEAUgBZ</data></dict>";  // "CANARYCANARY"
+    return service;
+}
+
+TEST_F(DirectAgentTest, JoinsANetworkThroughTheSupplicant) {
+    run([] {
+        const std::string before = machineState();
+        const auto there = makeTree({printerNetwork()});
+        const auto back = makeTree({});
+        // Nobody is there to join it, but all the rest is made, and undone.
+        EXPECT_EQ("joining a wireless network needs NetworkManager or a wireless supplicant",
+                  applyTree(there.get()).reason());
+        EXPECT_EQ("192.0.0.199/24 \n", addressesOf("card0"));
+        expectOk(applyTree(back.get()));
+        EXPECT_EQ(before, machineState());
+
+        mkdir("/run/wpa_supplicant", 0700);
+        StandInSupplicant supplicant("/run/wpa_supplicant/card0");
+        supplicant.networks[4] = {{{"ssid", "\"home\""}}, false};
+        expectOk(applyTree(there.get()));
+        EXPECT_EQ(5, supplicant.current());
+        EXPECT_EQ("\"CANARYCANARY\"", supplicant.networks[5].values["psk"]);
+        EXPECT_EQ("", shell("grep -rl -e CANARY -e Q0FOQVJZ " + currentHost().runtimeDirectory + " || true"));
+        // The same network with another address: it stays joined.
+        supplicant.changes();
+        Service other = printerNetwork();
+        other.entries.replace(other.entries.find("192.0.0.199"), 11, "192.0.0.200");
+        expectOk(applyTree(makeTree({other}).get()));
+        EXPECT_EQ(std::vector<std::string>{}, supplicant.changes());
+        EXPECT_EQ("192.0.0.200/24 \n", addressesOf("card0"));
+        // A plan without a network leaves it, and so does the way back.
+        expectOk(applyTree(makeTree({fixedService("card0")}).get()));
+        EXPECT_EQ((std::vector<std::string>{"ENABLE_NETWORK 4", "REMOVE_NETWORK 5"}), supplicant.changes());
+        expectOk(applyTree(there.get()));
+        expectOk(applyTree(back.get()));
+        EXPECT_EQ(1U, supplicant.networks.size());
+        EXPECT_FALSE(supplicant.networks[4].isDisabled);
+        EXPECT_EQ(before, machineState());
+    });
+}
+
+// A supplicant without a radio takes the whole conversation, and never gets onto the network.
+TEST_F(DirectAgentTest, TalksToARealSupplicant) {
+    const std::string program = commandFor("wpa_supplicant");
+    if (program.empty()) {
+        testing_support::skip("needs wpa_supplicant");
+        return;
+    }
+    run([&program] {
+        const TemporaryDirectory folder;
+        const std::string configuration = folder.write(
+            "conf", "ctrl_interface=DIR=/run/wpa_supplicant\nnetwork={\nssid=\"home\"\nkey_mgmt=NONE\n}\n");
+        shell("ip link set card0 up; " + program + " -B -i card0 -D wired -c " + configuration +
+              " -f /run/log");
+        std::optional<KnownNetworks> before;
+        expectOk(readKnownNetworks("card0", before));
+        ASSERT_TRUE(before);
+        EXPECT_EQ(std::vector<int>{0}, before->enabled);
+        const auto soon = std::chrono::steady_clock::now() + std::chrono::milliseconds(300);
+        EXPECT_EQ("the wireless supplicant did not get onto the network in time",
+                  joinNetwork("card0", {{}, "printer", "p\"ss wörd"}, false, soon).reason());
+        std::optional<KnownNetworks> now;
+        expectOk(readKnownNetworks("card0", now));
+        EXPECT_EQ((std::vector<int>{0, 1}), now->all);
+        EXPECT_EQ(std::vector<int>{1}, now->enabled);
+        expectOk(leaveNetwork("card0", before));
+        expectOk(readKnownNetworks("card0", now));
+        EXPECT_EQ(before->all, now->all);
+        EXPECT_EQ(before->enabled, now->enabled);
     });
 }
 

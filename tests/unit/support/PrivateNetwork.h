@@ -40,6 +40,14 @@ inline bool hasProgram(const std::string& name) {
     return std::system(("command -v " + name + " >/dev/null 2>&1").c_str()) == 0;
 }
 
+// For a test that needs something that is not here; the test returns after it.
+inline void skip(const std::string& reason) {
+    if (const char* forbidden = std::getenv("LA_FORBID_SKIPS"); forbidden != nullptr && *forbidden == '1') {
+        FAIL() << reason << ", and skips are forbidden";
+    }
+    GTEST_SKIP() << reason;
+}
+
 class PrivateNetwork {
   public:
     // True when namespaces can be made here. Otherwise the test is to skip, which LA_FORBID_SKIPS=1 forbids.
@@ -116,11 +124,7 @@ class PrivateNetworkTest : public testing::Test {
     void SetUp() override {
         static const bool isAvailable = PrivateNetwork::isAvailable();
         if (!isAvailable) {
-            if (const char* forbidden = std::getenv("LA_FORBID_SKIPS");
-                forbidden != nullptr && *forbidden == '1') {
-                FAIL() << "no private namespaces here, and skips are forbidden";
-            }
-            GTEST_SKIP() << "needs user, network and mount namespaces, and ip";
+            skip("needs user, network and mount namespaces, and ip");
         }
     }
 };
