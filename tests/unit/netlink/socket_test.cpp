@@ -1,0 +1,91 @@
+#include "platform/netlink/Socket.h"
+
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <string>
+#include <vector>
+
+#include "tests/unit/support/PrivateNetwork.h"
+
+namespace platform::netlink {
+namespace {
+
+using testing_support::PrivateNetwork;
+using testing_support::PrivateNetworkTest;
+using testing_support::shell;
+
+std::vector<std::string> linkNames(Socket& socket) {
+    std::vector<OwnedMessage> messages;
+    const Outcome done = socket.dump(Message(RTM_GETLINK, NLM_F_REQUEST | NLM_F_DUMP, ifinfomsg{}), messages);
+    EXPECT_TRUE(done.ok()) << done.reason();
+    std::vector<std::string> names;
+    for (const OwnedMessage& message : messages) {
+        names.emplace_back(message.view().attributes<ifinfomsg>().find(IFLA_IFNAME)->text());
+    }
+    return names;
+}
+
+Message linkCalled(const std::string& name) {
+    return std::move(Message(RTM_GETLINK, NLM_F_REQUEST | NLM_F_ACK, ifinfomsg{}).addText(IFLA_IFNAME, name));
+}
+
+class SocketTest : public PrivateNetworkTest {};
+
+TEST_F(SocketTest, AsksDumpsAndExplains) {
+    PrivateNetwork::run([] {
+        shell("ip link add card0 type veth peer name far0");
+        Socket socket;
+        ASSERT_TRUE(socket.open().ok());
+        EXPECT_EQ((std::vector<std::string>{"lo", "far0", "card0"}), linkNames(socket));
+        OwnedMessage answer;
+        EXPECT_TRUE(socket.ask(linkCalled("card0"), answer).ok());
+        EXPECT_EQ(3, answer.view().family<ifinfomsg>()->ifi_index);
+        EXPECT_TRUE(socket.ask(linkCalled("none"), answer, {ENODEV}).ok());
+        EXPECT_EQ(0, answer.header.nlmsg_type);
+        EXPECT_EQ("the kernel refused a netlink request: No such device",
+                  socket.request(linkCalled("none")).reason());
+
+        rtmsg route{};
+        route.rtm_family = AF_INET;
+        route.rtm_scope = 255;
+        const Outcome refused =
+            socket.request(Message(RTM_NEWROUTE, NLM_F_REQUEST | NLM_F_ACK | NLM_F_CREATE, route));
+        EXPECT_EQ(kSCStatusFailed, refused.status());
+        // With the kernel's own words, which differ from one to the next.
+        EXPECT_EQ(0U, refused.reason().find("the kernel refused a netlink request (Invalid "))
+            << refused.reason();
+        EXPECT_EQ(3U, linkNames(socket).size());
+    });
+}
+
+TEST_F(SocketTest, ReceivesNoticesAndTellsOfLostOnes) {
+    PrivateNetwork::run([] {
+        Socket socket;
+        ASSERT_TRUE(socket.open(RTMGRP_IPV4_IFADDR).ok());
+        Bytes datagram;
+        bool received = true;
+        bool overrun = true;
+        EXPECT_TRUE(socket.receiveNotices(datagram, received, overrun).ok());
+        EXPECT_FALSE(received || overrun);
+        shell("ip addr add 10.0.0.1/8 dev lo");
+        EXPECT_TRUE(socket.receiveNotices(datagram, received, overrun).ok());
+        ASSERT_TRUE(received);
+        ByteView rest = datagram;
+        EXPECT_EQ(RTM_NEWADDR, takeMessage(rest)->type());
+
+        const int small = 2048;
+        setsockopt(socket.descriptor(), SOL_SOCKET, SO_RCVBUF, &small, sizeof small);
+        shell("for i in $(seq 40); do ip addr add 10.0.$i.1/24 dev lo; done");
+        bool wasOverrun = false;
+        do {
+            EXPECT_TRUE(socket.receiveNotices(datagram, received, overrun).ok());
+            wasOverrun = wasOverrun || overrun;
+        } while (received || overrun);
+        EXPECT_TRUE(wasOverrun);
+    });
+}
+
+}  // namespace
+}  // namespace platform::netlink
