@@ -7,7 +7,7 @@
 // function says so.
 //
 // Strings are UTF-8 inside. Lengths, indices and characters count UTF-16 code units. The system's text
-// encoding is UTF-8, and bytes that are not well-formed UTF-8 make no string.
+// encoding is UTF-8, and bytes that are not well-formed UTF-8, or more than 2 GiB of them, make no string.
 #pragma once
 
 #include <cstddef>
@@ -144,7 +144,8 @@ Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix);
 // Without flags a literal comparison by code point. kCFCompareLocalized compares by the root collation, with
 // kCFCompareCaseInsensitive and kCFCompareNumerically as they say; the two also work without it.
 CFComparisonResult CFStringCompare(CFStringRef lhs, CFStringRef rhs, CFStringCompareFlags flags);
-// The first occurrence, searched literally, or location kCFNotFound and length 0. flags is 0.
+// The first occurrence, searched literally, or location kCFNotFound and length 0, as for an empty string.
+// flags is 0.
 CFRange CFStringFind(CFStringRef string, CFStringRef wanted, CFStringCompareFlags flags);
 void CFStringReplace(CFMutableStringRef string, CFRange range, CFStringRef replacement);
 // Lower case by the root locale. locale is null.
@@ -169,8 +170,8 @@ inline constexpr CFNumberType kCFNumberLongType = kCFNumberSInt32Type;
 
 CFTypeID CFNumberGetTypeID();
 CFNumberRef CFNumberCreate(CFAllocatorRef allocator, CFNumberType type, const void* value);
-// False when the number cannot be given in the type without loss; the value is then written as far as it
-// goes.
+// False when the number cannot be given in the type without loss; the value is then the nearest one of the
+// type on the way to zero.
 Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value);
 // True for a number that holds a real.
 Boolean CFNumberIsFloatType(CFNumberRef number);

@@ -10,7 +10,7 @@ using namespace platform::values;
 namespace {
 
 struct Conversion {
-    std::string directive;  // as printf takes it, with the widths that came as arguments put in
+    std::string directive;  // as printf takes it
     bool isLong = false;
     char kind = '\0';
 };
@@ -46,7 +46,7 @@ class Arguments {
 };
 
 // Takes one directive from the front of the format, its '%' included.
-std::optional<Conversion> takeConversion(std::string_view& format, Arguments& arguments) {
+std::optional<Conversion> takeConversion(std::string_view& format) {
     Conversion conversion;
     const auto take = [&] {
         const char next = format.empty() ? '\0' : format.front();
@@ -57,14 +57,9 @@ std::optional<Conversion> takeConversion(std::string_view& format, Arguments& ar
     };
     char next = take();
     conversion.directive.push_back(next);
-    for (next = take();
-         next != '\0' && std::string_view("-+ #0.*123456789").find(next) != std::string_view::npos;
-         next = take()) {
-        if (next == '*') {
-            conversion.directive += std::to_string(arguments.next<int>());
-        } else {
-            conversion.directive.push_back(next);
-        }
+    constexpr std::string_view flagsAndSizes = "-+ #.0123456789";
+    for (next = take(); next != '\0' && flagsAndSizes.find(next) != std::string_view::npos; next = take()) {
+        conversion.directive.push_back(next);
     }
     if (next == 'l') {
         conversion.isLong = true;
@@ -81,6 +76,9 @@ std::optional<Conversion> takeConversion(std::string_view& format, Arguments& ar
 
 bool appendConversion(std::string& text, const Conversion& conversion, Arguments& arguments) {
     const std::string& directive = conversion.directive;
+    if (conversion.isLong && std::string_view("diux").find(conversion.kind) == std::string_view::npos) {
+        return false;
+    }
     switch (conversion.kind) {
         case 'd':
         case 'i':
@@ -112,7 +110,7 @@ std::optional<std::string> formatted(std::string_view format, Arguments argument
         text.append(format.substr(0, plain));
         format.remove_prefix(plain);
         if (!format.empty()) {
-            const std::optional<Conversion> conversion = takeConversion(format, arguments);
+            const std::optional<Conversion> conversion = takeConversion(format);
             if (!conversion.has_value() || !appendConversion(text, *conversion, arguments)) {
                 return std::nullopt;
             }

@@ -152,12 +152,13 @@ TEST(String, IsFormatted) {
         return descriptionOf(Owned<CFStringRef>::adopt(string).get());
     };
     EXPECT_EQ(own(CFStringCreateWithFormat(
-                  nullptr, nullptr, CFSTR("%@|%@|%d %5.3i|%-4u|%ld|%lu|%.2s|%c|%#x|%*d|100%%"),
-                  CFSTR("\xC3\xA4"), nullptr, -1, 7, 8U, -(1L << 40), 1UL << 40, "cut", 'c', 255U, 3, 4)),
-              "\xC3\xA4|(null)|-1   007|8   |-1099511627776|1099511627776|cu|c|0xff|  4|100%");
+                  nullptr, nullptr, CFSTR("%@|%@|%d %5.3i|%-4u|%ld|%lu|%.2s|%c|%#x|%05d|100%%"),
+                  CFSTR("\xC3\xA4"), nullptr, -1, 7, 8U, -(1L << 40), 1UL << 40, "cut", 'c', 255U, -42)),
+              "\xC3\xA4|(null)|-1   007|8   |-1099511627776|1099511627776|cu|c|0xff|-0042|100%");
     EXPECT_EQ(own(CFStringCreateWithFormat(nullptr, nullptr, CFSTR("%.1s"), "\xC3\xA4")), "(null)");
-    EXPECT_EQ(own(CFStringCreateWithFormat(nullptr, nullptr, CFSTR("%n"))), "(null)");
-    EXPECT_EQ(own(CFStringCreateWithFormat(nullptr, nullptr, CFSTR("50%"))), "(null)");
+    for (const CFStringRef format : {CFSTR("%n"), CFSTR("%*d"), CFSTR("%ls"), CFSTR("50%")}) {
+        EXPECT_EQ(own(CFStringCreateWithFormat(nullptr, nullptr, format, 1, 2)), "(null)");
+    }
 }
 
 }  // namespace
