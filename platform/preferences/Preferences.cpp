@@ -1,5 +1,6 @@
 // The operations of SystemConfiguration.h on the preferences store.
 #include <string>
+#include <utility>
 
 #include "platform/Host.h"
 #include "platform/SystemConfiguration.h"
@@ -16,6 +17,8 @@ using platform::preferences::setStatus;
 using platform::values::as;
 using platform::values::Owned;
 using platform::values::textOf;
+
+constexpr int mostApplies = 5;
 
 Boolean answer(int status) {
     return static_cast<Boolean>(setStatus(status));
@@ -146,11 +149,23 @@ Boolean SCPreferencesApplyChanges(SCPreferencesRef session) {
     if (self == nullptr) {
         return answer(kSCStatusNoPrefsSession);
     }
-    Owned<CFDictionaryRef> committed;
-    const Outcome loaded = self->loadCommitted(committed);
-    if (!loaded.ok()) {
-        return answer(loaded, *self);
+    // Another process may have committed and applied while this one waited for its turn or worked. Whoever is
+    // last to look sees the newest tree, so the machine never stays behind the store; the same tree again
+    // touches nothing.
+    Owned<CFDictionaryRef> applied;
+    int status = kSCStatusOK;
+    for (int i = 0; i < mostApplies; ++i) {
+        Owned<CFDictionaryRef> committed;
+        const Outcome loaded = self->loadCommitted(committed);
+        if (!loaded.ok()) {
+            return answer(loaded, *self);
+        }
+        if (applied && CFEqual(applied.get(), committed.get()) != 0) {
+            break;
+        }
+        // What failed, and why, went to the log from where it happened.
+        status = platform::apply::applyTree(committed.get()).status();
+        applied = std::move(committed);
     }
-    // Every failure of an apply has told its reason to the log from where it happened.
-    return answer(platform::apply::applyTree(committed.get()).status());
+    return answer(status);
 }

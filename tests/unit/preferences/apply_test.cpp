@@ -1,0 +1,93 @@
+#include <functional>
+
+#include "tests/unit/preferences/Fixture.h"
+#include "tests/unit/support/RecordingAgent.h"
+
+namespace preferences_test {
+namespace {
+
+std::string locationOf(std::string_view device) {
+    return "<plist version=\"1.0\"><dict><key>CurrentSet</key><string>/Sets/1</string>"
+           "<key>NetworkServices</key><dict><key>1</key><dict><key>Interface</key><dict>"
+           "<key>DeviceName</key><string>" +
+           std::string(device) +
+           "</string><key>Type</key><string>Ethernet</string></dict>"
+           "<key>IPv4</key><dict><key>ConfigMethod</key><string>DHCP</string></dict></dict></dict>"
+           "<key>Sets</key><dict><key>1</key><dict><key>Network</key><dict>"
+           "<key>Global</key><dict><key>IPv4</key><dict><key>ServiceOrder</key><array><string>1</string>"
+           "</array></dict></dict>"
+           "<key>Service</key><dict><key>1</key><dict><key>__LINK__</key>"
+           "<string>/NetworkServices/1</string></dict></dict></dict></dict></dict></dict></plist>";
+}
+
+// Lets something happen in the middle of an apply.
+class InterruptedAgent : public testing_support::RecordingAgent {
+  public:
+    std::function<void()> interruption;
+
+    platform::Outcome takeOver(const platform::apply::InterfacePlan& plan,
+                               const platform::apply::Captured& before) override {
+        if (const std::function<void()> once = std::exchange(interruption, nullptr)) {
+            once();
+        }
+        return RecordingAgent::takeOver(plan, before);
+    }
+};
+
+class ApplyTest : public StoreTest {
+  protected:
+    ApplyTest() {
+        agent->machine = {{"eth0", "as found"}, {"eth1", "as found"}};
+        (void)directory.write("store/preferences.plist", locationOf("eth0"));
+    }
+    static int apply(const SessionRef& session) {
+        return SCPreferencesApplyChanges(session.get()) != 0 ? 0 : SCError();
+    }
+    // The interfaces that are ours.
+    [[nodiscard]] std::string taken() const {
+        std::string names;
+        for (const auto& [name, state] : agent->machine) {
+            names += state != "as found" ? name : "";
+        }
+        return names;
+    }
+
+    std::shared_ptr<InterruptedAgent> agent = std::make_shared<InterruptedAgent>();
+    platform::HostOverride withAgent{[this] {
+        platform::Host made = hostIn(directory.path().string());
+        made.agent = agent;
+        return made;
+    }()};
+};
+
+TEST_F(ApplyTest, OnlyWhatIsCommittedIsApplied) {
+    SessionRef session = open();
+    ASSERT_TRUE(SCPreferencesPathRemoveValue(session.get(), CFSTR("/NetworkServices/1/Interface")));
+    EXPECT_EQ(apply(session), 0);
+    EXPECT_EQ(taken(), "eth0");
+    ASSERT_TRUE(commit(session));
+    EXPECT_EQ(taken(), "eth0");
+    EXPECT_EQ(apply(session), 0);
+    EXPECT_EQ(taken(), "");
+}
+
+TEST_F(ApplyTest, ATreeCommittedInTheMiddleOfAnApplyIsAppliedAsWell) {
+    agent->interruption = [this] { (void)directory.write("store/preferences.plist", locationOf("eth1")); };
+    EXPECT_EQ(apply(open()), 0);
+    EXPECT_EQ(taken(), "eth1");
+}
+
+TEST_F(ApplyTest, FailuresAreTold) {
+    agent->failing = {"takeOver eth0"};
+    SessionRef session = open();
+    EXPECT_EQ(apply(session), 1001);
+    EXPECT_TRUE(logHas("takeOver eth0 was told to fail"));
+    (void)directory.write("store/preferences.plist", "garbage");
+    EXPECT_EQ(apply(session), 1001);
+    EXPECT_TRUE(logHas("tester: " + file + ", line 1"));
+    (void)directory.write("store/preferences.plist", smallTree);
+    EXPECT_EQ(apply(session), 1004) << "there is no current location";
+}
+
+}  // namespace
+}  // namespace preferences_test
