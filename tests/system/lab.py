@@ -182,16 +182,21 @@ class Lab:
     other end a DHCP server answers; with daemon the network before is NetworkManager's work."""
 
     def __init__(self, cards=("eth0", "wlan0"), printer="well", dhcp=None, daemon=False):
+        # Outside, the lines below would change the machine's own network and end its processes.
+        if os.getpid() != 1 or not TOOL.exists():
+            raise RuntimeError("not in the laboratory: call lab.enter() first")
         self.transcript = ""
         self.syslog = []
         self.daemons = []
         self.cards = cards
+        self.by_daemon = daemon
         Path("/etc/resolv.conf").write_text("nameserver 203.0.113.53\n")
         listener = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
         listener.bind("/dev/log")
         os.chmod("/dev/log", 0o666)
         self.listener = listener
-        threading.Thread(target=self._listen, daemon=True).start()
+        self.thread = threading.Thread(target=self._listen, daemon=True)
+        self.thread.start()
 
         for card in cards:
             ip(f"link add {card} address 02:00:00:00:00:{ord(card[0]):02x} type veth peer name far-{card} netns far")
@@ -237,6 +242,8 @@ class Lab:
         for process in self.daemons:
             process.wait()
         self.listener.shutdown(socket.SHUT_RDWR)
+        self.thread.join()
+        self.listener.close()
         sh(f"""
             for card in {' '.join(self.cards)}; do ip link del $card 2>/dev/null || ip -n far link del far-$card || :; done
             rm -rf /dev/log {STORE.parent} {RUNTIME} {LAB}/made/* {LAB}/*.log {LAB}/leases /run/dbus
@@ -350,7 +357,8 @@ class Lab:
         return [link for link in json.loads(ip("-j link")) if link["ifname"] in self.cards]
 
     def network(self):
-        """All that has to be the same before and after: link states, addresses, routes, name servers."""
+        """All that has to be the same before and after: link states, addresses, routes, name servers; with the daemon
+        its devices, its profiles and their files."""
         volatile = ("valid_life_time", "preferred_life_time", "tentative")
         state = {"resolv.conf": self.file("/etc/resolv.conf"), "links": {}, "addresses": []}
         for link in json.loads(ip("-j addr")):
@@ -362,6 +370,13 @@ class Lab:
                            for route in json.loads(ip(f"-{family} -j route show table all"))]
         for key in ("addresses", "routes"):
             state[key].sort()
+        if self.by_daemon:
+            fields = "GENERAL.DEVICE,GENERAL.STATE,GENERAL.CONNECTION,GENERAL.AUTOCONNECT,GENERAL.NM-MANAGED"
+            state["devices"] = [self.nmcli(f"-f {fields} device show {card}") for card in self.cards]
+            state["profiles"] = [line for line in self.nmcli("-f NAME,UUID,AUTOCONNECT,DEVICE,FILENAME connection")
+                                 .splitlines() if not line.startswith("lo:")]
+            state["files"] = {str(path): path.read_text() for folder in ("/etc", "/run") for path in
+                              Path(folder, "NetworkManager/system-connections").glob("*") if "lo.nm" not in str(path)}
         return state
 
     def ipv4(self, card):
