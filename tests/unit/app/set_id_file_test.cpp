@@ -1,0 +1,118 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <sstream>
+#include <string>
+
+#include "app/SetIDFile.h"
+#include "tests/unit/support/TemporaryDirectory.h"
+
+namespace {
+
+using testing_support::TemporaryDirectory;
+
+std::string contentOf(const std::string& path) {
+    std::ifstream file(path, std::ios::binary);
+    std::ostringstream text;
+    text << file.rdbuf();
+    return text.str();
+}
+
+void fill(const std::string& path, const std::string& text) {
+    std::ofstream(path, std::ios::binary) << text;
+}
+
+// "refused", "none" for a file without an ID, or the ID.
+std::string read(const std::string& path) {
+    CFStringRef id = nullptr;
+    if (!CopySetIDFromFile(path.c_str(), &id)) {
+        return "refused";
+    }
+    if (id == nullptr) {
+        return "none";
+    }
+    const std::string text = CFStringGetCStringPtr(id, kCFStringEncodingUTF8);
+    CFRelease(id);
+    return text;
+}
+
+TEST(SetIDFile, ReadsOneLineOfAtMost1023Bytes) {
+    const TemporaryDirectory directory;
+    const std::string path = directory.at("id");
+    const struct {
+        std::string content;
+        std::string id;
+    } rows[] = {
+        {"12", "12"},
+        {"12\n", "12\n"},
+        {"12\n13\n", "12\n"},
+        {"", "none"},
+        {std::string(1023, '7'), std::string(1023, '7')},
+        {std::string(1030, '7'), std::string(1023, '7')},
+        {"\xff\xfe", "none"},
+        {"L\xc3\xa4ge", "L\xc3\xa4ge"},
+    };
+    for (const auto& row : rows) {
+        fill(path, row.content);
+        EXPECT_EQ(read(path), row.id);
+    }
+}
+
+TEST(SetIDFile, ReplacesTheWholeContentAndKeepsNewFilesPrivate) {
+    const TemporaryDirectory directory;
+    const std::string path = directory.at("id");
+    fill(path, "a much longer text than the new one");
+    WriteSetIDFile(path.c_str(), "4");
+    EXPECT_EQ(contentOf(path), "4");
+
+    const std::string fresh = directory.at("fresh");
+    const mode_t before = umask(0);
+    WriteSetIDFile(fresh.c_str(), "5");
+    umask(before);
+    EXPECT_EQ(contentOf(fresh), "5");
+    struct stat status = {};
+    ASSERT_EQ(stat(fresh.c_str(), &status), 0);
+    EXPECT_EQ(status.st_mode & 07777U, 0600U);
+}
+
+TEST(SetIDFile, WhatIsNotAPlainFileOfOursCannotBeOpened) {
+    const TemporaryDirectory directory;
+    const std::string victim = directory.at("victim");
+    const std::string path = directory.at("id");
+    const struct {
+        const char* what;
+        std::function<int()> make;
+    } rows[] = {
+        {"a link", [&] { return symlink(victim.c_str(), path.c_str()); }},
+        {"a link to nowhere", [&] { return symlink("/nonexistent/nowhere", path.c_str()); }},
+        {"a second name of a file", [&] { return link(victim.c_str(), path.c_str()); }},
+        {"a directory", [&] { return mkdir(path.c_str(), 0700); }},
+        {"a FIFO without a reader", [&] { return mkfifo(path.c_str(), 0600); }},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        fill(victim, "untouched");
+        ASSERT_EQ(row.make(), 0);
+        EXPECT_EQ(read(path), "refused");
+        WriteSetIDFile(path.c_str(), "9");
+        EXPECT_EQ(contentOf(victim), "untouched");
+        EXPECT_EQ(read(path), "refused");
+        std::filesystem::remove(path);
+    }
+    EXPECT_EQ(read(directory.at("missing")), "refused");
+
+    if (geteuid() == 0) {
+        fill(path, "77");
+        ASSERT_EQ(chown(path.c_str(), 65534, 65534), 0);
+        EXPECT_EQ(read(path), "refused");
+        WriteSetIDFile(path.c_str(), "9");
+        EXPECT_EQ(contentOf(path), "77");
+    }
+}
+
+}  // namespace
