@@ -286,6 +286,8 @@ std::string commandFor(const std::string& name) {
                : "env LD_LIBRARY_PATH=" + usr + "/lib/" LA_LIBRARY_ARCHITECTURE " " + program;
 }
 
+constexpr int dhcpStride = 7;
+
 // A DHCP server in a network of its own at the far end of card0's cable. It ends with the test's namespaces.
 class DhcpServer {
   public:
@@ -376,6 +378,39 @@ TEST_F(DirectAgentTest, TakesALeaseAndGivesItBack) {
         EXPECT_EQ(before, machineState());
         EXPECT_EQ("/run/real\n", shell("readlink /etc/resolv.conf"));
         EXPECT_EQ("", shell("grep -l '[u]dhcpc' /proc/[0-9]*/cmdline 2>/dev/null || true"));
+    });
+}
+
+// As above, with a client that lives on by itself; only some of the steps, since each takes a lease.
+TEST_F(DirectAgentTest, ALeaseOfARunThatEndedIsGivenBack) {
+    const std::string dnsmasq = commandFor("dnsmasq");
+    if (dnsmasq.empty() || !testing_support::hasProgram("busybox")) {
+        testing_support::skip("needs dnsmasq and busybox");
+        return;
+    }
+    run([&dnsmasq] {
+        shell("echo nameserver 9.9.9.9 > /etc/resolv.conf");
+        const DhcpServer server(dnsmasq);
+        const std::string before = machineState();
+        const auto there =
+            makeTree({{"card0", "<key>IPv4</key><dict><key>ConfigMethod</key><string>DHCP</string></dict>"}});
+        const auto back = makeTree({});
+        for (const bool isGoing : {true, false}) {
+            bool wasEnded = true;
+            for (int step = 0; wasEnded && !testing::Test::HasFailure(); step += dhcpStride) {
+                SCOPED_TRACE((isGoing ? "going, step " : "coming back, step ") + std::to_string(step));
+                if (!isGoing) {
+                    expectOk(applyTree(there.get()));
+                }
+                wasEnded = testing_support::endBeforeStep(
+                    step, [&] { (void)applyTree(isGoing ? there.get() : back.get()); });
+                expectOk(applyTree(back.get()));
+                EXPECT_EQ(before, machineState());
+                EXPECT_EQ("", shell("grep -l '[u]dhcpc' /proc/[0-9]*/cmdline 2>/dev/null || true"));
+                EXPECT_EQ("", shell("ls " + currentHost().runtimeDirectory +
+                                    " | grep -v -e lock$ -e new$ || true"));
+            }
+        }
     });
 }
 
