@@ -54,7 +54,6 @@ OSStatus URLSimpleDownload(const char* url, const void* destination, Handle buff
         return paramErr;
     }
     try {
-        buffer->content.clear();
         std::shared_ptr<platform::services::Downloader> downloader = platform::currentHost().downloader;
         if (!downloader) {
             downloader = platform::services::makeHttpDownloader();
