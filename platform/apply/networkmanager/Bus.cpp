@@ -69,7 +69,7 @@ int noteOwner(sd_bus_message* message, void* left, sd_bus_error* /*error*/) {
 Outcome fromBus(const std::string& what, int result, const sd_bus_error& error, std::string_view secret) {
     const bool named = error.name != nullptr;
     std::string reason = what + ": ";
-    if (named && sd_bus_error_has_name(&error, SD_BUS_ERROR_NO_REPLY) != 0 && result == -ETIMEDOUT) {
+    if (result == -ETIMEDOUT) {
         reason += "no answer in " + std::to_string(callBound.count()) + " s";
     } else if (named) {
         const std::string_view text = error.message == nullptr ? "" : error.message;

@@ -466,8 +466,8 @@ Outcome Daemon::settle(Device& device) {
                       nullptr);
 }
 
-Outcome Daemon::readDefaultMetric(const Device& device, std::optional<std::uint32_t>& metric) {
-    metric.reset();
+Outcome Daemon::readMetric(const Device& device, std::uint32_t& metric) {
+    metric = 0;
     Dictionary properties;
     std::string error;
     if (device.addresses.empty()) {
@@ -475,12 +475,15 @@ Outcome Daemon::readDefaultMetric(const Device& device, std::optional<std::uint3
     }
     const Outcome outcome = bus_.readProperties(device.addresses, addressesInterface, properties, &error);
     const auto routes = valueOf<std::vector<Dictionary>>(properties, "RouteData");
+    bool hasDefault = false;
     for (const Dictionary& route : routes.value_or(std::vector<Dictionary>())) {
         const std::uint32_t own = numberIn(route, "metric");
-        if (valueOf<std::string>(route, "dest") == "0.0.0.0" && numberIn(route, "prefix") == 0 &&
-            (!metric || own < *metric)) {
+        const bool isDefault =
+            valueOf<std::string>(route, "dest") == "0.0.0.0" && numberIn(route, "prefix") == 0;
+        if (metric == 0 || (isDefault && !hasDefault) || (isDefault == hasDefault && own < metric)) {
             metric = own;
         }
+        hasDefault = hasDefault || isDefault;
     }
     return isGone(error) ? Outcome() : outcome;
 }

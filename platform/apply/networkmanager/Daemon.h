@@ -82,8 +82,8 @@ class Daemon {
     // seconds it cannot. The state is brought up to date.
     Outcome settle(Device& device);
 
-    // The best metric of the card's default routes; nothing when it has none.
-    Outcome readDefaultMetric(const Device& device, std::optional<std::uint32_t>& metric);
+    // The best metric of the card's default routes, or, when it has none, of its routes; 0 without routes.
+    Outcome readMetric(const Device& device, std::uint32_t& metric);
 
     // The radio of all wireless cards.
     [[nodiscard]] bool isRadioOn() const noexcept { return radio_; }

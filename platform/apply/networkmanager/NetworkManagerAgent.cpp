@@ -5,7 +5,6 @@
 // pulled cable, and the daemon then brings the best profile instead of the one before. An ordinary profile in
 // memory, and a note of what was active, survive all of that.
 #include <algorithm>
-#include <limits>
 #include <memory>
 #include <utility>
 
@@ -18,16 +17,16 @@
 namespace platform::apply {
 namespace {
 
-constexpr std::uint32_t noDefaultRoute = std::numeric_limits<std::uint32_t>::max();
-
 // Who leads the interface.
 enum class Leader { daemon, nobody, other };
 
 // An interface as it was captured.
 struct Earlier {
     Leader leader = Leader::daemon;
-    // With the daemon: what was active, and its switches.
+    // With the daemon: what was active, and its switches; and by name the interfaces that are given back
+    // later, with what was active on them.
     ProfileNote note;
+    TextMap following;
     // With nobody: what the direct agent captured.
     values::Owned<CFDictionaryRef> direct;
     // With another: why it is not touched.
@@ -37,11 +36,17 @@ struct Earlier {
 values::Owned<CFDictionaryRef> encode(const Earlier& earlier) {
     DictionaryBuilder state;
     switch (earlier.leader) {
-        case Leader::daemon:
+        case Leader::daemon: {
+            DictionaryBuilder following;
+            for (const auto& [interface, uuid] : earlier.following) {
+                following.setText(makeString(interface).get(), uuid);
+            }
             state.setText(CFSTR("UUID"), earlier.note.earlier)
                 .setBoolean(CFSTR("Autoconnect"), earlier.note.autoconnect)
-                .setBoolean(CFSTR("Radio"), earlier.note.radio);
+                .setBoolean(CFSTR("Radio"), earlier.note.radio)
+                .set(CFSTR("Following"), following.take().get());
             break;
+        }
         case Leader::nobody:
             state.set(CFSTR("Direct"), earlier.direct.get());
             break;
@@ -66,10 +71,17 @@ Outcome decode(CFDictionaryRef state, Earlier& earlier) {
     const auto uuid = textIn(state, CFSTR("UUID"));
     const auto autoconnect = booleanIn(state, CFSTR("Autoconnect"));
     const auto radio = booleanIn(state, CFSTR("Radio"));
-    if (!uuid || !autoconnect || !radio) {
+    CFDictionaryRef const following = dictionaryIn(state, CFSTR("Following"));
+    if (!uuid || !autoconnect || !radio || following == nullptr) {
         return {kSCStatusFailed, "the note of how the interface was cannot be read"};
     }
     earlier.note = {*uuid, *autoconnect, *radio};
+    std::vector<const void*> names(static_cast<std::size_t>(CFDictionaryGetCount(following)));
+    std::vector<const void*> uuids(names.size());
+    CFDictionaryGetKeysAndValues(following, names.data(), uuids.data());
+    for (std::size_t i = 0; i < names.size(); ++i) {
+        earlier.following[asText(names[i]).value_or("")] = asText(uuids[i]).value_or("");
+    }
     return {};
 }
 
@@ -233,8 +245,8 @@ class Going {
 // One interface on its way back.
 class Returning {
   public:
-    Returning(Daemon& daemon, const std::string& interface, const ProfileNote& note)
-        : daemon_(daemon), interface_(interface), note_(note) {}
+    Returning(Daemon& daemon, const std::string& interface, const Earlier& earlier)
+        : daemon_(daemon), interface_(interface), note_(earlier.note), following_(earlier.following) {}
 
     Outcome run() {
         std::optional<Device> device;
@@ -302,11 +314,36 @@ class Returning {
         if (active_ && active_->uuid == note_.earlier) {
             return active_->complete ? Outcome() : daemon_.awaitActive(*active_, device_);
         }
-        const Outcome activated = daemon_.activate(earlier->path, device_);
+        Outcome activated = releaseFollowing();
+        if (activated.ok()) {
+            activated = daemon_.activate(earlier->path, device_);
+        }
         return activated.ok()
                    ? activated
                    : Outcome(activated.status(),
                              "the profile that was active before does not come up: " + activated.reason());
+    }
+
+    // The daemon gives the routes of a card a worse number than those of all cards that are active. A card
+    // that is to have a worse one than this one, and was never taken over because the run was ended before,
+    // makes way, and comes back when it is its turn.
+    Outcome releaseFollowing() {
+        Outcome outcome;
+        for (const auto& [interface, uuid] : following_) {
+            std::optional<Device> device;
+            std::optional<Active> active;
+            outcome = daemon_.findDevice(interface, device);
+            if (outcome.ok() && device) {
+                outcome = daemon_.findActive(*device, active);
+            }
+            if (outcome.ok() && active && active->uuid == uuid) {
+                outcome = daemon_.disconnect(*device);
+            }
+            if (!outcome.ok()) {
+                break;
+            }
+        }
+        return outcome;
     }
 
     // After our profile is gone, or the daemon would activate it again.
@@ -337,6 +374,7 @@ class Returning {
     Daemon& daemon_;
     const std::string& interface_;
     const ProfileNote& note_;
+    const TextMap& following_;
     Device device_;
     std::optional<Active> active_;
     std::optional<Profile> profile_;
@@ -379,11 +417,16 @@ Outcome NetworkManagerAgent::capture(std::span<const std::string> interfaces,
     captured.clear();
     Daemon daemon;
     Outcome outcome = daemon.connect();
-    std::vector<std::pair<std::uint32_t, Captured>> ranked;
+    struct Ranked {
+        std::uint32_t metric;
+        std::string interface;
+        Earlier earlier;
+    };
+    std::vector<Ranked> ranked;
     std::vector<std::string> unmanaged;
     for (const std::string& interface : interfaces) {
         std::optional<Device> device;
-        std::optional<std::uint32_t> metric;
+        std::uint32_t metric = 0;
         Earlier earlier;
         if (outcome.ok()) {
             outcome = daemon.findDevice(interface, device);
@@ -396,20 +439,26 @@ Outcome NetworkManagerAgent::capture(std::span<const std::string> interfaces,
             outcome = captureOne(daemon, *device, interface, earlier);
         }
         if (outcome.ok() && device) {
-            outcome = daemon.readDefaultMetric(*device, metric);
+            outcome = daemon.readMetric(*device, metric);
         }
         if (!outcome.ok()) {
             return outcome;
         }
         if (device) {
-            ranked.emplace_back(metric.value_or(noDefaultRoute), Captured{interface, encode(earlier)});
+            ranked.push_back({metric, interface, std::move(earlier)});
         }
     }
-    // NetworkManager numbers default routes in the order of activation, so the best one has to come first.
+    // NetworkManager numbers the cards' routes in the order of activation, so the card with the best number
+    // comes first; before all, the ones that have none, which are to leave theirs free.
     std::stable_sort(ranked.begin(), ranked.end(),
-                     [](const auto& a, const auto& b) { return a.first < b.first; });
-    for (auto& [metric, one] : ranked) {
-        captured.push_back(std::move(one));
+                     [](const Ranked& a, const Ranked& b) { return a.metric < b.metric; });
+    for (auto one = ranked.begin(); one != ranked.end(); ++one) {
+        std::for_each(one + 1, ranked.end(), [one](const Ranked& later) {
+            if (!later.earlier.note.earlier.empty()) {
+                one->earlier.following[later.interface] = later.earlier.note.earlier;
+            }
+        });
+        captured.push_back({one->interface, encode(one->earlier)});
     }
     // What NetworkManager is told to leave alone is led without it, which it does not even notice.
     std::vector<Captured> direct;
@@ -463,7 +512,7 @@ Outcome NetworkManagerAgent::giveBack(const Captured& before) {
     }
     Daemon daemon;
     outcome = daemon.connect();
-    return outcome.ok() ? Returning(daemon, before.interface, earlier.note).run() : outcome;
+    return outcome.ok() ? Returning(daemon, before.interface, earlier).run() : outcome;
 }
 
 }  // namespace

@@ -62,15 +62,19 @@ std::string clientIDOctets(const std::string& clientID) {
     return octets;
 }
 
+// Below every metric that the daemon gives by itself.
+std::int64_t metricOf(const InterfacePlan& plan) {
+    return std::int64_t{plan.rank} + 1;
+}
+
 Dictionary makeIPv4(const InterfacePlan& plan) {
     const bool manual = plan.method == IPv4Method::manual && !plan.addresses.empty();
     if (!manual && plan.method != IPv4Method::dhcp) {
-        return {{"method", {std::string("disabled")}}};
+        return {{"method", {std::string("disabled")}}, {"route-metric", {metricOf(plan)}}};
     }
     Dictionary ipv4 = {{"method", {std::string(manual ? "manual" : "auto")}},
                        {"may-fail", {false}},
-                       // Below every metric that the daemon gives by itself.
-                       {"route-metric", {std::int64_t{plan.rank} + 1}}};
+                       {"route-metric", {metricOf(plan)}}};
     if (manual) {
         std::vector<Dictionary> addresses;
         for (const ManualAddress& address : plan.addresses) {
@@ -259,7 +263,9 @@ Outcome makeProfile(const InterfacePlan& plan, const WirelessFacts* facts, const
                              // For ever: after a few failures the daemon would turn to another profile.
                              {"autoconnect-retries", {std::int32_t{0}}}};
     profile["ipv4"] = makeIPv4(plan);
-    profile["ipv6"] = {{"method", {std::string("disabled")}}};
+    // A metric for what is off: without one the daemon keeps a number of its own for the card, and the
+    // profiles before would come back with other numbers than they had.
+    profile["ipv6"] = {{"method", {std::string("disabled")}}, {"route-metric", {metricOf(plan)}}};
     profile["user"] = {{"data",
                         {TextMap{{tagKey, plan.name},
                                  {earlierKey, note.earlier.empty() ? none : note.earlier},
