@@ -1,0 +1,190 @@
+#include "morescf/MoreSCFDigest.h"
+
+#include <arpa/inet.h>
+
+#include <cstring>
+
+#include "tests/unit/morescf/Fixture.h"
+
+namespace morescf_test {
+namespace {
+
+class DigestTest : public MoreSCFTest {
+  protected:
+    template <class Fill>
+    static std::string made(CFStringRef protocol, Fill fill) {
+        MoreSCDigest digest;
+        std::memset(&digest, 0, sizeof(digest));
+        fill(digest);
+        Output<CFMutableDictionaryRef> entity;
+        const OSStatus err = MoreSCCreateEntity(protocol, &digest, &entity);
+        EXPECT_EQ(err != 0, entity.shown() == "null" || entity.shown() == "untouched");
+        return err == 0 ? entity.shown() : std::to_string(err);
+    }
+    static std::string zeros(const char* protocol) {
+        return made(Str(protocol), [](MoreSCDigest&) {});
+    }
+};
+
+TEST_F(DigestTest, ZerosMakeTheSmallestRecord) {
+    EXPECT_EQ("{}", zeros("DNS"));
+    EXPECT_EQ(
+        "{FTPPassive = #0; FTPEnable = #0; GopherEnable = #0; HTTPEnable = #0; HTTPSEnable = #0; RTSPEnable "
+        "= "
+        "#0; SOCKSEnable = #0}",
+        zeros("Proxies"));
+    EXPECT_EQ("{MACAddress = 00:00:00:00:00:00}", zeros("AirPort"));
+    EXPECT_EQ("{MACAddress = 00:00:00:00:00:00}", zeros("Ethernet"));
+    for (const char* required : {"Interface", "AppleTalk", "IPv4", "Modem"}) {
+        EXPECT_EQ("-50", zeros(required));
+    }
+    for (const char* unknown : {"NetInfo", "Modem ", "modem", ""}) {
+        EXPECT_EQ("-1", zeros(unknown));
+    }
+}
+
+TEST_F(DigestTest, EveryMemberHasItsKeyAndPlace) {
+    EXPECT_EQ(
+        "{DeviceName = d; UserDefinedName = u; Hardware = h; Type = t; SubType = s; HardwareVariant = v}",
+        made(CFSTR("Interface"), [](MoreSCDigest& digest) {
+            digest.interface = {CFSTR("d"), CFSTR("h"), CFSTR("v"), CFSTR("t"), CFSTR("s"), CFSTR("u")};
+        }));
+    const Value exceptions = read("(*.local)");
+    EXPECT_EQ(
+        "{ExceptionsList = (*.local); FTPPassive = #1; FTPEnable = #0; FTPProxy = f; GopherEnable = #1; "
+        "GopherPort = #70; HTTPEnable = #1; HTTPProxy = h; HTTPPort = #65535; HTTPSEnable = #0; HTTPSProxy = "
+        "hs; HTTPSPort = #443; RTSPEnable = #0; RTSPProxy = r; RTSPPort = #554; SOCKSEnable = #1; SOCKSProxy "
+        "= s; SOCKSPort = #1080}",
+        made(CFSTR("Proxies"), [&](MoreSCDigest& digest) {
+            digest.proxies = {array(exceptions), 1,     0, CFSTR("f"),  0,   1, nullptr,    70,  1,
+                              CFSTR("h"),        65535, 0, CFSTR("hs"), 443, 0, CFSTR("r"), 554, 1,
+                              CFSTR("s"),        1080};
+        }));
+    EXPECT_EQ("{ConfigMethod = Node; DefaultZone = z; NetworkID = #65280; NodeID = #255}",
+              made(CFSTR("AppleTalk"), [](MoreSCDigest& digest) {
+                  digest.appleTalk = {1, CFSTR("Node"), 1, 65280, 255, CFSTR("z")};
+              }));
+    EXPECT_EQ("{ConfigMethod = Node; __INACTIVE__ = #1}", made(CFSTR("AppleTalk"), [](MoreSCDigest& digest) {
+                  digest.appleTalk = {0, CFSTR("Node"), 0, 65280, 255, nullptr};
+              }));
+    in_addr servers[2];
+    inet_aton("192.0.0.1", &servers[0]);
+    inet_aton("255.255.255.255", &servers[1]);
+    const CFStringRef domains[] = {CFSTR("example.org"), CFSTR("")};
+    EXPECT_EQ("{ServerAddresses = (192.0.0.1, 255.255.255.255); SearchDomains = (example.org, )}",
+              made(CFSTR("DNS"), [&](MoreSCDigest& digest) {
+                  digest.dns = {2, servers, 2, domains};
+              }));
+    const CFStringRef holes[] = {CFSTR("example.org"), nullptr};
+    EXPECT_EQ("-50", made(CFSTR("DNS"), [&](MoreSCDigest& digest) { digest.dns = {0, nullptr, 2, holes}; }));
+    EXPECT_EQ("-50", made(CFSTR("DNS"), [&](MoreSCDigest& digest) {
+                  digest.dns = {1, nullptr, 0, nullptr};
+              }));
+    EXPECT_EQ("{ConfigMethod = Manual; DHCPClientID = c; Addresses = (192.0.0.1); Router = 255.255.255.255}",
+              made(CFSTR("IPv4"), [&](MoreSCDigest& digest) {
+                  digest.ipv4 = {CFSTR("Manual"), servers[0], {}, servers[1], CFSTR("c")};
+              }));
+    EXPECT_EQ("{ConfigMethod = Manual; SubnetMasks = (255.255.255.255)}",
+              made(CFSTR("IPv4"), [&](MoreSCDigest& digest) {
+                  digest.ipv4 = {CFSTR("Manual"), {}, servers[1], {}, nullptr};
+              }));
+    EXPECT_EQ("{MACAddress = 00:0a:95:9d:68:16; PreferredNetwork = net}",
+              made(CFSTR("AirPort"), [](MoreSCDigest& digest) {
+                  digest.airPort = {{0x00, 0x0A, 0x95, 0x9D, 0x68, 0x16}, CFSTR("net")};
+              }));
+    EXPECT_EQ(
+        "{ConnectionScript = s; DataCompression = #0; DialMode = IgnoreDialTone; ErrorCorrection = #0; "
+        "PulseDial "
+        "= #1; Speaker = #1}",
+        made(CFSTR("Modem"), [](MoreSCDigest& digest) {
+            digest.modem = {CFSTR("s"), 0, 1, 1, 0};
+        }));
+}
+
+TEST_F(DigestTest, PPPTakesTheOptionsOfTheCallerOrOfTheSystem) {
+    const MoreSCPPPOptions options = {1, 1, 11, 1, 12, 0, 0, 13, 14, 0, 0, 1, 1};
+    const MoreSCPPPDigest full = {
+        1, CFSTR("u"), CFSTR("guest"), CFSTR("aé"), CFSTR("555"), CFSTR("556"), &options};
+    const auto ppp = [](const MoreSCPPPDigest& digest) {
+        Output<CFMutableDictionaryRef> entity;
+        EXPECT_EQ(0, MoreSCCreatePPPEntity(&digest, &entity));
+        return entity.shown();
+    };
+    EXPECT_EQ(
+        "{UserDefinedName = u; DialOnDemand = #1; DisconnectOnIdle = #1; DisconnectOnIdleTimer = #12; "
+        "DisconnectOnLogout = #0; IdleReminder = #1; IdleReminderTimer = #11; Logfile = /tmp/ppp.log; "
+        "VerboseLogging = #1; AuthName = guest; AuthPassword = <006100e9>; CommAlternateRemoteAddress = 556; "
+        "CommDisplayTerminalWindow = #1; CommRedialCount = #13; CommRedialEnabled = #0; CommRedialInterval = "
+        "#14; "
+        "CommRemoteAddress = 555; CommUseTerminalScript = #0; IPCPCompressionVJ = #0; LCPEchoEnabled = #0; "
+        "LCPEchoFailure = #4; LCPEchoInterval = #10}",
+        ppp(full));
+    // The version is asked for on every build, also when the caller brings the options.
+    platform::Host old = host;
+    old.systemVersion = 0x101F;
+    const platform::HostOverride scope(old);
+    const std::string before = ppp(full);
+    EXPECT_EQ(std::string::npos, before.find("CommUseTerminalScript"));
+    EXPECT_NE(std::string::npos, before.find("LCPEchoFailure = #3"));
+    EXPECT_EQ(
+        "{__INACTIVE__ = #1; DialOnDemand = #0; DisconnectOnIdle = #1; DisconnectOnIdleTimer = #900; "
+        "DisconnectOnLogout = #1; IdleReminder = #0; IdleReminderTimer = #1800; Logfile = /tmp/ppp.log; "
+        "VerboseLogging = #0; CommDisplayTerminalWindow = #0; CommRedialCount = #1; CommRedialEnabled = #1; "
+        "CommRedialInterval = #30; IPCPCompressionVJ = #1; LCPEchoEnabled = #1; LCPEchoFailure = #3; "
+        "LCPEchoInterval = #10}",
+        ppp({}));
+    EXPECT_EQ(&kMoreSCPPPOptionsDefaultTenOne, MoreSCGetDefaultPPPOptions(true));
+}
+
+TEST_F(DigestTest, Globals) {
+    const MoreSCGlobalDigest digest = {};
+    Output<CFMutableDictionaryRef> entity;
+    EXPECT_EQ(0, MoreSCCreateGlobalEntity(CFSTR("IPv4"), &digest, &entity));
+    EXPECT_EQ("{PPPOverridePrimary = #0; ServiceOrder = ()}", entity.shown());
+    EXPECT_EQ(0, MoreSCCreateGlobalEntity(CFSTR("NetInfo"), &digest, &entity));
+    EXPECT_EQ("{}", entity.shown());
+    EXPECT_EQ(-1, MoreSCCreateGlobalEntity(CFSTR("DNS"), &digest, &entity));
+    EXPECT_EQ("untouched", entity.shown());
+    EXPECT_EQ(-50, MoreSCCreateDNSEntity(nullptr, &entity));
+    EXPECT_EQ("null", entity.shown());
+}
+
+TEST_F(DigestTest, MacAddressesAndBack) {
+    const struct {
+        const char* text;
+        OSStatus err;
+        const char* back;
+    } rows[] = {
+        {"00:0A:95:9D:68:16", 0, "00:0a:95:9d:68:16"},
+        {"ff:FF:0:1:2:3", 0, "ff:ff:00:01:02:03"},
+        {"00:0a:95:9d:68:1", 0, "00:0a:95:9d:68:01"},
+        {"00:0a:95:9d:68", -1, nullptr},
+        {"00-0a-95-9d-68-16", -1, nullptr},
+        {"", -1, nullptr},
+        {"00:0a:95:9d:68:16 ", -4960, nullptr},
+        {"00:0a:95:9d:68:é", -4960, nullptr},
+    };
+    for (const auto& row : rows) {
+        UInt8 bytes[6] = {9, 9, 9, 9, 9, 9};
+        EXPECT_EQ(row.err, MoreSCFStringToMacAddress(Str(row.text), bytes)) << row.text;
+        Output<CFStringRef> back;
+        EXPECT_EQ(0, MoreSCFCreateStringWithMacAddress(bytes, &back));
+        EXPECT_EQ(row.back != nullptr ? row.back : "09:09:09:09:09:09", back.shown());
+    }
+}
+
+TEST_F(DigestTest, PasswordsAreUnitsWithTheHigherByteFirst) {
+    Output<CFDataRef> data;
+    EXPECT_EQ(0, MoreSCFCopyEncodedPPPPassword(CFSTR(""), &data));
+    EXPECT_EQ("<>", data.shown());
+    EXPECT_EQ(0, MoreSCFCopyEncodedPPPPassword(CFSTR("p€😀"), &data));
+    EXPECT_EQ("<007020acd83dde00>", data.shown());
+    EXPECT_EQ(-50, MoreSCFCopyEncodedPPPPassword(nullptr, &data));
+    EXPECT_EQ("null", data.shown());
+    Output<CFArrayRef> none;
+    EXPECT_EQ(0, MoreSCFCreateArrayWithInetAddresses(0, nullptr, &none));
+    EXPECT_EQ("()", none.shown());
+}
+
+}  // namespace
+}  // namespace morescf_test

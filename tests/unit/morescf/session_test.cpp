@@ -1,0 +1,146 @@
+#include "tests/unit/morescf/Fixture.h"
+
+namespace morescf_test {
+namespace {
+
+class SessionTest : public MoreSCFTest {
+  protected:
+    SessionTest() { setTree(twoSets); }
+};
+
+TEST_F(SessionTest, CommitsAndAppliesOnceAtTheOutermostClose) {
+    const std::string before = fileIdentity();
+    OSStatus err = MoreSCOpen(false, false);
+    SCPreferencesRef session = MoreSCGetSCPreferencesRef();
+    EXPECT_EQ(0, MoreSCRenameSet(Str("1"), Str("Cottage")));
+    EXPECT_EQ(0, MoreSCSetServiceActive(nullptr, Str("5"), false));
+    Output<CFStringRef> name;
+    EXPECT_EQ(0, MoreSCCopyUserVisibleNameOfSet(nullptr, &name));
+    EXPECT_EQ("Cottage", name.shown());
+    EXPECT_EQ(session, MoreSCGetSCPreferencesRef());
+    EXPECT_EQ(before, fileIdentity());
+    EXPECT_TRUE(agent->changes.empty());
+
+    MoreSCClose(&err, false);
+    EXPECT_EQ(0, err);
+    EXPECT_NE(std::string::npos, tree().find("Cottage"));
+    EXPECT_EQ(std::vector<std::string>({"eth0: idle -> ours: off"}), agent->changes);
+}
+
+TEST_F(SessionTest, OnlyAWriterWithoutAnErrorMarksAndNobodyClearsTheMark) {
+    const struct {
+        bool innerSucceeds;
+        OSStatus outerStatus;
+        bool outerDirty;
+        bool commits;
+    } rows[] = {
+        {true, 0, false, true},  {true, -1, true, true},  // a failure after a successful writer
+        {true, -1, false, true}, {false, 0, false, false}, {false, -1, true, false},
+    };
+    for (const auto& row : rows) {
+        setTree(twoSets);
+        const std::string before = fileIdentity();
+        OSStatus err = MoreSCOpen(false, false);
+        EXPECT_EQ(row.innerSucceeds ? 0 : kSCStatusNoKey,
+                  MoreSCRenameSet(Str(row.innerSucceeds ? "1" : "none"), Str("Cottage")));
+        EXPECT_EQ(kSCStatusNoKey, MoreSCRenameSet(Str("none"), Str("a failure behind it")));
+        err = row.outerStatus;
+        MoreSCClose(&err, row.outerDirty);
+        EXPECT_EQ(row.outerStatus, err);
+        EXPECT_EQ(row.commits, before != fileIdentity());
+    }
+    // The mark is gone with its session.
+    const std::string before = fileIdentity();
+    OSStatus err = MoreSCOpen(false, false);
+    SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), CFSTR("CurrentSet"), CFSTR("/Sets/2"));
+    MoreSCClose(&err, false);
+    EXPECT_EQ(before, fileIdentity());
+}
+
+TEST_F(SessionTest, AFailedCommitReplacesOnlySuccessAndIsNotApplied) {
+    for (const OSStatus earlier : {0, -17}) {
+        OSStatus err = MoreSCOpen(false, false);
+        EXPECT_EQ(0, MoreSCSetServiceActive(nullptr, Str("5"), false));
+        setTree("{CurrentSet = /Sets/1}");
+        err = earlier;
+        MoreSCClose(&err, true);
+        EXPECT_EQ(earlier != 0 ? earlier : kSCStatusStale, err);
+        EXPECT_EQ("{CurrentSet = /Sets/1}", tree());
+        EXPECT_TRUE(agent->calls.empty());
+        setTree(twoSets);
+    }
+    agent->failing.insert("takeOver eth0");
+    EXPECT_EQ(kSCStatusFailed, MoreSCSetServiceActive(nullptr, Str("5"), false));
+    EXPECT_NE(std::string::npos, tree().find("__INACTIVE__")) << "saved, though not made so";
+}
+
+TEST_F(SessionTest, AnOpenThatFailsIsBalanced) {
+    (void)directory.write("store/preferences.plist", "no property list");
+    OSStatus err = MoreSCOpen(true, false);
+    EXPECT_EQ(kSCStatusFailed, err);
+    EXPECT_EQ(nullptr, MoreSCGetSCPreferencesRef());
+    EXPECT_EQ(kSCStatusNoPrefsSession, MoreSCRenameSet(Str("1"), Str("x")));
+    MoreSCClose(&err, true);
+    EXPECT_EQ(kSCStatusFailed, err);
+    setTree(twoSets);
+    EXPECT_EQ(0, MoreSCRenameSet(Str("1"), Str("x")));
+}
+
+TEST_F(SessionTest, LocksForAsLongAsTheOutermostUse) {
+    const auto lockByAnother = [] {
+        SCPreferencesRef other = SCPreferencesCreate(nullptr, CFSTR("another"), nullptr);
+        const Boolean locked = SCPreferencesLock(other, false);
+        CFRelease(other);
+        return locked != 0;
+    };
+    OSStatus err = MoreSCOpen(false, false);
+    EXPECT_TRUE(lockByAnother());
+    OSStatus inner = MoreSCOpen(true, false);
+    EXPECT_EQ(0, inner);
+    MoreSCClose(&inner, false);
+    EXPECT_FALSE(lockByAnother());
+    MoreSCClose(&err, false);
+    EXPECT_TRUE(lockByAnother());
+
+    SCPreferencesRef other = SCPreferencesCreate(nullptr, CFSTR("another"), nullptr);
+    EXPECT_TRUE(SCPreferencesLock(other, false));
+    err = MoreSCOpen(true, false);
+    EXPECT_EQ(kSCStatusPrefsBusy, err);
+    EXPECT_NE(nullptr, MoreSCGetSCPreferencesRef());
+    MoreSCClose(&err, false);
+    CFRelease(other);
+}
+
+TEST_F(SessionTest, NamesItsClientFromTheNextSessionOn) {
+    EXPECT_EQ(nullptr, MoreSCGetClient());
+    const auto loggedBy = [this](std::string_view client) {
+        log.clear();
+        (void)directory.write("store/preferences.plist", "no property list");
+        OSStatus err = MoreSCOpen(false, false);
+        MoreSCClose(&err, false);
+        return !log.empty() && log.front().find(client) != std::string::npos;
+    };
+    EXPECT_TRUE(loggedBy("MoreSCF"));
+    {
+        const Str name("dial helper");
+        EXPECT_EQ(0, MoreSCSetClient(name));
+        EXPECT_EQ(static_cast<CFStringRef>(name), MoreSCGetClient());
+        EXPECT_EQ(0, MoreSCSetClient(MoreSCGetClient()));
+    }
+    EXPECT_TRUE(loggedBy("dial helper"));
+}
+
+TEST_F(SessionTest, TurnsTheStoresStatusIntoErrors) {
+    OSStatus err = MoreSCOpen(false, false);
+    EXPECT_NE(nullptr, SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), CFSTR("Sets")));
+    EXPECT_EQ(0, MoreSCErrorBoolean(true));
+    EXPECT_EQ(kSCStatusFailed, MoreSCErrorBoolean(false)) << "a failure without a reason";
+    EXPECT_EQ(nullptr, SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), CFSTR("none")));
+    EXPECT_EQ(kSCStatusNoKey, MoreSCError(nullptr));
+    EXPECT_EQ(0, MoreSCError(CFSTR("x")));
+    EXPECT_EQ(kSCStatusAccessError, MoreSCToOSStatus(kSCStatusAccessError));
+    MoreSCClose(&err, false);
+}
+
+}  // namespace
+}  // namespace morescf_test
