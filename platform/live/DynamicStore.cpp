@@ -234,7 +234,7 @@ class DynamicStore final : public Object {
     std::map<std::string, Value> seen_;
 };
 
-CFStringRef joined(CFStringRef domain, std::string_view middle, CFStringRef id, CFStringRef entity) {
+CFStringRef createKey(CFStringRef domain, std::string_view middle, CFStringRef id, CFStringRef entity) {
     if (as<CFStringRef>(domain) == nullptr) {
         setStatus(kSCStatusInvalidArgument);
         return nullptr;
@@ -261,12 +261,12 @@ SCDynamicStoreRef SCDynamicStoreCreate(CFAllocatorRef /*allocator*/, CFStringRef
 
 CFStringRef SCDynamicStoreKeyCreateNetworkGlobalEntity(CFAllocatorRef /*allocator*/, CFStringRef domain,
                                                        CFStringRef entity) {
-    return joined(domain, "/Network/Global", nullptr, entity);
+    return createKey(domain, "/Network/Global", nullptr, entity);
 }
 
 CFStringRef SCDynamicStoreKeyCreateNetworkServiceEntity(CFAllocatorRef /*allocator*/, CFStringRef domain,
                                                         CFStringRef serviceID, CFStringRef entity) {
-    return joined(domain, "/Network/Service", serviceID, entity);
+    return createKey(domain, "/Network/Service", serviceID, entity);
 }
 
 CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef pattern) {

@@ -136,17 +136,5 @@ TEST_F(ChangeNoticeTest, TheContextLivesAsLongAsTheSession) {
     EXPECT_EQ(held, 0);
 }
 
-TEST_F(ChangeNoticeTest, WithoutASessionOrASubscriptionThereIsNoSource) {
-    EXPECT_EQ(SCDynamicStoreCreateRunLoopSource(nullptr, nullptr, 0), nullptr);
-    EXPECT_EQ(SCError(), 2001);
-    EXPECT_FALSE(SCDynamicStoreSetNotificationKeys(nullptr, nullptr, nullptr));
-    EXPECT_EQ(SCError(), 2001);
-    network->isFailing = true;
-    const StoreRef store = openStore();
-    EXPECT_FALSE(SCDynamicStoreSetNotificationKeys(store.get(), nullptr, nullptr));
-    EXPECT_EQ(SCDynamicStoreCreateRunLoopSource(nullptr, store.get(), 0), nullptr);
-    EXPECT_EQ(SCError(), 1001);
-}
-
 }  // namespace
 }  // namespace live_test

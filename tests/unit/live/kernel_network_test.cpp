@@ -30,6 +30,10 @@ class KernelNetworkTest : public testing_support::PrivateNetworkTest {
                 shell("ip link set other" + number + " up && ip link set card" + number + " up");
                 shell("ip address add 10.0." + number + ".2/24 dev card" + number);
             }
+            // The carrier comes a moment later, and with it the routes of IPv6.
+            for (int i = 0; i < 500 && shell("ip -6 route show fe80::/64 dev card0").empty(); ++i) {
+                usleep(10'000);
+            }
             body();
         });
     }

@@ -213,11 +213,6 @@ TEST_F(LiveViewTest, AnAddressOfTheWrongSizeOrKindIsNoQuestion) {
         EXPECT_EQ(flags == 77, !row.isAsked);
         EXPECT_EQ(network->asked.size(), row.isAsked ? 1U : 0U);
     }
-    SCNetworkConnectionFlags flags = 77;
-    EXPECT_FALSE(SCNetworkCheckReachabilityByAddress(nullptr, 16, &flags));
-    EXPECT_FALSE(SCNetworkCheckReachabilityByAddress(any, 28, nullptr));
-    EXPECT_FALSE(SCNetworkCheckReachabilityByName("", &flags));
-    EXPECT_FALSE(SCNetworkCheckReachabilityByName(nullptr, &flags));
 }
 
 }  // namespace
