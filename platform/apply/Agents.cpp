@@ -12,7 +12,7 @@ Outcome chooseAgent(std::shared_ptr<Agent>& agent) {
         return {};
     }
     bool running = false;
-    const Outcome outcome = isNetworkManagerRunning(running);
+    Outcome outcome = isNetworkManagerRunning(running);
     if (outcome.ok()) {
         agent = running ? makeNetworkManagerAgent() : makeDirectAgent();
     }

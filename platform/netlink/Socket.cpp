@@ -11,7 +11,7 @@ namespace platform::netlink {
 namespace {
 
 // The largest datagram that the kernel makes for a dump.
-constexpr std::size_t largestDatagram = 64 * 1024;
+constexpr std::size_t largestDatagram = std::size_t{64} << 10U;
 constexpr int dumpTries = 5;
 
 // An NLMSG_ERROR as an outcome: the errno, and the text that the kernel puts behind it when the socket asks

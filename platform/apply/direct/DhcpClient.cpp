@@ -80,11 +80,16 @@ bool hasEnded(const FileDescriptor& handle, std::chrono::milliseconds wait) {
 }
 
 Outcome writeSettings(const DhcpSettings& settings, const Process& client) {
+    ArrayBuilder domains;
+    for (const std::string& domain : settings.domains) {
+        domains.addText(domain);
+    }
     DictionaryBuilder file;
     file.setText(CFSTR("Interface"), settings.interface)
         .setInteger(CFSTR("Rank"), settings.rank)
         .setData(CFSTR("ClientID"), std::as_bytes(std::span(settings.clientID)))
         .setBoolean(CFSTR("IgnoresServers"), settings.ignoresServers)
+        .set(CFSTR("Domains"), domains.get())
         .setText(CFSTR("ResolverFile"), currentHost().resolverFile)
         .setInteger(CFSTR("Client"), client.number)
         .setInteger(CFSTR("ClientStarted"), client.started);
@@ -102,9 +107,15 @@ Outcome decodeSettings(CFDictionaryRef file, HookSettings& settings, Process& cl
     if (!interface || !rank || !clientID || !ignores || !resolverFile || !number || !started) {
         return {kSCStatusFailed, "the settings of the DHCP client are not what this system wrote"};
     }
-    settings.dhcp = {*interface, static_cast<unsigned>(*rank),
-                     std::string(reinterpret_cast<const char*>(clientID->data()), clientID->size()),
-                     *ignores};
+    settings.dhcp.interface = *interface;
+    settings.dhcp.rank = static_cast<unsigned>(*rank);
+    settings.dhcp.clientID.assign(reinterpret_cast<const char*>(clientID->data()), clientID->size());
+    settings.dhcp.ignoresServers = *ignores;
+    settings.dhcp.domains.clear();
+    CFArrayRef const domains = arrayIn(file, CFSTR("Domains"));
+    for (CFIndex i = 0; domains != nullptr && i < CFArrayGetCount(domains); ++i) {
+        settings.dhcp.domains.push_back(asText(CFArrayGetValueAtIndex(domains, i)).value_or(""));
+    }
     settings.resolverFile = *resolverFile;
     client = {static_cast<pid_t>(*number), *started};
     return {};
@@ -167,6 +178,7 @@ std::vector<std::string> argumentsFor(const DhcpSettings& settings, const std::s
 
 std::vector<char*> pointersTo(std::vector<std::string>& texts) {
     std::vector<char*> pointers;
+    pointers.reserve(texts.size() + 1);
     for (std::string& text : texts) {
         pointers.push_back(text.data());
     }

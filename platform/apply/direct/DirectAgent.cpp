@@ -76,7 +76,7 @@ std::vector<Address> manualAddresses(const InterfacePlan& plan) {
 }
 
 DhcpSettings dhcpSettings(const InterfacePlan& plan) {
-    return {plan.name, plan.rank, plan.dhcpClientID, !plan.nameServers.empty()};
+    return {plan.name, plan.rank, plan.dhcpClientID, !plan.nameServers.empty(), plan.searchDomains};
 }
 
 class DirectAgent : public Agent {

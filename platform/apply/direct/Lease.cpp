@@ -207,7 +207,11 @@ Outcome takeLease(const DhcpSettings& settings, const Lease& lease) {
         done = done.ok() ? kernel.addRoute(*link, route) : done;
     }
     if (done.ok() && !settings.ignoresServers) {
-        done = bringNameServers(settings.interface, settings.rank, lease.nameService);
+        NameService service = lease.nameService;
+        if (!settings.domains.empty()) {
+            service.domains = settings.domains;
+        }
+        done = bringNameServers(settings.interface, settings.rank, service);
     }
     return done.ok() ? writeLease(settings.interface, {true, lease, true, ""}) : done;
 }

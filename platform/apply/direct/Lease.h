@@ -35,6 +35,8 @@ struct DhcpSettings {
     std::string clientID;
     // The location brings servers of its own, and the lease's are not used.
     bool ignoresServers = false;
+    // The location's own search domains, which take the place of the lease's.
+    std::vector<std::string> domains;
     bool operator==(const DhcpSettings&) const = default;
 };
 

@@ -27,7 +27,7 @@ constexpr milliseconds answerTime{2000};
 constexpr milliseconds scanTime{6000};
 constexpr milliseconds lookAgain{500};
 constexpr int firstChannel = 2412;
-constexpr std::size_t largestAnswer = 64 * 1024;
+constexpr std::size_t largestAnswer = std::size_t{64} << 10U;
 // The value of a network's "id_str", which is a note for whoever configures it.
 constexpr std::string_view ourTag = "\"location-assistant\"";
 
@@ -349,7 +349,11 @@ Outcome addNetwork(Conversation& supplicant, const std::vector<std::string>& set
     for (const std::string& setting : settings) {
         if (done.ok()) {
             const std::string what = "take the network's \"" + setting.substr(0, setting.find(' ')) + "\"";
-            done = supplicant.tell("SET_NETWORK " + number + " " + setting, what.c_str());
+            std::string command = "SET_NETWORK ";
+            command += number;
+            command += ' ';
+            command += setting;
+            done = supplicant.tell(command, what.c_str());
         }
     }
     return done;

@@ -373,6 +373,13 @@ TEST_F(DirectAgentTest, TakesALeaseAndGivesItBack) {
         EXPECT_EQ((std::vector<std::string>{"DHCPDISCOVER", "DHCPREQUEST", "DHCPACK", "DHCPRELEASE",
                                             "DHCPDISCOVER", "DHCPREQUEST", "DHCPACK"}),
                   DhcpServer::messages());
+        // The location's own domains, then its own servers too, take the place of the lease's.
+        plan.searchDomains = {"own.example"};
+        expectOk(agent->takeOver(plan, captured[0]));
+        EXPECT_EQ("search own.example\nnameserver 10.50.0.53\n", shell("grep -v '^#' /etc/resolv.conf"));
+        plan.nameServers = {address(10, 0, 0, 54)};
+        expectOk(agent->takeOver(plan, captured[0]));
+        EXPECT_EQ("search own.example\nnameserver 10.0.0.54\n", shell("grep -v '^#' /etc/resolv.conf"));
         expectOk(agent->giveBack(captured[0]));
         EXPECT_EQ("DHCPRELEASE", DhcpServer::messages().back());
         EXPECT_EQ(before, machineState());
