@@ -174,10 +174,10 @@ TEST_F(Download, EndsWithinItsBoundsWhateverTheServerDoes) {
 TEST_F(Download, SlowDripsDoNotMoveTheDeadline) {
     const std::pair<const char*, const char*> drips[] = {{"HTTP/1.1 200 OK\r\n\r\n", "x"},
                                                          {"", "HTTP/1.1 100 Continue\r\n\r\n"}};
-    for (const auto& [first, drip] : drips) {
+    for (const auto& row : drips) {
         LoopbackServer server([&](int connection, const std::string&) {
-            LoopbackServer::say(connection, first);
-            while (LoopbackServer::say(connection, drip)) {
+            LoopbackServer::say(connection, row.first);
+            while (LoopbackServer::say(connection, row.second)) {
                 std::this_thread::sleep_for(60ms);
             }
         });
