@@ -58,6 +58,19 @@ Outcome readOpen(int descriptor, const std::string& path, std::string& content) 
     }
 }
 
+// For a file that is a mount of its own, as containers have them: nothing can be put in its place.
+Outcome overwrite(const std::string& path, std::string_view content) {
+    const FileDescriptor file(::open(path.c_str(), O_WRONLY | O_TRUNC | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+    if (!file.isOpen()) {
+        return Outcome::fromErrno("cannot open " + path);
+    }
+    Outcome done = writeAll(file.get(), content, path);
+    if (done.ok() && ::fsync(file.get()) != 0) {
+        done = Outcome::fromErrno("cannot put " + path + " on the disk");
+    }
+    return done;
+}
+
 }  // namespace
 
 Outcome makeRuntimeDirectory() {
@@ -143,7 +156,10 @@ Outcome replaceFile(const std::string& path, std::string_view content, const Fil
         done = Outcome::fromErrno("cannot close " + temporary);
     }
     if (done.ok() && ::rename(temporary.c_str(), path.c_str()) != 0) {
-        done = Outcome::fromErrno("cannot replace " + path);
+        const int error = errno;
+        (void)::unlink(temporary.c_str());
+        return error == EBUSY ? overwrite(path, content)
+                              : Outcome::fromErrno("cannot replace " + path, error);
     }
     if (!done.ok()) {
         (void)::unlink(temporary.c_str());

@@ -29,7 +29,8 @@ Outcome writeStateFile(const std::string& path, CFDictionaryRef content);
 Outcome removeStateFile(const std::string& path);
 
 // The same two steps for plain content, which the name servers' file shares. mode, uid and gid are set before
-// the file has its name.
+// the file has its name. A file that is a mount of its own, as containers have it, cannot be replaced: it is
+// written in place, and keeps its mode and owner.
 Outcome readWholeFile(const std::string& path, std::string& content);
 struct FileOwnership {
     unsigned mode = 0600;

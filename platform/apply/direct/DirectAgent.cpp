@@ -237,8 +237,10 @@ Outcome Way::isTakenOver(const Notes& notes, const Snapshot& before, bool& taken
     Outcome done = kernel_.read(*link_, now);
     const bool isForeign =
         std::any_of(now.addresses.begin(), now.addresses.end(), [&](const Address& address) {
-            return address.family() == AF_INET && !contains(notes.addresses, address) &&
-                   !contains(before.state.addresses, address);
+            // Link-local ones are taken by daemons that watch for cards without an address, and stand for
+            // nobody.
+            return address.family() == AF_INET && address.scope() < RT_SCOPE_LINK &&
+                   !contains(notes.addresses, address) && !contains(before.state.addresses, address);
         });
     // Half-way there or back it may be on by our own doing.
     const bool isOn = notes.phase == Notes::Phase::made && notes.off && link_->up;

@@ -153,6 +153,10 @@ int Address::family() const noexcept {
     return netlink::valueFrom<ifaddrmsg>(key).value_or(ifaddrmsg{}).ifa_family;
 }
 
+std::uint8_t Address::scope() const noexcept {
+    return netlink::valueFrom<ifaddrmsg>(key).value_or(ifaddrmsg{}).ifa_scope;
+}
+
 int Route::family() const noexcept {
     return netlink::valueFrom<rtmsg>(key).value_or(rtmsg{}).rtm_family;
 }

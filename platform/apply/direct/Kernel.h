@@ -38,6 +38,7 @@ struct Address {
     bool comesByItself = false;
 
     [[nodiscard]] int family() const noexcept;
+    [[nodiscard]] std::uint8_t scope() const noexcept;  // RT_SCOPE_
     bool operator==(const Address& other) const noexcept { return key == other.key; }
 };
 

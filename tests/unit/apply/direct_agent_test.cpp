@@ -16,6 +16,7 @@
 #include "platform/apply/Agents.h"
 #include "platform/apply/Apply.h"
 #include "platform/apply/StateFile.h"
+#include "platform/apply/direct/NameServers.h"
 #include "platform/apply/direct/Supplicant.h"
 #include "tests/unit/apply/StandInSupplicant.h"
 #include "tests/unit/apply/Trees.h"
@@ -250,6 +251,8 @@ TEST_F(DirectAgentTest, LeavesAnInterfaceThatSomebodyElseTookOver) {
          "ip addr flush dev card0; ip addr add 10.7.0.1/24 dev card0; ip route add default via 10.7.0.9",
          "10.7.0.1/24 \n", "default via 10.7.0.9 dev card0 \n"},
         {"another address beside ours", false, "ip addr add 10.7.0.1/24 dev card0", "10.7.0.1/24 \n", ""},
+        {"a link-local address beside ours", false, "ip addr add 169.254.1.1/16 scope link dev card0",
+         "10.1.0.5/24 \n", "default via 10.1.0.1 dev card0 \n"},
         {"switched on", true, "ip link set card0 up", "", ""},
         {"switched off", false, "ip link set card0 down", "10.1.0.5/24 \n",
          "default via 10.1.0.1 dev card0 \n"},
@@ -418,6 +421,19 @@ TEST_F(DirectAgentTest, ALeaseOfARunThatEndedIsGivenBack) {
                                     " | grep -v -e lock$ -e new$ || true"));
             }
         }
+    });
+}
+
+TEST_F(DirectAgentTest, WritesANameServersFileThatIsAMountInPlace) {
+    run([] {
+        shell(
+            "echo nameserver 9.9.9.9 > /run/outer; chmod 640 /run/outer; touch /etc/resolv.conf;"
+            "mount --bind /run/outer /etc/resolv.conf");
+        const std::string before = machineState();
+        expectOk(bringNameServers("card0", 0, {{address(10, 0, 0, 53)}, {}}));
+        EXPECT_EQ("nameserver 10.0.0.53\n", shell("grep -v '^#' /run/outer"));
+        expectOk(bringNameServers("card0", 0, {}));
+        EXPECT_EQ(before, machineState());
     });
 }
 
