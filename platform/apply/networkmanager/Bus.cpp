@@ -248,4 +248,12 @@ Outcome Bus::waitUntil(const std::function<bool()>& condition, Clock::time_point
     return {};
 }
 
+Outcome Bus::drain() {
+    int result = 0;
+    do {
+        result = sd_bus_process(bus_.get(), nullptr);
+    } while (result > 0);
+    return result < 0 ? fromBus("the system bus", result) : Outcome();
+}
+
 }  // namespace platform::apply

@@ -74,6 +74,9 @@ class Bus {
     Outcome waitUntil(const std::function<bool()>& condition, Clock::time_point deadline,
                       const Outcome& late);
 
+    // Handles the signals that have come, without waiting for more.
+    Outcome drain();
+
   private:
     Outcome process(Clock::time_point deadline, bool& inTime);
 

@@ -386,8 +386,12 @@ Outcome Daemon::await(Progress& progress) {
     if (!outcome.ok() || progress.state == activeActivated) {
         return outcome;
     }
-    outcome = bus_.waitUntil([&progress] { return progress.failure != reasonNone; },
-                             Clock::now() + reasonBound, {});
+    // All of what came: an earlier signal tells how the profile before made way.
+    outcome = bus_.drain();
+    if (outcome.ok()) {
+        outcome = bus_.waitUntil([&progress] { return progress.failure != reasonNone; },
+                                 Clock::now() + reasonBound, {});
+    }
     return outcome.ok() ? Outcome(kSCStatusFailed, describeFailure(progress.failure)) : outcome;
 }
 

@@ -143,6 +143,9 @@ class Going {
             }
         }
         const bool wireless = device_.kind == Device::Kind::wireless;
+        if (outcome.ok() && !wireless && network()) {
+            outcome = {kSCStatusFailed, "a network to join is named and the card is no wireless one"};
+        }
         if (outcome.ok() && wireless) {
             outcome = switchRadio();
         }
@@ -250,7 +253,10 @@ class Returning {
 
     Outcome run() {
         std::optional<Device> device;
-        Outcome outcome = findOurProfile(daemon_, interface_, profile_);
+        Outcome outcome = daemon_.findProfile(profileUUID(interface_), profile_);
+        if (profile_ && !isOurs(profile_->sections)) {
+            profile_.reset();
+        }
         if (outcome.ok()) {
             outcome = daemon_.findDevice(interface_, device);
         }
