@@ -16,6 +16,7 @@ constexpr std::uint32_t fileEvents =
 
 // More than a path has folders that could come one after the other meanwhile.
 constexpr int mostWatchTries = 64;
+constexpr int mostReads = 1000;
 
 bool addTo(int poll, int descriptor) {
     epoll_event event{};
@@ -69,7 +70,7 @@ void ChangeWatch::watchPreferences() {
 bool ChangeWatch::drainPreferences() {
     bool any = false;
     alignas(inotify_event) char events[4096];
-    while (::read(files_.get(), events, sizeof events) > 0) {
+    for (int i = 0; i<mostReads&& ::read(files_.get(), events, sizeof events)> 0; ++i) {
         any = true;
     }
     if (any) {

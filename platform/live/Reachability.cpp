@@ -102,7 +102,7 @@ Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnecti
     if (status == EAI_NONAME) {
         status = resolve(nodename, 0, list);
     }
-    if (status != 0 && status != EAI_NONAME) {
+    if (status != 0 && status != EAI_NONAME && status != EAI_NODATA) {
         const Outcome failed(kSCStatusFailed,
                              std::string("cannot look up ") + nodename + ": " + ::gai_strerror(status));
         return static_cast<Boolean>(setStatus(failed, who));

@@ -36,7 +36,7 @@ Session* Session::from(SCPreferencesRef reference) noexcept {
 Outcome Session::checkFresh() const {
     std::optional<FileIdentity> now;
     Outcome looked = file_.look(now);
-    if (looked.ok() && now != onDisk_.identity) {
+    if (looked.ok() && !onDisk_.isOf(now)) {
         return {kSCStatusStale, file_.path() + " was changed by another process"};
     }
     return looked;
@@ -77,20 +77,20 @@ Outcome Session::write() {
     if (content->size() > largestPreferencesFile) {
         return {kSCStatusFailed, "the tree is larger than a preferences file may be"};
     }
-    std::optional<FileIdentity> identity;
-    Outcome done = file_.replace(*content, identity);
+    std::optional<KnownFile> known;
+    Outcome done = file_.replace(*content, known);
     if (done.ok()) {
-        onDisk_ = {tree_.root(), identity};
+        onDisk_ = {tree_.root(), std::move(known)};
         remember(file_, onDisk_);
-    } else if (identity) {
+    } else if (known) {
         // In its place, but perhaps not durable: the next commit is not stale, and writes once more.
-        onDisk_.identity = identity;
+        onDisk_.file = std::move(known);
     }
     return done;
 }
 
 Outcome Session::commit(std::chrono::milliseconds wait) {
-    if (onDisk_.identity && !isChanged()) {
+    if (onDisk_.file && !isChanged()) {
         return checkFresh();
     }
     const bool held = lock_.isOpen();

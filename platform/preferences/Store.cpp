@@ -47,18 +47,18 @@ Outcome load(const StoreFile& file, Snapshot& snapshot) {
         return {};
     }
     const Remembered& last = remembered();
-    if (last.path == file.path() && last.snapshot.identity == now) {
+    if (last.path == file.path() && last.snapshot.isOf(now)) {
         snapshot = last.snapshot;
         return {};
     }
     std::string content;
-    FileIdentity identity;
-    done = file.read(content, identity);
+    KnownFile known;
+    done = file.read(content, known);
     if (done.ok()) {
         done = parse(file.path(), content, snapshot.tree);
     }
     if (done.ok()) {
-        snapshot.identity = identity;
+        snapshot.file = std::move(known);
         remember(file, snapshot);
     }
     return done;

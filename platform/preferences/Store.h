@@ -12,8 +12,13 @@ namespace platform::preferences {
 
 // What the store holds at one moment.
 struct Snapshot {
-    values::Owned<CFDictionaryRef> tree;   // frozen
-    std::optional<FileIdentity> identity;  // nothing: there is no file, and the tree is the first-run tree
+    values::Owned<CFDictionaryRef> tree;  // frozen
+    std::optional<KnownFile> file;        // nothing: there is none, and the tree is the first-run tree
+
+    // Whether a look at the file found the one that the tree is from.
+    [[nodiscard]] bool isOf(const std::optional<FileIdentity>& now) const {
+        return file.has_value() == now.has_value() && (!file || file->identity == *now);
+    }
 };
 
 // The store as it is now. An unchanged file costs one look at it; a changed one is read and parsed.

@@ -103,8 +103,8 @@ Outcome StoreFile::look(std::optional<FileIdentity>& identity) const {
     return regular;
 }
 
-Outcome StoreFile::read(std::string& content, FileIdentity& identity) const {
-    const FileDescriptor file(operations_->open(path_, O_RDONLY, 0));
+Outcome StoreFile::read(std::string& content, KnownFile& known) const {
+    FileDescriptor file(operations_->open(path_, O_RDONLY, 0));
     if (!file.isOpen()) {
         return Outcome::fromErrno("cannot open " + path_);
     }
@@ -120,8 +120,9 @@ Outcome StoreFile::read(std::string& content, FileIdentity& identity) const {
         if (!done.ok()) {
             return done;
         }
-        identity = identityOf(status);
+        const FileIdentity identity = identityOf(status);
         if (::fstat(file.get(), &status) == 0 && identityOf(status) == identity) {
+            known = {identity, std::make_shared<const FileDescriptor>(std::move(file))};
             return {};
         }
     }
@@ -235,8 +236,23 @@ Outcome StoreFile::syncDirectory() {
     return {};
 }
 
-Outcome StoreFile::replace(std::string_view content, std::optional<FileIdentity>& identity) {
-    identity.reset();
+// The file that has just been given its name, which set the time of change and nothing but that.
+std::optional<KnownFile> StoreFile::recognize(FileIdentity written) const {
+    FileDescriptor file(::open(path_.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+    struct stat status {};
+    if (!file.isOpen() || ::fstat(file.get(), &status) != 0) {
+        return std::nullopt;
+    }
+    const FileIdentity now = identityOf(status);
+    written.changed = now.changed;
+    if (now != written) {
+        return std::nullopt;
+    }
+    return KnownFile{now, std::make_shared<const FileDescriptor>(std::move(file))};
+}
+
+Outcome StoreFile::replace(std::string_view content, std::optional<KnownFile>& known) {
+    known.reset();
     std::optional<FileIdentity> written;
     Outcome done = writeTemporary(content, written);
     if (done.ok() && operations_->rename(temporaryPath_, path_) != 0) {
@@ -246,14 +262,8 @@ Outcome StoreFile::replace(std::string_view content, std::optional<FileIdentity>
         (void)operations_->remove(temporaryPath_);
         return done;
     }
-    // The rename set the time of change, and nothing but that.
-    struct stat status {};
-    if (written && ::lstat(path_.c_str(), &status) == 0) {
-        const FileIdentity now = identityOf(status);
-        written->changed = now.changed;
-        if (now == *written) {
-            identity = now;
-        }
+    if (written) {
+        known = recognize(*written);
     }
     return syncDirectory();
 }

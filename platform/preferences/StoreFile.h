@@ -6,6 +6,7 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -28,6 +29,14 @@ struct FileIdentity {
     bool operator==(const FileIdentity&) const = default;
 };
 
+// A file that this process has read or written. The descriptor keeps the inode's number from being given to
+// another file, which could otherwise look the same to the last detail within one tick of the file system's
+// clock.
+struct KnownFile {
+    FileIdentity identity;
+    std::shared_ptr<const FileDescriptor> pin;
+};
+
 // "preferences.plist" in one directory, "preferences.lock" beside it, and "preferences.plist.new" while a
 // commit writes. A symbolic link in the place of any of them is refused, wherever it leads: the store of a
 // tool that runs as root has no business elsewhere. So is everything else that is no regular file, and none
@@ -42,15 +51,15 @@ class StoreFile {
     // make one.
     Outcome look(std::optional<FileIdentity>& identity) const;
     // All of the file, and what it was when it was read. Fails beyond largestPreferencesFile.
-    Outcome read(std::string& content, FileIdentity& identity) const;
+    Outcome read(std::string& content, KnownFile& known) const;
     // Takes the lock, which goes with the descriptor. Makes the directory (0700) and its parents when they
     // are missing. 3002 when another process keeps it for the whole wait.
     Outcome lock(std::chrono::milliseconds wait, FileDescriptor& lock);
     // Puts the content in the file's place, all of it or nothing, on the disk when the call returns. A new
-    // file has mode 0600, a replaced one keeps its mode and owner. The lock must be held. identity is what
+    // file has mode 0600, a replaced one keeps its mode and owner. The lock must be held. known is what
     // the file then is: set as soon as the new content has its place, even when the call fails after that,
     // and nothing, on success too, when somebody else touched the file at that very moment.
-    Outcome replace(std::string_view content, std::optional<FileIdentity>& identity);
+    Outcome replace(std::string_view content, std::optional<KnownFile>& known);
 
   private:
     Outcome makeDirectories();
@@ -58,6 +67,7 @@ class StoreFile {
     Outcome fill(int descriptor, std::string_view content);
     Outcome keepOwnership(int descriptor);
     Outcome syncDirectory();
+    [[nodiscard]] std::optional<KnownFile> recognize(FileIdentity written) const;
 
     std::string directory_;
     std::string path_;
