@@ -44,11 +44,11 @@ class Error {
     [[nodiscard]] const sd_bus_error& get() const noexcept { return error_; }
 
   private:
-    sd_bus_error error_ = SD_BUS_ERROR_NULL;
+    sd_bus_error error_ = {nullptr, nullptr, 0};
 };
 
 Outcome fromBus(const std::string& what, int result) {
-    return platform::apply::fromBus(what, result, SD_BUS_ERROR_NULL, {});
+    return platform::apply::fromBus(what, result, sd_bus_error{}, {});
 }
 
 int forwardSignal(sd_bus_message* message, void* context, sd_bus_error* /*error*/) {
