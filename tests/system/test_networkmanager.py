@@ -335,6 +335,47 @@ class Matrix(lab.LabTest):
             self.remove()
             self.assert_back(before)
 
+    def test_contract(self):
+        """What the stand-in of the unit tests is held to."""
+        self.fresh("idle")
+        self.nmcli("connection delete room")
+        program = lab.BUILD / "tests/unit/networkmanager/test_networkmanager"
+        run = subprocess.run([program, "--gtest_filter=Contract.*"], capture_output=True, text=True, check=False,
+                             env=lab.ENVIRONMENT | {"LA_NETWORKMANAGER_BUS": str(SOCKET)})
+        self.assertEqual(run.returncode, 0, run.stdout[-3000:] + run.stderr)
+        self.assertRegex(run.stdout, r"PASSED.* [1-9]\d* tests")
+
+    def test_unmanaged_card(self):
+        """What the daemon is told to leave alone is led without it."""
+        self.fresh("idle")
+        self.nmcli("device set eth0 managed no")
+        ip("addr add 192.168.77.10/24 dev eth0")
+        ip("route add default via 192.168.77.1 dev eth0 metric 50")
+        before = self.settled()
+        for mode in CREATED:
+            with self.subTest(mode):
+                self.lab.tool("create", mode)
+                self.assertEqual((self.lab.ipv4("eth0") or [""])[0].startswith("192.168.77."), mode == "auto")
+                self.assertIn("unmanaged", self.lab.nmcli("-g GENERAL.STATE device show eth0"))
+                self.remove()
+                self.assert_back(before)
+
+    def test_secrets(self):
+        """A password that the wired card cannot use is nowhere to be found, except where it belongs."""
+        before = self.fresh("automatic")
+        canary = "canary-e7c1-4f"
+        process = self.lab.start("create", "from_intro", "Printer", canary)
+        trace, _ = process.communicate()
+        log = "\n".join(self.lab.syslog)
+        self.assertIn("no wireless one", log)
+        for what in (trace.decode(), log, self.lab.file("networkmanager.log")):
+            self.assertNotIn(canary, what)
+        holders = subprocess.run(["grep", "-rlI", canary, "/run", "/var/lib", "/tmp", "/etc"], capture_output=True,
+                                 text=True, check=False).stdout.split()
+        self.assertEqual([path for path in holders if Path(path).stat().st_mode & 0o077], [])
+        self.remove()
+        self.assert_back(before)
+
 
 if __name__ == "__main__":
     lab.main()

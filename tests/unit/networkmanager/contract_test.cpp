@@ -234,6 +234,31 @@ TEST_F(Contract, anothersProfileUnderOurUUID) {
     EXPECT_TRUE(exists(profileUUID("eth0")));
 }
 
+// The real daemon judges wireless profiles without a radio too.
+TEST_F(Contract, wirelessProfilesAreJudged) {
+    const std::string canary = "canary-e7c1";
+    InterfacePlan plan = on("eth0");
+    plan.wireless.emplace().network = "Printer";
+    for (const AccessPoint& point :
+         {AccessPoint{}, AccessPoint{true}, AccessPoint{false, true}, AccessPoint{false, true, true, true},
+          AccessPoint{true, true, true, true}}) {
+        WirelessFacts facts;
+        facts.seen = {point};
+        plan.wireless->key = point.protectedAccess ? canary : "abcde";
+        Sections sections;
+        ASSERT_TRUE(makeProfile(plan, &facts, {}, sections).ok());
+        std::string path;
+        Outcome outcome = daemon_.addProfile(sections, *plan.wireless->key, path);
+        EXPECT_TRUE(outcome.ok()) << outcome.reason();
+        EXPECT_TRUE(daemon_.deleteProfile(path).ok());
+
+        sections["802-11-wireless-security"] = {{"key-mgmt", {canary}}};
+        outcome = daemon_.addProfile(sections, canary, path);
+        EXPECT_FALSE(outcome.ok());
+        EXPECT_EQ(outcome.reason().find(canary), std::string::npos) << outcome.reason();
+    }
+}
+
 TEST_F(Contract, cardsThatWereNeverTakenOverMakeWay) {
     use(desk, "eth0", "10.20.30.3");
     use(room, "wlan0", "10.20.30.2");
