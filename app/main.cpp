@@ -37,9 +37,30 @@ void ShowUsage(const char* programName) {
     std::printf("\n");
 }
 
+// Waits until no other run is under way, for as long as one may take. Two at once would delete each other's
+// temporary location between making it and making it current, and a current location that does not exist
+// leads nowhere back. The lock ends with the process. Without the rights to make the file there is nothing to
+// change either.
+void TakeTurn() {
+    constexpr const char* path = "/run/location-assistant.lock";
+    constexpr useconds_t pause = 20'000;
+    constexpr int tries = 3'000;
+    const int descriptor = open(path, O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, S_IRUSR | S_IWUSR);
+    if (descriptor < 0) {
+        return;
+    }
+    struct flock whole = {};
+    whole.l_type = F_WRLCK;
+    whole.l_whence = SEEK_SET;
+    for (int i = 0; i < tries && fcntl(descriptor, F_SETLK, &whole) != 0; ++i) {
+        usleep(pause);
+    }
+}
+
 // The last clean-up runs when the new location is current: it removes every other one of the temporary name,
 // and the library refuses to delete the current one.
 OSStatus CreateTemporary(char* mode, char* networkName, char* password) {
+    TakeTurn();
     assistant.Initialize();
     assistant.CleanupOldTemporarySets();
     assistant.SaveOriginalSet();
@@ -54,6 +75,7 @@ OSStatus CreateTemporary(char* mode, char* networkName, char* password) {
 }
 
 OSStatus RemoveTemporary() {
+    TakeTurn();
     assistant.Initialize();
     assistant.RestoreOriginalSet();
     assistant.CleanupOldTemporarySets();
@@ -62,6 +84,7 @@ OSStatus RemoveTemporary() {
 }
 
 OSStatus RemoveTemporary2() {
+    TakeTurn();
     assistant.Initialize();
     assistant.RestoreOriginalSet2();
     assistant.CleanupOldTemporarySets();
@@ -72,6 +95,7 @@ OSStatus RemoveTemporary2() {
 }
 
 OSStatus SaveTemporary() {
+    TakeTurn();
     assistant.CleanupOldUserSets();
     assistant.SaveTemporarySet();
     assistant.CleanupOldUserSets();
@@ -79,6 +103,7 @@ OSStatus SaveTemporary() {
 }
 
 OSStatus SaveZAT() {
+    TakeTurn();
     assistant.SaveZATSet();
     return 0;
 }

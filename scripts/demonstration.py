@@ -31,12 +31,7 @@ class Demonstration:
         self.machine = lab.Lab(daemon=DAEMON, **options)
         say("The machine: a wired and a wireless card, both in use")
         self.show_network()
-        self.before = self.network()
-
-    def network(self):
-        connections = self.machine.nmcli("-f NAME,UUID,AUTOCONNECT,ACTIVE,DEVICE,FILENAME connection") if DAEMON else ""
-        devices = self.machine.nmcli("-f DEVICE,STATE,CONNECTION device") if DAEMON else ""
-        return self.machine.network(), connections, devices
+        self.before = self.machine.network()
 
     def show_network(self):
         show("ip -brief -4 address | grep -v ^lo")
@@ -58,7 +53,7 @@ class Demonstration:
 
     def locations(self):
         say("The locations of this machine")
-        show(f"{lab.BUILD}/examples/list_locations")
+        show(f"{lab.BUILD}/examples/locations list")
 
     def only(self, card, other, address):
         say(f"Now only {card} is on")
@@ -77,7 +72,7 @@ class Demonstration:
         say("And back")
         self.tool("remove")
         self.show_network()
-        now = self.network()
+        now = self.machine.network()
         self.expect(now == self.before, f"before:\n{self.before}\nnow:\n{now}")
         say("Addresses, routes, link states and name servers are exactly as before"
             + (", and so are NetworkManager's profiles and devices" if DAEMON else ""))

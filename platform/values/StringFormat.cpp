@@ -92,9 +92,16 @@ bool appendConversion(std::string& text, const Conversion& conversion, Arguments
             return appendFormatted(text, directive, arguments.next<int>());
         case 's':
             return appendFormatted(text, directive, arguments.next<const char*>());
-        case '@':
-            text += descriptionOf(arguments.next<CFTypeRef>());
+        case '@': {
+            const CFTypeRef value = arguments.next<CFTypeRef>();
+            // A description is one line; a string stands for itself, line breaks included.
+            if (value != nullptr && CFGetTypeID(value) == CFStringGetTypeID()) {
+                text += textOf(static_cast<CFStringRef>(value));
+            } else {
+                text += descriptionOf(value);
+            }
             return true;
+        }
         case '%':
             text.push_back('%');
             return true;

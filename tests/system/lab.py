@@ -246,7 +246,7 @@ class Lab:
         self.listener.close()
         sh(f"""
             for card in {' '.join(self.cards)}; do ip link del $card 2>/dev/null || ip -n far link del far-$card || :; done
-            rm -rf /dev/log {STORE.parent} {RUNTIME} {LAB}/made/* {LAB}/*.log {LAB}/leases /run/dbus
+            rm -rf /dev/log {STORE.parent} {RUNTIME} /run/location-assistant.lock {LAB}/made/* {LAB}/*.log {LAB}/leases /run/dbus
             rm -rf /etc/NetworkManager/* /run/NetworkManager /var/lib/NetworkManager
             find /tmp -xdev -mindepth 1 -not -type d -delete
         """)

@@ -56,7 +56,7 @@ class BadInput(lab.LabTest):
             "deep": HEAD + deep + b"<string/>" + b"</dict>" * 1_000_000 + b"</plist>",
             "entities": b'<!DOCTYPE plist [<!ENTITY a "' + b"x" * 999 + b'"><!ENTITY b "' + b"&a;" * 999
                         + b'"><!ENTITY c "' + b"&b;" * 999 + b'">]>' + HEAD[39:] + b"<string>&c;</string></plist>",
-            "gigabyte": lambda path: path.open("wb").truncate(1 << 30),
+            "gigabyte": lambda path: lab.sh(f"truncate -s 1G {path}"),
             "directory": lambda path: path.mkdir(), "FIFO": os.mkfifo,
             "link to nowhere": lambda path: path.symlink_to("/var/lib/nowhere"),
         } | {f"cut at {at}": good[:at] for at in range(1, len(good.rstrip()), len(good) // 25)}
@@ -92,7 +92,7 @@ class BadInput(lab.LabTest):
                 parent[path[-1]] = wrong
                 with self.subTest("/".join(path), wrong=wrong):
                     self.put_store(plistlib.dumps(tree))
-                    for words in ["create", "auto"], ["save"], ["saveZAT"], ["remove"], ["restoreZAT"]:
+                    for words in ["create"], ["save"], ["saveZAT"], ["remove"], ["restoreZAT"]:
                         status, trace = self.lab.tool(*words)
                         self.assertEqual(0, status)
                         self.assertTrue(trace or words[0] != "create")
@@ -140,15 +140,15 @@ class BadInput(lab.LabTest):
                  "9" * 3000: ("", "9" * 1023, "9" * 1023)}
         for kind, (line, shown, current) in rows.items():
             with self.subTest(kind[:20]):
+                lab.sh(f"rm -rf {lab.STORE} {SET_FILE}")
                 self.lab.tool("create")
                 self.put_set_file(kind)
                 _, trace = self.lab.tool("remove")
                 self.assertIn(f'"/tmp/set.orig"\n{line}Activating the original set: "{shown}"\n', trace)
                 self.assertEqual(f"/Sets/{current}", self.lab.store()["CurrentSet"])
-                if current != "1":
-                    self.assert_as_before()
-                self.put_set_file("0")
-                lab.sh(f"rm -rf {lab.STORE} {SET_FILE}") if current != "1" else self.lab.tool("remove")
+                if current == "1":
+                    self.put_set_file("0")
+                    self.lab.tool("remove")
                 self.assert_as_before()
 
     def test_remembered_location_not_writable(self):
@@ -166,7 +166,7 @@ class BadInput(lab.LabTest):
     def test_output_gone(self):
         read, write = os.pipe()
         os.close(read)
-        outputs = {"full": {"stdout": open("/dev/full", "wb")}, "broken pipe": {"stdout": write},
+        outputs = {"full": {"stdout": os.open("/dev/full", os.O_WRONLY)}, "broken pipe": {"stdout": write},
                    "closed": {"stdout": None, "preexec_fn": lambda: os.close(1)},
                    "all closed": {"stdout": None, "preexec_fn": lambda: os.closerange(0, 3)}}
         for name, options in outputs.items():
@@ -179,18 +179,17 @@ class BadInput(lab.LabTest):
                 self.assert_whole()
 
     def test_two_at_once(self):
-        rounds = [("create", "create"), ("create", "remove"), ("remove", "remove"), ("create", "save")] * 4
-        for words in rounds:
-            with self.subTest(words):
+        rounds = [("create", "create"), ("create", "remove"), ("remove", "remove"), ("create", "save"),
+                  ("save", "restoreZAT")] * 6
+        self.lab.tool("saveZAT")
+        for number, words in enumerate(rounds):
+            with self.subTest(words, round=number):
                 runs = [self.lab.start(word) for word in words]
                 for run in runs:
                     out, errors = run.communicate(timeout=120)
                     self.assertEqual((0, b""), (run.returncode, errors), out)
                 self.assert_whole()
-        while self.set_names()[1] != "0":
-            SET_FILE.write_text("0")
-            Path("/tmp/zat.orig").write_text("0")
-            self.lab.tool("restoreZAT")
+        self.lab.tool("restoreZAT")
         self.lab.tool("remove")
         self.assert_as_before()
 
@@ -239,8 +238,7 @@ class Canary(lab.LabTest):
             self.assertNotIn(forms[0], out + seen + "".join(self.lab.syslog).encode())
             for folder in "/tmp", "/run", "/var/lib", "/etc":
                 for path in Path(folder).rglob("*"):
-                    if path.is_file() and not path.is_symlink() and path != lab.STORE and path.is_relative_to(folder) \
-                            and (path.stat().st_mode & 0o077 or path.is_relative_to(lab.RUNTIME)):
+                    if path.is_file() and path != lab.STORE and path.parts[2] not in ("lab", "netns"):
                         content = path.read_bytes()
                         self.assertFalse(any(form in content for form in forms), path)
         self.assertIn(forms[1], plistlib.dumps(self.lab.store()) + b"".join(
