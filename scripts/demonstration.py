@@ -20,8 +20,8 @@ def indented(text):
     print("".join(f"    {line}\n" for line in text.rstrip("\n").split("\n")), end="", flush=True)
 
 
-def show(command):
-    print(f"  $ {command}")
+def show(command, shown=None):
+    print(f"  $ {shown or command}")
     indented(subprocess.run(["sh", "-c", command], capture_output=True, text=True, check=True).stdout)
 
 
@@ -34,6 +34,7 @@ class Demonstration:
         self.before = self.machine.network()
 
     def show_network(self):
+        show("ip -brief link | grep -v ^lo")
         show("ip -brief -4 address | grep -v ^lo")
         show("ip route")
         if DAEMON:
@@ -53,7 +54,7 @@ class Demonstration:
 
     def locations(self):
         say("The locations of this machine")
-        show(f"{lab.BUILD}/examples/locations list")
+        show(f"{lab.BUILD}/examples/locations list", "examples/locations list")
 
     def only(self, card, other, address):
         say(f"Now only {card} is on")
@@ -111,7 +112,7 @@ def main():
     one.tool("create", "auto")
     one.only("eth0", "wlan0", "192.168.77.")
     say("What the DHCP server says")
-    indented("\n".join(line.split(": ", 1)[1] for line in one.machine.file("dhcp.log").splitlines() if "DHCP" in line))
+    indented("\n".join(line.split(": ", 1)[1] for line in one.machine.file("dhcp.log").splitlines() if " DHCP" in line))
     one.back()
 
     one = Demonstration("The whole cycle in one run, with a question to the user")

@@ -161,7 +161,7 @@ def skip_all(reason):
 def main():
     enter()
     arguments = [argument for argument in sys.argv if argument != "--update"]
-    result = unittest.main(module="__main__", argv=arguments, exit=False, verbosity=2).result
+    result = unittest.main(module="__main__", argv=arguments, exit=False, verbosity=2, warnings="ignore").result
     if not result.wasSuccessful() or (result.skipped and FORBID_SKIPS):
         sys.exit(1)
     for test, reason in result.skipped:
