@@ -206,10 +206,11 @@ int StandInDaemon::manager(sd_bus_message* call, const std::string& member) {
 int StandInDaemon::settings(sd_bus_message* call, const std::string& member) {
     if (member == "GetConnectionByUuid") {
         const std::string uuid = readText(call);
-        for (const auto& [path, profile] : profiles_) {
-            if (profile.uuid == uuid) {
-                return reply(call,
-                             [&](sd_bus_message* m) { return sd_bus_message_append(m, "o", path.c_str()); });
+        for (const auto& each : profiles_) {
+            if (each.second.uuid == uuid) {
+                return reply(call, [&each](sd_bus_message* m) {
+                    return sd_bus_message_append(m, "o", each.first.c_str());
+                });
             }
         }
         return fail(call, prefix + ".Settings.InvalidConnection", "No connection with the UUID was found.");
