@@ -122,7 +122,9 @@ class StandInDesktop {
                                              "<allow receive_sender=\"*\"/></policy></busconfig>\n");
         bus_ = std::make_unique<Process>([&] {
             // It complains about limits that only the machine's own bus may have.
-            static_cast<void>(std::freopen("/dev/null", "w", stderr));
+            if (std::freopen("/dev/null", "w", stderr) == nullptr) {
+                _exit(1);
+            }
             const char* none[] = {nullptr};
             execle("/usr/bin/dbus-daemon", "dbus-daemon", option.c_str(), "--nofork", "--nopidfile", nullptr,
                    none);
