@@ -1,5 +1,7 @@
 #!/usr/bin/env python3
 """The main job, shown to somebody who has never seen it. Exits 1 when the way back did not lead back."""
+import difflib
+import pprint
 import subprocess
 import sys
 from pathlib import Path
@@ -74,7 +76,8 @@ class Demonstration:
         self.tool("remove")
         self.show_network()
         now = self.machine.network()
-        self.expect(now == self.before, f"before:\n{self.before}\nnow:\n{now}")
+        difference = difflib.ndiff(pprint.pformat(self.before).split("\n"), pprint.pformat(now).split("\n"))
+        self.expect(now == self.before, "as before\n" + "\n".join(line for line in difference if line[0] != " "))
         say("Addresses, routes, link states and name servers are exactly as before"
             + (", and so are NetworkManager's profiles and devices" if DAEMON else ""))
         self.machine.close()

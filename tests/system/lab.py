@@ -67,7 +67,7 @@ method=link-local
 PROFILES = {
     "office": ("11111111-2222-4333-8444-555555555555", "eth0",
                "address1=192.168.77.10/24,192.168.77.1\naddress2=192.168.77.11/24\nroute-metric=100"),
-    "lounge": ("66666666-7777-4888-9999-aaaaaaaaaaaa", "wlan0", "address1=10.20.0.7/16\nroute1=10.30.0.0/16,10.20.0.1"),
+    "lounge": ("66666666-7777-4888-9999-aaaaaaaaaaaa", "wlan0", "address1=10.20.0.7/16\nroute1=10.30.0.0/16,10.20.0.1\nroute-metric=600"),
 }
 
 PREPARE = """
