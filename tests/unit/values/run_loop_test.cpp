@@ -65,7 +65,6 @@ TEST_F(RunLoop, ReturnsForEachOfItsReasons) {
     add(source);
     EXPECT_EQ(CFGetRetainCount(source.get()), 2);
     EXPECT_EQ(runFor(0), kCFRunLoopRunTimedOut);
-    EXPECT_EQ(runFor(0.01), kCFRunLoopRunTimedOut);
     pipe.send();
     pipe.send();
     EXPECT_EQ(runFor(10, true), kCFRunLoopRunHandledSource);
@@ -75,7 +74,6 @@ TEST_F(RunLoop, ReturnsForEachOfItsReasons) {
     CFRunLoopStop(loop);
     EXPECT_EQ(runFor(10), kCFRunLoopRunStopped);
     EXPECT_EQ(runFor(0), kCFRunLoopRunTimedOut);
-    EXPECT_EQ(CFRunLoopRunInMode(CFSTR("another mode"), 10, 0), kCFRunLoopRunFinished);
     remove(source);
     remove(source);
     EXPECT_EQ(CFGetRetainCount(source.get()), 1);
@@ -102,7 +100,7 @@ TEST_F(RunLoop, LetsACallbackChangeTheSources) {
     EXPECT_EQ(otherCalls, 0);
 }
 
-TEST_F(RunLoop, StopsFromACallbackAnotherThreadAndASignalHandler) {
+TEST_F(RunLoop, StopsFromACallbackAndASignalHandler) {
     const auto source = pipe.source([&] {
         pipe.receive();
         CFRunLoopStop(loop);
@@ -110,13 +108,6 @@ TEST_F(RunLoop, StopsFromACallbackAnotherThreadAndASignalHandler) {
     add(source);
     pipe.send();
     CFRunLoopRun();
-    std::thread stopper([this] {
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-        CFRunLoopStop(loop);
-    });
-    CFRunLoopRun();
-    stopper.join();
-
     static CFRunLoopRef signalled;
     signalled = loop;
     struct sigaction action {};

