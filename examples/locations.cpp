@@ -154,7 +154,7 @@ OSStatus Delete(CFStringRef name) {
 int main(int argc, char** argv) {
     const char* command = argc > 1 ? argv[1] : "";
     CFStringRef name = nullptr;
-    OSStatus err = 0;
+    OSStatus err = paramErr;
     if (argc == 3) {
         name = CFStringCreateWithCString(kCFAllocatorDefault, argv[2], CFStringGetSystemEncoding());
     }
@@ -166,10 +166,9 @@ int main(int argc, char** argv) {
         err = Delete(name);
     } else {
         std::fprintf(stderr, "Usage: %s list | make-dialup NAME | delete NAME\n", argv[0]);
-        err = paramErr;
     }
     if (err != 0) {
-        std::fprintf(stderr, "failed: %d\n", static_cast<int>(err));
+        std::fprintf(stderr, "status %d\n", static_cast<int>(err));
     }
     CFQRelease(name);
     return err == 0 ? 0 : 1;

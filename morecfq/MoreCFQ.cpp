@@ -45,7 +45,10 @@ OSStatus CreateArrayWithKeysOrValues(CFDictionaryRef dict, bool wantKeys, CFArra
 // The path's keys as a vector, to be freed; they stay borrowed from the array.
 OSStatus PathArrayHelper(CFArrayRef path, const void*** elements) {
     const CFIndex count = CFArrayGetCount(path);
-    const OSStatus err = AllocateSlots(count, elements);
+    OSStatus err = AllocateSlots(count, elements);
+    if (err == 0 && *elements == nullptr) {
+        err = paramErr;
+    }
     if (err == 0) {
         CFArrayGetValues(path, CFRangeMake(0, count), *elements);
     }

@@ -6,8 +6,8 @@
 // CFQRelease; one named Get hands out a borrowed value that lives as long as its container holds it.
 // Arguments must not be null except where null is mentioned. No state is kept between calls.
 //
-// Statuses: -50 (arrays of different length), -108 (no memory for a temporary buffer), -4960 (the platform
-// refused to make a value), and the two below.
+// Statuses: -50 (arrays of different length, an empty path), -108 (no memory for a temporary buffer), -4960
+// (the platform refused to make a value), and the two below.
 #pragma once
 
 #include "platform/CoreFoundation.h"
@@ -49,7 +49,7 @@ OSStatus CFQDictionarySetNumber(CFMutableDictionaryRef dict, const void* key, SI
 //
 // A path is a list of keys, at least one, each taken as it is: the first is looked up in the dictionary
 // given, each further one in what the key before it led to. It is a plain vector with a count, or (PathArray)
-// an array value. A path without keys is a caller error and is not checked.
+// an array value. An array without keys is -50; a vector without keys is a caller error and is not checked.
 
 // The value that the last key leads to, of whatever kind, borrowed; untouched on failure.
 OSStatus CFQDictionaryGetValueAtPath(CFDictionaryRef dict, const CFTypeRef* path, CFIndex count,

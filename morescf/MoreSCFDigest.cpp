@@ -410,8 +410,9 @@ OSStatus MoreSCCreateGlobalEntity(CFStringRef protocol, const MoreSCGlobalDigest
 
 OSStatus MoreSCFCreateStringWithMacAddress(const UInt8 macAddr[6], CFStringRef* result) {
     char text[19] = "";
-    for (int i = 0; i < 6; ++i) {
-        std::snprintf(text + i * 3, 4, "%2.2x:", static_cast<unsigned int>(macAddr[i]));
+    char* end = text;
+    for (int i = 0; i < 6; ++i, end += 3) {
+        std::snprintf(end, 4, "%2.2x:", static_cast<unsigned int>(macAddr[i]));
     }
     text[17] = '\0';
     return CreateStringWithASCII(text, result);

@@ -27,6 +27,7 @@ struct MoreSCInterfaceDigest {
 
 // "Proxies": "ExceptionsList", "FTPPassive" and, for each of FTP, Gopher, HTTP, HTTPS, RTSP and SOCKS, a flag
 // ("FTPEnable", always there), a host ("FTPProxy") and a port ("FTPPort", left out when 0).
+// NOLINTNEXTLINE(clang-analyzer-optin.performance.Padding): callers rely on the order of the members.
 struct MoreSCProxiesDigest {
     CFArrayRef exceptionsList;  // strings: hosts that are reached without a proxy
     Boolean ftpPassive;

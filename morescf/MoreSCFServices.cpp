@@ -183,9 +183,9 @@ OSStatus MoreSCCopyServicesDict(CFStringRef setID, CFDictionaryRef* servicesDict
     if (err == 0 && servicesDict != nullptr) {
         err = CopySetServicesPath(setID, &servicesPath);
         if (err == 0) {
-            services = SCPreferencesPathGetValue(session, servicesPath);
+            services =
+                static_cast<CFDictionaryRef>(CFQRetain(SCPreferencesPathGetValue(session, servicesPath)));
             err = MoreSCError(services);
-            CFQRetain(services);
         }
     }
     if (err == 0 && serviceOrder != nullptr) {
@@ -194,8 +194,7 @@ OSStatus MoreSCCopyServicesDict(CFStringRef setID, CFDictionaryRef* servicesDict
             CFDictionaryRef globalIPv4 = SCPreferencesPathGetValue(session, orderPath);
             err = MoreSCError(globalIPv4);
             if (err == 0) {
-                order = GetArrayValue(globalIPv4, CFSTR("ServiceOrder"));
-                CFQRetain(order);
+                order = static_cast<CFArrayRef>(CFQRetain(GetArrayValue(globalIPv4, CFSTR("ServiceOrder"))));
                 if (order == nullptr) {
                     err = coreFoundationUnknownErr;
                 }
@@ -319,8 +318,7 @@ OSStatus MoreSCCopyUserVisibleNameOfService(CFStringRef setID, CFStringRef servi
         err = MoreSCCopyEntitiesDict(setID, serviceID, &service);
     }
     if (err == 0) {
-        name = GetStringValue(service, CFSTR("UserDefinedName"));
-        CFQRetain(name);
+        name = static_cast<CFStringRef>(CFQRetain(GetStringValue(service, CFSTR("UserDefinedName"))));
         if (name == nullptr) {
             err = coreFoundationUnknownErr;
         }
@@ -375,8 +373,7 @@ OSStatus MoreSCCopyBSDNameOfService(CFStringRef setID, CFStringRef serviceID, CF
         err = MoreSCCopyEntity(setID, serviceID, CFSTR("Interface"), &interface);
     }
     if (err == 0) {
-        name = GetStringValue(interface, CFSTR("DeviceName"));
-        CFQRetain(name);
+        name = static_cast<CFStringRef>(CFQRetain(GetStringValue(interface, CFSTR("DeviceName"))));
         if (name == nullptr) {
             err = coreFoundationUnknownErr;
         }

@@ -100,9 +100,8 @@ OSStatus MoreSCCopySetsDict(CFDictionaryRef* setsDict) {
     CFTypeRef dict = nullptr;
     OSStatus err = MoreSCOpen(false, false);
     if (err == 0) {
-        dict = SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), CFSTR("Sets"));
+        dict = CFQRetain(SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), CFSTR("Sets")));
         err = MoreSCError(dict);
-        CFQRetain(dict);
     }
     if (err == 0 && !IsDictionary(dict)) {
         err = coreFoundationUnknownErr;
@@ -168,8 +167,7 @@ OSStatus MoreSCCopyUserVisibleNameOfSet(CFStringRef setID, CFStringRef* userVisi
         CFDictionaryRef dict = SCPreferencesPathGetValue(MoreSCGetSCPreferencesRef(), setPath);
         err = MoreSCError(dict);
         if (err == 0) {
-            name = GetStringValue(dict, CFSTR("UserDefinedName"));
-            CFQRetain(name);
+            name = static_cast<CFStringRef>(CFQRetain(GetStringValue(dict, CFSTR("UserDefinedName"))));
             if (name == nullptr) {
                 err = coreFoundationUnknownErr;
             }

@@ -1,9 +1,5 @@
 #include "morescf/MoreSCFCCLScanner.h"
 
-#include <sys/stat.h>
-
-#include <filesystem>
-
 #include "tests/unit/morescf/Fixture.h"
 
 namespace morescf_test {
@@ -26,7 +22,8 @@ class ScannerTest : public MoreSCFTest {
 TEST_F(ScannerTest, WithoutFoldersThereIsNone) {
     EXPECT_EQ("()", scan(index));
     EXPECT_EQ(0, index);
-    EXPECT_EQ(0, MoreSCCreateCCLArray(&*std::make_unique<CFArrayRef>(nullptr), nullptr));
+    Output<CFArrayRef> scripts;
+    EXPECT_EQ(0, MoreSCCreateCCLArray(&scripts, nullptr));
 }
 
 TEST_F(ScannerTest, SortsByNumberAndListsEachNameOnce) {

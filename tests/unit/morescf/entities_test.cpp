@@ -57,7 +57,7 @@ TEST_F(EntitiesTest, AddReadWriteAndRemoveOne) {
     EXPECT_EQ(-50, MoreSCSetEntity(nullptr, five, CFSTR("DNS"), nullptr));
     EXPECT_EQ(-50, MoreSCSetEntity(nullptr, five, nullptr, dictionary(entity)));
     EXPECT_EQ(-50, MoreSCSetEntitiesDict(nullptr, five, nullptr));
-    EXPECT_EQ(read(tree_).get() != nullptr, tree() == show(read(tree_).get())) << "nothing changed so far";
+    EXPECT_EQ(show(read(tree_).get()), tree()) << "nothing changed so far";
 
     EXPECT_EQ(0, MoreSCNewEntity(nullptr, five, CFSTR("Modem"), dictionary(entity)));
     EXPECT_EQ(0, MoreSCSetEntity(nullptr, five, CFSTR("AirPort"), dictionary(entity)));
