@@ -88,7 +88,8 @@ fi
 mount -t overlay -o lowerdir={lab}/usr:$usr overlay /usr
 mount -t overlay -o lowerdir=$etc,upperdir={lab}/etc/upper,workdir={lab}/etc/work overlay /etc
 rm -f /etc/resolv.conf
-echo 'resident:x:{resident}:{resident}::/:/bin/sh' >>/etc/passwd
+{{ cat /etc/passwd; echo 'resident:x:{resident}:{resident}::/:/bin/sh'; }} >{lab}/passwd
+mount --bind {lab}/passwd /etc/passwd
 [ -s /etc/machine-id ] || echo 0123456789abcdef0123456789abcdef >/etc/machine-id
 mkdir -p /etc/NetworkManager
 mount -t tmpfs -o mode=755 tmpfs /etc/NetworkManager
