@@ -128,7 +128,7 @@ Outcome Bus::connect(const std::string& service, bool& found) {
     }
     while (result >= 0 && (result = sd_bus_is_ready(made)) == 0) {
         bool inTime = false;
-        const Outcome outcome = process(deadline, inTime);
+        Outcome outcome = process(deadline, inTime);
         if (!outcome.ok()) {
             return outcome;
         }
@@ -186,7 +186,7 @@ Outcome Bus::call(const Call& call, Message& reply, std::string* errorName) {
 Outcome Bus::readProperties(const std::string& path, const std::string& interface, Dictionary& properties,
                             std::string* error) {
     Message reply;
-    const Outcome outcome =
+    Outcome outcome =
         call({path,
               propertiesInterface,
               "GetAll",
@@ -204,16 +204,16 @@ Outcome Bus::readProperties(const std::string& path, const std::string& interfac
 Outcome Bus::setProperty(const std::string& path, const std::string& interface, const char* property,
                          const Value& value) {
     Message reply;
-    const Outcome outcome = call({path,
-                                  propertiesInterface,
-                                  "Set",
-                                  [&](sd_bus_message* m) {
-                                      const int result =
-                                          sd_bus_message_append(m, "ss", interface.c_str(), property);
-                                      return result < 0 ? result : appendVariant(m, value);
-                                  },
-                                  {}},
-                                 reply);
+    Outcome outcome = call({path,
+                            propertiesInterface,
+                            "Set",
+                            [&](sd_bus_message* m) {
+                                const int result =
+                                    sd_bus_message_append(m, "ss", interface.c_str(), property);
+                                return result < 0 ? result : appendVariant(m, value);
+                            },
+                            {}},
+                           reply);
     return outcome.ok() ? outcome
                         : Outcome(outcome.status(), std::string(property) + ": " + outcome.reason());
 }
@@ -234,7 +234,7 @@ Outcome Bus::waitUntil(const std::function<bool()>& condition, Clock::time_point
                        const Outcome& late) {
     while (!condition()) {
         bool inTime = false;
-        const Outcome outcome = process(deadline, inTime);
+        Outcome outcome = process(deadline, inTime);
         if (!outcome.ok()) {
             return outcome;
         }

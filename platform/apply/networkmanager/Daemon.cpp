@@ -155,7 +155,7 @@ Outcome Daemon::connect() {
 
 Outcome Daemon::readManager() {
     Dictionary manager;
-    const Outcome outcome = bus_.readProperties(managerPath, managerInterface, manager);
+    Outcome outcome = bus_.readProperties(managerPath, managerInterface, manager);
     if (outcome.ok()) {
         starting_ = valueOf<bool>(manager, "Startup").value_or(false);
         radio_ = valueOf<bool>(manager, "WirelessEnabled").value_or(true);
@@ -229,7 +229,7 @@ Outcome Daemon::findActive(const Device& device, std::optional<Active>& active) 
     }
     Dictionary properties;
     std::string error;
-    const Outcome outcome = bus_.readProperties(device.active, activeInterface, properties, &error);
+    Outcome outcome = bus_.readProperties(device.active, activeInterface, properties, &error);
     const std::uint32_t state = numberIn(properties, "State");
     if (isGone(error) || (outcome.ok() && state > activeActivated)) {
         return {};
@@ -245,7 +245,7 @@ Outcome Daemon::findActive(const Device& device, std::optional<Active>& active) 
 Outcome Daemon::readProfile(const std::string& path, std::optional<Profile>& profile) {
     Message reply;
     std::string error;
-    const Outcome outcome = call(path, profileInterface, "GetSettings", {}, reply, &error);
+    Outcome outcome = call(path, profileInterface, "GetSettings", {}, reply, &error);
     if (isGone(error)) {
         return {};
     }
@@ -276,7 +276,7 @@ Outcome Daemon::findProfile(const std::string& uuid, std::optional<Profile>& pro
 
 Outcome Daemon::isVolatile(const std::string& profile, bool& result) {
     Dictionary properties;
-    const Outcome outcome = bus_.readProperties(profile, profileInterface, properties);
+    Outcome outcome = bus_.readProperties(profile, profileInterface, properties);
     result = (numberIn(properties, "Flags") & profileIsVolatile) != 0;
     return outcome;
 }
@@ -288,8 +288,12 @@ Outcome Daemon::readSecrets(const std::string& profile, Sections& sections) {
             continue;
         }
         Message reply;
-        const Outcome outcome = call(profile, profileInterface, "GetSecrets", textArgument(name), reply);
+        std::string error;
+        Outcome outcome = call(profile, profileInterface, "GetSecrets", textArgument(name), reply, &error);
         Sections secrets;
+        if (error == "org.freedesktop.NetworkManager.AgentManager.NoSecrets") {
+            continue;
+        }
         if (!outcome.ok()) {
             return outcome;
         }
@@ -306,7 +310,7 @@ Outcome Daemon::readSecrets(const std::string& profile, Sections& sections) {
 Outcome Daemon::addProfile(const Sections& sections, std::string_view secret, std::string& path) {
     Message reply;
     // Not AddAndActivateConnection, which completes what is missing or wrong instead of refusing it.
-    const Outcome outcome = call(
+    Outcome outcome = call(
         settingsPath, settingsInterface, "AddConnection2",
         [&sections](sd_bus_message* message) {
             const int result = appendSections(message, sections);
@@ -330,13 +334,13 @@ Outcome Daemon::updateProfile(const std::string& path, const Sections& sections,
 Outcome Daemon::deleteProfile(const std::string& path) {
     Message reply;
     std::string error;
-    const Outcome outcome = call(path, profileInterface, "Delete", {}, reply, &error);
+    Outcome outcome = call(path, profileInterface, "Delete", {}, reply, &error);
     return isGone(error) ? Outcome() : outcome;
 }
 
 Outcome Daemon::follow(Progress& progress, const Device& device) {
     progress.device = device.path;
-    const Outcome outcome = bus_.watch(
+    Outcome outcome = bus_.watch(
         activeInterface, "StateChanged",
         [&progress](const char* path, sd_bus_message* message) {
             std::uint32_t state = 0;
@@ -416,7 +420,7 @@ Outcome Daemon::activate(const std::string& profile, const Device& device) {
 Outcome Daemon::awaitActive(const Active& active, const Device& device) {
     Progress progress;
     progress.path = active.path;
-    const Outcome outcome = follow(progress, device);
+    Outcome outcome = follow(progress, device);
     return outcome.ok() ? await(progress) : outcome;
 }
 
@@ -449,7 +453,7 @@ Outcome Daemon::awaitState(Device& device, std::uint32_t lowest, std::uint32_t h
 Outcome Daemon::disconnect(const Device& device) {
     Message reply;
     std::string error;
-    const Outcome outcome = call(device.path, deviceInterface, "Disconnect", {}, reply, &error);
+    Outcome outcome = call(device.path, deviceInterface, "Disconnect", {}, reply, &error);
     if (!outcome.ok() && error != "org.freedesktop.NetworkManager.Device.NotActive") {
         return outcome;
     }
@@ -477,7 +481,7 @@ Outcome Daemon::readMetric(const Device& device, std::uint32_t& metric) {
     if (device.addresses.empty()) {
         return {};
     }
-    const Outcome outcome = bus_.readProperties(device.addresses, addressesInterface, properties, &error);
+    Outcome outcome = bus_.readProperties(device.addresses, addressesInterface, properties, &error);
     const auto routes = valueOf<std::vector<Dictionary>>(properties, "RouteData");
     bool hasDefault = false;
     for (const Dictionary& route : routes.value_or(std::vector<Dictionary>())) {
@@ -493,7 +497,7 @@ Outcome Daemon::readMetric(const Device& device, std::uint32_t& metric) {
 }
 
 Outcome Daemon::setRadio(bool on) {
-    const Outcome outcome = bus_.setProperty(managerPath, managerInterface, "WirelessEnabled", {on});
+    Outcome outcome = bus_.setProperty(managerPath, managerInterface, "WirelessEnabled", {on});
     if (outcome.ok()) {
         radio_ = on;
     }
@@ -504,7 +508,7 @@ Outcome Daemon::readAccessPoints(const Device& device, const std::string& networ
                                  std::vector<AccessPoint>& seen) {
     seen.clear();
     Message reply;
-    const Outcome outcome = call(device.path, wirelessInterface, "GetAllAccessPoints", {}, reply);
+    Outcome outcome = call(device.path, wirelessInterface, "GetAllAccessPoints", {}, reply);
     if (!outcome.ok()) {
         return outcome;
     }
@@ -516,7 +520,7 @@ Outcome Daemon::readAccessPoints(const Device& device, const std::string& networ
     for (const std::string& path : paths) {
         Dictionary point;
         std::string error;
-        const Outcome read = bus_.readProperties(path, accessPointInterface, point, &error);
+        Outcome read = bus_.readProperties(path, accessPointInterface, point, &error);
         if (isGone(error)) {
             continue;
         }

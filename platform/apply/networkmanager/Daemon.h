@@ -62,7 +62,8 @@ class Daemon {
 
     // Whether the profile is gone once nothing uses it.
     Outcome isVolatile(const std::string& profile, bool& result);
-    // Adds the secrets of the sections that have some.
+    // Adds the secrets of the sections that have some. Those that only the desktop's key ring has may be
+    // missing.
     Outcome readSecrets(const std::string& profile, Sections& sections);
     // In memory only, and not activated by the daemon of its own accord. The secret is kept out of reasons.
     Outcome addProfile(const Sections& sections, std::string_view secret, std::string& path);

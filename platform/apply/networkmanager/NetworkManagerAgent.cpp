@@ -99,7 +99,7 @@ class NetworkManagerAgent final : public Agent {
 
 // Our profile for the interface; nothing when there is none. Fails when somebody else's has its UUID.
 Outcome findOurProfile(Daemon& daemon, const std::string& interface, std::optional<Profile>& profile) {
-    const Outcome outcome = daemon.findProfile(profileUUID(interface), profile);
+    Outcome outcome = daemon.findProfile(profileUUID(interface), profile);
     if (outcome.ok() && profile && !isOurs(profile->sections)) {
         profile.reset();
         return {kSCStatusFailed, "another program has a profile under this system's UUID"};
@@ -109,7 +109,7 @@ Outcome findOurProfile(Daemon& daemon, const std::string& interface, std::option
 
 Outcome findExisting(Daemon& daemon, const std::string& interface, Device& device) {
     std::optional<Device> found;
-    const Outcome outcome = daemon.findDevice(interface, found);
+    Outcome outcome = daemon.findDevice(interface, found);
     if (outcome.ok() && !found) {
         return {kSCStatusFailed, "the card is gone"};
     }
@@ -186,7 +186,7 @@ class Going {
 
     Outcome removeProfile() {
         std::optional<Profile> profile;
-        const Outcome outcome = findOurProfile(daemon_, plan_.name, profile);
+        Outcome outcome = findOurProfile(daemon_, plan_.name, profile);
         return outcome.ok() && profile ? daemon_.deleteProfile(profile->path) : outcome;
     }
 
@@ -198,7 +198,7 @@ class Going {
         if (daemon_.isRadioBlocked()) {
             return {kSCStatusFailed, "the radio is switched off by a switch on the computer"};
         }
-        const Outcome outcome = daemon_.setRadio(true);
+        Outcome outcome = daemon_.setRadio(true);
         return outcome.ok() ? daemon_.settle(device_) : outcome;
     }
 
@@ -288,7 +288,7 @@ class Returning {
 
   private:
     Outcome removeProfile() {
-        const Outcome outcome = profile_ ? daemon_.deleteProfile(profile_->path) : Outcome();
+        Outcome outcome = profile_ ? daemon_.deleteProfile(profile_->path) : Outcome();
         profile_.reset();
         return outcome;
     }
@@ -297,7 +297,7 @@ class Returning {
         if (device_.managed) {
             return {};
         }
-        const Outcome outcome = daemon_.setManaged(device_, true);
+        Outcome outcome = daemon_.setManaged(device_, true);
         return outcome.ok() ? daemon_.settle(device_) : outcome;
     }
 
@@ -305,7 +305,7 @@ class Returning {
 
     Outcome activateEarlier() {
         std::optional<Profile> earlier;
-        const Outcome outcome = daemon_.findProfile(note_.earlier, earlier);
+        Outcome outcome = daemon_.findProfile(note_.earlier, earlier);
         if (!outcome.ok()) {
             return outcome;
         }
@@ -398,14 +398,15 @@ Outcome NetworkManagerAgent::captureOne(Daemon& daemon, const Device& device, co
     if (!outcome.ok()) {
         return outcome;
     }
-    if (device.kind == Device::Kind::other || (active && active->external)) {
-        earlier.leader = Leader::other;
+    if (device.kind == Device::Kind::other) {
+        earlier.refusal = "it is neither a wired nor a wireless card";
+    } else if (active && active->external) {
         earlier.refusal = "another program than NetworkManager configured it";
-        return {};
-    }
-    if (isVolatile) {
-        earlier.leader = Leader::other;
+    } else if (isVolatile) {
         earlier.refusal = "its profile would be lost with its connection";
+    }
+    if (!earlier.refusal.empty()) {
+        earlier.leader = Leader::other;
         return {};
     }
     earlier.note = {active ? active->uuid : "", device.autoconnect, daemon.isRadioOn()};
@@ -531,7 +532,7 @@ Outcome isNetworkManagerRunning(bool& running) {
     Bus bus;
     running = false;
     bool found = false;
-    const Outcome outcome = bus.connect("org.freedesktop.NetworkManager", found);
+    Outcome outcome = bus.connect("org.freedesktop.NetworkManager", found);
     return outcome.ok() && found ? bus.hasOwner(running) : outcome;
 }
 

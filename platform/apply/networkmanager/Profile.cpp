@@ -4,10 +4,10 @@
 
 #include <algorithm>
 #include <array>
-#include <cctype>
 #include <cstdio>
 
 #include "platform/apply/Digest.h"
+#include "platform/apply/WirelessKey.h"
 
 namespace platform::apply {
 namespace {
@@ -24,25 +24,6 @@ constexpr std::int32_t highestPriority = 999;
 
 constexpr std::array<const char*, 3> wirelessSectionNames = {"802-11-wireless", "802-11-wireless-security",
                                                              "802-1x"};
-
-enum class Security { open, wep, wpa };
-
-bool isHexadecimal(const std::string& text) {
-    return std::all_of(text.begin(), text.end(), [](unsigned char c) { return std::isxdigit(c) != 0; });
-}
-
-bool isPrintable(const std::string& text) {
-    return std::all_of(text.begin(), text.end(), [](unsigned char c) { return c >= 0x20 && c < 0x7F; });
-}
-
-bool fitsWEP(const std::string& key) {
-    return ((key.size() == 5 || key.size() == 13) && isPrintable(key)) ||
-           ((key.size() == 10 || key.size() == 26) && isHexadecimal(key));
-}
-
-bool fitsWPA(const std::string& key) {
-    return (key.size() >= 8 && key.size() <= 63) || (key.size() == 64 && isHexadecimal(key));
-}
 
 std::string dotted(IPv4Address address) {
     std::array<char, INET_ADDRSTRLEN> text{};
@@ -103,32 +84,32 @@ Dictionary makeIPv4(const InterfacePlan& plan) {
     return ipv4;
 }
 
-Outcome chooseSecurity(const std::optional<std::string>& key, const AccessPoint* seen, Security& security) {
-    const auto refuse = [](const char* reason) { return Outcome(kSCStatusFailed, reason); };
-    if (seen == nullptr) {
-        if (key && !fitsWEP(*key) && !fitsWPA(*key)) {
-            return refuse("the network's key has no form that a key can have");
+// A secret from the desktop's key ring is looked for there again under the new profile, which it does not
+// know, unless the profile is said to hold it.
+void keepSecretsInside(Dictionary& section) {
+    static constexpr std::string_view flags = "-flags";
+    std::erase_if(section, [&section](const auto& entry) {
+        const std::string_view key = entry.first;
+        if (!key.ends_with(flags)) {
+            return false;
         }
-        // A key of 10 hexadecimal digits could be both; the older networks are the ones that need it.
-        security = !key ? Security::open : fitsWEP(*key) ? Security::wep : Security::wpa;
+        const std::string_view secret = key.substr(0, key.size() - flags.size());
+        return std::any_of(section.begin(), section.end(), [secret](const auto& other) {
+            return other.first.starts_with(secret) && !std::string_view(other.first).ends_with(flags);
+        });
+    });
+}
+
+// What the access point announces; nothing without one.
+Outcome readAnnouncement(const AccessPoint* seen, std::optional<Security>& announced) {
+    if (seen == nullptr) {
         return {};
     }
     if (seen->protectedAccess && !seen->preSharedKey) {
-        return refuse("the network asks each user for a name and a password, which a location does not hold");
+        return {kSCStatusFailed,
+                "the network asks each user for a name and a password, which a location does not hold"};
     }
-    security = seen->protectedAccess ? Security::wpa : seen->privacy ? Security::wep : Security::open;
-    if (security == Security::open) {
-        return {};
-    }
-    if (!key) {
-        return refuse("the network asks for a key and the location holds none");
-    }
-    if (security == Security::wep ? !fitsWEP(*key) : !fitsWPA(*key)) {
-        return refuse(
-            security == Security::wep
-                ? "the key fits no WEP network, whose keys have 5 or 13 characters or 10 or 26 digits"
-                : "the key fits no WPA network, whose keys have 8 to 63 characters or 64 digits");
-    }
+    announced = seen->protectedAccess ? Security::wpa : seen->privacy ? Security::wep : Security::open;
     return {};
 }
 
@@ -139,6 +120,11 @@ Outcome makeWireless(const WirelessSettings& settings, const WirelessFacts& fact
             return {kSCStatusFailed, "the card is on no network and the location names none"};
         }
         profile.insert(facts.current.begin(), facts.current.end());
+        for (const char* const name : wirelessSectionNames) {
+            if (const auto section = profile.find(name); section != profile.end()) {
+                keepSecretsInside(section->second);
+            }
+        }
         return {};
     }
     const auto strongest =
@@ -146,7 +132,11 @@ Outcome makeWireless(const WirelessSettings& settings, const WirelessFacts& fact
                          [](const AccessPoint& a, const AccessPoint& b) { return a.strength < b.strength; });
     const AccessPoint* const seen = strongest == facts.seen.end() ? nullptr : &*strongest;
     Security security{};
-    const Outcome outcome = chooseSecurity(settings.key, seen, security);
+    std::optional<Security> announced;
+    Outcome outcome = readAnnouncement(seen, announced);
+    if (outcome.ok()) {
+        outcome = chooseSecurity(announced, settings.key, security);
+    }
     if (!outcome.ok()) {
         return outcome;
     }
@@ -247,7 +237,7 @@ Outcome makeProfile(const InterfacePlan& plan, const WirelessFacts* facts, const
     profile.clear();
     const bool wireless = facts != nullptr;
     if (wireless) {
-        const Outcome outcome = makeWireless(plan.wireless.value_or(WirelessSettings()), *facts, profile);
+        Outcome outcome = makeWireless(plan.wireless.value_or(WirelessSettings()), *facts, profile);
         if (!outcome.ok()) {
             return outcome;
         }

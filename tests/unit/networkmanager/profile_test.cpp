@@ -176,7 +176,8 @@ TEST(Profile, keepsTheNetworkOfTheCard) {
          {{"ssid", {Bytes{'h', 'o', 'm', 'e'}}},
           {"hidden", {true}},
           {"seen-bssids", {Texts{"00:11:22:33:44:55"}}}}},
-        {"802-11-wireless-security", {{"key-mgmt", {std::string("wpa-psk")}}, {"psk", {canary}}}},
+        {"802-11-wireless-security",
+         {{"key-mgmt", {std::string("wpa-psk")}}, {"psk", {canary}}, {"psk-flags", {std::uint32_t{1}}}}},
         {"connection", {{"id", {std::string("Home")}}}},
         {"ipv4", {{"method", {std::string("auto")}}}},
     };
@@ -192,6 +193,7 @@ TEST(Profile, keepsTheNetworkOfTheCard) {
         const Sections profile = made(plan, &facts);
         EXPECT_EQ(networkOf(profile), "home");
         EXPECT_EQ(in<std::string>(profile, "802-11-wireless-security", "psk"), canary);
+        EXPECT_EQ(in<std::uint32_t>(profile, "802-11-wireless-security", "psk-flags"), std::nullopt);
         EXPECT_EQ(in<bool>(profile, "802-11-wireless", "hidden"), true);
         EXPECT_EQ(in<Texts>(profile, "802-11-wireless", "seen-bssids"), std::nullopt);
         EXPECT_EQ(in<std::string>(profile, "connection", "id"), "location-assistant wlan0");
