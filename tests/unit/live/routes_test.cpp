@@ -134,33 +134,5 @@ TEST(RoutesTest, WhatIsCutShortIsNotReadBeyondItsEnd) {
     }
 }
 
-TEST(RoutesTest, OnlyUnicastAndLocalRoutesReachAnything) {
-    const struct {
-        std::string_view line;
-        std::string_view answer;
-        bool isReachable, isLocal, isDirect;
-    } rows[] = {
-        {"local 192.0.0.199 dev lo src 192.0.0.199 uid 0",
-         "680000001800000001000000c65e000002200000fe0000020002008008000f00fe00000008000100c00000c708000400010"
-         "0"
-         "000008000700c00000c7080019000000000024000c000100000000000000000000000000000000000000000000000000000"
-         "0"
-         "00000000",
-         true, true, true},
-        {"default via 192.0.0.192 dev v0", viaRouter, true, false, false},
-        {"10.0.0.0/24 dev v2", connected, true, false, true},
-        {"unreachable default", refusing, false, false, false},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.line);
-        const std::vector<OwnedMessage> messages = messagesIn(bytesOf(row.answer));
-        ASSERT_EQ(messages.size(), 1U);
-        const auto route = routeIn(messages[0].view());
-        EXPECT_EQ(route.isReachable, row.isReachable);
-        EXPECT_EQ(route.isLocal, row.isLocal);
-        EXPECT_EQ(route.isDirect, row.isDirect);
-    }
-}
-
 }  // namespace
 }  // namespace live_test
