@@ -246,7 +246,8 @@ class Canary(lab.LabTest):
             self.assertNotIn(forms[0], out + seen + "".join(self.lab.syslog).encode())
             for folder in "/tmp", "/run", "/var/lib", "/etc":
                 for path in Path(folder).rglob("*"):
-                    if os.access(path, os.R_OK) and path.is_file() and path != lab.STORE and path.parts[2] not in ("lab", "netns"):
+                    if path.is_file() and os.access(path, os.R_OK) and path != lab.STORE \
+                            and path.parts[2] not in ("lab", "netns"):
                         content = path.read_bytes()
                         self.assertFalse(any(form in content for form in forms), path)
         self.assertIn(forms[1], plistlib.dumps(self.lab.store()) + b"".join(
