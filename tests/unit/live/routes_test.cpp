@@ -7,6 +7,8 @@
 #include <string>
 #include <string_view>
 
+#include "tests/unit/support/Hexadecimal.h"
+
 namespace live_test {
 namespace {
 
@@ -18,14 +20,7 @@ using platform::netlink::Bytes;
 using platform::netlink::ByteView;
 using platform::netlink::MessageView;
 using platform::netlink::OwnedMessage;
-
-Bytes bytesOf(std::string_view hex) {
-    Bytes bytes;
-    for (std::size_t i = 0; i + 1 < hex.size(); i += 2) {
-        bytes.push_back(static_cast<std::byte>(std::stoi(std::string(hex.substr(i, 2)), nullptr, 16)));
-    }
-    return bytes;
-}
+using testing_support::fromHex;
 
 std::vector<OwnedMessage> messagesIn(ByteView datagram) {
     std::vector<OwnedMessage> messages;
@@ -112,12 +107,12 @@ TEST(RoutesTest, DefaultRoutesComeInTheKernelsOrder) {
         {"nothing", "", ""},
     };
     for (const auto& row : rows) {
-        EXPECT_EQ(describe(defaultRoutesIn(messagesIn(bytesOf(row.dump)))), row.routes) << row.what;
+        EXPECT_EQ(describe(defaultRoutesIn(messagesIn(fromHex(row.dump)))), row.routes) << row.what;
     }
 }
 
 TEST(RoutesTest, WhatIsCutShortIsNotReadBeyondItsEnd) {
-    const Bytes dump = bytesOf(joined({twoHops, viaRouter}));
+    const Bytes dump = fromHex(joined({twoHops, viaRouter}));
     const std::string whole = describe(defaultRoutesIn(messagesIn(dump)));
     for (std::size_t length = 0; length < dump.size(); ++length) {
         const Bytes cut(dump.begin(), dump.begin() + static_cast<std::ptrdiff_t>(length));

@@ -1,7 +1,7 @@
-#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <signal.h>
+#include <sys/eventfd.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -16,26 +16,20 @@ using platform::FileDescriptor;
 
 namespace {
 
-// A pipe whose reading end is watched.
-class Pipe {
+// A descriptor that is watched, and can be read once for each time that something was sent.
+class Bell {
   public:
-    Pipe() {
-        int ends[2] = {};
-        EXPECT_EQ(::pipe2(ends, O_CLOEXEC | O_NONBLOCK), 0);
-        reading.reset(ends[0]);
-        writing.reset(ends[1]);
-    }
-    void send() const { EXPECT_EQ(::write(writing.get(), "x", 1), 1); }
+    void send() const { EXPECT_EQ(::eventfd_write(descriptor.get(), 1), 0); }
     void receive() const {
-        char byte = 0;
-        EXPECT_EQ(::read(reading.get(), &byte, 1), 1);
+        eventfd_t once = 0;
+        EXPECT_EQ(::eventfd_read(descriptor.get(), &once), 0);
     }
     Owned<CFRunLoopSourceRef> source(std::function<void()> perform) const {
-        return makeRunLoopSource(reading.get(), POLLIN, [perform = std::move(perform)](short) { perform(); });
+        return makeRunLoopSource(descriptor.get(), POLLIN,
+                                 [perform = std::move(perform)](short) { perform(); });
     }
 
-    FileDescriptor reading;
-    FileDescriptor writing;
+    FileDescriptor descriptor{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK | EFD_SEMAPHORE)};
 };
 
 class RunLoop : public testing::Test {
@@ -51,22 +45,22 @@ class RunLoop : public testing::Test {
     }
 
     const CFRunLoopRef loop = CFRunLoopGetCurrent();
-    Pipe pipe;
+    Bell bell;
     int calls = 0;
 };
 
 TEST_F(RunLoop, ReturnsForEachOfItsReasons) {
     EXPECT_EQ(runFor(10), kCFRunLoopRunFinished);
-    const auto source = pipe.source([&] {
-        pipe.receive();
+    const auto source = bell.source([&] {
+        bell.receive();
         ++calls;
     });
     add(source);
     add(source);
     EXPECT_EQ(CFGetRetainCount(source.get()), 2);
     EXPECT_EQ(runFor(0), kCFRunLoopRunTimedOut);
-    pipe.send();
-    pipe.send();
+    bell.send();
+    bell.send();
     EXPECT_EQ(runFor(10, true), kCFRunLoopRunHandledSource);
     EXPECT_EQ(calls, 1);
     EXPECT_EQ(runFor(0), kCFRunLoopRunTimedOut);
@@ -81,10 +75,10 @@ TEST_F(RunLoop, ReturnsForEachOfItsReasons) {
 }
 
 TEST_F(RunLoop, LetsACallbackChangeTheSources) {
-    Pipe other;
+    Bell other;
     int otherCalls = 0;
     Owned<CFRunLoopSourceRef> second = other.source([&] { ++otherCalls; });
-    Owned<CFRunLoopSourceRef> first = pipe.source([&] {
+    Owned<CFRunLoopSourceRef> first = bell.source([&] {
         ++calls;
         remove(first);
         first = {};
@@ -93,7 +87,7 @@ TEST_F(RunLoop, LetsACallbackChangeTheSources) {
     });
     add(first);
     add(second);
-    pipe.send();
+    bell.send();
     other.send();
     CFRunLoopRun();
     EXPECT_EQ(calls, 1);
@@ -101,12 +95,12 @@ TEST_F(RunLoop, LetsACallbackChangeTheSources) {
 }
 
 TEST_F(RunLoop, StopsFromACallbackAndASignalHandler) {
-    const auto source = pipe.source([&] {
-        pipe.receive();
+    const auto source = bell.source([&] {
+        bell.receive();
         CFRunLoopStop(loop);
     });
     add(source);
-    pipe.send();
+    bell.send();
     CFRunLoopRun();
     static CFRunLoopRef signalled;
     signalled = loop;
@@ -125,9 +119,9 @@ TEST_F(RunLoop, StopsFromACallbackAndASignalHandler) {
 }
 
 TEST_F(RunLoop, DropsASourceWhoseDescriptorIsClosed) {
-    const auto source = pipe.source([&] { ++calls; });
+    const auto source = bell.source([&] { ++calls; });
     add(source);
-    pipe.reading.reset();
+    bell.descriptor.reset();
     EXPECT_EQ(runFor(10), kCFRunLoopRunFinished);
     EXPECT_EQ(calls, 0);
 }
