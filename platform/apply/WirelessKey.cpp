@@ -9,21 +9,25 @@ bool isHexadecimal(const std::string& text) {
     return text.find_first_not_of("0123456789abcdefABCDEF") == std::string::npos;
 }
 
-bool isPrintable(const std::string& text) {
-    return std::none_of(text.begin(), text.end(), [](unsigned char c) { return c < ' ' || c == 0x7F; });
+bool holdsControl(const std::string& text) {
+    return std::any_of(text.begin(), text.end(), [](unsigned char c) { return c < ' ' || c == 0x7F; });
+}
+
+bool isASCII(const std::string& text) {
+    return std::all_of(text.begin(), text.end(), [](unsigned char c) { return c < 0x80; });
 }
 
 }  // namespace
 
 bool fitsWEP(const std::string& key) {
     const std::size_t size = key.size();
-    return isPrintable(key) &&
+    return isASCII(key) && !holdsControl(key) &&
            (size == 5 || size == 13 || ((size == 10 || size == 26) && isHexadecimal(key)));
 }
 
 bool fitsWPA(const std::string& key) {
     const std::size_t size = key.size();
-    return isPrintable(key) && ((size >= 8 && size <= 63) || (size == 64 && isHexadecimal(key)));
+    return !holdsControl(key) && ((size >= 8 && size <= 63) || (size == 64 && isHexadecimal(key)));
 }
 
 bool isInDigits(const std::string& key) {

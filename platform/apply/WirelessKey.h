@@ -10,8 +10,8 @@ namespace platform::apply {
 
 enum class Security { open, wep, wpa };
 
-// WEP: 5 or 13 characters, or 10 or 26 hexadecimal digits. WPA: 8 to 63 characters, or 64 hexadecimal digits.
-// A key with a control character fits neither.
+// WEP: 5 or 13 ASCII characters, or 10 or 26 hexadecimal digits. WPA: 8 to 63 bytes of text, or 64
+// hexadecimal digits. A key with a control character fits neither.
 [[nodiscard]] bool fitsWEP(const std::string& key);
 [[nodiscard]] bool fitsWPA(const std::string& key);
 // Whether a key that fits is given in digits rather than in characters.
