@@ -37,10 +37,11 @@ void ShowUsage(const char* programName) {
     std::printf("\n");
 }
 
-// Waits until no other run is under way, for as long as one may take. Two at once would delete each other's
-// temporary location between making it and making it current, and a current location that does not exist
-// leads nowhere back. The lock ends with the process. Without the rights to make the file there is nothing to
-// change either.
+// Waits until no other run is under way, for at most a minute, which is longer than one takes. Two at once
+// would delete each other's temporary location between making it and making it current, and a current
+// location that does not exist leads nowhere back. The lock ends with the process. Without the rights to make
+// the file there is nothing to change either. "test" takes no turn: it waits for its user, for ever if need
+// be, and "remove" has to be able to lead back meanwhile.
 void TakeTurn() {
     constexpr const char* path = "/run/location-assistant.lock";
     constexpr useconds_t pause = 20'000;
