@@ -11,8 +11,8 @@ bool IsString(CFTypeRef value) {
     return value != nullptr && CFGetTypeID(value) == CFStringGetTypeID();
 }
 
-// Deletes every location of that name but the current one. The walk runs backwards, so that the listing in
-// the trace keeps the indices that ListLocations showed while entries go.
+// Deletes every location of that name but the current one. The walk runs backwards, so that
+// the status that comes back is that of the one with the lowest index.
 OSStatus DeleteSetsNamed(CFStringRef doomedName, const char* heading, bool onlyStrings) {
     CFArrayRef ids = nullptr;
     CFIndex currentIndex = kCFNotFound;

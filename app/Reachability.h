@@ -19,6 +19,7 @@ int IsWirelessPrinterReachableViaHTTP(int maxtries);
 // over.
 void OpenConfigurationPage();
 
-// Asks on standard output until standard input answers with a line that begins with "y"; always 0. Without
-// such a line it asks for ever, at the end of the input too.
+// Asks on standard output until standard input answers "y"; always 0. Line breaks in front of an answer
+// are passed over, and one character behind each answer is taken away unread. Without a "y" it asks for ever,
+// at the end of the input too.
 OSStatus WaitForUserToBeDone();

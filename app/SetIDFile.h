@@ -12,6 +12,6 @@
 void WriteSetIDFile(const char* path, const char* text);
 
 // Reads one line of at most 1023 bytes, a line break at its end included, as an ID in the system's text
-// encoding. False when the file cannot be opened; setID is then untouched. An empty line, or one that is not
-// text, gives null. The ID belongs to the caller.
+// encoding. False when the file cannot be opened; setID is then untouched. An empty file, or a line that is
+// not text, gives null. The ID belongs to the caller.
 bool CopySetIDFromFile(const char* path, CFStringRef* setID);

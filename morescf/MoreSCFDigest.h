@@ -7,8 +7,8 @@
 // dotted quads, MAC addresses as lower-case hexadecimal bytes between colons.
 //
 // Every builder's output is a new mutable dictionary of the caller's, null on failure. Statuses: -50 for a
-// null digest or a null member that must not be (marked "required"), -4960 when a value cannot be made, -108
-// without memory. Nothing here touches the preferences.
+// null digest (the two global builders read none and take null) or a null member that must not be (marked
+// "required"), -4960 when a value cannot be made, -108 without memory. Nothing here touches the preferences.
 #pragma once
 
 #include <netinet/in.h>

@@ -334,7 +334,7 @@ OSStatus SubstituteKeywordsInUserVisibleName(io_object_t /*entry*/, CFDictionary
         for (const auto& each : keywords) {
             const CFRange place = CFStringFind(text, each.keyword, 0);
             if (place.location != kCFNotFound) {
-                // Only a hook's name can ask for what the rules did not record.
+                // A hook's name, or a product's, can ask for what the rules did not record.
                 CFStringRef value = GetStringValue(portDict, each.key);
                 CFStringReplace(text, place, value != nullptr ? value : Unknown());
             }

@@ -36,9 +36,9 @@ OSStatus PreferencesPathSetProperty(CFStringRef path, CFStringRef key, CFPropert
 // on failure: a store's status that SCError still has, or, when that is 0, a parent that is a link or has no
 // number left.
 //
-// Keys count when they are at most 15 ASCII characters, all of them digits: a parent without any gets
-// -2147483647, and since a sign is no digit it gets the same key again the next time, in place of the child
-// that is there. Whoever makes children needs one with a decimal key there before.
+// Keys count when they are at most 15 ASCII characters, all of them digits, and at most 2147483647: a parent
+// without any gets -2147483647, and since a sign is no digit it gets the same key again the next time, in
+// place of the child that is there. Whoever makes children needs one with a decimal key there before.
 CFStringRef MySCPreferencesPathCreateUniqueChild(SCPreferencesRef session, CFStringRef prefix);
 // The same below a top-level key ("Sets", "NetworkServices"). Both outputs must come in as null, and are null
 // on failure.
