@@ -36,13 +36,13 @@
 //   optional may be null pointers, the others may not.
 // - A null set ID means the current location, a null service ID the location's global entities, except where
 //   null is told to be -50.
-// - An operation that writes gives back the status of the commit and of the apply when it is the outermost
-// one;
-//   "store's status" stands for any of the store's values (SystemConfiguration.h), among them 1003 without
-//   the rights, 1004 for a value that is not there, 1001 for a value of the wrong type or a reason unknown.
-// - -50: a null argument, or as told. -108: no memory for a list. -4960: a value cannot be made, or one that
-// is
-//   expected in the tree is missing or has the wrong type (a name that is no string counts as missing).
+// - An operation that writes gives back the status of the commit and of the apply when it is the
+//   outermost one; "store's status" stands for any of the store's values (SystemConfiguration.h), among them
+//   1003 without the rights, 1004 for a value that is not there, 1001 for a value of the wrong type or a
+//   reason unknown.
+// - -50: a null argument, or as told. -108: no memory for a list. -4960: a value cannot be made, or one
+//   that is expected in the tree is missing or has the wrong type (a name that is no string counts as
+//   missing).
 #pragma once
 
 #include "platform/CoreFoundation.h"
