@@ -320,6 +320,16 @@ class Matrix(lab.LabTest):
             self.remove()
             self.assert_back(before)
 
+        with self.subTest("no daemon on the way back"):
+            self.create("auto")
+            self.stop_daemon()
+            self.remove()
+            self.assertIn("eth0: NetworkManager does not run", "".join(self.lab.syslog))
+            self.start_daemon()
+            self.create("auto")
+            self.remove()
+            self.assert_back(before, restarted=True)
+
     def test_no_address(self):
         before = self.fresh("static")
         ip("-n far addr del 192.168.77.1/24 dev far-eth0")
