@@ -81,10 +81,7 @@ class MoreSCFTest : public testing::Test {
             agent->machine[interface] = "idle";
         }
     }
-    ~MoreSCFTest() override {
-        EXPECT_EQ(nullptr, MoreSCGetSCPreferencesRef()) << "a session is open";
-        MoreSCSetClient(nullptr);
-    }
+    ~MoreSCFTest() override { EXPECT_EQ(nullptr, MoreSCGetSCPreferencesRef()) << "a session is open"; }
 
     platform::Host makeHost() {
         platform::Host made;
@@ -139,9 +136,7 @@ class MoreSCFTest : public testing::Test {
     testing_support::SysfsTree sysfs;
     std::shared_ptr<testing_support::RecordingAgent> agent =
         std::make_shared<testing_support::RecordingAgent>();
-    std::vector<std::string> log;
-    platform::LogCapture capture{
-        [this](platform::LogLevel /*level*/, std::string_view line) { log.emplace_back(line); }};
+    platform::LogCapture capture{[](platform::LogLevel /*level*/, std::string_view /*line*/) {}};
     platform::Host host;
     platform::HostOverride override;
 };

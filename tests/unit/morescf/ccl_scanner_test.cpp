@@ -19,13 +19,6 @@ class ScannerTest : public MoreSCFTest {
     CFIndex index = 0;
 };
 
-TEST_F(ScannerTest, WithoutFoldersThereIsNone) {
-    EXPECT_EQ("()", scan(index));
-    EXPECT_EQ(0, index);
-    Output<CFArrayRef> scripts;
-    EXPECT_EQ(0, MoreSCCreateCCLArray(&scripts, nullptr));
-}
-
 TEST_F(ScannerTest, SortsByNumberAndListsEachNameOnce) {
     for (const char* name : {"Modem 10", "abc", ".hidden", "Zebra"}) {
         script("user", name);

@@ -21,27 +21,7 @@ class DigestTest : public MoreSCFTest {
         EXPECT_EQ(err != 0, entity.shown() == "null" || entity.shown() == "untouched");
         return err == 0 ? entity.shown() : std::to_string(err);
     }
-    static std::string zeros(const char* protocol) {
-        return made(Str(protocol), [](MoreSCDigest&) {});
-    }
 };
-
-TEST_F(DigestTest, ZerosMakeTheSmallestRecord) {
-    EXPECT_EQ("{}", zeros("DNS"));
-    EXPECT_EQ(
-        "{FTPPassive = #0; FTPEnable = #0; GopherEnable = #0; HTTPEnable = #0; HTTPSEnable = #0; RTSPEnable "
-        "= "
-        "#0; SOCKSEnable = #0}",
-        zeros("Proxies"));
-    EXPECT_EQ("{MACAddress = 00:00:00:00:00:00}", zeros("AirPort"));
-    EXPECT_EQ("{MACAddress = 00:00:00:00:00:00}", zeros("Ethernet"));
-    for (const char* required : {"Interface", "AppleTalk", "IPv4", "Modem"}) {
-        EXPECT_EQ("-50", zeros(required));
-    }
-    for (const char* unknown : {"NetInfo", "Modem ", "modem", ""}) {
-        EXPECT_EQ("-1", zeros(unknown));
-    }
-}
 
 TEST_F(DigestTest, EveryMemberHasItsKeyAndPlace) {
     EXPECT_EQ(
@@ -64,9 +44,6 @@ TEST_F(DigestTest, EveryMemberHasItsKeyAndPlace) {
               made(CFSTR("AppleTalk"), [](MoreSCDigest& digest) {
                   digest.appleTalk = {1, CFSTR("Node"), 1, 65280, 255, CFSTR("z")};
               }));
-    EXPECT_EQ("{ConfigMethod = Node; __INACTIVE__ = #1}", made(CFSTR("AppleTalk"), [](MoreSCDigest& digest) {
-                  digest.appleTalk = {0, CFSTR("Node"), 0, 65280, 255, nullptr};
-              }));
     in_addr servers[2];
     inet_aton("192.0.0.1", &servers[0]);
     inet_aton("255.255.255.255", &servers[1]);
@@ -75,18 +52,9 @@ TEST_F(DigestTest, EveryMemberHasItsKeyAndPlace) {
               made(CFSTR("DNS"), [&](MoreSCDigest& digest) {
                   digest.dns = {2, servers, 2, domains};
               }));
-    const CFStringRef holes[] = {CFSTR("example.org"), nullptr};
-    EXPECT_EQ("-50", made(CFSTR("DNS"), [&](MoreSCDigest& digest) { digest.dns = {0, nullptr, 2, holes}; }));
-    EXPECT_EQ("-50", made(CFSTR("DNS"), [&](MoreSCDigest& digest) {
-                  digest.dns = {1, nullptr, 0, nullptr};
-              }));
     EXPECT_EQ("{ConfigMethod = Manual; DHCPClientID = c; Addresses = (192.0.0.1); Router = 255.255.255.255}",
               made(CFSTR("IPv4"), [&](MoreSCDigest& digest) {
                   digest.ipv4 = {CFSTR("Manual"), servers[0], {}, servers[1], CFSTR("c")};
-              }));
-    EXPECT_EQ("{ConfigMethod = Manual; SubnetMasks = (255.255.255.255)}",
-              made(CFSTR("IPv4"), [&](MoreSCDigest& digest) {
-                  digest.ipv4 = {CFSTR("Manual"), {}, servers[1], {}, nullptr};
               }));
     EXPECT_EQ("{MACAddress = 00:0a:95:9d:68:16; PreferredNetwork = net}",
               made(CFSTR("AirPort"), [](MoreSCDigest& digest) {
@@ -134,56 +102,6 @@ TEST_F(DigestTest, PPPTakesTheOptionsOfTheCallerOrOfTheSystem) {
         "LCPEchoInterval = #10}",
         ppp({}));
     EXPECT_EQ(&kMoreSCPPPOptionsDefaultTenOne, MoreSCGetDefaultPPPOptions(true));
-}
-
-TEST_F(DigestTest, Globals) {
-    const MoreSCGlobalDigest digest = {};
-    Output<CFMutableDictionaryRef> entity;
-    EXPECT_EQ(0, MoreSCCreateGlobalEntity(CFSTR("IPv4"), &digest, &entity));
-    EXPECT_EQ("{PPPOverridePrimary = #0; ServiceOrder = ()}", entity.shown());
-    EXPECT_EQ(0, MoreSCCreateGlobalEntity(CFSTR("NetInfo"), &digest, &entity));
-    EXPECT_EQ("{}", entity.shown());
-    EXPECT_EQ(-1, MoreSCCreateGlobalEntity(CFSTR("DNS"), &digest, &entity));
-    EXPECT_EQ("untouched", entity.shown());
-    EXPECT_EQ(-50, MoreSCCreateDNSEntity(nullptr, &entity));
-    EXPECT_EQ("null", entity.shown());
-}
-
-TEST_F(DigestTest, MacAddressesAndBack) {
-    const struct {
-        const char* text;
-        OSStatus err;
-        const char* back;
-    } rows[] = {
-        {"00:0A:95:9D:68:16", 0, "00:0a:95:9d:68:16"},
-        {"ff:FF:0:1:2:3", 0, "ff:ff:00:01:02:03"},
-        {"00:0a:95:9d:68:1", 0, "00:0a:95:9d:68:01"},
-        {"00:0a:95:9d:68", -1, nullptr},
-        {"00-0a-95-9d-68-16", -1, nullptr},
-        {"", -1, nullptr},
-        {"00:0a:95:9d:68:16 ", -4960, nullptr},
-        {"00:0a:95:9d:68:é", -4960, nullptr},
-    };
-    for (const auto& row : rows) {
-        UInt8 bytes[6] = {9, 9, 9, 9, 9, 9};
-        EXPECT_EQ(row.err, MoreSCFStringToMacAddress(Str(row.text), bytes)) << row.text;
-        Output<CFStringRef> back;
-        EXPECT_EQ(0, MoreSCFCreateStringWithMacAddress(bytes, &back));
-        EXPECT_EQ(row.back != nullptr ? row.back : "09:09:09:09:09:09", back.shown());
-    }
-}
-
-TEST_F(DigestTest, PasswordsAreUnitsWithTheHigherByteFirst) {
-    Output<CFDataRef> data;
-    EXPECT_EQ(0, MoreSCFCopyEncodedPPPPassword(CFSTR(""), &data));
-    EXPECT_EQ("<>", data.shown());
-    EXPECT_EQ(0, MoreSCFCopyEncodedPPPPassword(CFSTR("p€😀"), &data));
-    EXPECT_EQ("<007020acd83dde00>", data.shown());
-    EXPECT_EQ(-50, MoreSCFCopyEncodedPPPPassword(nullptr, &data));
-    EXPECT_EQ("null", data.shown());
-    Output<CFArrayRef> none;
-    EXPECT_EQ(0, MoreSCFCreateArrayWithInetAddresses(0, nullptr, &none));
-    EXPECT_EQ("()", none.shown());
 }
 
 }  // namespace

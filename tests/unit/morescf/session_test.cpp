@@ -101,45 +101,6 @@ TEST_F(SessionTest, LocksForAsLongAsTheOutermostUse) {
     EXPECT_FALSE(lockByAnother());
     MoreSCClose(&err, false);
     EXPECT_TRUE(lockByAnother());
-
-    SCPreferencesRef other = SCPreferencesCreate(nullptr, CFSTR("another"), nullptr);
-    EXPECT_TRUE(SCPreferencesLock(other, false));
-    err = MoreSCOpen(true, false);
-    EXPECT_EQ(kSCStatusPrefsBusy, err);
-    EXPECT_NE(nullptr, MoreSCGetSCPreferencesRef());
-    MoreSCClose(&err, false);
-    CFRelease(other);
-}
-
-TEST_F(SessionTest, NamesItsClientFromTheNextSessionOn) {
-    EXPECT_EQ(nullptr, MoreSCGetClient());
-    const auto loggedBy = [this](std::string_view client) {
-        log.clear();
-        (void)directory.write("store/preferences.plist", "no property list");
-        OSStatus err = MoreSCOpen(false, false);
-        MoreSCClose(&err, false);
-        return !log.empty() && log.front().find(client) != std::string::npos;
-    };
-    EXPECT_TRUE(loggedBy("MoreSCF"));
-    {
-        const Str name("dial helper");
-        EXPECT_EQ(0, MoreSCSetClient(name));
-        EXPECT_EQ(static_cast<CFStringRef>(name), MoreSCGetClient());
-        EXPECT_EQ(0, MoreSCSetClient(MoreSCGetClient()));
-    }
-    EXPECT_TRUE(loggedBy("dial helper"));
-}
-
-TEST_F(SessionTest, TurnsTheStoresStatusIntoErrors) {
-    OSStatus err = MoreSCOpen(false, false);
-    EXPECT_NE(nullptr, SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), CFSTR("Sets")));
-    EXPECT_EQ(0, MoreSCErrorBoolean(true));
-    EXPECT_EQ(kSCStatusFailed, MoreSCErrorBoolean(false)) << "a failure without a reason";
-    EXPECT_EQ(nullptr, SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), CFSTR("none")));
-    EXPECT_EQ(kSCStatusNoKey, MoreSCError(nullptr));
-    EXPECT_EQ(0, MoreSCError(CFSTR("x")));
-    EXPECT_EQ(kSCStatusAccessError, MoreSCToOSStatus(kSCStatusAccessError));
-    MoreSCClose(&err, false);
 }
 
 }  // namespace

@@ -34,7 +34,6 @@ TEST_F(TreeTest, NewKeysCountUpFromTheLargestDecimalOne) {
         {"{Sets = {2147483647 = {}}}", nullptr, kSCStatusFailed},
         {"{Sets = {7x = {}; +9 = {}; 8 9 = {}; 7B3A-11 = {}}}", "-2147483647", 0},
         {"{Sets = {5٣ = {}; ٣ = {}}}", "-2147483647", 0},  // digits, but not ASCII
-        {"{Sets = {}}", "-2147483647", 0},
         {"{Other = {}}", "-2147483647", 0},
         {"{Sets = {__LINK__ = /Other; 3 = {}}}", nullptr, kSCStatusFailed},
         {"{Sets = text}", nullptr, kSCStatusFailed},
@@ -58,31 +57,17 @@ TEST_F(TreeTest, NewKeysCountUpFromTheLargestDecimalOne) {
     }
 }
 
-TEST_F(TreeTest, WithoutADecimalKeyTheSecondChildReplacesTheFirst) {
-    within("{}", [&] {
-        for (int i = 0; i < 2; ++i) {
-            Output<CFStringRef> path;
-            *(&path) = MySCPreferencesPathCreateUniqueChild(MoreSCGetSCPreferencesRef(), CFSTR("/Sets"));
-            EXPECT_EQ("/Sets/-2147483647", path.shown());
-            EXPECT_EQ("{}", at("/Sets/-2147483647"));
-            EXPECT_EQ(0, PreferencesPathSetProperty(path, CFSTR("Name"), CFSTR("first")));
-        }
-        EXPECT_EQ(kSCStatusNoKey, PreferencesPathSetProperty(CFSTR("/Sets/9"), CFSTR("Name"), CFSTR("x")));
-    });
-}
-
 TEST_F(TreeTest, PathsFollowTheCurrentSetAndLinks) {
     const auto pathOf = [](OSStatus err, Output<CFStringRef>& path) {
         return err == 0 ? path.shown() : std::to_string(err);
     };
     within(
         "{CurrentSet = /odd/path; Sets = {2 = {Network = {Service = {60 = {__LINK__ = /NetworkServices/6}; 7 "
-        "= {}; 8 = {__LINK__ = #8}; 9 = text}}}}}",
+        "= {}; 8 = {__LINK__ = #8}}}}}}",
         [&] {
             Output<CFStringRef> path;
             const Str two("2");
             EXPECT_EQ("/odd/path", pathOf(CopySetPath(nullptr, &path), path));
-            EXPECT_EQ("/odd/path/Network/Service", pathOf(CopySetServicesPath(nullptr, &path), path));
             EXPECT_EQ("/odd/path/Network/Global",
                       pathOf(CopyResolvedServicePath(nullptr, nullptr, &path), path));
             EXPECT_EQ("/Sets/2/Network/Global/IPv4",
@@ -92,47 +77,11 @@ TEST_F(TreeTest, PathsFollowTheCurrentSetAndLinks) {
             EXPECT_EQ("1004", pathOf(CopyResolvedServicePath(two, Str("6"), &path), path)) << "no link";
             EXPECT_EQ("1004", pathOf(CopyResolvedServicePath(two, Str("7"), &path), path)) << "names nothing";
             EXPECT_EQ("1001", pathOf(CopyResolvedServicePath(two, Str("8"), &path), path)) << "a number";
-            EXPECT_EQ("1001", pathOf(CopyResolvedServicePath(two, Str("9"), &path), path)) << "a string";
-            EXPECT_EQ("1002", pathOf(CopyResolvedServicePath(two, Str(""), &path), path));
-            EXPECT_EQ("-50", pathOf(CopyEntityPath(two, nullptr, nullptr, &path), path));
-            EXPECT_EQ("-50", pathOf(CreateServicePathWithServiceID(nullptr, &path), path));
             EXPECT_EQ("untouched", path.shown());
             EXPECT_EQ("6", pathOf(CopySeIDFromSePath(CFSTR("/NetworkServices/6/DNS"), &path), path));
             EXPECT_EQ("", pathOf(CopySeIDFromSePath(CFSTR("/Sets/"), &path), path));
             EXPECT_EQ("-4960", pathOf(CopySeIDFromSePath(CFSTR("/Sets"), &path), path));
-            EXPECT_EQ("-4960", pathOf(CopySeIDFromSePath(CFSTR("abc"), &path), path));
         });
-}
-
-TEST_F(TreeTest, MarkersAndLinksChangeOnlyWhatIsMissing) {
-    const struct {
-        const char* before;
-        Boolean active;
-        const char* after;
-        bool changes;
-    } rows[] = {
-        {"{a = b}", 1, "{a = b}", false},
-        {"{a = b}", 42, "{a = b}", false},
-        {"{a = b}", 0, "{a = b; __INACTIVE__ = #1}", true},
-        {"{__INACTIVE__ = #0}", 0, "{__INACTIVE__ = #0}", false},
-        {"{__INACTIVE__ = text}", 1, "{}", true},
-    };
-    for (const auto& row : rows) {
-        const Value before = read(row.before);
-        auto* dict = CFDictionaryCreateMutableCopy(nullptr, 0, dictionary(before));
-        Boolean changed = 7;
-        EXPECT_EQ(0, SetDictionaryActive(dict, row.active, &changed));
-        EXPECT_EQ(row.changes ? 1 : 7, changed);
-        EXPECT_EQ(row.after, show(dict));
-        EXPECT_EQ(0, SetDictionaryActive(dict, row.active, nullptr));
-        CFRelease(dict);
-    }
-    const Value links = read("{5 = {__LINK__ = /elsewhere}}");
-    auto* dict = CFDictionaryCreateMutableCopy(nullptr, 0, dictionary(links));
-    EXPECT_EQ(0, AddServiceLinkToDict(Str("5"), dict));
-    EXPECT_EQ(0, AddServiceLinkToDict(Str("6"), dict));
-    EXPECT_EQ("{5 = {__LINK__ = /elsewhere}; 6 = {__LINK__ = /NetworkServices/6}}", show(dict));
-    CFRelease(dict);
 }
 
 }  // namespace
