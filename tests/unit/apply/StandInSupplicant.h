@@ -32,8 +32,6 @@ class StandInSupplicant {
     // What joining comes to: a notice, and whether the card then is on the network.
     std::string notice = "<3>CTRL-EVENT-CONNECTED";
     bool joins = true;
-    std::string refuses;  // a command that starts like this is answered with FAIL
-    bool isMute = false;
 
     explicit StandInSupplicant(const std::string& path) : path_(path) {
         sockaddr_un address{};
@@ -74,17 +72,16 @@ class StandInSupplicant {
             socklen_t size = sizeof from;
             const ssize_t length =
                 recvfrom(socket_, buffer, sizeof buffer, 0, reinterpret_cast<sockaddr*>(&from), &size);
-            if (length <= 0 || isMute) {
+            if (length <= 0) {
                 continue;
             }
             const auto send = [&](const std::string& text) {
                 sendto(socket_, text.data(), text.size(), 0, reinterpret_cast<const sockaddr*>(&from), size);
             };
             const std::string command(buffer, static_cast<std::size_t>(length));
-            const bool isRefused = !refuses.empty() && command.compare(0, refuses.size(), refuses) == 0;
             send("<3>a notice at any time");
-            send(isRefused ? "FAIL\n" : answer(command));
-            if (command.compare(0, 14, "SELECT_NETWORK") == 0 && !isRefused) {
+            send(answer(command));
+            if (command.compare(0, 14, "SELECT_NETWORK") == 0) {
                 send(notice);
             } else if (command == "SCAN") {
                 send("<3>CTRL-EVENT-SCAN-STARTED ");

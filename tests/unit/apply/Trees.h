@@ -17,9 +17,6 @@ inline constexpr const char* switchedOff = "<key>__INACTIVE__</key><integer>1</i
 struct Service {
     std::string device;
     std::string entries;  // of the service, beside its "Interface"
-    std::string interfaceEntries = "<key>Type</key><string>Ethernet</string>";
-    bool isOrdered = true;
-    bool isLinked = true;
 };
 
 // A service that is on, with a fixed address.
@@ -49,15 +46,11 @@ inline values::Owned<CFDictionaryRef> makeTree(const std::vector<Service>& servi
         const Service& service = services[i];
         const std::string id = std::to_string(100 + i);
         all += "<key>" + id + "</key><dict><key>Interface</key><dict><key>DeviceName</key><string>" +
-               service.device + "</string>" + service.interfaceEntries + "</dict>" + service.entries +
+               service.device + "</string><key>Type</key><string>Ethernet</string></dict>" + service.entries +
                "</dict>";
-        if (service.isLinked) {
-            links += "<key>" + id + "</key><dict><key>__LINK__</key><string>/NetworkServices/" + id +
-                     "</string></dict>";
-        }
-        if (service.isOrdered) {
-            order += "<string>" + id + "</string>";
-        }
+        links += "<key>" + id + "</key><dict><key>__LINK__</key><string>/NetworkServices/" + id +
+                 "</string></dict>";
+        order += "<string>" + id + "</string>";
     }
     return parseTree(
         "<key>CurrentSet</key><string>/Sets/7</string><key>Sets</key><dict><key>7</key><dict><key>Network"

@@ -87,11 +87,6 @@ TEST_F(NameServersTest, SeveralInterfacesShareTheFileInTheirOrder) {
     bring("wlan0", 1, {{server(3), server(1), server(4)}, {}});
     bring("eth0", 0, {{server(1), server(2)}, {}});
     EXPECT_EQ("nameserver 10.0.0.1\nnameserver 10.0.0.2\nnameserver 10.0.0.3\n", content());
-    const auto written = fs::last_write_time(path_);
-    const auto kept = fs::last_write_time(folder_.at("run/name-servers.plist"));
-    bring("eth0", 0, {{server(1), server(2)}, {}});
-    EXPECT_EQ(written, fs::last_write_time(path_));
-    EXPECT_EQ(kept, fs::last_write_time(folder_.at("run/name-servers.plist")));
     bring("eth0", 0, {});
     EXPECT_EQ("nameserver 10.0.0.3\nnameserver 10.0.0.1\nnameserver 10.0.0.4\n", content());
     bring("wlan0", 1, {});
@@ -107,18 +102,6 @@ TEST_F(NameServersTest, WhatSomebodyElseWroteStays) {
     bring("eth0", 0, {});
     EXPECT_EQ("nameserver 8.8.8.8\n", content());
     EXPECT_FALSE(fs::exists(folder_.at("run/name-servers.plist")));
-}
-
-TEST_F(NameServersTest, AStateThatCannotBeReadChangesNothing) {
-    folder_.write("etc/resolv.conf", "nameserver 9.9.9.9\n");
-    bring("eth0", 0, {{server(1)}, {}});
-    std::string good;
-    ASSERT_TRUE(readWholeFile(folder_.at("run/name-servers.plist"), good).ok());
-    for (std::size_t length = 0; length < good.size() - 10; length += 61) {
-        folder_.write("run/name-servers.plist", good.substr(0, length));
-        EXPECT_FALSE(bringNameServers("eth0", 0, {}).ok()) << length;
-    }
-    EXPECT_EQ("nameserver 10.0.0.1\n", content());
 }
 
 }  // namespace
