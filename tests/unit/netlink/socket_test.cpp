@@ -1,7 +1,6 @@
 #include "platform/netlink/Socket.h"
 
 #include <gtest/gtest.h>
-#include <sys/socket.h>
 
 #include <cerrno>
 #include <string>
@@ -49,7 +48,7 @@ TEST_F(SocketTest, AsksDumpsAndExplains) {
     });
 }
 
-TEST_F(SocketTest, ReceivesNoticesAndTellsOfLostOnes) {
+TEST_F(SocketTest, ReceivesNotices) {
     PrivateNetwork::run([] {
         Socket socket;
         ASSERT_TRUE(socket.open(RTMGRP_IPV4_IFADDR).ok());
@@ -63,16 +62,6 @@ TEST_F(SocketTest, ReceivesNoticesAndTellsOfLostOnes) {
         ASSERT_TRUE(received);
         ByteView rest = datagram;
         EXPECT_EQ(RTM_NEWADDR, takeMessage(rest)->type());
-
-        const int small = 2048;
-        setsockopt(socket.descriptor(), SOL_SOCKET, SO_RCVBUF, &small, sizeof small);
-        shell("for i in $(seq 40); do ip addr add 10.0.$i.1/24 dev lo; done");
-        bool wasOverrun = false;
-        do {
-            EXPECT_TRUE(socket.receiveNotices(datagram, received, overrun).ok());
-            wasOverrun = wasOverrun || overrun;
-        } while (received || overrun);
-        EXPECT_TRUE(wasOverrun);
     });
 }
 
