@@ -1,5 +1,4 @@
 #include "morescf/MoreSCFPortScanner.h"
-#include "morescf/MoreSCFTree.h"
 #include "tests/unit/morescf/Fixture.h"
 
 namespace morescf_test {
