@@ -8,7 +8,78 @@ namespace {
 class HelpersTest : public MoreSCFTest {
   protected:
     HelpersTest() { setTree(twoSets); }
+
+    // The current location with services 5, 6, ... of these dictionaries.
+    void setServices(const std::vector<const char*>& services) const {
+        std::string links;
+        std::string order;
+        std::string all;
+        int id = 5;
+        for (const char* service : services) {
+            const std::string key = std::to_string(id++);
+            links += key + " = {__LINK__ = /NetworkServices/" + key + "};";
+            order += key + ",";
+            all += key + " = " + service + ";";
+        }
+        setTree("{CurrentSet = /Sets/1; Sets = {1 = {UserDefinedName = Home; Network = {Service = {" + links +
+                "}; Global = {IPv4 = {ServiceOrder = (" + order + ")}}}}}; NetworkServices = {" + all + "}}");
+    }
 };
+
+TEST_F(HelpersTest, AppleTalk) {
+    const struct {
+        std::vector<const char*> services;
+        OSStatus err;
+        bool active;
+        int on;   // entities that are on
+        int off;  // and off
+    } rows[] = {
+        {{}, 0, false, 0, 0},
+        {{"{AppleTalk = {}}"}, 0, true, 1, 0},
+        {{"{AppleTalk = {__INACTIVE__ = #1}}", "{AppleTalk = {}}", "{}"}, 0, true, 1, 1},
+        {{"{__INACTIVE__ = #1; AppleTalk = {}}"}, 0, false, 1, 0},
+        {{"{__INACTIVE__ = #1; AppleTalk = {__INACTIVE__ = #1}}"}, 0, false, 0, 1},
+        {{"{}", "{AppleTalk = {}}"}, kSCStatusNoKey, false, 1, 0},
+    };
+    const auto count = [this](std::string_view what) {
+        const std::string all = tree();
+        int found = 0;
+        for (std::size_t at = all.find(what); at != std::string::npos; at = all.find(what, at + 1)) {
+            ++found;
+        }
+        return found;
+    };
+    for (const auto& row : rows) {
+        for (const bool wanted : {true, false}) {
+            setServices(row.services);
+            Boolean active = 7;
+            EXPECT_EQ(row.err, MoreSCIsAppleTalkActive(nullptr, &active));
+            EXPECT_EQ(row.active, active != 0);
+            const std::string before = fileIdentity();
+            EXPECT_EQ(0, MoreSCSetAppleTalkActive(nullptr, wanted));
+            EXPECT_EQ((wanted ? row.off : row.on) > 0, before != fileIdentity());
+            EXPECT_EQ(wanted ? row.on + row.off : 0, count("AppleTalk = {}"));
+            EXPECT_EQ(wanted ? 0 : row.on + row.off, count("AppleTalk = {__INACTIVE__ = #1}"));
+        }
+    }
+}
+
+TEST_F(HelpersTest, ListsTheServicesThatUseDHCP) {
+    Output<CFArrayRef> ids;
+    setServices({"{Interface = {DeviceName = eth0}; IPv4 = {ConfigMethod = PPP}}"});
+    EXPECT_EQ(0, MoreSCCreateActiveDHCPServicesArray(&ids));
+    EXPECT_EQ("()", ids.shown());
+    setServices({"{IPv4 = {ConfigMethod = DHCP}}", "{IPv4 = {ConfigMethod = Manual}}",
+                 "{IPv4 = {ConfigMethod = DHCP}}", "{DNS = {ConfigMethod = DHCP}}",
+                 "{__INACTIVE__ = #1; IPv4 = {ConfigMethod = DHCP}}"});
+    EXPECT_EQ(0, MoreSCCreateActiveDHCPServicesArray(&ids));
+    EXPECT_EQ("(5, 7)", ids.shown());
+    for (const char* method : {"{IPv4 = {}}", "{IPv4 = {ConfigMethod = (DHCP)}}"}) {
+        setServices({"{IPv4 = {ConfigMethod = DHCP}}", method});
+        EXPECT_EQ(-2, MoreSCCreateActiveDHCPServicesArray(&ids));
+        EXPECT_EQ("null", ids.shown());
+    }
+}
 
 TEST_F(HelpersTest, ReleaseIsTwoCommitsAndTwoApplies) {
     EXPECT_EQ(0, MoreSCSetEntity(nullptr, Str("5"), CFSTR("DNS"), dictionary(read("{}"))));
@@ -23,6 +94,19 @@ TEST_F(HelpersTest, ReleaseIsTwoCommitsAndTwoApplies) {
     EXPECT_EQ(kSCStatusFailed, MoreSCDHCPRelease(Str("5")));
     EXPECT_NE(std::string::npos, tree().find("__INACTIVE__")) << "not switched on again after a failure";
     EXPECT_EQ(-50, MoreSCDHCPRelease(nullptr));
+}
+
+TEST_F(HelpersTest, FindsTheFirstLocationOfAName) {
+    setTree(
+        "{Sets = {4 = {UserDefinedName = home}; 3 = {UserDefinedName = Home}; 1 = {UserDefinedName = Home}; "
+        "2 = {}}}");
+    Output<CFStringRef> id;
+    EXPECT_EQ(0, MoreSCFindSetByUserVisibleNameAndCopyID(CFSTR("Home"), &id));
+    EXPECT_EQ("3", id.shown()) << "a nameless one behind it does not matter";
+    EXPECT_EQ(-4960, MoreSCFindSetByUserVisibleNameAndCopyID(CFSTR("Away"), &id));
+    setTree("{Sets = {4 = {UserDefinedName = home}}}");
+    EXPECT_EQ(0, MoreSCFindSetByUserVisibleNameAndCopyID(CFSTR("Away"), &id));
+    EXPECT_EQ("untouched", id.shown());
 }
 
 TEST_F(HelpersTest, MakesADialupLocation) {
