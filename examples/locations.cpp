@@ -3,6 +3,7 @@
 //     locations list               every location with its services, and the live state of the current one's
 //     locations make-dialup NAME   a new location in which only the first modem is on
 //     locations delete NAME        deletes the first location of that name, unless it is the current one
+//     locations renew              gives the leases of the current location back and takes new ones
 //
 // Changing something takes root. The exit status is 0, or 1 with a line on standard error.
 #include <cstdio>
@@ -149,6 +150,20 @@ OSStatus Delete(CFStringRef name) {
     return err;
 }
 
+OSStatus Renew() {
+    CFArrayRef services = nullptr;
+    OSStatus err = MoreSCCreateActiveDHCPServicesArray(&services);
+    const CFIndex count = err == 0 ? CFArrayGetCount(services) : 0;
+    for (CFIndex i = 0; err == 0 && i < count; ++i) {
+        const auto serviceID = static_cast<CFStringRef>(CFArrayGetValueAtIndex(services, i));
+        Print("renewing the lease of service ", serviceID);
+        // Outside of any session: the two halves have to be applied one after the other.
+        err = MoreSCDHCPRelease(serviceID);
+    }
+    CFQRelease(services);
+    return err;
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -160,12 +175,14 @@ int main(int argc, char** argv) {
     }
     if (argc == 2 && std::strcmp(command, "list") == 0) {
         err = List();
+    } else if (argc == 2 && std::strcmp(command, "renew") == 0) {
+        err = Renew();
     } else if (name != nullptr && std::strcmp(command, "make-dialup") == 0) {
         err = MakeDialup(name);
     } else if (name != nullptr && std::strcmp(command, "delete") == 0) {
         err = Delete(name);
     } else {
-        std::fprintf(stderr, "Usage: %s list | make-dialup NAME | delete NAME\n", argv[0]);
+        std::fprintf(stderr, "Usage: %s list | make-dialup NAME | delete NAME | renew\n", argv[0]);
     }
     if (err != 0) {
         std::fprintf(stderr, "status %d\n", static_cast<int>(err));

@@ -57,5 +57,20 @@ class Examples(lab.LabTest):
             self.assertIn(line, listed)
 
 
+class Lease(lab.LabTest):
+    options = {"dhcp": "eth0"}
+
+    def test_renew(self):
+        self.lab.tool("create", "auto")
+        lab.sh(f"cp {lab.BUILD}/examples/locations {lab.TOOL.parent}/location-assistant-dhcp-hook /tmp/")
+        service = next(key for key, value in self.lab.store()["NetworkServices"].items()
+                       if value.get("IPv4") == {"ConfigMethod": "DHCP"})
+        self.assertEqual(f"renewing the lease of service {service}\n", lab.sh("/tmp/locations renew"))
+        taken = ["DHCPDISCOVER", "DHCPOFFER", "DHCPREQUEST", "DHCPACK"]
+        log = [line.split("(")[0].split()[-1] for line in self.lab.file("dhcp.log").splitlines() if "far-eth0)" in line]
+        self.assertEqual([*taken, "DHCPRELEASE", *taken], log)
+        self.assertEqual(1, len(self.lab.ipv4("eth0")))
+
+
 if __name__ == "__main__":
     lab.main()
