@@ -42,7 +42,7 @@ struct User {
 std::optional<User> userWithId(uid_t id) {
     passwd record{};
     passwd* found = nullptr;
-    std::vector<char> buffer(64 * 1024);
+    std::vector<char> buffer(std::size_t{64} * 1024);
     if (getpwuid_r(id, &record, buffer.data(), buffer.size(), &found) != 0 || found == nullptr) {
         return std::nullopt;
     }

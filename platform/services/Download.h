@@ -17,8 +17,8 @@ struct DownloadBounds {
     // From the first step to the last, connecting included.
     std::chrono::milliseconds whole{5000};
     // The status line and the header fields together, for each answer on the connection.
-    std::size_t headerBytes = 16 * 1024;
-    std::size_t bodyBytes = 1024 * 1024;
+    std::size_t headerBytes = std::size_t{16} * 1024;
+    std::size_t bodyBytes = std::size_t{1024} * 1024;
     // Interim answers (1xx) before the real one.
     int interimAnswers = 8;
 };
