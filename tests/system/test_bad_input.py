@@ -244,10 +244,11 @@ class Canary(lab.LabTest):
             out += run.stdout.read() + run.stderr.read()
             self.assertIn(b"location-assistant\0create", seen)
             self.assertNotIn(forms[0], out + seen + "".join(self.lab.syslog).encode())
+            # A checkout that lies under one of the folders names the password itself.
+            passed_over = {lab.STORE, lab.LAB, Path("/run/netns"), lab.PROJECT, lab.BINARY.parent}
             for folder in "/tmp", "/run", "/var/lib", "/etc":
                 for path in Path(folder).rglob("*"):
-                    if path.is_file() and os.access(path, os.R_OK) and path != lab.STORE \
-                            and path.parts[2] not in ("lab", "netns"):
+                    if path.is_file() and os.access(path, os.R_OK) and not passed_over & {path, *path.parents}:
                         content = path.read_bytes()
                         self.assertFalse(any(form in content for form in forms), path)
         self.assertIn(forms[1], plistlib.dumps(self.lab.store()) + b"".join(
