@@ -382,7 +382,9 @@ class Matrix(lab.LabTest):
             self.assertNotIn(canary, what)
         holders = subprocess.run(["grep", "-rlI", canary, "/run", "/var/lib", "/tmp", "/etc"], capture_output=True,
                                  text=True, check=False).stdout.split()
-        self.assertEqual([path for path in holders if Path(path).stat().st_mode & 0o077], [])
+        # A checkout that lies under one of the folders names the password itself.
+        self.assertEqual([path for path in map(Path, holders)
+                          if path.stat().st_mode & 0o077 and lab.PROJECT not in path.parents], [])
         self.remove()
         self.assert_back(before)
 
