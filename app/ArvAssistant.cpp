@@ -3,6 +3,7 @@
 #include "app/Reachability.h"
 #include "app/SetIDFile.h"
 #include "app/Trace.h"
+#include "app/Turn.h"
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
 
@@ -143,6 +144,7 @@ OSStatus ArvAssistant::Run() {
 OSStatus ArvAssistant::ConfigureWirelessPrinter() {
     TRACE("Configuring the device\n");
     OpenConfigurationPage();
+    const TurnPause pause;
     return WaitForUserToBeDone();
 }
 

@@ -6,52 +6,72 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
+#include <string>
+
+#include "platform/CoreServices.h"
 
 namespace {
 
-// A descriptor, or -1. Does not truncate: nothing may happen to a file before it is known to be ours.
-int OpenOwnFile(const char* path, int flags) {
-    const int descriptor =
-        open(path, flags | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC, S_IRUSR | S_IWUSR);
+int OpenOwnFile(const char* path) {
+    const int descriptor = open(path, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
     if (descriptor < 0) {
         return -1;
     }
     struct stat status = {};
     if (fstat(descriptor, &status) != 0 || !S_ISREG(status.st_mode) || status.st_uid != geteuid() ||
-        status.st_nlink != 1) {
+        status.st_nlink != 1 || (status.st_mode & (S_IWGRP | S_IWOTH)) != 0) {
         close(descriptor);
         return -1;
     }
     return descriptor;
 }
 
-}  // namespace
-
-void WriteSetIDFile(const char* path, const char* text) {
-    const int descriptor = OpenOwnFile(path, O_WRONLY | O_CREAT);
-    if (descriptor < 0) {
-        return;
-    }
-    if (ftruncate(descriptor, 0) == 0) {
-        size_t left = std::strlen(text);
-        while (left > 0) {
-            const ssize_t written = write(descriptor, text, left);
-            if (written < 0) {
-                if (errno == EINTR) {
-                    continue;
-                }
-                break;
-            }
+// False with errno set when not all of it is written.
+bool WriteText(int descriptor, const char* text) {
+    size_t left = std::strlen(text);
+    while (left > 0) {
+        const ssize_t written = write(descriptor, text, left);
+        if (written < 0 && errno != EINTR) {
+            return false;
+        }
+        if (written > 0) {
             text += written;
             left -= static_cast<size_t>(written);
         }
     }
-    close(descriptor);
+    return true;
+}
+
+}  // namespace
+
+void WriteSetIDFile(const char* path, const char* text) {
+    // Beside it under a name that nobody can foresee, and moved into its place when it is whole.
+    std::string beside = std::string(path) + ".XXXXXX";
+    const int descriptor = mkostemp(beside.data(), O_CLOEXEC);
+    bool isDone = descriptor >= 0 && WriteText(descriptor, text);
+    int error = isDone ? 0 : errno;
+    if (descriptor >= 0 && close(descriptor) != 0 && isDone) {
+        isDone = false;
+        error = errno;
+    }
+    if (isDone && rename(beside.c_str(), path) != 0) {
+        isDone = false;
+        error = errno;
+    }
+    if (!isDone) {
+        if (descriptor >= 0) {
+            unlink(beside.c_str());
+        }
+        SystemLog((std::string("the location to return to cannot be remembered in ") + path + ": " +
+                   std::strerror(error))
+                      .c_str());
+    }
 }
 
 bool CopySetIDFromFile(const char* path, CFStringRef* setID) {
-    const int descriptor = OpenOwnFile(path, O_RDONLY);
+    const int descriptor = OpenOwnFile(path);
     if (descriptor < 0) {
         return false;
     }

@@ -13,6 +13,8 @@
 #include <string>
 
 #include "app/ArvAssistant.h"
+#include "app/Turn.h"
+#include "platform/SystemConfiguration.h"
 
 ArvAssistant assistant;
 
@@ -37,31 +39,20 @@ void ShowUsage(const char* programName) {
     std::printf("\n");
 }
 
-// Waits until no other run is under way, for at most a minute, which is longer than one takes. Two at once
-// would delete each other's temporary location between making it and making it current, and a current
-// location that does not exist leads nowhere back. The lock ends with the process. Without the rights to make
-// the file there is nothing to change either. "test" takes no turn: it waits for its user, for ever if need
-// be, and "remove" has to be able to lead back meanwhile.
-void TakeTurn() {
-    constexpr const char* path = "/run/location-assistant.lock";
-    constexpr useconds_t pause = 20'000;
-    constexpr int tries = 3'000;
-    const int descriptor = open(path, O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, S_IRUSR | S_IWUSR);
-    if (descriptor < 0) {
-        return;
-    }
-    struct flock whole = {};
-    whole.l_type = F_WRLCK;
-    whole.l_whence = SEEK_SET;
-    for (int i = 0; i < tries && fcntl(descriptor, F_SETLK, &whole) != 0; ++i) {
-        usleep(pause);
+// Has what is committed applied, as far as an earlier run left that undone: it was ended half-way, or a
+// daemon was away. So every command, again, finishes what went wrong before. What comes of it is in the
+// system log.
+void FinishEarlierRun() {
+    SCPreferencesRef session = SCPreferencesCreate(kCFAllocatorDefault, CFSTR("location-assistant"), nullptr);
+    if (session != nullptr) {
+        SCPreferencesApplyChanges(session);
+        CFRelease(session);
     }
 }
 
 // The last clean-up runs when the new location is current: it removes every other one of the temporary name,
 // and the library refuses to delete the current one.
 OSStatus CreateTemporary(char* mode, char* networkName, char* password) {
-    TakeTurn();
     assistant.Initialize();
     assistant.CleanupOldTemporarySets();
     assistant.SaveOriginalSet();
@@ -76,7 +67,6 @@ OSStatus CreateTemporary(char* mode, char* networkName, char* password) {
 }
 
 OSStatus RemoveTemporary() {
-    TakeTurn();
     assistant.Initialize();
     assistant.RestoreOriginalSet();
     assistant.CleanupOldTemporarySets();
@@ -85,7 +75,6 @@ OSStatus RemoveTemporary() {
 }
 
 OSStatus RemoveTemporary2() {
-    TakeTurn();
     assistant.Initialize();
     assistant.RestoreOriginalSet2();
     assistant.CleanupOldTemporarySets();
@@ -96,7 +85,6 @@ OSStatus RemoveTemporary2() {
 }
 
 OSStatus SaveTemporary() {
-    TakeTurn();
     assistant.CleanupOldUserSets();
     assistant.SaveTemporarySet();
     assistant.CleanupOldUserSets();
@@ -104,9 +92,17 @@ OSStatus SaveTemporary() {
 }
 
 OSStatus SaveZAT() {
-    TakeTurn();
     assistant.SaveZATSet();
     return 0;
+}
+
+bool IsCommandWord(const char* word) {
+    for (const char* known : {"create", "remove", "save", "saveZAT", "restoreZAT", "test"}) {
+        if (IsWord(word, known)) {
+            return true;
+        }
+    }
+    return false;
 }
 
 // 1 when the first word is a known one, else 0. argv holds argc words, the program's name first.
@@ -115,6 +111,13 @@ int ProcessArguments(int argc, const char** argv) {
         return index < argc ? const_cast<char*>(argv[index]) : nullptr;
     };
     const char* command = word(1);
+    if (!IsCommandWord(command)) {
+        return 0;
+    }
+    const Turn turn;
+    if (turn.IsTaken()) {
+        FinishEarlierRun();
+    }
     if (IsWord(command, "create")) {
         char* mode = word(2);
         if (mode != nullptr &&
@@ -131,10 +134,8 @@ int ProcessArguments(int argc, const char** argv) {
         SaveZAT();
     } else if (IsWord(command, "restoreZAT")) {
         RemoveTemporary2();
-    } else if (IsWord(command, "test")) {
-        assistant.Run();
     } else {
-        return 0;
+        assistant.Run();
     }
     return 1;
 }

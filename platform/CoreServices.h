@@ -105,3 +105,9 @@ OSStatus URLSimpleDownload(const char* url, const void* destination, Handle buff
 // Opens the URL in the browser of the user who sits at the computer, as that user, and returns without
 // waiting for it. Nothing happens when nobody does (fnfErr). openedURL must be null.
 OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL);
+
+// --- System log ---
+
+// Writes one line to the system log, as a warning of this system, without waiting: where nobody reads the log
+// it is lost.
+void SystemLog(const char* line);

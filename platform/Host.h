@@ -10,6 +10,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace platform {
 
@@ -52,8 +53,9 @@ struct Host {
     // A BCD version number; nothing: the question fails.
     std::optional<std::int32_t> systemVersion = 0x1040;
 
+    // In the order in which they are asked who leads an interface; none: the platform's own.
+    std::vector<std::shared_ptr<apply::Agent>> agents;
     // Null: the platform's own, chosen at the call.
-    std::shared_ptr<apply::Agent> agent;
     std::shared_ptr<services::Downloader> downloader;
     std::shared_ptr<services::Opener> opener;
     std::shared_ptr<live::NetworkState> networkState;

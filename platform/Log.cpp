@@ -4,6 +4,8 @@
 
 #include <utility>
 
+#include "platform/CoreServices.h"
+
 namespace platform {
 namespace {
 
@@ -56,3 +58,7 @@ LogCapture::~LogCapture() {
 }
 
 }  // namespace platform
+
+void SystemLog(const char* line) {
+    platform::logLine(platform::LogLevel::warning, line);
+}

@@ -38,3 +38,11 @@ class [[nodiscard]] Outcome {
 };
 
 }  // namespace platform
+
+// Leaves the function with the outcome when it is a failure.
+#define RETURN_IF_FAILED(step)                                     \
+    do {                                                           \
+        if (platform::Outcome stepDone = (step); !stepDone.ok()) { \
+            return stepDone;                                       \
+        }                                                          \
+    } while (false)

@@ -1,6 +1,7 @@
-// Who makes a plan so on this machine: NetworkManager, or the platform itself through rtnetlink.
+// Who makes a plan so on this machine: NetworkManager, or the platform itself through the kernel.
 #pragma once
 
+#include <chrono>
 #include <span>
 #include <string>
 #include <string_view>
@@ -13,6 +14,8 @@
 
 namespace platform::apply {
 
+using Clock = std::chrono::steady_clock;
+
 // How an interface was before this system first changed it, in a form that only its agent reads: a property
 // list, since it outlives the process. It is on disk before the first change and is dropped after the way
 // back.
@@ -21,6 +24,20 @@ struct Captured {
     values::Owned<CFDictionaryRef> state;
 };
 
+// An interface that is to become what a plan says, or to be given back, and what came of it.
+struct Task {
+    const Captured* before = nullptr;
+    const InterfacePlan* plan = nullptr;  // null: it is given back
+
+    // Filled in by the agent. The machine (the kernel, a daemon, the disk) did not take the settings.
+    Outcome refusal;
+    // What a network, a cable, a key, a switch or a card that is away did; empty for nothing. The settings
+    // stand all the same, and whoever leads the interface goes on by itself where it can.
+    std::string trouble;
+};
+
+// Every interface is started before any is waited for: start() gives each its settings and asks for what
+// takes time, settle() waits for all of them at once.
 class Agent {
   public:
     virtual ~Agent() = default;
@@ -28,19 +45,22 @@ class Agent {
     // Kept in the record with each interface, so that the way back is led by the agent that led the way out.
     [[nodiscard]] virtual std::string_view name() const noexcept = 0;
 
-    // How these interfaces are now, in the order in which they have to be given back. An interface that does
-    // not exist is left out. Changes nothing.
-    virtual Outcome capture(std::span<const std::string> interfaces, std::vector<Captured>& captured) = 0;
+    // How those of these interfaces are now that this agent leads, in the order in which they have to be
+    // given back. One that it leads and may not touch, since it is somebody else's work, stands in leftAlone
+    // instead. Changes nothing.
+    virtual Outcome capture(std::span<const std::string> interfaces, std::vector<Captured>& captured,
+                            std::vector<Trouble>& leftAlone) = 0;
 
-    // Makes the interface what the plan says, whatever it is now, and returns when it is so, has failed, or
-    // the agent's bound on waiting is over. Called again with the same plan it changes nothing. An interface
-    // that the plan wants off and that does not exist is off.
-    virtual Outcome takeOver(const InterfacePlan& plan, const Captured& before) = 0;
+    // Begins. An interface that already is what its plan says is not changed. Giving back restores what was
+    // captured and compares; nothing is changed when the interface is gone or nothing is left to undo, and
+    // only what is this system's own is removed when somebody else has taken the interface over since. The
+    // tasks stay where they are until the end of settle.
+    virtual void start(std::span<Task> tasks, Clock::time_point deadline) = 0;
 
-    // Makes the interface as it was captured, compares, and fails when it is not so. Succeeds without a
-    // change when the interface is gone, when there is nothing left to undo, or when somebody else has taken
-    // it over since (it then removes only what is its own).
-    virtual Outcome giveBack(const Captured& before) = 0;
+    // Waits until nothing more can be expected of any task, at most until the given time or the deadline.
+    // True when all are settled: each is what it was to become, or its refusal or trouble tells why not.
+    // Only what was up before is waited for on the way back.
+    virtual bool settle(Clock::time_point until) = 0;
 };
 
 }  // namespace platform::apply

@@ -6,31 +6,33 @@
 
 namespace platform::apply {
 
-Outcome chooseAgent(std::shared_ptr<Agent>& agent) {
-    agent = currentHost().agent;
-    if (agent != nullptr) {
+Outcome findAgents(Agents& agents) {
+    agents = currentHost().agents;
+    if (!agents.empty()) {
         return {};
     }
     bool running = false;
-    Outcome outcome = isNetworkManagerRunning(running);
-    if (outcome.ok()) {
-        agent = running ? makeNetworkManagerAgent() : makeDirectAgent();
+    RETURN_IF_FAILED(isNetworkManagerRunning(running));
+    if (running) {
+        agents.push_back(makeNetworkManagerAgent());
     }
-    return outcome;
+    agents.push_back(makeDirectAgent());
+    return {};
 }
 
-Outcome agentNamed(std::string_view name, std::shared_ptr<Agent>& agent) {
-    agent = currentHost().agent;
-    if (agent != nullptr && agent->name() == name) {
-        return {};
+Outcome findAgent(std::string_view name, std::shared_ptr<Agent>& agent) {
+    for (const std::shared_ptr<Agent>& own : currentHost().agents) {
+        if (own->name() == name) {
+            agent = own;
+            return {};
+        }
     }
     agent = name == "direct"           ? makeDirectAgent()
             : name == "networkmanager" ? makeNetworkManagerAgent()
                                        : nullptr;
-    if (agent == nullptr) {
-        return {kSCStatusFailed, "there is no agent \"" + std::string(name) + "\" to give it back"};
-    }
-    return {};
+    return agent != nullptr
+               ? Outcome()
+               : Outcome(kSCStatusFailed, "there is no agent \"" + std::string(name) + "\" to give it back");
 }
 
 }  // namespace platform::apply

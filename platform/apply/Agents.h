@@ -1,21 +1,25 @@
-// The agents there are, and which one leads.
+// The agents there are.
 #pragma once
 
 #include <memory>
 #include <string_view>
+#include <vector>
 
 #include "platform/Outcome.h"
 #include "platform/apply/Agent.h"
 
 namespace platform::apply {
 
-// The agent for interfaces that are taken over now: the host's own when it has one; NetworkManager when it
-// runs; else the direct agent. Fails when that cannot be found out: a bus that does not answer is no reason
-// to write behind the back of a daemon that may be running.
-Outcome chooseAgent(std::shared_ptr<Agent>& agent);
+using Agents = std::vector<std::shared_ptr<Agent>>;
+
+// The agents for interfaces that are taken over now, in the order in which they are asked who leads an
+// interface: the host's own when it has some; else NetworkManager, when it runs, and the direct agent. Fails
+// when it cannot be found out whether NetworkManager runs: a bus that does not answer is no reason to write
+// behind the back of a daemon that may be there.
+Outcome findAgents(Agents& agents);
 
 // The agent of a name that a record holds, for the way back. Fails when there is none of that name.
-Outcome agentNamed(std::string_view name, std::shared_ptr<Agent>& agent);
+Outcome findAgent(std::string_view name, std::shared_ptr<Agent>& agent);
 
 // rtnetlink, with the DHCP client and the wireless supplicant. Its name is "direct".
 [[nodiscard]] std::shared_ptr<Agent> makeDirectAgent();

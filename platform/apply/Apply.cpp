@@ -1,7 +1,6 @@
 #include "platform/apply/Apply.h"
 
 #include <algorithm>
-#include <chrono>
 #include <memory>
 #include <utility>
 
@@ -15,16 +14,25 @@
 namespace platform::apply {
 namespace {
 
-// Longer than one run holds the lock: a slow activation of every interface, and the way back before it.
-constexpr std::chrono::seconds lockBound{120};
+// Longer than one apply holds the lock.
+constexpr std::chrono::seconds lockBound{60};
+constexpr std::chrono::seconds goingBound{20};
+constexpr std::chrono::seconds returningBound{15};
+// With agents at work side by side each gets its turn this often.
+constexpr std::chrono::milliseconds slice{50};
+// How often one process tries to finish the same unfinished plan: each try may take a deadline's time.
+constexpr int mostRetries = 1;
+
+void logFor(LogLevel level, const std::string& interface, const std::string& reason) {
+    logLine(level, interface.empty() ? reason : interface + ": " + reason);
+}
 
 // Keeps the first failure, and logs every one.
 class Failures {
   public:
     bool note(const Outcome& outcome, const std::string& interface = {}) {
         if (!outcome.ok()) {
-            logLine(LogLevel::error,
-                    interface.empty() ? outcome.reason() : interface + ": " + outcome.reason());
+            logFor(LogLevel::error, interface, outcome.reason());
             if (first_.ok()) {
                 first_ = outcome;
             }
@@ -37,21 +45,44 @@ class Failures {
     Outcome first_;
 };
 
-values::Owned<CFDictionaryRef> asProperties(const InterfacePlan& plan, const Record& record) {
-    return values::Owned<CFDictionaryRef>::adopt(copyPlanAsPropertyList(plan, record.salt));
-}
+// The tasks of each agent, in order.
+class Crew {
+  public:
+    void add(const std::shared_ptr<Agent>& agent, Task task) {
+        auto group =
+            std::ranges::find(groups_, agent->name(), [](const Group& g) { return g.agent->name(); });
+        if (group == groups_.end()) {
+            group = groups_.insert(group, {agent, {}});
+        }
+        group->tasks.push_back(std::move(task));
+    }
+    void run(Clock::time_point deadline) {
+        for (Group& group : groups_) {
+            group.agent->start(group.tasks, deadline);
+        }
+        const bool isAlone = groups_.size() == 1;
+        for (bool waiting = true; waiting;) {
+            waiting = false;
+            for (Group& group : groups_) {
+                const bool settled = group.agent->settle(isAlone ? deadline : Clock::now() + slice);
+                waiting = waiting || !settled;
+            }
+        }
+    }
+    template <class Each>
+    void forEach(const Each& each) const {
+        for (const Group& group : groups_) {
+            std::ranges::for_each(group.tasks, each);
+        }
+    }
 
-bool isSo(const RecordEntry* entry, const InterfacePlan& plan, const Record& record) {
-    return entry != nullptr && entry->completed && entry->plan &&
-           CFEqual(entry->plan.get(), asProperties(plan, record).get()) != 0;
-}
-
-bool isSo(const Record& record, const Plan& plan) {
-    return record.entries.size() == plan.size() &&
-           std::all_of(plan.begin(), plan.end(), [&record](const InterfacePlan& interface) {
-               return isSo(record.find(interface.name), interface, record);
-           });
-}
+  private:
+    struct Group {
+        std::shared_ptr<Agent> agent;
+        std::vector<Task> tasks;
+    };
+    std::vector<Group> groups_;
+};
 
 // One run under the lock.
 class Run {
@@ -60,101 +91,165 @@ class Run {
         : plan_(plan), record_(record), failures_(failures) {}
 
     void make() {
-        // An interface that was missing may have come since: it is looked at again.
-        std::erase_if(record_.entries, [](const RecordEntry& entry) { return entry.isAbsent(); });
-        std::shared_ptr<Agent> agent;
-        const bool hasAgent = plan_.empty() || failures_.note(chooseAgent(agent));
-        giveBack(agent.get());
-        if (hasAgent && !plan_.empty() && capture(*agent)) {
-            takeOver(*agent);
+        const Clock::time_point begin = Clock::now();
+        // What was missing may have come since: it is looked at again.
+        const bool isShorter =
+            std::erase_if(record_.entries, [](const RecordEntry& entry) { return entry.isLeftAlone(); }) != 0;
+        const bool hasAgents = plan_.empty() || failures_.note(findAgents(agents_));
+        known_ = agents_;
+        giveBack(begin + returningBound, isShorter);
+        if (hasAgents && !plan_.empty() && capture()) {
+            takeOver(begin + goingBound);
         }
     }
 
   private:
+    // One agent of a name for the whole run.
+    Outcome agentOf(const std::string& name, std::shared_ptr<Agent>& agent) {
+        const auto known = std::ranges::find(known_, name, [](const auto& one) { return one->name(); });
+        if (known != known_.end()) {
+            agent = *known;
+            return {};
+        }
+        RETURN_IF_FAILED(findAgent(name, agent));
+        known_.push_back(agent);
+        return {};
+    }
+
     [[nodiscard]] const InterfacePlan* wanted(const std::string& interface) const {
-        const auto found = std::find_if(plan_.begin(), plan_.end(), [&interface](const InterfacePlan& plan) {
-            return plan.name == interface;
-        });
+        const auto found = std::ranges::find(plan_, interface, &InterfacePlan::name);
         return found == plan_.end() ? nullptr : &*found;
     }
 
-    // What the plan does not name, and what another agent holds than the one that leads now.
-    void giveBack(const Agent* leading) {
-        std::vector<std::string> leaving;
+    // An interface that the direct agent holds and that NetworkManager leads by now changes hands.
+    [[nodiscard]] std::vector<std::string> changingHands() {
+        std::vector<std::string> names;
         for (const RecordEntry& entry : record_.entries) {
-            if (wanted(entry.captured.interface) == nullptr ||
-                (leading != nullptr && entry.agent != leading->name())) {
-                leaving.push_back(entry.captured.interface);
+            if (agents_.size() > 1 && entry.agent == agents_.back()->name()) {
+                names.push_back(entry.captured.interface);
             }
         }
-        for (const std::string& interface : leaving) {
-            RecordEntry& entry = *record_.find(interface);
-            // A run that ends in mid-way leaves an entry that no plan equals.
+        std::vector<Captured> captured;
+        std::vector<Trouble> leftAlone;
+        if (names.empty() || !agents_.front()->capture(names, captured, leftAlone).ok()) {
+            return {};
+        }
+        names.clear();
+        for (const Captured& one : captured) {
+            names.push_back(one.interface);
+        }
+        return names;
+    }
+
+    void giveBack(Clock::time_point deadline, bool isChanged) {
+        const std::vector<std::string> changing = changingHands();
+        Crew crew;
+        for (RecordEntry& entry : record_.entries) {
+            const std::string& interface = entry.captured.interface;
+            if (wanted(interface) != nullptr && std::ranges::count(changing, interface) == 0) {
+                continue;
+            }
+            isChanged = true;
             entry.completed = false;
             std::shared_ptr<Agent> agent;
-            if (failures_.note(agentNamed(entry.agent, agent), interface) &&
-                failures_.note(agent->giveBack(entry.captured), interface)) {
-                std::erase_if(record_.entries, [&interface](const RecordEntry& e) {
-                    return e.captured.interface == interface;
-                });
-                failures_.note(writeRecord(record_));
+            if (failures_.note(agentOf(entry.agent, agent), interface)) {
+                crew.add(agent, {&entry.captured, nullptr, {}, {}});
             }
         }
+        if (!isChanged) {
+            return;
+        }
+        crew.run(deadline);
+        std::vector<std::string> given;
+        crew.forEach([this, &given](const Task& task) {
+            if (note(task)) {
+                given.push_back(task.before->interface);
+            }
+        });
+        std::erase_if(record_.entries, [&given](const RecordEntry& entry) {
+            return std::ranges::count(given, entry.captured.interface) != 0;
+        });
+        failures_.note(writeRecord(record_));
+    }
+
+    bool note(const Task& task) {
+        const std::string& interface = task.before->interface;
+        if (task.refusal.ok() && !task.trouble.empty()) {
+            logFor(LogLevel::warning, interface, task.trouble);
+        }
+        return failures_.note(task.refusal, interface);
     }
 
     // Puts on the disk how the interfaces are that are new to the record, and what all of them are to become.
-    bool capture(Agent& agent) {
+    bool capture() {
         std::vector<std::string> names;
         for (const InterfacePlan& plan : plan_) {
             if (record_.find(plan.name) == nullptr) {
                 names.push_back(plan.name);
             }
         }
-        std::vector<Captured> captured;
-        if (!names.empty() && failures_.note(agent.capture(names, captured))) {
-            for (Captured& one : captured) {
-                record_.entries.push_back({std::string(agent.name()), std::move(one), {}, false});
+        bool isWhole = true;
+        for (const std::shared_ptr<Agent>& agent : agents_) {
+            std::vector<Captured> captured;
+            std::vector<Trouble> leftAlone;
+            if (names.empty() || !isWhole) {
+                break;
             }
-            for (const std::string& name : names) {
-                noteMissing(name);
+            isWhole = failures_.note(agent->capture(names, captured, leftAlone));
+            for (Captured& one : captured) {
+                std::erase(names, one.interface);
+                record_.entries.push_back({std::string(agent->name()), std::move(one), {}, false});
+            }
+            for (const Trouble& trouble : leftAlone) {
+                std::erase(names, trouble.interface);
+                leaveAlone(trouble.interface, trouble.reason);
+            }
+        }
+        for (const std::string& name : names) {
+            // One that is wanted off and is not there is off.
+            if (isWhole) {
+                leaveAlone(name, wanted(name)->active ? "there is no such interface" : "");
             }
         }
         for (const InterfacePlan& plan : plan_) {
             RecordEntry* const entry = record_.find(plan.name);
-            if (entry != nullptr && entry->agent == agent.name() && !isSo(entry, plan, record_)) {
-                entry->plan = asProperties(plan, record_);
-                entry->completed = false;
+            std::optional<InterfacePlan> recorded = withoutKey(plan, record_.salt);
+            if (entry != nullptr && (!entry->completed || entry->plan != recorded)) {
+                entry->plan = std::move(recorded);
+                entry->completed = entry->isLeftAlone();
             }
         }
         return failures_.note(writeRecord(record_));
     }
 
-    void noteMissing(const std::string& name) {
-        if (record_.find(name) != nullptr) {
-            return;
+    void leaveAlone(const std::string& interface, const std::string& reason) {
+        if (!reason.empty()) {
+            logFor(LogLevel::warning, interface, reason);
         }
-        const InterfacePlan& plan = *wanted(name);
-        if (plan.active) {
-            failures_.note({kSCStatusFailed, "there is no such interface"}, name);
-            return;
-        }
-        record_.entries.push_back(
-            {"", {name, DictionaryBuilder().take()}, asProperties(plan, record_), true});
+        record_.entries.push_back({"",
+                                   {interface, DictionaryBuilder().take()},
+                                   withoutKey(*wanted(interface), record_.salt),
+                                   true});
     }
 
-    void takeOver(Agent& agent) {
-        bool changed = false;
+    void takeOver(Clock::time_point deadline) {
+        Crew crew;
         for (const InterfacePlan& plan : plan_) {
-            RecordEntry* const entry = record_.find(plan.name);
-            if (entry == nullptr || entry->completed || entry->agent != agent.name()) {
-                continue;
-            }
-            if (failures_.note(agent.takeOver(plan, entry->captured), plan.name)) {
-                entry->completed = true;
-                changed = true;
+            const RecordEntry* const entry = record_.find(plan.name);
+            std::shared_ptr<Agent> agent;
+            if (entry != nullptr && !entry->isLeftAlone() &&
+                failures_.note(agentOf(entry->agent, agent), plan.name)) {
+                crew.add(agent, {&entry->captured, &plan, {}, {}});
             }
         }
-        if (changed) {
+        crew.run(deadline);
+        bool isChanged = false;
+        crew.forEach([this, &isChanged](const Task& task) {
+            RecordEntry& entry = *record_.find(task.before->interface);
+            isChanged = entry.completed != note(task) || isChanged;
+            entry.completed = task.refusal.ok();
+        });
+        if (isChanged) {
             failures_.note(writeRecord(record_));
         }
     }
@@ -162,28 +257,64 @@ class Run {
     const Plan& plan_;
     Record& record_;
     Failures& failures_;
+    Agents agents_;  // that may lead interfaces now
+    Agents known_;   // and those of the record
 };
+
+// Whether this process may try once more to make this location so.
+bool mayRetry(const std::optional<std::string>& location) {
+    static std::optional<std::string> tried;
+    static int tries = 0;
+    if (tried != location) {
+        tried = location;
+        tries = 0;
+    }
+    return tries++ < mostRetries;
+}
+
+bool isActivation(CFDictionaryRef root, CFDictionaryRef replaced, const Plan& plan) {
+    if (replaced == nullptr) {
+        return false;
+    }
+    std::vector<Trouble> ignored;
+    return CFEqual(replaced, root) != 0 ||
+           textIn(replaced, CFSTR("CurrentSet")) != textIn(root, CFSTR("CurrentSet")) ||
+           makePlan(replaced, ignored) != plan;
+}
 
 }  // namespace
 
-Outcome applyTree(CFDictionaryRef root) {
+Outcome applyTree(CFDictionaryRef root, CFDictionaryRef replaced) {
     Failures failures;
-    Plan plan;
-    failures.note(makePlan(root, plan));
+    std::vector<Trouble> troubles;
+    const Plan plan = makePlan(root, troubles);
+    const bool activates = isActivation(root, replaced, plan);
+    const auto outcome = [&failures, activates] { return activates ? failures.first() : Outcome(); };
 
+    for (const Trouble& trouble : troubles) {
+        if (activates) {
+            logFor(LogLevel::warning, trouble.interface, trouble.reason);
+        }
+    }
     // Without the lock: the file is replaced as a whole, and a run that is under way has marked what it
     // changes.
     Record record;
-    if (!failures.note(readRecord(record)) || isSo(record, plan)) {
-        return failures.first();
+    if (!failures.note(readRecord(record))) {
+        return outcome();
+    }
+    if (record.entries.empty() ? !activates || plan.empty() : !activates && record.isOf(plan)) {
+        return {};
+    }
+    if (!activates && !mayRetry(textIn(root, CFSTR("CurrentSet")))) {
+        return {};
     }
     StateLock lock;
     if (failures.note(makeRuntimeDirectory()) &&
         failures.note(lock.acquire(runtimePath("applied.lock"), lockBound)) &&
-        failures.note(readRecord(record)) && !isSo(record, plan)) {
+        failures.note(readRecord(record)) && (activates || !record.isOf(plan))) {
         Run(plan, record, failures).make();
     }
-    return failures.first();
+    return outcome();
 }
 
 }  // namespace platform::apply

@@ -154,7 +154,7 @@ const char* readManual(CFDictionaryRef entity, InterfacePlan& plan) {
             }
             return address.has_value();
         })) {
-        return "an entry of \"Addresses\" is no address of a machine";
+        return "an entry of \"Addresses\" is not an address of a machine";
     }
     std::size_t next = 0;
     if (!forEach(entity, CFSTR("SubnetMasks"), [&plan, &next](CFTypeRef value) {
@@ -164,12 +164,12 @@ const char* readManual(CFDictionaryRef entity, InterfacePlan& plan) {
             }
             return length.has_value();
         })) {
-        return "an entry of \"SubnetMasks\" is no subnet mask";
+        return "an entry of \"SubnetMasks\" is not a subnet mask";
     }
     const CFTypeRef router = valueIn(entity, CFSTR("Router"));
     const std::optional<IPv4Address> address = parseHostAddress(router);
     if (router != nullptr && !address) {
-        return "\"Router\" is no address of a machine";
+        return "\"Router\" is not an address of a machine";
     }
     plan.router = address.value_or(0);
     return nullptr;
@@ -181,7 +181,7 @@ const char* readIPv4(CFDictionaryRef entity, InterfacePlan& plan) {
     }
     const std::optional<std::string> method = textIn(entity, CFSTR("ConfigMethod"));
     if (!method) {
-        return "\"ConfigMethod\" is no string";
+        return "\"ConfigMethod\" is not a string";
     }
     if (*method == "Manual") {
         plan.method = IPv4Method::manual;
@@ -192,7 +192,7 @@ const char* readIPv4(CFDictionaryRef entity, InterfacePlan& plan) {
         const std::optional<std::string> clientID = textIn(entity, CFSTR("DHCPClientID"));
         if (valueIn(entity, CFSTR("DHCPClientID")) != nullptr &&
             (!clientID || clientID->size() > longestClientID)) {
-            return "\"DHCPClientID\" is no string of up to 254 bytes";
+            return "\"DHCPClientID\" is not a string of up to 254 bytes";
         }
         plan.dhcpClientID = clientID.value_or("");
     }
@@ -207,7 +207,7 @@ const char* readDNS(CFDictionaryRef entity, InterfacePlan& plan) {
             }
             return address.has_value();
         })) {
-        return "an entry of \"ServerAddresses\" is no address of a machine";
+        return "an entry of \"ServerAddresses\" is not an address of a machine";
     }
     if (!forEach(entity, CFSTR("SearchDomains"), [&plan](CFTypeRef value) {
             const std::optional<std::string> domain = asText(value);
@@ -217,7 +217,7 @@ const char* readDNS(CFDictionaryRef entity, InterfacePlan& plan) {
             }
             return usable;
         })) {
-        return "an entry of \"SearchDomains\" is no domain name";
+        return "an entry of \"SearchDomains\" is not a domain name";
     }
     return nullptr;
 }
@@ -239,14 +239,14 @@ const char* readAirPort(CFDictionaryRef entity, InterfacePlan& plan) {
     if (valueIn(entity, CFSTR("PreferredNetwork")) != nullptr) {
         settings.network = textIn(entity, CFSTR("PreferredNetwork"));
         if (!settings.network || settings.network->empty() || settings.network->size() > longestNetworkName) {
-            return "\"PreferredNetwork\" is no network name, which has 1 to 32 bytes";
+            return "\"PreferredNetwork\" is not a network name, which has 1 to 32 bytes";
         }
     }
     if (valueIn(entity, CFSTR("AuthPassword")) != nullptr) {
         const auto data = dataIn(entity, CFSTR("AuthPassword"));
         settings.key = data ? decodeKey(*data) : std::nullopt;
         if (!settings.key) {
-            return "\"AuthPassword\" is no password in its stored form";
+            return "\"AuthPassword\" is not a password in its stored form";
         }
         if (settings.key->empty()) {
             settings.key.reset();
@@ -278,26 +278,26 @@ CFDictionaryRef resolveService(CFDictionaryRef root, CFDictionaryRef links, CFTy
 
 }  // namespace
 
-Outcome makePlan(CFDictionaryRef root, Plan& plan) {
-    plan.clear();
+Plan makePlan(CFDictionaryRef root, std::vector<Trouble>& troubles) {
+    Plan plan;
     const std::optional<std::string> current = textIn(root, CFSTR("CurrentSet"));
     CFDictionaryRef const location = current ? memberAtPath(root, *current, "Sets") : nullptr;
     if (location == nullptr) {
-        return {kSCStatusNoKey, "\"CurrentSet\" names no location"};
+        troubles.push_back(
+            {"", "\"CurrentSet\" names no location, so every interface is left to the system"});
+        return plan;
     }
     CFDictionaryRef const network = dictionaryIn(location, CFSTR("Network"));
     CFDictionaryRef const links = dictionaryIn(network, CFSTR("Service"));
     CFArrayRef const order =
         arrayIn(dictionaryIn(dictionaryIn(network, CFSTR("Global")), CFSTR("IPv4")), CFSTR("ServiceOrder"));
 
-    Outcome first;
-    const auto note = [&first](const std::string& name, const char* wrong) {
-        if (first.ok()) {
-            first = Outcome(kSCStatusFailed, "the settings for \"" + name + "\" cannot be used: " + wrong);
-        }
+    const auto reject = [&troubles](const std::string& name, const char* wrong) {
+        troubles.push_back(
+            {name, std::string("its settings cannot be used, and it is left to the system: ") + wrong});
     };
     // Interfaces whose first active service has bad settings: a later service does not get them instead.
-    std::vector<std::string> spoilt;
+    std::vector<std::string> rejected;
     for (CFIndex i = 0; order != nullptr && i < CFArrayGetCount(order); ++i) {
         CFDictionaryRef const service = resolveService(root, links, CFArrayGetValueAtIndex(order, i));
         CFDictionaryRef const port = activeEntity(service, CFSTR("Interface"));
@@ -306,14 +306,14 @@ Outcome makePlan(CFDictionaryRef root, Plan& plan) {
             continue;
         }
         if (!canNameInterface(*name) || *name == "lo") {
-            note(*name, "\"DeviceName\" is no name of a network card");
+            reject(*name, "\"DeviceName\" is not the name of a network card");
             continue;
         }
         const auto same = std::find_if(plan.begin(), plan.end(),
                                        [&name](const InterfacePlan& known) { return known.name == *name; });
         const bool known = same != plan.end();
         if ((known && (same->active || !isActive(service))) ||
-            std::find(spoilt.begin(), spoilt.end(), *name) != spoilt.end()) {
+            std::find(rejected.begin(), rejected.end(), *name) != rejected.end()) {
             continue;
         }
         InterfacePlan interface;
@@ -324,8 +324,8 @@ Outcome makePlan(CFDictionaryRef root, Plan& plan) {
             plan.erase(same);
         }
         if (wrong != nullptr) {
-            note(*name, wrong);
-            spoilt.push_back(*name);
+            reject(*name, wrong);
+            rejected.push_back(*name);
             continue;
         }
         interface.rank = interface.active
@@ -334,46 +334,15 @@ Outcome makePlan(CFDictionaryRef root, Plan& plan) {
                              : 0;
         plan.push_back(std::move(interface));
     }
-    return first;
+    return plan;
 }
 
-CFDictionaryRef copyPlanAsPropertyList(const InterfacePlan& plan, const Salt& salt) {
-    DictionaryBuilder dictionary;
-    dictionary.setText(CFSTR("Name"), plan.name).setBoolean(CFSTR("Active"), plan.active);
-    if (!plan.active) {
-        return dictionary.take().take();
+InterfacePlan withoutKey(InterfacePlan plan, const Salt& salt) {
+    if (plan.wireless && plan.wireless->key) {
+        // 16 bits: a key that was changed is noticed, a list of likely keys cannot be narrowed to one.
+        plan.wireless->key = std::to_string(sipHash(salt, *plan.wireless->key) & 0xFFFFU);
     }
-    dictionary.setInteger(CFSTR("Rank"), plan.rank)
-        .setInteger(CFSTR("Method"), static_cast<int>(plan.method));
-    ArrayBuilder addresses;
-    for (const ManualAddress& address : plan.addresses) {
-        addresses.addData(std::as_bytes(std::span(&address, 1)));
-    }
-    ArrayBuilder domains;
-    for (const std::string& domain : plan.searchDomains) {
-        domains.addText(domain);
-    }
-    dictionary.set(CFSTR("Addresses"), addresses.get())
-        .setInteger(CFSTR("Router"), plan.router)
-        .setText(CFSTR("ClientID"), plan.dhcpClientID)
-        .setData(CFSTR("NameServers"), std::as_bytes(std::span(plan.nameServers)))
-        .set(CFSTR("SearchDomains"), domains.get());
-    if (plan.wireless) {
-        DictionaryBuilder wireless;
-        if (plan.wireless->powerEnabled) {
-            wireless.setBoolean(CFSTR("Power"), *plan.wireless->powerEnabled);
-        }
-        if (plan.wireless->network) {
-            wireless.setData(CFSTR("Network"), std::as_bytes(std::span(*plan.wireless->network)));
-        }
-        if (plan.wireless->key) {
-            // 16 bits: a key that was changed is noticed, a list of likely keys cannot be narrowed to one.
-            wireless.setInteger(CFSTR("KeyCheck"),
-                                static_cast<std::int64_t>(sipHash(salt, *plan.wireless->key) & 0xFFFFU));
-        }
-        dictionary.set(CFSTR("Wireless"), wireless.take().get());
-    }
-    return dictionary.take().take();
+    return plan;
 }
 
 }  // namespace platform::apply

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "platform/CoreFoundation.h"
-#include "platform/Outcome.h"
+#include "platform/values/Fields.h"
 
 namespace platform::apply {
 
@@ -18,12 +18,17 @@ using IPv4Address = std::uint32_t;
 // Random bytes that one record's digests are made with.
 using Salt = std::array<std::uint8_t, 16>;
 
-enum class IPv4Method { none, manual, dhcp };
+enum class IPv4Method { none, manual, dhcp, last = dhcp };
 
 struct ManualAddress {
     IPv4Address address = 0;
     unsigned prefixLength = 32;
     bool operator==(const ManualAddress&) const = default;
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Address", self.address);
+        fields("PrefixLength", self.prefixLength);
+    }
 };
 
 struct WirelessSettings {
@@ -35,6 +40,12 @@ struct WirelessSettings {
     // The key as UTF-8 text. Never logged.
     std::optional<std::string> key;
     bool operator==(const WirelessSettings&) const = default;
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Power", self.powerEnabled);
+        fields("Network", self.network);
+        fields("Key", self.key);
+    }
 };
 
 struct InterfacePlan {
@@ -52,27 +63,46 @@ struct InterfacePlan {
     // that is off.
     unsigned rank = 0;
     bool operator==(const InterfacePlan&) const = default;
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Name", self.name);
+        fields("Active", self.active);
+        fields("Method", self.method);
+        fields("Addresses", self.addresses);
+        fields("Router", self.router);
+        fields("ClientID", self.dhcpClientID);
+        fields("NameServers", self.nameServers);
+        fields("SearchDomains", self.searchDomains);
+        fields("Wireless", self.wireless);
+        fields("Rank", self.rank);
+    }
 };
 
 // In service order: the first active interface is the preferred one. An interface stands here once; of
 // several services for it the first active one counts. Interfaces that are not named are left to the system.
 using Plan = std::vector<InterfacePlan>;
 
-// The plan for the current location of a preferences tree (its root dictionary). Fails with 1004 and an empty
-// plan when "CurrentSet" names no location, and with 1001 when an interface's settings cannot be used: an
-// address that is no dotted quad, a mask with holes, a name that no interface or network can have. The plan
-// then holds the interfaces whose settings can be used, so that one bad service does not keep the others from
-// being made so; the bad one is left to the system.
+// Something in the current location that cannot be made so, for the log: whose, and why.
+struct Trouble {
+    std::string interface;  // empty when it is about the whole location
+    std::string reason;
+    bool operator==(const Trouble&) const = default;
+};
+
+// The plan for the current location of a preferences tree (its root dictionary). Empty, with one trouble,
+// when "CurrentSet" names no location. An interface whose settings cannot be used (an address that is no
+// dotted quad, a mask with holes, a name that no interface or network can have) is left to the system, with a
+// trouble for it, so that one bad service does not keep the others from being made so.
 //
 // A "Manual" entity without addresses, as a new location has it, asks for an interface that is on and has
 // none. An address without a mask gets the one of its class. A serial service ("Type" "PPP") and a service
 // that is not in the order ask for nothing. A service for the device "*" stands for every interface that no
 // other service names, and leaves them to the system.
-Outcome makePlan(CFDictionaryRef root, Plan& plan);
+[[nodiscard]] Plan makePlan(CFDictionaryRef root, std::vector<Trouble>& troubles);
 
-// The plan as a property list for the record. The key is replaced by a short digest of it under the salt:
-// enough to see that it changed, too little to tell it from the thousands of others with the same one. Equal
-// plans give equal values under one salt. The caller owns the value.
-[[nodiscard]] CFDictionaryRef copyPlanAsPropertyList(const InterfacePlan& plan, const Salt& salt);
+// The plan as the record keeps it: the key is replaced by a short digest of it under the salt, enough to see
+// that it changed, too little to tell it from the thousands of others with the same one. Equal plans give
+// equal ones under one salt.
+[[nodiscard]] InterfacePlan withoutKey(InterfacePlan plan, const Salt& salt);
 
 }  // namespace platform::apply

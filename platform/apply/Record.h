@@ -5,27 +5,34 @@
 // of the machine the interfaces come up as the system has them, and there is nothing to give back.
 #pragma once
 
+#include <optional>
 #include <string>
 #include <vector>
 
-#include "platform/CoreFoundation.h"
 #include "platform/Outcome.h"
 #include "platform/apply/Agent.h"
 #include "platform/apply/Plan.h"
-#include "platform/values/Object.h"
 
 namespace platform::apply {
 
 struct RecordEntry {
-    std::string
-        agent;  // the name of the one that captured the interface; empty when there was none to capture
+    // The name of the agent that captured the interface; empty for one that is left alone, because it did not
+    // exist or is somebody else's: nothing was changed and nothing is to be undone.
+    std::string agent;
     Captured captured;
-    values::Owned<CFDictionaryRef> plan;  // what the interface was last to become (copyPlanAsPropertyList)
-    bool completed = false;               // and whether it became so
+    std::optional<InterfacePlan> plan;  // what the interface was last to become, without its key
+    bool completed = false;             // and whether the machine took it
 
-    // An interface that was to be switched off and did not exist: nothing was changed and nothing is to be
-    // undone.
-    [[nodiscard]] bool isAbsent() const noexcept { return agent.empty(); }
+    [[nodiscard]] bool isLeftAlone() const noexcept { return agent.empty(); }
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Interface", self.captured.interface);
+        fields("Agent", self.agent);
+        fields("Before", self.captured.state);
+        fields("Plan", self.plan);
+        fields("Completed", self.completed);
+    }
 };
 
 struct Record {
@@ -34,6 +41,14 @@ struct Record {
 
     [[nodiscard]] RecordEntry* find(const std::string& interface) noexcept;
     [[nodiscard]] const RecordEntry* find(const std::string& interface) const noexcept;
+    // Whether the machine took this plan, all of it and nothing else.
+    [[nodiscard]] bool isOf(const Plan& plan) const;
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Salt", self.salt);
+        fields("Interfaces", self.entries);
+    }
 };
 
 // Without a file the record is empty and gets a new salt. Strict: a file that is not a record as writeRecord

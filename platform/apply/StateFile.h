@@ -2,13 +2,14 @@
 #pragma once
 
 #include <chrono>
+#include <optional>
 #include <string>
 #include <string_view>
 
 #include "platform/CoreFoundation.h"
 #include "platform/FileDescriptor.h"
 #include "platform/Outcome.h"
-#include "platform/values/Object.h"
+#include "platform/values/Fields.h"
 
 namespace platform::apply {
 
@@ -25,6 +26,22 @@ Outcome makeRuntimeDirectory();
 Outcome readStateFile(const std::string& path, values::Owned<CFDictionaryRef>& content);
 // All of it or nothing, mode 0600, on the disk when the call returns.
 Outcome writeStateFile(const std::string& path, CFDictionaryRef content);
+// The same for a struct that lists its fields (Fields.h). Nothing, and success, when there is no such file.
+template <class T>
+Outcome readState(const std::string& path, std::optional<T>& state) {
+    state.reset();
+    values::Owned<CFDictionaryRef> content;
+    RETURN_IF_FAILED(readStateFile(path, content));
+    if (content && !values::fromPropertyList(content.get(), state.emplace())) {
+        state.reset();
+        return {kSCStatusFailed, path + " is not what this system wrote"};
+    }
+    return {};
+}
+template <class T>
+Outcome writeState(const std::string& path, const T& state) {
+    return writeStateFile(path, values::toPropertyList(state).get());
+}
 // Success when it is not there. What a writer that was ended half-way left beside it goes too.
 Outcome removeStateFile(const std::string& path);
 

@@ -4,7 +4,6 @@
 
 #include "platform/Host.h"
 #include "platform/SystemConfiguration.h"
-#include "platform/apply/Apply.h"
 #include "platform/preferences/Session.h"
 #include "platform/preferences/Status.h"
 #include "platform/values/Values.h"
@@ -17,8 +16,6 @@ using platform::preferences::setStatus;
 using platform::values::as;
 using platform::values::Owned;
 using platform::values::textOf;
-
-constexpr int mostApplies = 5;
 
 Boolean answer(int status) {
     return static_cast<Boolean>(setStatus(status));
@@ -142,30 +139,4 @@ Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path)
 Boolean SCPreferencesCommitChanges(SCPreferencesRef session) {
     Session* const self = Session::from(session);
     return self == nullptr ? answer(kSCStatusNoPrefsSession) : answer(self->commit(), *self);
-}
-
-Boolean SCPreferencesApplyChanges(SCPreferencesRef session) {
-    Session* const self = Session::from(session);
-    if (self == nullptr) {
-        return answer(kSCStatusNoPrefsSession);
-    }
-    // Another process may have committed and applied while this one waited for its turn or worked. Whoever is
-    // last to look sees the newest tree, so the machine never stays behind the store; the same tree again
-    // touches nothing.
-    Owned<CFDictionaryRef> applied;
-    int status = kSCStatusOK;
-    for (int i = 0; i < mostApplies; ++i) {
-        Owned<CFDictionaryRef> committed;
-        const Outcome loaded = self->loadCommitted(committed);
-        if (!loaded.ok()) {
-            return answer(loaded, *self);
-        }
-        if (applied && CFEqual(applied.get(), committed.get()) != 0) {
-            break;
-        }
-        // What failed, and why, went to the log from where it happened.
-        status = platform::apply::applyTree(committed.get()).status();
-        applied = std::move(committed);
-    }
-    return answer(status);
 }

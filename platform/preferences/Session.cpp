@@ -90,6 +90,15 @@ Outcome Session::write() {
 }
 
 Outcome Session::commit(std::chrono::milliseconds wait) {
+    values::Owned<CFDictionaryRef> replaced = replaced_ ? replaced_ : onDisk_.tree;
+    Outcome done = makeDurable(wait);
+    if (done.ok()) {
+        replaced_ = std::move(replaced);
+    }
+    return done;
+}
+
+Outcome Session::makeDurable(std::chrono::milliseconds wait) {
     if (onDisk_.file && !isChanged()) {
         return checkFresh();
     }

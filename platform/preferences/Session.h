@@ -3,6 +3,7 @@
 
 #include <chrono>
 #include <string>
+#include <utility>
 
 #include "platform/FileDescriptor.h"
 #include "platform/Outcome.h"
@@ -41,17 +42,22 @@ class Session final : public values::Object {
     Outcome commit(std::chrono::milliseconds wait = commitWait);
     // The tree on disk now, whoever put it there.
     Outcome loadCommitted(values::Owned<CFDictionaryRef>& tree) const;
+    // The tree that the commits of this session took the place of, since it was last asked for: the same as
+    // the committed one when they changed nothing, null when there was none.
+    [[nodiscard]] values::Owned<CFDictionaryRef> takeReplaced() noexcept { return std::move(replaced_); }
 
   private:
     Session(std::string name, StoreFile file, Snapshot read);
 
     [[nodiscard]] bool isChanged() const;
     Outcome checkFresh() const;
+    Outcome makeDurable(std::chrono::milliseconds wait);
     Outcome write();
 
     std::string name_;
     StoreFile file_;
     Snapshot onDisk_;
+    values::Owned<CFDictionaryRef> replaced_;
     Tree tree_;
     FileDescriptor lock_;
 };

@@ -11,21 +11,18 @@
 #include <cerrno>
 #include <charconv>
 #include <csignal>
-#include <thread>
 #include <vector>
 
 #include "platform/FileDescriptor.h"
 #include "platform/Host.h"
 #include "platform/Log.h"
-#include "platform/apply/Properties.h"
 #include "platform/apply/StateFile.h"
 
 namespace platform::apply {
 namespace {
 
 // For the message to the server and the program's last run.
-constexpr std::chrono::milliseconds stopTime{5000};
-constexpr std::chrono::milliseconds lookAgain{20};
+constexpr std::chrono::milliseconds stopTime{3000};
 
 std::string settingsPath(const std::string& interface) {
     return runtimePath("dhcp-" + interface + ".plist");
@@ -35,6 +32,25 @@ std::string settingsPath(const std::string& interface) {
 struct Process {
     pid_t number = 0;
     std::int64_t started = 0;  // in clock ticks since the machine's start
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Number", self.number);
+        fields("Started", self.started);
+    }
+};
+
+// What is kept of a client.
+struct ClientState {
+    HookSettings settings;
+    Process client;
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Settings", self.settings.dhcp);
+        fields("ResolverFile", self.settings.resolverFile);
+        fields("Client", self.client);
+    }
 };
 
 // 0 when there is no such process, or it has ended and waits for its parent to notice.
@@ -77,55 +93,6 @@ FileDescriptor handleOf(const Process& process) {
 bool hasEnded(const FileDescriptor& handle, std::chrono::milliseconds wait) {
     pollfd ended{handle.get(), POLLIN, 0};
     return ::poll(&ended, 1, static_cast<int>(wait.count())) > 0;
-}
-
-Outcome writeSettings(const DhcpSettings& settings, const Process& client) {
-    ArrayBuilder domains;
-    for (const std::string& domain : settings.domains) {
-        domains.addText(domain);
-    }
-    DictionaryBuilder file;
-    file.setText(CFSTR("Interface"), settings.interface)
-        .setInteger(CFSTR("Rank"), settings.rank)
-        .setData(CFSTR("ClientID"), std::as_bytes(std::span(settings.clientID)))
-        .setBoolean(CFSTR("IgnoresServers"), settings.ignoresServers)
-        .set(CFSTR("Domains"), domains.get())
-        .setText(CFSTR("ResolverFile"), currentHost().resolverFile)
-        .setInteger(CFSTR("Client"), client.number)
-        .setInteger(CFSTR("ClientStarted"), client.started);
-    return writeStateFile(settingsPath(settings.interface), file.take().get());
-}
-
-Outcome decodeSettings(CFDictionaryRef file, HookSettings& settings, Process& client) {
-    const auto interface = textIn(file, CFSTR("Interface"));
-    const auto rank = integerIn(file, CFSTR("Rank"));
-    const auto clientID = dataIn(file, CFSTR("ClientID"));
-    const auto ignores = booleanIn(file, CFSTR("IgnoresServers"));
-    const auto resolverFile = textIn(file, CFSTR("ResolverFile"));
-    const auto number = integerIn(file, CFSTR("Client"));
-    const auto started = integerIn(file, CFSTR("ClientStarted"));
-    if (!interface || !rank || !clientID || !ignores || !resolverFile || !number || !started) {
-        return {kSCStatusFailed, "the settings of the DHCP client are not what this system wrote"};
-    }
-    settings.dhcp.interface = *interface;
-    settings.dhcp.rank = static_cast<unsigned>(*rank);
-    settings.dhcp.clientID.assign(reinterpret_cast<const char*>(clientID->data()), clientID->size());
-    settings.dhcp.ignoresServers = *ignores;
-    settings.dhcp.domains.clear();
-    CFArrayRef const domains = arrayIn(file, CFSTR("Domains"));
-    for (CFIndex i = 0; domains != nullptr && i < CFArrayGetCount(domains); ++i) {
-        settings.dhcp.domains.push_back(asText(CFArrayGetValueAtIndex(domains, i)).value_or(""));
-    }
-    settings.resolverFile = *resolverFile;
-    client = {static_cast<pid_t>(*number), *started};
-    return {};
-}
-
-// Success with an empty interface when there is no such file.
-Outcome readSettings(const std::string& path, HookSettings& settings, Process& client) {
-    values::Owned<CFDictionaryRef> file;
-    Outcome read = readStateFile(path, file);
-    return read.ok() && file ? decodeSettings(file.get(), settings, client) : read;
 }
 
 bool isProgram(const std::string& path) {
@@ -263,96 +230,74 @@ Outcome startHeld(const DhcpSettings& settings, const std::string& hook, Process
 
 Outcome readDhcpSettings(const std::string& interface, std::optional<DhcpSettings>& settings) {
     settings.reset();
-    HookSettings read;
-    Process client;
-    Outcome done = readSettings(settingsPath(interface), read, client);
-    if (done.ok() && !read.dhcp.interface.empty()) {
-        settings = read.dhcp;
+    std::optional<ClientState> state;
+    RETURN_IF_FAILED(readState(settingsPath(interface), state));
+    if (state) {
+        settings = state->settings.dhcp;
     }
-    return done;
+    return {};
 }
 
 Outcome readHookSettings(const std::string& path, HookSettings& settings) {
-    Process client;
-    Outcome done = readSettings(path, settings, client);
-    if (done.ok() && settings.dhcp.interface.empty()) {
+    std::optional<ClientState> state;
+    RETURN_IF_FAILED(readState(path, state));
+    if (!state) {
         return {kSCStatusFailed, "there are no settings for the DHCP client at " + path};
     }
-    return done;
+    settings = std::move(state->settings);
+    return {};
 }
 
 Outcome isDhcpClientRunning(const std::string& interface, bool& running) {
-    HookSettings settings;
-    Process client;
-    Outcome done = readSettings(settingsPath(interface), settings, client);
-    running = done.ok() && isAlive(client);
-    return done;
+    std::optional<ClientState> state;
+    RETURN_IF_FAILED(readState(settingsPath(interface), state));
+    running = state && isAlive(state->client);
+    return {};
 }
 
 Outcome startDhcpClient(const DhcpSettings& settings) {
     std::string hook;
+    RETURN_IF_FAILED(findHook(hook));
+    if (!isProgram(currentHost().dhcpClient)) {
+        return Outcome::fromErrno("cannot run the DHCP client " + currentHost().dhcpClient);
+    }
     Process client;
     FileDescriptor opener;
-    Outcome done = findHook(hook);
-    if (done.ok() && !isProgram(currentHost().dhcpClient)) {
-        done = Outcome::fromErrno("cannot run the DHCP client " + currentHost().dhcpClient);
-    }
-    if (done.ok()) {
-        done = startHeld(settings, hook, client, opener);
-    }
+    RETURN_IF_FAILED(startHeld(settings, hook, client, opener));
     // Only a client that the next run can find again is let go.
-    if (done.ok()) {
-        done = writeSettings(settings, client);
-    }
-    if (done.ok() && ::write(opener.get(), "g", 1) != 1) {
-        done = Outcome::fromErrno("cannot start the DHCP client");
-    }
-    return done;
+    RETURN_IF_FAILED(writeState(settingsPath(settings.interface),
+                                ClientState{{settings, currentHost().resolverFile}, client}));
+    return ::write(opener.get(), "g", 1) == 1 ? Outcome()
+                                              : Outcome::fromErrno("cannot start the DHCP client");
 }
 
-Outcome waitForLease(const std::string& interface, std::chrono::steady_clock::time_point deadline) {
-    for (;;) {
-        bool running = false;
-        Outcome done = isDhcpClientRunning(interface, running);
-        LeaseState state;
-        if (done.ok()) {
-            done = readLease(interface, state);
+void hurryDhcpClient(const std::string& interface) {
+    std::optional<ClientState> state;
+    if (readState(settingsPath(interface), state).ok() && state) {
+        if (const FileDescriptor handle = handleOf(state->client); handle.isOpen()) {
+            (void)::syscall(SYS_pidfd_send_signal, handle.get(), SIGUSR1, nullptr, 0);
         }
-        if (!done.ok() || state.isTaken) {
-            return done;
-        }
-        if (!state.refusal.empty()) {
-            return {kSCStatusFailed, state.refusal};
-        }
-        if (!running) {
-            return {kSCStatusFailed, "the DHCP client ended before it had a lease"};
-        }
-        if (std::chrono::steady_clock::now() >= deadline) {
-            return {kSCStatusFailed, "no DHCP server gave a lease in time"};
-        }
-        std::this_thread::sleep_for(lookAgain);
     }
 }
 
 Outcome stopDhcpClient(const std::string& interface) {
-    HookSettings settings;
-    Process client;
-    Outcome done = readSettings(settingsPath(interface), settings, client);
-    if (!done.ok() || settings.dhcp.interface.empty()) {
-        return done;
+    std::optional<ClientState> state;
+    RETURN_IF_FAILED(readState(settingsPath(interface), state));
+    if (!state) {
+        return {};
     }
-    const FileDescriptor handle = handleOf(client);
+    const FileDescriptor handle = handleOf(state->client);
     if (handle.isOpen()) {
         (void)::syscall(SYS_pidfd_send_signal, handle.get(), SIGTERM, nullptr, 0);
         if (!hasEnded(handle, stopTime)) {
             logLine(LogLevel::warning, interface + ": the DHCP client does not end by itself and is ended");
             // With the program that it may be waiting for: it leads a process group of its own.
-            (void)::kill(-client.number, SIGKILL);
+            (void)::kill(-state->client.number, SIGKILL);
             (void)hasEnded(handle, stopTime);
         }
     }
-    done = dropLease(settings.dhcp);
-    return done.ok() ? removeStateFile(settingsPath(interface)) : done;
+    RETURN_IF_FAILED(dropLease(state->settings.dhcp));
+    return removeStateFile(settingsPath(interface));
 }
 
 }  // namespace platform::apply

@@ -6,7 +6,6 @@
 // was started, never by a name.
 #pragma once
 
-#include <chrono>
 #include <optional>
 #include <string>
 
@@ -32,9 +31,9 @@ Outcome readHookSettings(const std::string& path, HookSettings& settings);
 Outcome isDhcpClientRunning(const std::string& interface, bool& running);
 // Starts a client. There must be none.
 Outcome startDhcpClient(const DhcpSettings& settings);
-// Returns when the lease is taken. Fails when an offer cannot be used, when the client ends, and at the
-// deadline; the client, if it still runs, goes on asking.
-Outcome waitForLease(const std::string& interface, std::chrono::steady_clock::time_point deadline);
+// Has a client without a lease ask for one right now: its card has just come onto a network. A client that
+// has ended is let be.
+void hurryDhcpClient(const std::string& interface);
 // Lets the client give its lease back to the server and end, and undoes what is left of the lease. Success
 // when there is no client.
 Outcome stopDhcpClient(const std::string& interface);

@@ -40,6 +40,14 @@ struct Address {
     [[nodiscard]] int family() const noexcept;
     [[nodiscard]] std::uint8_t scope() const noexcept;  // RT_SCOPE_
     bool operator==(const Address& other) const noexcept { return key == other.key; }
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Message", self.key);
+        fields("Protocol", self.protocol);
+        fields("Valid", self.valid);
+        fields("Preferred", self.preferred);
+        fields("ComesByItself", self.comesByItself);
+    }
 };
 
 struct Route {
@@ -53,6 +61,14 @@ struct Route {
     [[nodiscard]] std::uint8_t protocol() const noexcept;
     [[nodiscard]] bool hasGateway() const noexcept;
     bool operator==(const Route& other) const noexcept { return key == other.key; }
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Message", self.key);
+        fields("Preceded", self.preceded);
+        fields("ComesByItself", self.comesByItself);
+        fields("Shared", self.isShared);
+        fields("Elsewhere", self.isElsewhere);
+    }
 };
 
 struct InterfaceState {

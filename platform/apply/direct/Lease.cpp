@@ -8,7 +8,7 @@
 #include <optional>
 #include <string_view>
 
-#include "platform/apply/Properties.h"
+#include "platform/Log.h"
 #include "platform/apply/StateFile.h"
 
 namespace platform::apply {
@@ -72,22 +72,18 @@ std::optional<unsigned> parsePrefixLength(const Environment& environment, IPv4Ad
     return length && *length >= 1 && *length <= 32 ? length : std::nullopt;
 }
 
-Outcome writeLease(const std::string& interface, const LeaseState& state) {
-    DictionaryBuilder file;
-    file.setBoolean(CFSTR("Taken"), state.isTaken).setText(CFSTR("Refusal"), state.refusal);
-    if (state.isKnown) {
-        ArrayBuilder domains;
-        for (const std::string& domain : state.lease.nameService.domains) {
-            domains.addText(domain);
-        }
-        file.setInteger(CFSTR("Address"), state.lease.address.address)
-            .setInteger(CFSTR("PrefixLength"), state.lease.address.prefixLength)
-            .setInteger(CFSTR("Router"), state.lease.router)
-            .setInteger(CFSTR("Seconds"), state.lease.seconds)
-            .setData(CFSTR("Servers"), std::as_bytes(std::span(state.lease.nameService.servers)))
-            .set(CFSTR("Domains"), domains.get());
+// A name servers' file that cannot be written keeps no address from standing.
+Outcome setServers(const DhcpSettings& settings, const NameService& service) {
+    std::string trouble;
+    RETURN_IF_FAILED(setInterfaceNameServers(settings.interface, settings.rank, service, trouble));
+    if (!trouble.empty()) {
+        logLine(LogLevel::warning, settings.interface + ": " + trouble);
     }
-    return writeStateFile(leasePath(interface), file.take().get());
+    return {};
+}
+
+Outcome writeLease(const std::string& interface, const LeaseState& state) {
+    return writeState(leasePath(interface), state);
 }
 
 }  // namespace
@@ -143,107 +139,71 @@ std::vector<Route> routesOf(const Lease& lease, unsigned rank) {
 }
 
 Outcome readLease(const std::string& interface, LeaseState& state) {
-    state = {};
-    values::Owned<CFDictionaryRef> file;
-    Outcome read = readStateFile(leasePath(interface), file);
-    if (!read.ok() || !file) {
-        return read;
-    }
-    state.isTaken = booleanIn(file.get(), CFSTR("Taken")).value_or(false);
-    state.refusal = textIn(file.get(), CFSTR("Refusal")).value_or("");
-    const auto address = integerIn(file.get(), CFSTR("Address"));
-    state.isKnown = address.has_value();
-    if (!state.isKnown) {
-        return {};
-    }
-    const auto numberIn = [&file](CFStringRef key) {
-        return static_cast<std::uint32_t>(integerIn(file.get(), key).value_or(0));
-    };
-    Lease& lease = state.lease;
-    lease.address = {static_cast<IPv4Address>(*address), numberIn(CFSTR("PrefixLength"))};
-    lease.router = numberIn(CFSTR("Router"));
-    lease.seconds = numberIn(CFSTR("Seconds"));
-    if (const auto servers = dataIn(file.get(), CFSTR("Servers"))) {
-        lease.nameService.servers.resize(servers->size() / sizeof(IPv4Address));
-        std::copy_n(servers->begin(), lease.nameService.servers.size() * sizeof(IPv4Address),
-                    std::as_writable_bytes(std::span(lease.nameService.servers)).begin());
-    }
-    CFArrayRef const domains = arrayIn(file.get(), CFSTR("Domains"));
-    for (CFIndex i = 0; domains != nullptr && i < CFArrayGetCount(domains); ++i) {
-        lease.nameService.domains.push_back(asText(CFArrayGetValueAtIndex(domains, i)).value_or(""));
-    }
+    std::optional<LeaseState> file;
+    RETURN_IF_FAILED(readState(leasePath(interface), file));
+    state = file.value_or(LeaseState());
     return {};
 }
 
 Outcome takeLease(const DhcpSettings& settings, const Lease& lease) {
     LeaseState earlier;
-    Outcome done = readLease(settings.interface, earlier);
+    RETURN_IF_FAILED(readLease(settings.interface, earlier));
     Kernel kernel;
+    RETURN_IF_FAILED(kernel.open());
     std::optional<Link> link;
-    if (done.ok()) {
-        done = kernel.open();
+    RETURN_IF_FAILED(kernel.findLink(settings.interface, link));
+    if (!link) {
+        return {kSCStatusFailed, "the interface is gone"};
     }
-    if (done.ok()) {
-        done = kernel.findLink(settings.interface, link);
+    if (earlier.lease && !(earlier.lease->address == lease.address)) {
+        RETURN_IF_FAILED(dropLease(settings));
     }
-    if (done.ok() && !link) {
-        done = {kSCStatusFailed, "there is no such interface"};
-    }
-    if (done.ok() && earlier.isKnown && !(earlier.lease.address == lease.address)) {
-        done = dropLease(settings);
-    }
-    if (done.ok()) {
-        done = writeLease(settings.interface, {false, lease, true, ""});
-    }
-    if (done.ok()) {
-        done = kernel.addAddress(*link, addressOf(settings.interface, lease));
-    }
-    if (done.ok() && earlier.isKnown && earlier.lease.router != lease.router) {
-        for (const Route& route : routesOf(earlier.lease, settings.rank)) {
-            done = done.ok() ? kernel.removeRoute(*link, route) : done;
+    RETURN_IF_FAILED(writeLease(settings.interface, {false, lease, ""}));
+    RETURN_IF_FAILED(kernel.addAddress(*link, addressOf(settings.interface, lease)));
+    if (earlier.lease && earlier.lease->router != lease.router) {
+        for (const Route& route : routesOf(*earlier.lease, settings.rank)) {
+            RETURN_IF_FAILED(kernel.removeRoute(*link, route));
         }
     }
     for (const Route& route : routesOf(lease, settings.rank)) {
-        done = done.ok() ? kernel.addRoute(*link, route) : done;
+        RETURN_IF_FAILED(kernel.addRoute(*link, route));
     }
-    if (done.ok() && !settings.ignoresServers) {
+    if (!settings.ignoresServers) {
         NameService service = lease.nameService;
         if (!settings.domains.empty()) {
             service.domains = settings.domains;
         }
-        done = bringNameServers(settings.interface, settings.rank, service);
+        RETURN_IF_FAILED(setServers(settings, service));
     }
-    return done.ok() ? writeLease(settings.interface, {true, lease, true, ""}) : done;
+    return writeLease(settings.interface, {true, lease, ""});
 }
 
 Outcome refuseLease(const std::string& interface, const std::string& reason) {
     LeaseState state;
-    Outcome done = readLease(interface, state);
+    RETURN_IF_FAILED(readLease(interface, state));
     state.refusal = reason;
-    return done.ok() ? writeLease(interface, state) : done;
+    return writeLease(interface, state);
 }
 
 Outcome dropLease(const DhcpSettings& settings) {
     LeaseState state;
-    Outcome done = readLease(settings.interface, state);
-    Kernel kernel;
-    std::optional<Link> link;
-    if (done.ok() && state.isKnown) {
-        done = kernel.open();
-        if (done.ok()) {
-            done = kernel.findLink(settings.interface, link);
+    RETURN_IF_FAILED(readLease(settings.interface, state));
+    if (state.lease) {
+        Kernel kernel;
+        RETURN_IF_FAILED(kernel.open());
+        std::optional<Link> link;
+        RETURN_IF_FAILED(kernel.findLink(settings.interface, link));
+        if (link) {
+            for (const Route& route : routesOf(*state.lease, settings.rank)) {
+                RETURN_IF_FAILED(kernel.removeRoute(*link, route));
+            }
+            RETURN_IF_FAILED(kernel.removeAddress(*link, addressOf(settings.interface, *state.lease)));
         }
-        for (const Route& route : routesOf(state.lease, settings.rank)) {
-            done = done.ok() && link ? kernel.removeRoute(*link, route) : done;
-        }
-        if (done.ok() && link) {
-            done = kernel.removeAddress(*link, addressOf(settings.interface, state.lease));
-        }
-        if (done.ok() && !settings.ignoresServers) {
-            done = bringNameServers(settings.interface, settings.rank, {});
+        if (!settings.ignoresServers) {
+            RETURN_IF_FAILED(setServers(settings, {}));
         }
     }
-    return done.ok() ? removeStateFile(leasePath(settings.interface)) : done;
+    return removeStateFile(leasePath(settings.interface));
 }
 
 }  // namespace platform::apply

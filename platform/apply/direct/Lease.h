@@ -3,6 +3,7 @@
 
 #include <cstdint>
 #include <map>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -19,6 +20,13 @@ struct Lease {
     NameService nameService;
     std::uint32_t seconds = forever;
     bool operator==(const Lease&) const = default;
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Address", self.address);
+        fields("Router", self.router);
+        fields("NameService", self.nameService);
+        fields("Seconds", self.seconds);
+    }
 };
 
 using Environment = std::map<std::string, std::string, std::less<>>;
@@ -38,6 +46,14 @@ struct DhcpSettings {
     // The location's own search domains, which take the place of the lease's.
     std::vector<std::string> domains;
     bool operator==(const DhcpSettings&) const = default;
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Interface", self.interface);
+        fields("Rank", self.rank);
+        fields("ClientID", self.clientID);
+        fields("IgnoresServers", self.ignoresServers);
+        fields("Domains", self.domains);
+    }
 };
 
 // Writes the lease into the runtime directory, then makes it so: the address for the lease's time (in place
@@ -51,9 +67,15 @@ Outcome refuseLease(const std::string& interface, const std::string& reason);
 // What the interface's lease has come to.
 struct LeaseState {
     bool isTaken = false;
-    Lease lease;           // with isTaken, or while it is being made so
-    bool isKnown = false;  // the lease is filled in
-    std::string refusal;   // why the last offer was refused
+    std::optional<Lease> lease;  // with isTaken, and while it is being made so
+    std::string refusal;         // why the last offer was refused
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Taken", self.isTaken);
+        fields("Lease", self.lease);
+        fields("Refusal", self.refusal);
+    }
 };
 Outcome readLease(const std::string& interface, LeaseState& state);
 

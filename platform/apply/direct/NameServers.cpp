@@ -13,7 +13,6 @@
 
 #include "platform/Host.h"
 #include "platform/Log.h"
-#include "platform/apply/Properties.h"
 #include "platform/apply/StateFile.h"
 
 namespace platform::apply {
@@ -26,10 +25,19 @@ constexpr std::size_t mostDomains = 6;
 
 // What stands under the name of the file: nothing, a file, or a link.
 struct FileState {
-    enum class Kind { absent, file, link };
+    enum class Kind { absent, file, link, last = link };
     Kind kind = Kind::absent;
     std::string content;  // of a file, or the target of a link
     FileOwnership ownership;
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Kind", self.kind);
+        fields("Content", self.content);
+        fields("Mode", self.ownership.mode);
+        fields("User", self.ownership.user);
+        fields("Group", self.ownership.group);
+    }
 
     bool operator==(const FileState& other) const {
         return kind == other.kind && content == other.content &&
@@ -39,18 +47,34 @@ struct FileState {
     }
 };
 
-struct Brought {
+// What one interface brings.
+struct Contribution {
     std::string interface;
     unsigned rank = 0;
     NameService service;
-    bool operator==(const Brought&) const = default;
+    bool operator==(const Contribution&) const = default;
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Interface", self.interface);
+        fields("Rank", self.rank);
+        fields("Service", self.service);
+    }
 };
 
 struct State {
-    std::optional<FileState> before;
-    // What the file was last replaced by and what it was to be replaced by: after a crash it is one of them.
+    FileState before;
+    // What the file was last replaced by and what it was to be replaced by: after a crash it is one of them,
+    // or, where it is a mount and was written in place, the beginning of one of them.
     std::vector<std::string> written;
-    std::vector<Brought> brought;
+    std::vector<Contribution> contributions;
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Before", self.before);
+        fields("Written", self.written);
+        fields("Contributions", self.contributions);
+    }
 };
 
 Outcome readFileState(const std::string& path, FileState& state) {
@@ -98,106 +122,12 @@ std::string statePath() {
     return runtimePath("name-servers.plist");
 }
 
-std::span<const std::byte> bytesOf(const std::string& text) {
-    return std::as_bytes(std::span(text));
-}
-
-std::string textOf(std::span<const std::byte> bytes) {
-    return {reinterpret_cast<const char*>(bytes.data()), bytes.size()};
-}
-
-bool decodeBefore(CFDictionaryRef dictionary, State& state) {
-    const auto kind = integerIn(dictionary, CFSTR("Kind"));
-    const auto content = dataIn(dictionary, CFSTR("Content"));
-    if (!kind || *kind < 0 || *kind > static_cast<int>(FileState::Kind::link) || !content) {
-        return false;
-    }
-    FileState& before = state.before.emplace();
-    before.kind = static_cast<FileState::Kind>(*kind);
-    before.content = textOf(*content);
-    before.ownership = {static_cast<unsigned>(integerIn(dictionary, CFSTR("Mode")).value_or(0644)),
-                        static_cast<unsigned>(integerIn(dictionary, CFSTR("User")).value_or(0)),
-                        static_cast<unsigned>(integerIn(dictionary, CFSTR("Group")).value_or(0))};
-    return true;
-}
-
-bool decodeBrought(CFDictionaryRef dictionary, State& state) {
-    const auto interface = textIn(dictionary, CFSTR("Interface"));
-    const auto rank = integerIn(dictionary, CFSTR("Rank"));
-    const auto servers = dataIn(dictionary, CFSTR("Servers"));
-    CFArrayRef const domains = arrayIn(dictionary, CFSTR("Domains"));
-    if (!interface || !rank || !servers || domains == nullptr) {
-        return false;
-    }
-    Brought brought{*interface, static_cast<unsigned>(*rank), {}};
-    brought.service.servers.resize(servers->size() / sizeof(IPv4Address));
-    std::copy_n(servers->begin(), brought.service.servers.size() * sizeof(IPv4Address),
-                std::as_writable_bytes(std::span(brought.service.servers)).begin());
-    for (CFIndex i = 0; i < CFArrayGetCount(domains); ++i) {
-        brought.service.domains.push_back(asText(CFArrayGetValueAtIndex(domains, i)).value_or(""));
-    }
-    state.brought.push_back(std::move(brought));
-    return true;
-}
-
-Outcome readState(State& state) {
-    values::Owned<CFDictionaryRef> file;
-    Outcome read = readStateFile(statePath(), file);
-    if (!read.ok() || !file) {
-        return read;
-    }
-    CFArrayRef const written = arrayIn(file.get(), CFSTR("Written"));
-    CFArrayRef const brought = arrayIn(file.get(), CFSTR("Brought"));
-    bool good = decodeBefore(dictionaryIn(file.get(), CFSTR("Before")), state) && written != nullptr &&
-                brought != nullptr;
-    for (CFIndex i = 0; good && i < CFArrayGetCount(written); ++i) {
-        const auto content = asData(CFArrayGetValueAtIndex(written, i));
-        good = content.has_value();
-        state.written.push_back(good ? textOf(*content) : "");
-    }
-    for (CFIndex i = 0; good && i < CFArrayGetCount(brought); ++i) {
-        good = decodeBrought(asDictionary(CFArrayGetValueAtIndex(brought, i)), state);
-    }
-    return good ? Outcome() : Outcome(kSCStatusFailed, statePath() + " is not what this system wrote");
-}
-
-Outcome writeState(const State& state) {
-    DictionaryBuilder before;
-    before.setInteger(CFSTR("Kind"), static_cast<int>(state.before->kind))
-        .setData(CFSTR("Content"), bytesOf(state.before->content))
-        .setInteger(CFSTR("Mode"), state.before->ownership.mode)
-        .setInteger(CFSTR("User"), state.before->ownership.user)
-        .setInteger(CFSTR("Group"), state.before->ownership.group);
-    ArrayBuilder written;
-    for (const std::string& content : state.written) {
-        written.addData(bytesOf(content));
-    }
-    ArrayBuilder brought;
-    for (const Brought& one : state.brought) {
-        ArrayBuilder domains;
-        for (const std::string& domain : one.service.domains) {
-            domains.addText(domain);
-        }
-        DictionaryBuilder dictionary;
-        dictionary.setText(CFSTR("Interface"), one.interface)
-            .setInteger(CFSTR("Rank"), one.rank)
-            .setData(CFSTR("Servers"), std::as_bytes(std::span(one.service.servers)))
-            .set(CFSTR("Domains"), domains.get());
-        brought.add(dictionary.take().get());
-    }
-    DictionaryBuilder file;
-    file.set(CFSTR("Before"), before.take().get())
-        .set(CFSTR("Written"), written.get())
-        .set(CFSTR("Brought"), brought.get());
-    return writeStateFile(statePath(), file.take().get());
-}
-
-std::string contentFor(const std::vector<Brought>& brought) {
+std::string contentFor(const std::vector<Contribution>& contributions) {
     std::string servers;
     std::string domains;
     std::size_t serverCount = 0;
     std::size_t domainCount = 0;
-    for (const Brought& one : brought) {
+    for (const Contribution& one : contributions) {
         for (const IPv4Address server : one.service.servers) {
             char text[INET_ADDRSTRLEN] = "";
             ::inet_ntop(AF_INET, &server, text, sizeof text);
@@ -222,17 +152,22 @@ std::string contentFor(const std::vector<Brought>& brought) {
 
 bool isOurs(const FileState& now, const State& state) {
     return now.kind == FileState::Kind::file &&
-           std::find(state.written.begin(), state.written.end(), now.content) != state.written.end();
+           std::ranges::any_of(state.written,
+                               [&now](const std::string& text) { return text.starts_with(now.content); });
 }
 
-Outcome giveFileBack(const std::string& path, const FileState& now, const State& state) {
+Outcome giveFileBack(const std::string& path, const FileState& now, State& state, std::string& trouble) {
     (void)::unlink(temporaryFor(path).c_str());
-    if (!isOurs(now, state) && !(now == *state.before)) {
+    if (!isOurs(now, state) && !(now == state.before)) {
         logLine(LogLevel::notice, path + " was written by somebody else meanwhile and stays as it is");
-    } else if (!(now == *state.before)) {
-        Outcome made = makeFileState(path, *state.before);
-        if (!made.ok()) {
-            return made;
+    } else if (!(now == state.before)) {
+        // Written in place it may be cut short. A runtime directory that is full does not stop the way back.
+        state.written.push_back(state.before.content);
+        (void)writeState(statePath(), state).ok();
+        if (const Outcome made = makeFileState(path, state.before); !made.ok()) {
+            // The state stays, for the next try.
+            trouble = made.reason();
+            return {};
         }
     }
     return removeStateFile(statePath());
@@ -240,53 +175,54 @@ Outcome giveFileBack(const std::string& path, const FileState& now, const State&
 
 }  // namespace
 
-Outcome bringNameServers(const std::string& interface, unsigned rank, const NameService& service) {
+Outcome setInterfaceNameServers(const std::string& interface, unsigned rank, const NameService& service,
+                                std::string& trouble) {
+    trouble.clear();
     StateLock lock;
-    Outcome done = lock.acquire(runtimePath("name-servers.lock"), lockBound);
-    State state;
-    if (done.ok()) {
-        done = readState(state);
-    }
-    if (!done.ok() || (!state.before && service.empty())) {
-        return done;
+    RETURN_IF_FAILED(lock.acquire(runtimePath("name-servers.lock"), lockBound));
+    std::optional<State> known;
+    RETURN_IF_FAILED(readState(statePath(), known));
+    if (!known && service.empty()) {
+        return {};
     }
     const std::string& path = currentHost().resolverFile;
     FileState now;
-    done = readFileState(path, now);
-    if (!done.ok()) {
-        return done;
-    }
-    if (!state.before) {
-        state.before = now;
-    }
-    const std::vector<Brought> earlier = state.brought;
-    std::erase_if(state.brought, [&interface](const Brought& one) { return one.interface == interface; });
-    if (!service.empty()) {
-        state.brought.push_back({interface, rank, service});
-    }
-    if (state.brought.empty()) {
-        return giveFileBack(path, now, state);
-    }
-    std::sort(state.brought.begin(), state.brought.end(), [](const Brought& lhs, const Brought& rhs) {
-        return std::tie(lhs.rank, lhs.interface) < std::tie(rhs.rank, rhs.interface);
-    });
-    const std::string content = contentFor(state.brought);
-    if (isOurs(now, state) && now.content == content && state.brought == earlier) {
+    if (const Outcome read = readFileState(path, now); !read.ok()) {
+        trouble = read.reason();
         return {};
     }
-    if (!isOurs(now, state) && !(now == *state.before)) {
+    State state = known.value_or(State{now, {}, {}});
+    const std::vector<Contribution> earlier = state.contributions;
+    std::erase_if(state.contributions,
+                  [&interface](const Contribution& one) { return one.interface == interface; });
+    if (!service.empty()) {
+        state.contributions.push_back({interface, rank, service});
+    }
+    if (state.contributions.empty()) {
+        return giveFileBack(path, now, state, trouble);
+    }
+    std::ranges::sort(state.contributions, [](const Contribution& lhs, const Contribution& rhs) {
+        return std::tie(lhs.rank, lhs.interface) < std::tie(rhs.rank, rhs.interface);
+    });
+    const std::string content = contentFor(state.contributions);
+    const bool isWritten = std::ranges::count(state.written, now.content) != 0;
+    if (isWritten && now.content == content && state.contributions == earlier) {
+        return {};
+    }
+    if (known && !isOurs(now, state) && !(now == state.before)) {
         // They know of nothing that we keep, so there is nothing to give back either, except to ourselves
         // later.
         logLine(LogLevel::warning, path + " was written by somebody else meanwhile and stays as it is");
-        return writeState(state);
+        return writeState(statePath(), state);
     }
-    std::erase_if(state.written, [&now](const std::string& old) { return old != now.content; });
+    std::erase_if(state.written, [&now](const std::string& old) { return !old.starts_with(now.content); });
     state.written.push_back(content);
-    done = writeState(state);
-    if (done.ok()) {
-        done = replaceFile(path, content, {0644, ::geteuid(), ::getegid()});
+    RETURN_IF_FAILED(writeState(statePath(), state));
+    if (const Outcome replaced = replaceFile(path, content, {0644, ::geteuid(), ::getegid()});
+        !replaced.ok()) {
+        trouble = replaced.reason();
     }
-    return done;
+    return {};
 }
 
 }  // namespace platform::apply

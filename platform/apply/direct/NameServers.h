@@ -19,11 +19,21 @@ struct NameService {
     std::vector<std::string> domains;
     bool operator==(const NameService&) const = default;
     [[nodiscard]] bool empty() const noexcept { return servers.empty() && domains.empty(); }
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Servers", self.servers);
+        fields("Domains", self.domains);
+    }
 };
 
 // Makes these the servers that an interface brings, in place of what it brought before; an empty service
 // withdraws it. Servers of a lower rank come first. The same service again touches nothing. Several processes
 // may call it at once: the programs that take leases do.
-Outcome bringNameServers(const std::string& interface, unsigned rank, const NameService& service);
+//
+// A file that cannot be read or replaced, as with a read-only /etc, is a success with the reason in
+// `trouble`, which is empty otherwise: the addresses stand without it. What cannot be kept in the runtime
+// directory is a failure.
+Outcome setInterfaceNameServers(const std::string& interface, unsigned rank, const NameService& service,
+                                std::string& trouble);
 
 }  // namespace platform::apply

@@ -7,12 +7,11 @@
 #include <string>
 #include <vector>
 
-#include "platform/CoreFoundation.h"
 #include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/Kernel.h"
 #include "platform/apply/direct/Supplicant.h"
-#include "platform/values/Object.h"
+#include "platform/values/Fields.h"
 
 namespace platform::apply {
 
@@ -22,10 +21,17 @@ struct Snapshot {
     InterfaceState state;
     std::optional<KnownNetworks> networks;  // nothing when no wireless supplicant ran
     std::int64_t takenAt = 0;               // seconds since the machine's start, sleep included
-};
 
-[[nodiscard]] values::Owned<CFDictionaryRef> encodeSnapshot(const Snapshot& snapshot);
-[[nodiscard]] std::optional<Snapshot> decodeSnapshot(CFDictionaryRef dictionary);
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Up", self.up);
+        fields("IPv6Disabled", self.ipv6Disabled);
+        fields("Addresses", self.state.addresses);
+        fields("Routes", self.state.routes);
+        fields("Networks", self.networks);
+        fields("TakenAt", self.takenAt);
+    }
+};
 
 // The IPv6 switch of an interface.
 [[nodiscard]] std::optional<bool> isIPv6Disabled(const std::string& interface);
@@ -35,6 +41,12 @@ Outcome disableIPv6(const std::string& interface, bool disabled);
 struct JoinedNetwork {
     Salt salt{};
     std::uint32_t check = 0;
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Salt", self.salt);
+        fields("Check", self.check);
+    }
 };
 [[nodiscard]] JoinedNetwork makeJoinedNetwork(const WirelessSettings& settings);
 [[nodiscard]] bool isSameNetwork(const JoinedNetwork& joined, const WirelessSettings& settings);
@@ -42,11 +54,19 @@ struct JoinedNetwork {
 // What the direct agent has done with an interface; no notes means nothing that would have to be undone. They
 // are on disk before the first change and are removed behind the last one of the way back.
 struct Notes {
-    enum class Phase { going, made, returning };
-    Phase phase = Phase::going;
+    enum class Phase { applying, applied, restoring, last = restoring };
+    Phase phase = Phase::applying;
     bool off = false;                // the interface was switched off
     std::vector<Address> addresses;  // what it was given, other than by a lease
     std::optional<JoinedNetwork> joined;
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Phase", self.phase);
+        fields("Off", self.off);
+        fields("Addresses", self.addresses);
+        fields("Joined", self.joined);
+    }
 };
 
 Outcome readNotes(const std::string& interface, std::optional<Notes>& notes);

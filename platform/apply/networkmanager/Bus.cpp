@@ -51,11 +51,6 @@ Outcome fromBus(const std::string& what, int result) {
     return platform::apply::fromBus(what, result, sd_bus_error{}, {});
 }
 
-int forwardSignal(sd_bus_message* message, void* context, sd_bus_error* /*error*/) {
-    (*static_cast<Bus::Handler*>(context))(sd_bus_message_get_path(message), message);
-    return 0;
-}
-
 int noteOwner(sd_bus_message* message, void* left, sd_bus_error* /*error*/) {
     const char* before = nullptr;
     if (sd_bus_message_read(message, "sss", nullptr, &before, nullptr) >= 0 && *before != '\0') {
@@ -100,10 +95,12 @@ Outcome Bus::process(Clock::time_point deadline, bool& inTime) {
     return result < 0 && result != -EINTR ? fromBus("the system bus", result) : Outcome();
 }
 
-Outcome Bus::connect(const std::string& service, bool& found) {
+Outcome Bus::connect(const std::string& service, bool& owned) {
     const std::string what = "connecting to the system bus";
     const Clock::time_point deadline = Clock::now() + connectBound;
     service_ = service;
+    owned = false;
+    watches_.clear();
     ownerSlot_.reset();
     ownerLeft_ = false;
     sd_bus* made = nullptr;
@@ -121,17 +118,13 @@ Outcome Bus::connect(const std::string& service, bool& found) {
     if (result >= 0) {
         result = sd_bus_start(made);
     }
-    found = result != -ENOENT;
-    if (!found) {
+    if (result == -ENOENT) {
         bus_.reset();
         return {};
     }
     while (result >= 0 && (result = sd_bus_is_ready(made)) == 0) {
         bool inTime = false;
-        Outcome outcome = process(deadline, inTime);
-        if (!outcome.ok()) {
-            return outcome;
-        }
+        RETURN_IF_FAILED(process(deadline, inTime));
         if (!inTime) {
             return {kSCStatusFailed, what + ": no answer in " + std::to_string(connectBound.count()) + " s"};
         }
@@ -145,11 +138,18 @@ Outcome Bus::connect(const std::string& service, bool& found) {
         result = sd_bus_add_match_async(made, &slot, rule.c_str(), noteOwner, nullptr, &ownerLeft_);
         ownerSlot_.reset(slot);
     }
-    return result < 0 ? fromBus(what, result) : Outcome();
+    return result < 0 ? fromBus(what, result) : readOwner(owned);
 }
 
-Outcome Bus::hasOwner(bool& owned) {
-    const int result = sd_bus_get_name_creds(bus_.get(), service_.c_str(), 0, nullptr);
+Outcome Bus::readOwner(bool& owned) {
+    sd_bus_creds* credentials = nullptr;
+    const int result =
+        sd_bus_get_name_creds(bus_.get(), service_.c_str(), SD_BUS_CREDS_UNIQUE_NAME, &credentials);
+    const char* name = nullptr;
+    if (result >= 0 && sd_bus_creds_get_unique_name(credentials, &name) >= 0) {
+        owner_ = name;
+    }
+    sd_bus_creds_unref(credentials);
     owned = result >= 0;
     return result >= 0 || result == -ENXIO ? Outcome()
                                            : fromBus("asking for the owner of " + service_, result);
@@ -218,41 +218,37 @@ Outcome Bus::setProperty(const std::string& path, const std::string& interface, 
                         : Outcome(outcome.status(), std::string(property) + ": " + outcome.reason());
 }
 
-Outcome Bus::watch(const std::string& interface, const std::string& member, Handler handler,
-                   std::unique_ptr<Watch>& watch) {
-    watch = std::make_unique<Watch>(Watch{std::move(handler), nullptr});
+int Bus::forwardSignal(sd_bus_message* message, void* watch, sd_bus_error* /*error*/) {
+    const auto& self = *static_cast<Watch*>(watch);
+    const char* const sender = sd_bus_message_get_sender(message);
+    if (sender != nullptr && self.bus->owner_ == sender) {
+        self.handler(sd_bus_message_get_path(message), message);
+    }
+    return 0;
+}
+
+Outcome Bus::watch(const std::string& interface, const std::string& member, Handler handler) {
+    watches_.push_back(std::make_unique<Watch>(Watch{this, std::move(handler), nullptr}));
+    Watch& made = *watches_.back();
     sd_bus_slot* slot = nullptr;
     // Not waited for: the bus takes requests in order, and this one comes before any call made later.
     const int result =
         sd_bus_match_signal_async(bus_.get(), &slot, service_.c_str(), nullptr, interface.c_str(),
-                                  member.c_str(), forwardSignal, nullptr, &watch->handler);
-    watch->slot.reset(slot);
+                                  member.c_str(), forwardSignal, nullptr, &made);
+    made.slot.reset(slot);
     return result < 0 ? fromBus("listening to " + member, result) : Outcome();
 }
 
-Outcome Bus::waitUntil(const std::function<bool()>& condition, Clock::time_point deadline,
-                       const Outcome& late) {
-    while (!condition()) {
-        bool inTime = false;
-        Outcome outcome = process(deadline, inTime);
-        if (!outcome.ok()) {
-            return outcome;
-        }
-        if (ownerLeft_) {
-            return {kSCStatusFailed, service_ + " left the bus while it was waited for"};
-        }
-        if (!inTime) {
-            return late;
-        }
-    }
-    return {};
-}
-
-Outcome Bus::drain() {
+Outcome Bus::handleSignals(Clock::time_point until) {
+    bool inTime = true;
+    RETURN_IF_FAILED(process(until, inTime));
     int result = 0;
     do {
         result = sd_bus_process(bus_.get(), nullptr);
     } while (result > 0);
+    if (ownerLeft_) {
+        return {kSCStatusFailed, service_ + " left the bus while it was waited for"};
+    }
     return result < 0 ? fromBus("the system bus", result) : Outcome();
 }
 

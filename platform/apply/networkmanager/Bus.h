@@ -9,6 +9,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "platform/Outcome.h"
 #include "platform/apply/networkmanager/Value.h"
@@ -36,11 +37,10 @@ class Bus {
     Bus(const Bus&) = delete;
     Bus& operator=(const Bus&) = delete;
 
-    // Connects to the host's system bus, whatever the environment says. found is false, and the outcome
-    // success, when there is no such socket. Calls go to the service of this name from then on.
-    Outcome connect(const std::string& service, bool& found);
-    // Whether anybody owns the service's name. Never starts it.
-    Outcome hasOwner(bool& owned);
+    // Connects to the host's system bus, whatever the environment says. owned tells whether anybody owns the
+    // service's name, whom calls go to from then on; it is false, and the outcome success, without a bus
+    // socket too. Never starts the service.
+    Outcome connect(const std::string& service, bool& owned);
 
     // One method call. A secret that the arguments hold never comes back in the reason. error, when given,
     // gets the name of a D-Bus error, or becomes empty.
@@ -59,25 +59,24 @@ class Bus {
     Outcome setProperty(const std::string& path, const std::string& interface, const char* property,
                         const Value& value);
 
-    // Hands the service's signals of this name to the function while the slot lives. The message is read from
-    // its start. What is sent after a call that is made later is not missed.
+    // Hands the service's signals of this name to the function as long as the bus is open. The message is
+    // read from its start. What is sent after a call that is made later is not missed. A signal counts only
+    // when the owner of the service's name sent it: anybody can send one under the name itself.
     using Handler = std::function<void(const char* path, sd_bus_message* message)>;
+    Outcome watch(const std::string& interface, const std::string& member, Handler handler);
+
+    // Handles the signals that have come; when there are none, waits for one until the time. Fails when the
+    // service left the bus.
+    Outcome handleSignals(Clock::time_point until);
+
+  private:
     struct Watch {
+        Bus* bus;
         Handler handler;
         Slot slot;
     };
-    Outcome watch(const std::string& interface, const std::string& member, Handler handler,
-                  std::unique_ptr<Watch>& watch);
-
-    // Handles signals until the condition holds. Fails when the service left the bus, with `late` when the
-    // deadline came first.
-    Outcome waitUntil(const std::function<bool()>& condition, Clock::time_point deadline,
-                      const Outcome& late);
-
-    // Handles the signals that have come, without waiting for more.
-    Outcome drain();
-
-  private:
+    static int forwardSignal(sd_bus_message* message, void* watch, sd_bus_error* error);
+    Outcome readOwner(bool& owned);
     Outcome process(Clock::time_point deadline, bool& inTime);
 
     struct BusUnref {
@@ -89,8 +88,10 @@ class Bus {
     };
     std::string service_;
     std::unique_ptr<sd_bus, BusUnref> bus_;
+    std::string owner_;  // the unique name of the service's owner; empty when there is none
     Slot ownerSlot_;
     bool ownerLeft_ = false;
+    std::vector<std::unique_ptr<Watch>> watches_;
 };
 
 // What sd-bus or the other side says, as an outcome: "<what>: <the error's name>: <its message>". The rights

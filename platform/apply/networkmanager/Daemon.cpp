@@ -2,7 +2,7 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <limits>
+#include <ctime>
 #include <utility>
 
 namespace platform::apply {
@@ -22,27 +22,20 @@ constexpr const char* accessPointInterface = "org.freedesktop.NetworkManager.Acc
 constexpr const char* propertiesInterface = "org.freedesktop.DBus.Properties";
 
 constexpr std::chrono::seconds startupBound{10};
-constexpr std::chrono::seconds settleBound{5};
-constexpr std::chrono::seconds scanBound{10};
-// What a card says about its failure comes right after what its profile says.
-constexpr std::chrono::milliseconds reasonBound{250};
 
 constexpr std::uint32_t typeEthernet = 1;
 constexpr std::uint32_t typeWireless = 2;
 constexpr std::uint32_t typeVirtualEthernet = 20;
 
-constexpr std::uint32_t activeActivated = 2;
-constexpr std::uint32_t activeDeactivated = 4;
 constexpr std::uint32_t activeIsExternal = 0x80;
 
 constexpr std::uint32_t profileIsVolatile = 0x4;
-// In memory, and not to be activated until somebody asks for it.
-constexpr std::uint32_t profileFlags = 0x2 | 0x20;
+constexpr std::uint32_t inMemory = 0x2;
+constexpr std::uint32_t blockAutoconnect = 0x20;
 
 constexpr std::uint32_t reasonNone = 0;
 constexpr std::uint32_t reasonNewActivation = 60;
 
-constexpr std::uint32_t capabilityAdHoc = 0x80;
 constexpr std::uint32_t modeAdHoc = 1;
 constexpr std::uint32_t accessPrivacy = 0x1;
 constexpr std::uint32_t keyManagementShared = 0x100;
@@ -61,6 +54,16 @@ std::string pathIn(const Dictionary& properties, const char* key) {
 bool isGone(const std::string& error) {
     return error == SD_BUS_ERROR_UNKNOWN_OBJECT || error == SD_BUS_ERROR_UNKNOWN_METHOD ||
            error == SD_BUS_ERROR_UNKNOWN_INTERFACE;
+}
+
+Security securityOf(const Dictionary& point) {
+    const std::uint32_t protection = numberIn(point, "WpaFlags") | numberIn(point, "RsnFlags");
+    if (protection == 0) {
+        return (numberIn(point, "Flags") & accessPrivacy) != 0 ? Security::wep : Security::open;
+    }
+    return (protection & keyManagementShared) != 0 ? Security::wpa
+           : (protection & keyManagementSAE) != 0  ? Security::sae
+                                                   : Security::enterprise;
 }
 
 Arguments textArgument(const std::string& text) {
@@ -91,7 +94,7 @@ std::string describeFailure(std::uint32_t reason) {
         case 15:
         case 16:
         case 17:
-            return "no address was had";
+            return "no DHCP server answered";
         case 7:
             return "the network's key is wrong or missing";
         case 8:
@@ -122,35 +125,22 @@ std::string describeFailure(std::uint32_t reason) {
     }
 }
 
-// What the signals have told of one activation.
-struct Daemon::Progress {
-    std::string path;    // of the active profile
-    std::string device;  // of the card
-    std::uint32_t state = 0;
-    std::uint32_t failure = reasonNone;
-    std::unique_ptr<Bus::Watch> activeWatch;
-    std::unique_ptr<Bus::Watch> deviceWatch;
-};
-
 Outcome Daemon::call(const std::string& path, const char* interface, const char* member, Arguments arguments,
                      Message& reply, std::string* error, std::string_view secret) {
     return bus_.call({path, interface, member, std::move(arguments), secret}, reply, error);
 }
 
 Outcome Daemon::connect() {
-    bool found = false;
-    Outcome outcome = bus_.connect(serviceName, found);
-    bool owned = false;
-    if (outcome.ok() && found) {
-        outcome = bus_.hasOwner(owned);
+    if (!isConnected_) {
+        bool owned = false;
+        RETURN_IF_FAILED(bus_.connect(serviceName, owned));
+        if (!owned) {
+            return {kSCStatusFailed, "NetworkManager does not run"};
+        }
+        isConnected_ = true;
     }
-    if (outcome.ok() && !owned) {
-        outcome = {kSCStatusFailed, "NetworkManager does not run"};
-    }
-    if (outcome.ok()) {
-        outcome = readManager();
-    }
-    return outcome.ok() && starting_ ? awaitStartup() : outcome;
+    RETURN_IF_FAILED(readManager());
+    return starting_ ? awaitStartup() : Outcome();
 }
 
 Outcome Daemon::readManager() {
@@ -165,24 +155,17 @@ Outcome Daemon::readManager() {
 }
 
 Outcome Daemon::awaitStartup() {
-    bool changed = true;
-    std::unique_ptr<Bus::Watch> watch;
-    Outcome outcome = bus_.watch(
-        propertiesInterface, "PropertiesChanged",
-        [&changed](const char* path, sd_bus_message* /*message*/) {
-            changed = changed || std::string_view(path) == managerPath;
-        },
-        watch);
+    RETURN_IF_FAILED(listen());
     const Clock::time_point deadline = Clock::now() + startupBound;
-    while (outcome.ok() && starting_ && Clock::now() < deadline) {
-        changed = false;
-        outcome = readManager();
-        if (outcome.ok() && starting_) {
-            // A daemon that takes longer, because a card waits for an address, can be worked with.
-            outcome = bus_.waitUntil([&changed] { return changed; }, deadline, {});
+    // A daemon that takes longer, because a card waits for an address, can be worked with.
+    while (starting_ && Clock::now() < deadline) {
+        managerChanged_ = false;
+        RETURN_IF_FAILED(readManager());
+        while (starting_ && !managerChanged_ && Clock::now() < deadline) {
+            RETURN_IF_FAILED(bus_.handleSignals(deadline));
         }
     }
-    return outcome;
+    return {};
 }
 
 Outcome Daemon::findDevice(const std::string& interface, std::optional<Device>& device) {
@@ -212,7 +195,7 @@ Outcome Daemon::findDevice(const std::string& interface, std::optional<Device>& 
         } else if (type == typeWireless) {
             found.kind = Device::Kind::wireless;
         }
-        found.state = numberIn(properties, "State");
+        found.state = devices_[found.path] = numberIn(properties, "State");
         found.managed = valueOf<bool>(properties, "Managed").value_or(false);
         found.autoconnect = valueOf<bool>(properties, "Autoconnect").value_or(false);
         found.active = pathIn(properties, "ActiveConnection");
@@ -307,17 +290,19 @@ Outcome Daemon::readSecrets(const std::string& profile, Sections& sections) {
     return {};
 }
 
-Outcome Daemon::addProfile(const Sections& sections, std::string_view secret, std::string& path) {
+Outcome Daemon::addProfile(const Sections& sections, Adding adding, std::string_view secret,
+                           std::string& path) {
     Message reply;
+    const std::uint32_t flags = inMemory | (adding == Adding::heldBack ? blockAutoconnect : 0);
     // Not AddAndActivateConnection, which completes what is missing or wrong instead of refusing it.
-    Outcome outcome = call(
+    RETURN_IF_FAILED(call(
         settingsPath, settingsInterface, "AddConnection2",
-        [&sections](sd_bus_message* message) {
+        [&sections, flags](sd_bus_message* message) {
             const int result = appendSections(message, sections);
-            return result < 0 ? result : sd_bus_message_append(message, "ua{sv}", profileFlags, 0);
+            return result < 0 ? result : sd_bus_message_append(message, "ua{sv}", flags, 0);
         },
-        reply, nullptr, secret);
-    return outcome.ok() ? readPath("AddConnection2", reply, path) : outcome;
+        reply, nullptr, secret));
+    return readPath("AddConnection2", reply, path);
 }
 
 Outcome Daemon::updateProfile(const std::string& path, const Sections& sections, std::string_view secret) {
@@ -326,7 +311,8 @@ Outcome Daemon::updateProfile(const std::string& path, const Sections& sections,
         path, profileInterface, "Update2",
         [&sections](sd_bus_message* message) {
             const int result = appendSections(message, sections);
-            return result < 0 ? result : sd_bus_message_append(message, "ua{sv}", profileFlags, 0);
+            return result < 0 ? result
+                              : sd_bus_message_append(message, "ua{sv}", inMemory | blockAutoconnect, 0);
         },
         reply, nullptr, secret);
 }
@@ -338,127 +324,25 @@ Outcome Daemon::deleteProfile(const std::string& path) {
     return isGone(error) ? Outcome() : outcome;
 }
 
-Outcome Daemon::follow(Progress& progress, const Device& device) {
-    progress.device = device.path;
-    Outcome outcome = bus_.watch(
-        activeInterface, "StateChanged",
-        [&progress](const char* path, sd_bus_message* message) {
-            std::uint32_t state = 0;
-            if (sd_bus_message_read(message, "uu", &state, nullptr) >= 0 && progress.path == path) {
-                progress.state = state;
-            }
-        },
-        progress.activeWatch);
-    if (!outcome.ok()) {
-        return outcome;
-    }
-    return bus_.watch(
-        deviceInterface, "StateChanged",
-        [&progress](const char* path, sd_bus_message* message) {
-            std::uint32_t state = 0;
-            std::uint32_t reason = 0;
-            if (progress.device != path ||
-                sd_bus_message_read(message, "uuu", &state, nullptr, &reason) < 0) {
-                return;
-            }
-            if (state == deviceDeactivating || state == deviceFailed) {
-                progress.failure = reason;
-            } else if (state > deviceDisconnected) {
-                // What was before made way for this one.
-                progress.failure = reasonNone;
-            }
-        },
-        progress.deviceWatch);
-}
-
-Outcome Daemon::await(Progress& progress) {
-    // The signals tell changes only; it may be up already, or gone.
-    Dictionary properties;
-    std::string error;
-    Outcome outcome = bus_.readProperties(progress.path, activeInterface, properties, &error);
-    progress.state = numberIn(properties, "State");
-    if (isGone(error)) {
-        outcome = {};
-        progress.state = activeDeactivated;
-    }
-    if (outcome.ok()) {
-        outcome = bus_.waitUntil(
-            [&progress] { return progress.state == activeActivated || progress.state == activeDeactivated; },
-            Clock::now() + activationBound,
-            {kSCStatusFailed, "it was not up after " + std::to_string(activationBound.count()) + " s"});
-    }
-    if (!outcome.ok() || progress.state == activeActivated) {
-        return outcome;
-    }
-    // All of what came: an earlier signal tells how the profile before made way.
-    outcome = bus_.drain();
-    if (outcome.ok()) {
-        outcome = bus_.waitUntil([&progress] { return progress.failure != reasonNone; },
-                                 Clock::now() + reasonBound, {});
-    }
-    return outcome.ok() ? Outcome(kSCStatusFailed, describeFailure(progress.failure)) : outcome;
-}
-
-Outcome Daemon::activate(const std::string& profile, const Device& device) {
-    Progress progress;
-    Outcome outcome = follow(progress, device);
+Outcome Daemon::activate(const std::string& profile, const Device& device, std::string& active) {
     Message reply;
-    if (outcome.ok()) {
-        outcome = call(
-            managerPath, managerInterface, "ActivateConnection",
-            [&](sd_bus_message* message) {
-                return sd_bus_message_append(message, "ooo", profile.c_str(), device.path.c_str(), "/");
-            },
-            reply);
-    }
-    if (outcome.ok()) {
-        outcome = readPath("ActivateConnection", reply, progress.path);
-    }
-    return outcome.ok() ? await(progress) : outcome;
-}
-
-Outcome Daemon::awaitActive(const Active& active, const Device& device) {
-    Progress progress;
-    progress.path = active.path;
-    Outcome outcome = follow(progress, device);
-    return outcome.ok() ? await(progress) : outcome;
-}
-
-Outcome Daemon::awaitState(Device& device, std::uint32_t lowest, std::uint32_t highest,
-                           std::chrono::seconds bound, const char* late) {
-    const Clock::time_point deadline = Clock::now() + bound;
-    std::unique_ptr<Bus::Watch> watch;
-    Outcome outcome = bus_.watch(
-        deviceInterface, "StateChanged",
-        [&device](const char* path, sd_bus_message* message) {
-            std::uint32_t state = 0;
-            if (device.path == path && sd_bus_message_read(message, "uuu", &state, nullptr, nullptr) >= 0) {
-                device.state = state;
-            }
+    failures_.erase(device.path);
+    // Until a signal tells how far the new one is.
+    devices_[device.path] = deviceDisconnected;
+    RETURN_IF_FAILED(call(
+        managerPath, managerInterface, "ActivateConnection",
+        [&](sd_bus_message* message) {
+            return sd_bus_message_append(message, "ooo", profile.c_str(), device.path.c_str(), "/");
         },
-        watch);
-    Dictionary properties;
-    if (outcome.ok()) {
-        outcome = bus_.readProperties(device.path, deviceInterface, properties);
-    }
-    if (outcome.ok()) {
-        device.state = numberIn(properties, "State");
-        outcome = bus_.waitUntil(
-            [&device, lowest, highest] { return device.state >= lowest && device.state <= highest; },
-            deadline, late == nullptr ? Outcome() : Outcome(kSCStatusFailed, late));
-    }
-    return outcome;
+        reply));
+    return readPath("ActivateConnection", reply, active);
 }
 
 Outcome Daemon::disconnect(const Device& device) {
     Message reply;
     std::string error;
     Outcome outcome = call(device.path, deviceInterface, "Disconnect", {}, reply, &error);
-    if (!outcome.ok() && error != "org.freedesktop.NetworkManager.Device.NotActive") {
-        return outcome;
-    }
-    Device now = device;
-    return awaitState(now, 0, deviceDisconnected, activationBound, "the card did not come to rest in 45 s");
+    return error == "org.freedesktop.NetworkManager.Device.NotActive" || isGone(error) ? Outcome() : outcome;
 }
 
 Outcome Daemon::setManaged(const Device& device, bool managed) {
@@ -467,11 +351,6 @@ Outcome Daemon::setManaged(const Device& device, bool managed) {
 
 Outcome Daemon::setAutoconnect(const Device& device, bool autoconnect) {
     return bus_.setProperty(device.path, deviceInterface, "Autoconnect", {autoconnect});
-}
-
-Outcome Daemon::settle(Device& device) {
-    return awaitState(device, deviceDisconnected, std::numeric_limits<std::uint32_t>::max(), settleBound,
-                      nullptr);
 }
 
 Outcome Daemon::readMetric(const Device& device, std::uint32_t& metric) {
@@ -504,19 +383,18 @@ Outcome Daemon::setRadio(bool on) {
     return outcome;
 }
 
-Outcome Daemon::readAccessPoints(const Device& device, const std::string& network,
-                                 std::vector<AccessPoint>& seen) {
-    seen.clear();
+Outcome Daemon::readHeard(const Device& device, const std::string& network,
+                          std::vector<HeardNetwork>& heard) {
+    heard.clear();
     Message reply;
-    Outcome outcome = call(device.path, wirelessInterface, "GetAllAccessPoints", {}, reply);
-    if (!outcome.ok()) {
-        return outcome;
-    }
+    RETURN_IF_FAILED(call(device.path, wirelessInterface, "GetAllAccessPoints", {}, reply));
     Texts paths;
     if (readTexts(reply.get(), paths) < 0) {
         return unreadable("GetAllAccessPoints");
     }
     paths.resize(std::min(paths.size(), mostAccessPoints));
+    timespec now{};
+    ::clock_gettime(CLOCK_BOOTTIME, &now);
     for (const std::string& path : paths) {
         Dictionary point;
         std::string error;
@@ -527,75 +405,90 @@ Outcome Daemon::readAccessPoints(const Device& device, const std::string& networ
         if (!read.ok()) {
             return read;
         }
-        if (valueOf<Bytes>(point, "Ssid") != Bytes(network.begin(), network.end())) {
+        // One that was never heard is the daemon's own note of a network that it is to join.
+        const std::int32_t lastHeard = valueOf<std::int32_t>(point, "LastSeen").value_or(-1);
+        if (valueOf<Bytes>(point, "Ssid") != Bytes(network.begin(), network.end()) || lastHeard < 0) {
             continue;
         }
-        const std::uint32_t protection = numberIn(point, "WpaFlags") | numberIn(point, "RsnFlags");
-        seen.push_back({numberIn(point, "Mode") == modeAdHoc, (numberIn(point, "Flags") & accessPrivacy) != 0,
-                        protection != 0, (protection & (keyManagementShared | keyManagementSAE)) != 0,
-                        numberIn(point, "Strength")});
+        heard.push_back({numberIn(point, "Mode") == modeAdHoc, securityOf(point),
+                         static_cast<int>(numberIn(point, "Strength")),
+                         static_cast<int>(numberIn(point, "Frequency")),
+                         valueOf<std::string>(point, "HwAddress").value_or(""),
+                         std::chrono::seconds(std::max<std::int64_t>(now.tv_sec - lastHeard, 0))});
     }
     return {};
 }
 
-Outcome Daemon::look(const Device& device, const std::string& network, WirelessFacts& facts) {
-    Dictionary properties;
-    Outcome outcome = bus_.readProperties(device.path, wirelessInterface, properties);
-    if (!outcome.ok()) {
-        return outcome;
-    }
-    facts.canAdHoc = (numberIn(properties, "WirelessCapabilities") & capabilityAdHoc) != 0;
-    facts.seen.clear();
-    if (network.empty()) {
+Outcome Daemon::listen() {
+    if (std::exchange(isListening_, true)) {
         return {};
     }
-    bool changed = false;
-    std::unique_ptr<Bus::Watch> watch;
-    outcome = bus_.watch(
-        propertiesInterface, "PropertiesChanged",
-        [&](const char* path, sd_bus_message* /*message*/) { changed = changed || device.path == path; },
-        watch);
-    if (outcome.ok()) {
-        outcome = readAccessPoints(device, network, facts.seen);
-    }
-    if (!outcome.ok() || !facts.seen.empty()) {
-        return outcome;
-    }
-    // By its name, since a network may keep quiet until it is asked for.
-    Message reply;
-    const Outcome requested = call(
-        device.path, wirelessInterface, "RequestScan",
-        [&network](sd_bus_message* m) {
-            int result = sd_bus_message_open_container(m, 'a', "{sv}");
-            result = result < 0 ? result : sd_bus_message_open_container(m, 'e', "sv");
-            result = result < 0 ? result : sd_bus_message_append(m, "s", "ssids");
-            result = result < 0 ? result : sd_bus_message_open_container(m, 'v', "aay");
-            result = result < 0 ? result : sd_bus_message_open_container(m, 'a', "ay");
-            result =
-                result < 0 ? result : sd_bus_message_append_array(m, 'y', network.data(), network.size());
-            for (int depth = 0; depth < 4; ++depth) {
-                result = result < 0 ? result : sd_bus_message_close_container(m);
+    RETURN_IF_FAILED(
+        bus_.watch(activeInterface, "StateChanged", [this](const char* path, sd_bus_message* message) {
+            std::uint32_t state = 0;
+            if (sd_bus_message_read(message, "uu", &state, nullptr) >= 0) {
+                actives_[path] = state;
             }
-            return result;
-        },
-        reply);
-    const auto lastScan = valueOf<std::int64_t>(properties, "LastScan");
-    const Clock::time_point deadline = Clock::now() + scanBound;
-    // The daemon refuses when it has just looked: then there is nothing to wait for.
-    while (requested.ok() && outcome.ok() && facts.seen.empty() && Clock::now() < deadline) {
-        outcome = bus_.waitUntil([&changed] { return changed; }, deadline, {});
-        changed = false;
-        if (outcome.ok()) {
-            outcome = readAccessPoints(device, network, facts.seen);
-        }
-        if (outcome.ok()) {
-            outcome = bus_.readProperties(device.path, wirelessInterface, properties);
-        }
-        if (valueOf<std::int64_t>(properties, "LastScan") != lastScan) {
-            break;
-        }
+        }));
+    RETURN_IF_FAILED(
+        bus_.watch(deviceInterface, "StateChanged", [this](const char* path, sd_bus_message* message) {
+            std::uint32_t state = 0;
+            std::uint32_t reason = 0;
+            if (sd_bus_message_read(message, "uuu", &state, nullptr, &reason) >= 0) {
+                noteDevice(path, state, reason);
+            }
+        }));
+    RETURN_IF_FAILED(bus_.watch(
+        propertiesInterface, "PropertiesChanged", [this](const char* path, sd_bus_message* message) {
+            const char* interface = "";
+            (void)sd_bus_message_read(message, "s", &interface);
+            const std::string_view changed = interface;
+            managerChanged_ = managerChanged_ || std::string_view(path) == managerPath;
+            if (changed == wirelessInterface || changed == accessPointInterface) {
+                ++changesOnAir_;
+            }
+        }));
+    return bus_.watch(wirelessInterface, "AccessPointAdded",
+                      [this](const char* /*path*/, sd_bus_message* /*message*/) { ++changesOnAir_; });
+}
+
+void Daemon::noteDevice(const char* path, std::uint32_t state, std::uint32_t reason) {
+    devices_[path] = state;
+    if (state == deviceDeactivating || state == deviceFailed) {
+        failures_[path] = reason;
+    } else if (state > deviceDisconnected) {
+        // What was before made way for this one.
+        failures_.erase(path);
     }
-    return outcome;
+}
+
+Outcome Daemon::deviceState(const std::string& path, std::uint32_t& state) {
+    if (const auto known = devices_.find(path); known != devices_.end()) {
+        state = known->second;
+        return {};
+    }
+    Dictionary properties;
+    std::string error;
+    Outcome outcome = bus_.readProperties(path, deviceInterface, properties, &error);
+    state = devices_[path] = numberIn(properties, "State");
+    return isGone(error) ? Outcome() : outcome;
+}
+
+Outcome Daemon::activeState(const std::string& path, std::uint32_t& state) {
+    if (const auto known = actives_.find(path); known != actives_.end()) {
+        state = known->second;
+        return {};
+    }
+    Dictionary properties;
+    std::string error;
+    Outcome outcome = bus_.readProperties(path, activeInterface, properties, &error);
+    state = actives_[path] = isGone(error) ? activeDeactivated : numberIn(properties, "State");
+    return isGone(error) ? Outcome() : outcome;
+}
+
+std::uint32_t Daemon::failureOf(const std::string& device) const {
+    const auto found = failures_.find(device);
+    return found == failures_.end() ? reasonNone : found->second;
 }
 
 }  // namespace platform::apply

@@ -3,25 +3,30 @@
 
 #include <chrono>
 #include <cstdint>
-#include <memory>
+#include <map>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/Outcome.h"
+#include "platform/apply/WirelessChoice.h"
 #include "platform/apply/networkmanager/Bus.h"
 #include "platform/apply/networkmanager/Profile.h"
 #include "platform/apply/networkmanager/Value.h"
 
 namespace platform::apply {
 
-// How long an activation, or a card that is being switched off, is waited for.
-inline constexpr std::chrono::seconds activationBound{45};
-
 // Of NetworkManager's states of a card: unmanaged 10, unavailable 20, disconnected 30, then activating,
 // activated 100, deactivating 110, failed 120.
 inline constexpr std::uint32_t deviceDisconnected = 30;
+inline constexpr std::uint32_t deviceGetsAddresses = 70;
+inline constexpr std::uint32_t deviceActivated = 100;
 inline constexpr std::uint32_t deviceDeactivating = 110;
 inline constexpr std::uint32_t deviceFailed = 120;
+
+// And of an active profile's: activating 1, activated 2, deactivating 3, deactivated 4.
+inline constexpr std::uint32_t activeActivated = 2;
+inline constexpr std::uint32_t activeDeactivated = 4;
 
 struct Device {
     enum class Kind { wired, wireless, other };
@@ -49,10 +54,16 @@ struct Profile {
     Sections sections;  // without secrets
 };
 
+// How a profile is added. Ours stays in memory. heldBack: the daemon does not activate it of its own accord
+// before somebody has asked for it once.
+enum class Adding { heldBack, atOnce };
+
+// Every call is bounded (Bus.h); nothing here waits for a card or a network, except connect for a daemon that
+// has just been started. What goes on is told by signals, which handleSignals takes in.
 class Daemon {
   public:
     // Fails when NetworkManager does not run. Waits for a daemon that is starting, whose cards are not yet
-    // what they will be, for at most ten seconds.
+    // what they will be, for at most ten seconds. Connected already, it only looks at the radio again.
     Outcome connect();
 
     // Nothing, and success, when there is none of that name, path or UUID.
@@ -65,23 +76,19 @@ class Daemon {
     // Adds the secrets of the sections that have some. Those that only the desktop's key ring has may be
     // missing.
     Outcome readSecrets(const std::string& profile, Sections& sections);
-    // In memory only, and not activated by the daemon of its own accord. The secret is kept out of reasons.
-    Outcome addProfile(const Sections& sections, std::string_view secret, std::string& path);
+    // The secret is kept out of reasons.
+    Outcome addProfile(const Sections& sections, Adding adding, std::string_view secret, std::string& path);
     Outcome updateProfile(const std::string& path, const Sections& sections, std::string_view secret);
     // One that is gone is a success.
     Outcome deleteProfile(const std::string& path);
 
-    // Return when the profile is active on the card, with its addresses; the reason says what went wrong.
-    Outcome activate(const std::string& profile, const Device& device);
-    Outcome awaitActive(const Active& active, const Device& device);
-    // Returns when nothing is active on the card. The daemon leaves it alone until somebody activates a
-    // profile on it.
+    // Asks for the profile to be activated on the card. `active` is the path to follow it by.
+    Outcome activate(const std::string& profile, const Device& device, std::string& active);
+    // Asks for nothing to be active on the card; one that has nothing active is a success. The daemon leaves
+    // it alone until somebody activates a profile on it.
     Outcome disconnect(const Device& device);
     Outcome setManaged(const Device& device, bool managed);
     Outcome setAutoconnect(const Device& device, bool autoconnect);
-    // Waits for a card that was just handed to the daemon until a profile can be activated on it; after five
-    // seconds it cannot. The state is brought up to date.
-    Outcome settle(Device& device);
 
     // The best metric of the card's default routes, or, when it has none, of its routes; 0 without routes.
     Outcome readMetric(const Device& device, std::uint32_t& metric);
@@ -90,29 +97,40 @@ class Daemon {
     [[nodiscard]] bool isRadioOn() const noexcept { return radio_; }
     [[nodiscard]] bool isRadioBlocked() const noexcept { return !radioHardware_; }
     Outcome setRadio(bool on);
-    // What the card can do and sees of a network. A network that it does not see is looked for, for ten
-    // seconds at most. An empty name looks for nothing.
-    Outcome look(const Device& device, const std::string& network, WirelessFacts& facts);
+    // The networks of this name that the card hears, with their ages.
+    Outcome readHeard(const Device& device, const std::string& network, std::vector<HeardNetwork>& heard);
+    // From here on the signals of cards and profiles are taken in.
+    Outcome listen();
+    // Waits for a signal at most until the time; fails when the daemon left the bus.
+    Outcome handleSignals(Clock::time_point until) { return bus_.handleSignals(until); }
+    // The state of a card or of an active profile (activeDeactivated when it is gone), read once and then
+    // kept up to date by signals.
+    Outcome deviceState(const std::string& path, std::uint32_t& state);
+    Outcome activeState(const std::string& path, std::uint32_t& state);
+    // Why the card last failed or was switched off, since it last began anything; 0 for no reason.
+    [[nodiscard]] std::uint32_t failureOf(const std::string& device) const;
+    // Counts what changed about the networks on the air.
+    [[nodiscard]] unsigned changesOnAir() const noexcept { return changesOnAir_; }
 
   private:
-    struct Progress;
-
     Outcome call(const std::string& path, const char* interface, const char* member, Arguments arguments,
                  Message& reply, std::string* error = nullptr, std::string_view secret = {});
     Outcome readManager();
     Outcome awaitStartup();
     Outcome readProfile(const std::string& path, std::optional<Profile>& profile);
-    Outcome follow(Progress& progress, const Device& device);
-    Outcome await(Progress& progress);
-    Outcome awaitState(Device& device, std::uint32_t lowest, std::uint32_t highest,
-                       std::chrono::seconds bound, const char* late);
-    Outcome readAccessPoints(const Device& device, const std::string& network,
-                             std::vector<AccessPoint>& seen);
+    void noteDevice(const char* path, std::uint32_t state, std::uint32_t reason);
 
     Bus bus_;
+    bool isConnected_ = false;
+    bool isListening_ = false;
     bool starting_ = false;
     bool radio_ = true;
     bool radioHardware_ = true;
+    bool managerChanged_ = false;
+    unsigned changesOnAir_ = 0;
+    std::map<std::string, std::uint32_t, std::less<>> devices_;
+    std::map<std::string, std::uint32_t, std::less<>> actives_;
+    std::map<std::string, std::uint32_t, std::less<>> failures_;
 };
 
 // What a card's reason for failing means to a person.

@@ -5,9 +5,9 @@
 #include <algorithm>
 #include <array>
 #include <cstdio>
+#include <limits>
 
 #include "platform/apply/Digest.h"
-#include "platform/apply/WirelessKey.h"
 
 namespace platform::apply {
 namespace {
@@ -18,7 +18,8 @@ constexpr const char* autoconnectKey = "location-assistant.autoconnect";
 constexpr const char* radioKey = "location-assistant.radio";
 constexpr const char* none = "none";
 
-constexpr std::int32_t dhcpSeconds = 20;
+// Without an end: whoever waits has a bound of its own, and the server may come later.
+constexpr std::int32_t dhcpSeconds = std::numeric_limits<std::int32_t>::max();
 // Higher than a person's: the largest there is.
 constexpr std::int32_t highestPriority = 999;
 
@@ -100,73 +101,47 @@ void keepSecretsInside(Dictionary& section) {
     });
 }
 
-// What the access point announces; nothing without one.
-Outcome readAnnouncement(const AccessPoint* seen, std::optional<Security>& announced) {
-    if (seen == nullptr) {
-        return {};
-    }
-    if (seen->protectedAccess && !seen->preSharedKey) {
-        return {kSCStatusFailed,
-                "the network asks each user for a name and a password, which a location does not hold"};
-    }
-    announced = seen->protectedAccess ? Security::wpa : seen->privacy ? Security::wep : Security::open;
-    return {};
-}
-
-Outcome makeWireless(const WirelessSettings& settings, const WirelessFacts& facts, Sections& profile) {
-    const bool isOnIt = !facts.current.empty() && networkOf(facts.current) == settings.network;
-    if (!settings.network || (isOnIt && !settings.key)) {
-        if (facts.current.empty()) {
-            return {kSCStatusFailed, "the card is on no network and the location names none"};
-        }
-        profile.insert(facts.current.begin(), facts.current.end());
+void setWireless(const WirelessSettings& settings, const WirelessLink& link, Sections& profile) {
+    if (!link.choice) {
+        profile.insert(link.current.begin(), link.current.end());
         for (const char* const name : wirelessSectionNames) {
             if (const auto section = profile.find(name); section != profile.end()) {
                 keepSecretsInside(section->second);
             }
         }
-        return {};
+        return;
     }
-    const auto strongest =
-        std::max_element(facts.seen.begin(), facts.seen.end(),
-                         [](const AccessPoint& a, const AccessPoint& b) { return a.strength < b.strength; });
-    const AccessPoint* const seen = strongest == facts.seen.end() ? nullptr : &*strongest;
-    Security security{};
-    std::optional<Security> announced;
-    Outcome outcome = readAnnouncement(seen, announced);
-    if (outcome.ok()) {
-        outcome = chooseSecurity(announced, settings.key, security);
-    }
-    if (!outcome.ok()) {
-        return outcome;
-    }
-    const bool adHoc = seen == nullptr ? facts.canAdHoc : seen->adHoc;
-    Dictionary wireless = {{"ssid", {Bytes(settings.network->begin(), settings.network->end())}},
-                           {"mode", {std::string(adHoc ? "adhoc" : "infrastructure")}}};
-    if (seen == nullptr && !adHoc) {
+    const JoinChoice& choice = *link.choice;
+    const std::string network = settings.network.value_or("");
+    Dictionary wireless = {{"ssid", {Bytes(network.begin(), network.end())}},
+                           {"mode", {std::string(choice.isAdHoc ? "adhoc" : "infrastructure")}}};
+    if (!choice.isHeard) {
         // It may be one that does not announce its name and has to be asked for.
         wireless["hidden"] = {true};
     }
     profile["802-11-wireless"] = std::move(wireless);
-    switch (security) {
-        case Security::open:
-            break;
+    const std::string key = settings.key.value_or("");
+    switch (choice.security) {
         case Security::wep:
             profile["802-11-wireless-security"] = {{"key-mgmt", {std::string("none")}},
                                                    {"wep-key-type", {std::uint32_t{1}}},
-                                                   {"wep-key0", {*settings.key}}};
+                                                   {"wep-key0", {key}}};
             break;
         case Security::wpa:
-            profile["802-11-wireless-security"] = {{"key-mgmt", {std::string("wpa-psk")}},
-                                                   {"psk", {*settings.key}}};
-            if (adHoc) {
+            profile["802-11-wireless-security"] = {{"key-mgmt", {std::string("wpa-psk")}}, {"psk", {key}}};
+            if (choice.isAdHoc) {
                 // All that a network without an access point can agree on.
                 profile["802-11-wireless-security"].insert(
                     {{"proto", {Texts{"rsn"}}}, {"pairwise", {Texts{"ccmp"}}}, {"group", {Texts{"ccmp"}}}});
             }
             break;
+        case Security::sae:
+            profile["802-11-wireless-security"] = {{"key-mgmt", {std::string("sae")}}, {"psk", {key}}};
+            break;
+        case Security::open:
+        case Security::enterprise:
+            break;
     }
-    return {};
 }
 
 const TextMap* userData(const Sections& profile) {
@@ -232,21 +207,16 @@ std::string networkOf(const Sections& profile) {
     return ssid ? std::string(ssid->begin(), ssid->end()) : std::string();
 }
 
-Outcome makeProfile(const InterfacePlan& plan, const WirelessFacts* facts, const ProfileNote& note,
-                    Sections& profile) {
-    profile.clear();
-    const bool wireless = facts != nullptr;
-    if (wireless) {
-        Outcome outcome = makeWireless(plan.wireless.value_or(WirelessSettings()), *facts, profile);
-        if (!outcome.ok()) {
-            return outcome;
-        }
+Sections makeProfile(const InterfacePlan& plan, const WirelessLink* link, const ProfileNote& note) {
+    Sections profile;
+    if (link != nullptr) {
+        setWireless(plan.wireless.value_or(WirelessSettings()), *link, profile);
     } else {
         profile["802-3-ethernet"] = {};
     }
     profile["connection"] = {{"id", {"location-assistant " + plan.name}},
                              {"uuid", {profileUUID(plan.name)}},
-                             {"type", {std::string(wireless ? "802-11-wireless" : "802-3-ethernet")}},
+                             {"type", {std::string(link != nullptr ? "802-11-wireless" : "802-3-ethernet")}},
                              {"interface-name", {plan.name}},
                              {"autoconnect", {true}},
                              {"autoconnect-priority", {highestPriority}},
@@ -261,7 +231,7 @@ Outcome makeProfile(const InterfacePlan& plan, const WirelessFacts* facts, const
                                  {earlierKey, note.earlier.empty() ? none : note.earlier},
                                  {autoconnectKey, note.autoconnect ? "yes" : "no"},
                                  {radioKey, note.radio ? "yes" : "no"}}}}};
-    return {};
+    return profile;
 }
 
 }  // namespace platform::apply

@@ -6,8 +6,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
+#include "platform/apply/WirelessChoice.h"
 #include "platform/apply/networkmanager/Value.h"
 
 namespace platform::apply {
@@ -21,18 +21,10 @@ struct ProfileNote {
     bool operator==(const ProfileNote&) const = default;
 };
 
-// One access point, or one cell of a network without one, as the scan shows it.
-struct AccessPoint {
-    bool adHoc = false;
-    bool privacy = false;          // something is encrypted
-    bool protectedAccess = false;  // announces WPA or RSN
-    bool preSharedKey = false;     // and takes a key for all
-    unsigned strength = 0;         // in percent
-};
-
-struct WirelessFacts {
-    bool canAdHoc = false;
-    std::vector<AccessPoint> seen;  // that have the wanted network's name
+// The wireless link of a profile.
+struct WirelessLink {
+    // How the plan's network is joined; nothing keeps the link of `current`.
+    std::optional<JoinChoice> choice;
     // The sections about the wireless link of the profile that the card is on, with their secrets; empty when
     // it is on none.
     Sections current;
@@ -49,9 +41,8 @@ struct WirelessFacts {
 // The bytes of the network's name in a profile; empty when it has none.
 [[nodiscard]] std::string networkOf(const Sections& profile);
 
-// The profile for an active interface. facts is null for a wired card. Fails with 1001 when the key does not
-// fit the network, or when a card is to keep its network and has none. No reason holds the key.
-Outcome makeProfile(const InterfacePlan& plan, const WirelessFacts* facts, const ProfileNote& note,
-                    Sections& profile);
+// The profile for an active interface; link is null for a wired card.
+[[nodiscard]] Sections makeProfile(const InterfacePlan& plan, const WirelessLink* link,
+                                   const ProfileNote& note);
 
 }  // namespace platform::apply

@@ -10,11 +10,13 @@
 #include <algorithm>
 #include <atomic>
 #include <cstring>
+#include <functional>
 #include <map>
 #include <mutex>
 #include <sstream>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 namespace platform::apply {
@@ -28,10 +30,11 @@ class StandInSupplicant {
     // The networks and the air are written before the first command and read after the last.
     std::map<int, Network> networks;
     std::string scanResults = "bssid / frequency / signal level / flags / ssid\n";
-    std::string seenAfterScan;
+    std::string heardLater;  // once a network is looked for
+    int age = 0;             // of everything heard, in seconds
     // What joining comes to: a notice, and whether the card then is on the network.
     std::string notice = "<3>CTRL-EVENT-CONNECTED";
-    bool joins = true;
+    std::function<bool(const Network&)> joins = [](const Network&) { return true; };
 
     explicit StandInSupplicant(const std::string& path) : path_(path) {
         sockaddr_un address{};
@@ -82,11 +85,9 @@ class StandInSupplicant {
             send("<3>a notice at any time");
             send(answer(command));
             if (command.compare(0, 14, "SELECT_NETWORK") == 0) {
-                send(notice);
-            } else if (command == "SCAN") {
-                send("<3>CTRL-EVENT-SCAN-STARTED ");
-                scanResults += seenAfterScan;
+                scanResults += std::exchange(heardLater, "");
                 send("<3>CTRL-EVENT-SCAN-RESULTS ");
+                send(notice);
             }
         }
     }
@@ -125,7 +126,7 @@ class StandInSupplicant {
             for (auto& [other, network] : networks) {
                 network.isDisabled = other != number;
             }
-            current_ = joins ? number : -1;
+            current_ = joins(networks[number]) ? number : -1;
         } else if (name == "ENABLE_NETWORK") {
             networks[number].isDisabled = false;
         } else if (name == "REMOVE_NETWORK") {
@@ -142,8 +143,8 @@ class StandInSupplicant {
             return list;
         } else if (name == "SCAN_RESULTS") {
             return scanResults;
-        } else if (name == "GET_CAPABILITY") {
-            return "IBSS AP";
+        } else if (name == "BSS") {
+            return "id=1\nage=" + std::to_string(age) + "\n";
         } else if (name == "STATUS") {
             return current_ < 0 ? "wpa_state=SCANNING\n"
                                 : "bssid=02:00:00:00:00:01\nid=" + std::to_string(current_) +

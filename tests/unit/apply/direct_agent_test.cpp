@@ -113,6 +113,39 @@ void expectOk(const Outcome& outcome) {
     EXPECT_TRUE(outcome.ok()) << outcome.reason();
 }
 
+// One task at a time, to its end.
+Task runTask(Agent& agent, const Captured& before, const InterfacePlan* plan) {
+    std::vector<Task> tasks{{&before, plan, {}, {}}};
+    const Clock::time_point deadline = Clock::now() + std::chrono::seconds(10);
+    agent.start(tasks, deadline);
+    EXPECT_TRUE(agent.settle(deadline));
+    return tasks[0];
+}
+
+void takeOver(Agent& agent, const InterfacePlan& plan, const Captured& before) {
+    const Task task = runTask(agent, before, &plan);
+    expectOk(task.refusal);
+    EXPECT_EQ("", task.trouble);
+}
+
+void giveBack(Agent& agent, const Captured& before) {
+    const Task task = runTask(agent, before, nullptr);
+    expectOk(task.refusal);
+    EXPECT_EQ("", task.trouble);
+}
+
+std::vector<Captured> capture(Agent& agent, const std::vector<std::string>& cards) {
+    std::vector<Captured> captured;
+    std::vector<Trouble> leftAlone;
+    expectOk(agent.capture(cards, captured, leftAlone));
+    return captured;
+}
+
+// What a commit that changes nothing asks for.
+Outcome activate(CFDictionaryRef root) {
+    return applyTree(root, root);
+}
+
 struct Earlier {
     const char* name;
     const char* commands;
@@ -149,14 +182,12 @@ TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
             shell(earlier.commands);
             const std::string before = machineState();
             const auto agent = makeDirectAgent();
-            const std::vector<std::string> cards{"card0", "card1", "missing"};
-            std::vector<Captured> captured;
-            expectOk(agent->capture(cards, captured));
+            const std::vector<Captured> captured = capture(*agent, {"card0", "card1", "missing"});
             ASSERT_EQ(2U, captured.size());
             InterfacePlan plan = printerPlan("card0");
             plan.nameServers = {address(192, 0, 0, 53)};
-            expectOk(agent->takeOver(plan, captured[0]));
-            expectOk(agent->takeOver(offPlan("card1"), captured[1]));
+            takeOver(*agent, plan, captured[0]);
+            takeOver(*agent, offPlan("card1"), captured[1]);
             const std::string made = machineState();
             EXPECT_NE(before, made);
             EXPECT_EQ("192.0.0.199/24 \n", addressesOf("card0"));
@@ -164,12 +195,12 @@ TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
                       shell("ip route get 192.0.0.192"));
             EXPECT_EQ("default via 192.0.0.192 dev card0 proto 76 \n", defaultRoutes());
             EXPECT_EQ("", shell("ip -br addr show up dev card1"));
-            expectOk(agent->takeOver(plan, captured[0]));
-            expectOk(agent->takeOver(offPlan("card1"), captured[1]));
+            takeOver(*agent, plan, captured[0]);
+            takeOver(*agent, offPlan("card1"), captured[1]);
             EXPECT_EQ(made, machineState());
             for (const Captured& one : captured) {
-                expectOk(agent->giveBack(one));
-                expectOk(agent->giveBack(one));
+                giveBack(*agent, one);
+                giveBack(*agent, one);
             }
             EXPECT_EQ(before, machineState());
         });
@@ -195,24 +226,24 @@ TEST_F(DirectAgentTest, AProcessThatEndsAnywhereLeavesTheWayBack) {
                 "dict>";
             const auto there = makeTree({{"card1", switchedOff}, card0});
             const auto back = makeTree({});
-            expectOk(applyTree(there.get()));
+            expectOk(activate(there.get()));
             const std::string made = machineState();
-            expectOk(applyTree(back.get()));
+            expectOk(activate(back.get()));
             for (const bool isGoing : {true, false}) {
                 bool wasEnded = true;
                 int step = 0;
                 for (; wasEnded && !testing::Test::HasFailure(); ++step) {
                     SCOPED_TRACE((isGoing ? "going, step " : "coming back, step ") + std::to_string(step));
                     if (!isGoing) {
-                        expectOk(applyTree(there.get()));
+                        expectOk(activate(there.get()));
                     }
                     wasEnded = testing_support::endBeforeStep(
-                        step, [&] { (void)applyTree(isGoing ? there.get() : back.get()); });
+                        step, [&] { (void)activate(isGoing ? there.get() : back.get()); });
                     if (isGoingOn) {
-                        expectOk(applyTree(isGoing ? there.get() : back.get()));
+                        expectOk(activate(isGoing ? there.get() : back.get()));
                         EXPECT_EQ(isGoing ? made : before, machineState());
                     }
-                    expectOk(applyTree(back.get()));
+                    expectOk(activate(back.get()));
                     EXPECT_EQ(before, machineState());
                     EXPECT_EQ("", shell("ls " + currentHost().runtimeDirectory +
                                         " | grep -v -e lock$ -e new$ || true"));
@@ -245,9 +276,9 @@ TEST_F(DirectAgentTest, LeavesAnInterfaceThatSomebodyElseTookOver) {
             shell(
                 "ip addr add 10.1.0.5/24 dev card0; ip link set card0 up; ip route add default via 10.1.0.1");
             const auto there = makeTree({fixedService("card0")});
-            expectOk(applyTree(there.get()));
+            expectOk(activate(there.get()));
             shell(row.theirs);
-            expectOk(applyTree(makeTree({}).get()));
+            expectOk(activate(makeTree({}).get()));
             EXPECT_EQ(row.addresses, addressesOf("card0"));
             EXPECT_EQ(row.routes, defaultRoutes());
         });
@@ -324,24 +355,22 @@ TEST_F(DirectAgentTest, TakesALeaseAndGivesItBack) {
         const DhcpServer server(dnsmasq);
         const std::string before = machineState();
         const auto agent = makeDirectAgent();
-        const std::vector<std::string> cards{"card0"};
-        std::vector<Captured> captured;
-        expectOk(agent->capture(cards, captured));
+        const std::vector<Captured> captured = capture(*agent, {"card0"});
         ASSERT_EQ(1U, captured.size());
         InterfacePlan plan;
         plan.name = "card0";
         plan.active = true;
         plan.method = IPv4Method::dhcp;
         plan.dhcpClientID = "a client";
-        expectOk(agent->takeOver(plan, captured[0]));
+        takeOver(*agent, plan, captured[0]);
         EXPECT_EQ("10.50.0.10/24 \n", addressesOf("card0"));
         EXPECT_EQ("default via 10.50.0.1 dev card0 proto 76 \n", defaultRoutes());
         EXPECT_EQ("search example.org\nnameserver 10.50.0.53\n", shell("grep -v '^#' /etc/resolv.conf"));
-        expectOk(agent->takeOver(plan, captured[0]));
+        takeOver(*agent, plan, captured[0]);
         EXPECT_EQ((std::vector<std::string>{"DHCPDISCOVER", "DHCPREQUEST", "DHCPACK"}),
                   DhcpServer::messages());
 
-        expectOk(agent->giveBack(captured[0]));
+        giveBack(*agent, captured[0]);
         EXPECT_EQ("DHCPRELEASE", DhcpServer::messages().back());
         EXPECT_EQ(before, machineState());
         EXPECT_EQ("/run/real\n", shell("readlink /etc/resolv.conf"));
@@ -355,9 +384,10 @@ TEST_F(DirectAgentTest, WritesANameServersFileThatIsAMountInPlace) {
             "echo nameserver 9.9.9.9 > /run/outer; chmod 640 /run/outer; touch /etc/resolv.conf;"
             "mount --bind /run/outer /etc/resolv.conf");
         const std::string before = machineState();
-        expectOk(bringNameServers("card0", 0, {{address(10, 0, 0, 53)}, {}}));
+        std::string trouble;
+        expectOk(setInterfaceNameServers("card0", 0, {{address(10, 0, 0, 53)}, {}}, trouble));
         EXPECT_EQ("nameserver 10.0.0.53\n", shell("grep -v '^#' /run/outer"));
-        expectOk(bringNameServers("card0", 0, {}));
+        expectOk(setInterfaceNameServers("card0", 0, {}, trouble));
         EXPECT_EQ(before, machineState());
     });
 }
@@ -378,7 +408,7 @@ TEST_F(DirectAgentTest, JoinsANetworkThroughTheSupplicant) {
         mkdir("/run/wpa_supplicant", 0700);
         StandInSupplicant supplicant("/run/wpa_supplicant/card0");
         supplicant.networks[4] = {{{"ssid", "\"home\""}}, false};
-        expectOk(applyTree(there.get()));
+        expectOk(activate(there.get()));
         EXPECT_EQ(5, supplicant.current());
         EXPECT_EQ("\"CANARYCANARY\"", supplicant.networks[5].values["psk"]);
         EXPECT_EQ("", shell("grep -rl -e CANARY -e Q0FOQVJZ " + currentHost().runtimeDirectory + " || true"));
@@ -386,10 +416,10 @@ TEST_F(DirectAgentTest, JoinsANetworkThroughTheSupplicant) {
         supplicant.changes();
         Service other = printerNetwork();
         other.entries.replace(other.entries.find("192.0.0.199"), 11, "192.0.0.200");
-        expectOk(applyTree(makeTree({other}).get()));
+        expectOk(activate(makeTree({other}).get()));
         EXPECT_EQ(std::vector<std::string>{}, supplicant.changes());
         EXPECT_EQ("192.0.0.200/24 \n", addressesOf("card0"));
-        expectOk(applyTree(back.get()));
+        expectOk(activate(back.get()));
         EXPECT_EQ(1U, supplicant.networks.size());
         EXPECT_FALSE(supplicant.networks[4].isDisabled);
         EXPECT_EQ(before, machineState());
@@ -413,14 +443,20 @@ TEST_F(DirectAgentTest, TalksToARealSupplicant) {
         expectOk(readKnownNetworks("card0", before));
         ASSERT_TRUE(before);
         EXPECT_EQ(std::vector<int>{0}, before->enabled);
-        const auto soon = std::chrono::steady_clock::now() + std::chrono::milliseconds(300);
-        EXPECT_EQ("the wireless supplicant did not get onto the network in time",
-                  joinNetwork("card0", {{}, "printer", "p\"ss wörd"}, false, soon).reason());
+        std::unique_ptr<WirelessJoin> join;
+        WirelessJoin::State state{};
+        std::string reason;
+        expectOk(joinBySupplicant("card0", {{}, "printer", "p\"ss wörd"}, false, join));
+        ASSERT_TRUE(join);
+        expectOk(join->poll(state, reason));
+        EXPECT_EQ(WirelessJoin::State::waiting, state);
+        EXPECT_EQ("the network was not found", reason);
         std::optional<KnownNetworks> now;
         expectOk(readKnownNetworks("card0", now));
         EXPECT_EQ((std::vector<int>{0, 1}), now->all);
         EXPECT_EQ(std::vector<int>{1}, now->enabled);
-        expectOk(leaveNetwork("card0", before));
+        expectOk(leaveBySupplicant("card0", before, join));
+        EXPECT_FALSE(join);
         expectOk(readKnownNetworks("card0", now));
         EXPECT_EQ(before->all, now->all);
         EXPECT_EQ(before->enabled, now->enabled);

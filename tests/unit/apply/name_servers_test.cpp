@@ -31,8 +31,10 @@ class NameServersTest : public testing::Test {
         EXPECT_TRUE(makeRuntimeDirectory().ok());
     }
     void bring(const std::string& interface, unsigned rank, const NameService& service) {
-        const Outcome done = bringNameServers(interface, rank, service);
+        std::string trouble;
+        const Outcome done = setInterfaceNameServers(interface, rank, service, trouble);
         EXPECT_TRUE(done.ok()) << done.reason();
+        EXPECT_EQ("", trouble);
     }
     // The lines that a resolver reads; kind, mode and content in one.
     std::string content() {

@@ -92,7 +92,7 @@ class MoreSCFTest : public testing::Test {
         made.networkModemScripts = directory.at("scripts/network");
         made.localModemScripts = directory.at("scripts/local");
         made.systemModemScripts = directory.at("scripts/system");
-        made.agent = agent;
+        made.agents = {agent};
         return made;
     }
 

@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <chrono>
 #include <csignal>
+#include <ctime>
 #include <stdexcept>
 #include <utility>
 
@@ -45,6 +46,12 @@ Sections pick(const Sections& sections, bool secrets) {
 
 std::string idOf(const Sections& sections) {
     return valueOf<std::string>(sections.at("connection"), "id").value_or("");
+}
+
+std::int64_t secondsSinceStart() {
+    timespec now{};
+    clock_gettime(CLOCK_BOOTTIME, &now);
+    return now.tv_sec;
 }
 
 int fail(sd_bus_message* call, const std::string& name, const std::string& message) {
@@ -96,6 +103,31 @@ PrivateBus::PrivateBus() {
 PrivateBus::~PrivateBus() {
     kill(process_, SIGKILL);
     waitpid(process_, nullptr, 0);
+}
+
+StandInDaemon::Forger::Forger(const std::string& socket) {
+    if (sd_bus_new(&bus_) < 0 || sd_bus_set_address(bus_, ("unix:path=" + socket).c_str()) < 0 ||
+        sd_bus_set_bus_client(bus_, 1) < 0 || sd_bus_start(bus_) < 0) {
+        throw std::runtime_error("no place on the bus");
+    }
+    thread_ = std::thread([this] {
+        while (!stop_) {
+            for (std::size_t number = 1; number < 6; ++number) {
+                sd_bus_emit_signal(bus_, pathOf("ActiveConnection", number).c_str(),
+                                   (prefix + ".Connection.Active").c_str(), "StateChanged", "uu", 2U, 0U);
+            }
+            sd_bus_flush(bus_);
+            while (sd_bus_process(bus_, nullptr) > 0) {
+            }
+            std::this_thread::sleep_for(std::chrono::milliseconds(20));
+        }
+    });
+}
+
+StandInDaemon::Forger::~Forger() {
+    stop_ = true;
+    thread_.join();
+    sd_bus_flush_close_unref(bus_);
 }
 
 StandInDaemon::StandInDaemon(const std::string& socket, std::vector<Card> theCards)
@@ -228,7 +260,7 @@ int StandInDaemon::settings(sd_bus_message* call, const std::string& member) {
     const std::string uuid = valueOf<std::string>(sections["connection"], "uuid").value_or("");
     const bool known = std::any_of(profiles_.begin(), profiles_.end(),
                                    [&uuid](const auto& each) { return each.second.uuid == uuid; });
-    if (!wrong.empty() || known || flags != (0x2 | 0x20)) {
+    if (!wrong.empty() || known || (flags & ~0x20U) != 0x2) {
         return fail(call, prefix + ".Settings.Connection.InvalidProperty", known ? "the UUID exists" : wrong);
     }
     changes.push_back("AddConnection2 " + idOf(sections));
@@ -280,17 +312,6 @@ int StandInDaemon::cardCall(sd_bus_message* call, const std::string& member, std
             return result < 0 ? result : sd_bus_message_close_container(m);
         });
     }
-    if (member == "RequestScan") {
-        later_.emplace_back([this, number] {
-            ++lastScan_;
-            for (Point& point : cards[number].points) {
-                point.announced = true;
-            }
-            sd_bus_emit_signal(bus_, pathOf("Devices", number).c_str(), "org.freedesktop.DBus.Properties",
-                               "PropertiesChanged", "sa{sv}as", (prefix + ".Device.Wireless").c_str(), 0, 0);
-        });
-        return reply(call);
-    }
     if (card.active.empty()) {
         return fail(call, prefix + ".Device.NotActive", "This device is not active");
     }
@@ -316,6 +337,10 @@ int StandInDaemon::activate(sd_bus_message* call) {
     actives_[path] = {number, profile, 1};
     card.active = path;
     card.autoconnect = true;
+    // A network that keeps quiet is heard once it is asked for.
+    for (Point& point : card.points) {
+        point.announced = true;
+    }
     const int result =
         reply(call, [&](sd_bus_message* m) { return sd_bus_message_append(m, "o", path.c_str()); });
     signalCard(number, 40, 0);
@@ -349,6 +374,10 @@ void StandInDaemon::finish(const std::string& path) {
     const auto own =
         valueOf<std::int64_t>(profiles_[actives_[path].profile].sections["ipv4"], "route-metric");
     card.metric = own && *own >= 0 ? static_cast<unsigned>(*own) : highest + 1;
+    signalCard(number, 70, 0);
+    if (card.hangs) {
+        return;
+    }
     signalCard(number, 100, 0);
     signalActive(path, 2);
 }
@@ -396,6 +425,8 @@ Dictionary StandInDaemon::describe(const std::string& path, const std::string& i
                 {"Mode", {point.adHoc ? 1U : 2U}},
                 {"Flags", {point.privacy ? 1U : 0U}},
                 {"RsnFlags", {point.protection}},
+                {"LastSeen", {static_cast<std::int32_t>(secondsSinceStart() - point.age)}},
+                {"Frequency", {2412U}},
                 {"Strength", {50U}}};
     }
     if (path.find("/Devices/") == std::string::npos && path.find("/IP4Config/") == std::string::npos) {
@@ -409,7 +440,7 @@ Dictionary StandInDaemon::describe(const std::string& path, const std::string& i
                                            {"metric", {std::uint32_t{card.metric}}}}}}}};
     }
     if (interface == prefix + ".Device.Wireless") {
-        return {{"WirelessCapabilities", {card.capabilities}}, {"LastScan", {lastScan_}}};
+        return {{"WirelessCapabilities", {card.capabilities}}, {"LastScan", {std::int64_t{1}}}};
     }
     return {{"DeviceType", {card.type}},
             {"State", {card.state}},

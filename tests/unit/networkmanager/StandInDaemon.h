@@ -40,7 +40,8 @@ class StandInDaemon {
         bool adHoc = false;
         bool privacy = false;
         std::uint32_t protection = 0;
-        bool announced = true;  // false: seen only after a scan for it
+        bool announced = true;  // false: heard only once it is looked for
+        int age = 0;            // seconds since it was heard
     };
     struct Card {
         std::string name;
@@ -52,8 +53,23 @@ class StandInDaemon {
         std::vector<Point> points = {};
         std::uint32_t failure = 0;  // the reason for which activations fail; 0: they succeed
         bool external = false;
+        bool hangs = false;       // activations get no address
         std::string active = {};  // a path
         unsigned metric = 0;
+    };
+
+    // Somebody on the same bus who keeps sending that every activation has succeeded.
+    class Forger {
+      public:
+        explicit Forger(const std::string& socket);
+        ~Forger();
+        Forger(const Forger&) = delete;
+        Forger& operator=(const Forger&) = delete;
+
+      private:
+        sd_bus* bus_ = nullptr;
+        std::atomic<bool> stop_ = false;
+        std::thread thread_;
     };
 
     StandInDaemon(const std::string& socket, std::vector<Card> cards);
@@ -107,7 +123,6 @@ class StandInDaemon {
     std::map<std::string, Active> actives_;
     std::vector<std::function<void()>> later_;
     unsigned next_ = 0;
-    std::int64_t lastScan_ = 1;
     std::atomic<bool> stop_ = false;
     std::thread thread_;
 };

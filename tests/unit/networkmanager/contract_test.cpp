@@ -35,10 +35,11 @@ class Contract : public ::testing::Test {
         }
         override_ = std::make_unique<HostOverride>(host);
         ASSERT_TRUE(daemon_.connect().ok());
+        ASSERT_TRUE(daemon_.listen().ok());
         for (const char* interface : {"eth0", "wlan0"}) {
             const Device card = device(interface);
             EXPECT_TRUE(daemon_.setManaged(card, true).ok());
-            EXPECT_TRUE(daemon_.disconnect(card).ok());
+            disconnect(interface);
             EXPECT_TRUE(daemon_.setAutoconnect(card, true).ok());
         }
         agent_ = makeNetworkManagerAgent();
@@ -60,9 +61,26 @@ class Contract : public ::testing::Test {
     // Somebody's profile, activated.
     std::string use(const std::string& uuid, const char* interface, const char* address) {
         const std::string path = add(uuid, interface, address);
-        const Outcome outcome = daemon_.activate(path, device(interface));
-        EXPECT_TRUE(outcome.ok()) << outcome.reason();
+        activate(path, interface);
         return path;
+    }
+    void activate(const std::string& path, const char* interface) {
+        std::string active;
+        std::uint32_t state = 0;
+        const Outcome outcome = daemon_.activate(path, device(interface), active);
+        EXPECT_TRUE(outcome.ok()) << outcome.reason();
+        while (state != activeActivated && daemon_.activeState(active, state).ok() &&
+               daemon_.handleSignals(Clock::now() + std::chrono::milliseconds(20)).ok()) {
+        }
+    }
+    void disconnect(const char* interface) {
+        const Device card = device(interface);
+        std::uint32_t state = 0;
+        EXPECT_TRUE(daemon_.disconnect(card).ok());
+        do {
+            EXPECT_TRUE(daemon_.handleSignals(Clock::now() + std::chrono::milliseconds(20)).ok());
+            state = device(interface).state;
+        } while (state > deviceDisconnected);
     }
     std::string add(const std::string& uuid, const char* interface, const char* address) {
         Sections sections = {
@@ -81,7 +99,7 @@ class Contract : public ::testing::Test {
                    {{"address", {std::string(address)}}, {"prefix", {std::uint32_t{24}}}}}}}}},
             {"ipv6", {{"method", {std::string("disabled")}}, {"route-metric", {std::int64_t{1}}}}}};
         std::string path;
-        const Outcome outcome = daemon_.addProfile(sections, {}, path);
+        const Outcome outcome = daemon_.addProfile(sections, Adding::heldBack, {}, path);
         EXPECT_TRUE(outcome.ok()) << outcome.reason();
         return path;
     }
@@ -101,17 +119,31 @@ class Contract : public ::testing::Test {
     }
     std::vector<Captured> capture(const std::vector<std::string>& interfaces) {
         std::vector<Captured> captured;
-        const Outcome outcome = agent_->capture(interfaces, captured);
+        std::vector<Trouble> leftAlone;
+        const Outcome outcome = agent_->capture(interfaces, captured, leftAlone);
         EXPECT_TRUE(outcome.ok()) << outcome.reason();
+        EXPECT_TRUE(leftAlone.empty());
         return captured;
     }
-    void takeOver(const InterfacePlan& plan, const Captured& before) {
-        const Outcome outcome = agent_->takeOver(plan, before);
-        EXPECT_TRUE(outcome.ok()) << outcome.reason();
+    // One task at a time, to its end or for as long as it may take.
+    Task run(const Captured& before, const InterfacePlan* plan,
+             std::chrono::milliseconds bound = std::chrono::seconds(10)) {
+        std::vector<Task> tasks{{&before, plan, {}, {}}};
+        const Clock::time_point deadline = Clock::now() + bound;
+        agent_->start(tasks, deadline);
+        while (!agent_->settle(deadline)) {
+        }
+        return tasks[0];
     }
-    void giveBack(const Captured& before) {
-        const Outcome outcome = agent_->giveBack(before);
-        EXPECT_TRUE(outcome.ok()) << outcome.reason();
+    void takeOver(const InterfacePlan& plan, const Captured& before) {
+        const Task task = run(before, &plan);
+        EXPECT_TRUE(task.refusal.ok()) << task.refusal.reason();
+        EXPECT_EQ(task.trouble, "");
+    }
+    std::string giveBack(const Captured& before) {
+        const Task task = run(before, nullptr);
+        EXPECT_TRUE(task.refusal.ok()) << task.refusal.reason();
+        return task.trouble;
     }
     static InterfacePlan on(const char* interface, const char* address = "192.0.0.199") {
         InterfacePlan plan = off(interface);
@@ -144,7 +176,7 @@ TEST_F(Contract, capturesInTheOrderOfTheWayBack) {
     EXPECT_EQ(captured[0].interface, "wlan0");
     EXPECT_EQ(state("eth0") + state("wlan0"), before);
 
-    EXPECT_TRUE(daemon_.disconnect(device("eth0")).ok());
+    disconnect("eth0");
     captured = capture({"wlan0", "eth0"});
     ASSERT_EQ(captured.size(), 2U);
     EXPECT_EQ(captured[0].interface, "eth0") << "what has no route comes first";
@@ -182,8 +214,10 @@ TEST_F(Contract, offAndOnAndBack) {
     takeOver(off("eth0"), captured);
     giveBack(captured);
     EXPECT_EQ(state("eth0"), desk);
-    takeOver(off("nosuch0"), captured);
-    EXPECT_EQ(agent_->takeOver(on("nosuch0"), captured).status(), kSCStatusFailed);
+    const Captured missing{"nosuch0", captured.state};
+    takeOver(off("nosuch0"), missing);
+    const InterfacePlan plan = on("nosuch0");
+    EXPECT_EQ(run(missing, &plan).trouble, "there is no such interface");
 }
 
 TEST_F(Contract, idleCards) {
@@ -218,18 +252,19 @@ TEST_F(Contract, whatOthersDidMeanwhile) {
     EXPECT_EQ(state("eth0"), room) << "somebody activated another profile";
     EXPECT_FALSE(exists(profileUUID("eth0")));
 
-    EXPECT_TRUE(daemon_.activate(path, device("eth0")).ok());
+    activate(path, "eth0");
     takeOver(on("eth0"), captured);
     EXPECT_TRUE(daemon_.deleteProfile(path).ok());
-    giveBack(captured);
-    EXPECT_EQ(state("eth0"), "nothing") << "somebody deleted the earlier profile";
+    EXPECT_EQ(giveBack(captured), "the profile that was active on it is deleted");
+    EXPECT_EQ(state("eth0"), "nothing");
     EXPECT_FALSE(exists(profileUUID("eth0")));
 }
 
 TEST_F(Contract, anothersProfileUnderOurUUID) {
     const Captured captured = capture({"eth0"}).at(0);
     add(profileUUID("eth0"), "eth0", "10.20.30.5");
-    EXPECT_EQ(agent_->takeOver(on("eth0"), captured).status(), kSCStatusFailed);
+    const InterfacePlan plan = on("eth0");
+    EXPECT_EQ(run(captured, &plan).refusal.status(), kSCStatusFailed);
     giveBack(captured);
     EXPECT_TRUE(exists(profileUUID("eth0")));
 }
@@ -239,40 +274,55 @@ TEST_F(Contract, wirelessProfilesAreJudged) {
     const std::string canary = "canary-e7c1";
     InterfacePlan plan = on("eth0");
     plan.wireless.emplace().network = "Printer";
-    for (const AccessPoint& point :
-         {AccessPoint{}, AccessPoint{true}, AccessPoint{false, true}, AccessPoint{false, true, true, true},
-          AccessPoint{true, true, true, true}}) {
-        WirelessFacts facts;
-        facts.seen = {point};
-        plan.wireless->key = point.protectedAccess ? canary : "abcde";
-        Sections sections;
-        ASSERT_TRUE(makeProfile(plan, &facts, {}, sections).ok());
+    for (const HeardNetwork& heard : {HeardNetwork{}, HeardNetwork{true}, HeardNetwork{false, Security::wep},
+                                      HeardNetwork{false, Security::wpa}, HeardNetwork{true, Security::wpa},
+                                      HeardNetwork{false, Security::sae}}) {
+        plan.wireless->key.reset();
+        if (heard.security != Security::open) {
+            plan.wireless->key = heard.security == Security::wep ? "abcde" : canary;
+        }
+        const WirelessLink link{chooseNetwork({&heard, 1}, plan.wireless->key).choice, {}};
+        Sections sections = makeProfile(plan, &link, {});
         std::string path;
-        Outcome outcome = daemon_.addProfile(sections, *plan.wireless->key, path);
+        Outcome outcome =
+            daemon_.addProfile(sections, Adding::heldBack, plan.wireless->key.value_or(""), path);
         EXPECT_TRUE(outcome.ok()) << outcome.reason();
         EXPECT_TRUE(daemon_.deleteProfile(path).ok());
 
         sections["802-11-wireless-security"] = {{"key-mgmt", {canary}}};
-        outcome = daemon_.addProfile(sections, canary, path);
+        outcome = daemon_.addProfile(sections, Adding::heldBack, canary, path);
         EXPECT_FALSE(outcome.ok());
         EXPECT_EQ(outcome.reason().find(canary), std::string::npos) << outcome.reason();
     }
 }
 
-TEST_F(Contract, cardsThatWereNeverTakenOverMakeWay) {
+// In the order of the capture, whatever is active already: the daemon numbers the routes by that order.
+TEST_F(Contract, cardsComeBackInTheirOrder) {
     use(desk, "eth0", "10.20.30.3");
     use(room, "wlan0", "10.20.30.2");
     const std::vector<Captured> captured = capture({"wlan0", "eth0"});
     ASSERT_EQ(captured.at(0).interface, "eth0");
+    for (const bool isSecondAway : {false, true}) {
+        takeOver(off("eth0"), captured[0]);
+        if (isSecondAway) {
+            takeOver(on("wlan0"), captured[1]);
+        }
+        std::vector<Task> tasks{{captured.data(), nullptr, {}, {}}, {&captured[1], nullptr, {}, {}}};
+        const Clock::time_point deadline = Clock::now() + std::chrono::seconds(10);
+        agent_->start(tasks, deadline);
+        EXPECT_TRUE(agent_->settle(deadline));
+        std::uint32_t first = 0;
+        std::uint32_t second = 0;
+        EXPECT_TRUE(daemon_.readMetric(device("eth0"), first).ok());
+        EXPECT_TRUE(daemon_.readMetric(device("wlan0"), second).ok());
+        EXPECT_LT(first, second);
+        EXPECT_EQ(state("eth0") + state("wlan0"), desk + room);
+    }
+    // One that is not given back in this run stays as it is.
     takeOver(on("eth0"), captured[0]);
-    giveBack(captured[0]);
-    giveBack(captured[1]);
-    std::uint32_t first = 0;
-    std::uint32_t second = 0;
-    EXPECT_TRUE(daemon_.readMetric(device("eth0"), first).ok());
-    EXPECT_TRUE(daemon_.readMetric(device("wlan0"), second).ok());
-    EXPECT_LT(first, second);
-    EXPECT_EQ(state("wlan0"), room);
+    const std::string active = activePath("wlan0");
+    EXPECT_EQ(giveBack(captured[0]), "");
+    EXPECT_EQ(activePath("wlan0"), active);
 }
 
 }  // namespace

@@ -1,6 +1,8 @@
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
 
+#include <limits>
+
 #include "platform/apply/networkmanager/Profile.h"
 #include "tests/unit/networkmanager/Verify.h"
 
@@ -38,10 +40,8 @@ std::optional<T> in(const Sections& profile, const char* section, const char* ke
     return found == profile.end() ? std::nullopt : valueOf<T>(found->second, key);
 }
 
-Sections made(const InterfacePlan& plan, const WirelessFacts* facts = nullptr, const ProfileNote& note = {}) {
-    Sections profile;
-    const Outcome outcome = makeProfile(plan, facts, note, profile);
-    EXPECT_TRUE(outcome.ok()) << outcome.reason();
+Sections made(const InterfacePlan& plan, const WirelessLink* link = nullptr, const ProfileNote& note = {}) {
+    Sections profile = makeProfile(plan, link, note);
     EXPECT_EQ(verifyProfile(profile), "");
     return profile;
 }
@@ -76,7 +76,7 @@ TEST(Profile, addresses) {
     plan.dhcpClientID = "mac";  // a word of NetworkManager's, but free text here
     profile = made(plan);
     EXPECT_EQ(in<std::string>(profile, "ipv4", "dhcp-client-id"), "00:6d:61:63");
-    EXPECT_EQ(in<std::int32_t>(profile, "ipv4", "dhcp-timeout"), 20);
+    EXPECT_EQ(in<std::int32_t>(profile, "ipv4", "dhcp-timeout"), std::numeric_limits<std::int32_t>::max());
     EXPECT_EQ(in<bool>(profile, "ipv4", "ignore-auto-dns"), true);
     EXPECT_EQ(in<bool>(profile, "ipv4", "may-fail"), false);
     EXPECT_EQ(in<std::string>(profile, "ipv4", "gateway"), std::nullopt);
@@ -97,76 +97,78 @@ TEST(Profile, isFoundAgain) {
     }
 }
 
-TEST(Profile, wirelessSecurity) {
-    constexpr AccessPoint open{false, false, false, false, 50};
-    constexpr AccessPoint wep{false, true, false, false, 50};
-    constexpr AccessPoint wpa{false, true, true, true, 50};
-    constexpr AccessPoint enterprise{false, true, true, false, 50};
-    constexpr AccessPoint cell{true, false, false, false, 90};
-    constexpr AccessPoint wpaCell{true, true, true, true, 90};
-    const std::string none;
+// What is joined of what is on the air, and as what the daemon is told to join it.
+TEST(Profile, joinsByTheKeyAndByWhatIsOnTheAir) {
+    const HeardNetwork open{false, Security::open, 50};
+    const HeardNetwork wep{false, Security::wep, 90};
+    const HeardNetwork wpa{false, Security::wpa, 50};
+    const HeardNetwork sae{false, Security::sae, 50};
+    const HeardNetwork enterprise{false, Security::enterprise, 50};
+    const HeardNetwork cell{true, Security::open, 90, 2462};
+    const HeardNetwork oldCell{true, Security::open, 90, 2462, "", oldestCell + std::chrono::seconds(1)};
+    const HeardNetwork wpaCell{true, Security::wpa, 90, 2462};
+    const char* const adHoc = "adhoc";
+    const char* const point = "infrastructure";
     const struct {
         const char* what;
-        std::vector<AccessPoint> seen;
-        bool canAdHoc;
+        std::vector<HeardNetwork> heard;
         std::optional<std::string> key;
-        const char* mode;      // null: refused
+        const char* mode;      // null: nothing is joined
         const char* security;  // key-mgmt; null for none
+        bool hidden = false;
     } rows[] = {
-        {"open", {open}, true, {}, "infrastructure", nullptr},
-        {"open, with a key that nobody asks for", {open}, true, canary, "infrastructure", nullptr},
-        {"an open cell", {cell}, false, {}, "adhoc", nullptr},
-        {"the strongest counts", {open, cell}, false, {}, "adhoc", nullptr},
-        {"WEP, 5 characters", {wep}, false, "abcde", "infrastructure", "none"},
-        {"WEP, 13 characters", {wep}, false, "abcdefghijklm", "infrastructure", "none"},
-        {"WEP, 10 digits", {wep}, false, "0123456789", "infrastructure", "none"},
-        {"WEP, 26 digits", {wep}, false, "0123456789abcdefABCDEF0123", "infrastructure", "none"},
-        {"WEP, 10 characters that are no digits", {wep}, false, "canary-xyz", nullptr, nullptr},
-        {"WEP, 11 characters", {wep}, false, canary, nullptr, nullptr},
-        {"WEP, 5 bytes that are no characters", {wep}, false, "caf\xc3\xa9", nullptr, nullptr},
-        {"WEP without a key", {wep}, false, {}, nullptr, nullptr},
-        {"WPA, 8 characters", {wpa}, false, "abcdefgh", "infrastructure", "wpa-psk"},
-        {"WPA, 63 characters", {wpa}, false, std::string(63, 'k'), "infrastructure", "wpa-psk"},
-        {"WPA, 64 digits", {wpa}, false, std::string(64, 'a'), "infrastructure", "wpa-psk"},
-        {"WPA, a key that looks like WEP's", {wpa}, false, "0123456789", "infrastructure", "wpa-psk"},
-        {"WPA, 7 characters", {wpa}, false, "canary7", nullptr, nullptr},
-        {"WPA, 64 characters", {wpa}, false, std::string(64, 'k'), nullptr, nullptr},
-        {"WPA without a key", {wpa}, false, {}, nullptr, nullptr},
-        {"a cell with WPA", {wpaCell}, true, canary, "adhoc", "wpa-psk"},
-        {"a name and a password for each user", {enterprise}, false, canary, nullptr, nullptr},
-        {"unseen, the card can be a cell", {}, true, {}, "adhoc", nullptr},
-        {"unseen, the card cannot", {}, false, {}, "infrastructure", nullptr},
-        {"unseen, WEP by its form", {}, false, "0123456789", "infrastructure", "none"},
-        {"unseen, WPA by its form", {}, false, canary, "infrastructure", "wpa-psk"},
-        {"unseen, a key of no form", {}, false, "canary7", nullptr, nullptr},
+        {"open", {open}, {}, point, nullptr},
+        {"an open cell", {cell}, {}, adHoc, nullptr},
+        {"the strongest counts", {open, cell}, {}, adHoc, nullptr},
+        {"a cell of long ago is not formed anew", {oldCell}, {}, point, nullptr, true},
+        {"WEP, 5 characters", {wep}, "abcde", point, "none"},
+        {"WEP, 13 characters", {wep}, "abcdefghijklm", point, "none"},
+        {"WEP, 10 digits", {wep}, "0123456789", point, "none"},
+        {"WEP, 26 digits", {wep}, "0123456789abcdefABCDEF0123", point, "none"},
+        {"WEP, 10 characters that are no digits", {wep}, "canary-xyz", nullptr, nullptr},
+        {"WEP, 5 bytes that are no characters", {wep}, "caf\xc3\xa9", nullptr, nullptr},
+        {"WEP without a key", {wep}, {}, nullptr, nullptr},
+        {"WPA, 8 characters", {wpa}, "abcdefgh", point, "wpa-psk"},
+        {"WPA, 63 characters", {wpa}, std::string(63, 'k'), point, "wpa-psk"},
+        {"WPA, 64 digits", {wpa}, std::string(64, 'a'), point, "wpa-psk"},
+        {"WPA, a key that looks like WEP's", {wpa}, "0123456789", point, "wpa-psk"},
+        {"WPA, 7 characters", {wpa}, "canary7", nullptr, nullptr},
+        {"WPA, 64 characters", {wpa}, std::string(64, 'k'), nullptr, nullptr},
+        {"WPA3", {sae}, canary, point, "sae"},
+        {"a cell with WPA", {wpaCell}, canary, adHoc, "wpa-psk"},
+        {"a name and a password for each user", {enterprise}, canary, nullptr, nullptr},
+        {"the key is not given up for an open network of the name", {open}, canary, point, "wpa-psk", true},
+        {"nor for the stronger WEP network", {wep, wpa}, "abcdefghijklm", point, "wpa-psk"},
+        {"nothing on the air", {}, {}, point, nullptr, true},
+        {"nothing on the air, a key of WEP's form alone", {}, "abcde", point, "none", true},
+        {"nothing on the air, a key of both forms", {}, "abcdefghijklm", point, "wpa-psk", true},
+        {"nothing on the air, a key of no form", {}, "canary7", nullptr, nullptr},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
-        const WirelessFacts facts{row.canAdHoc, row.seen, {}};
-        Sections profile;
-        const InterfacePlan plan = wireless("printer \xf0\x9f\x96\xa8", row.key);
-        const Outcome outcome = makeProfile(plan, &facts, {}, profile);
-        EXPECT_EQ(outcome.ok(), row.mode != nullptr) << outcome.reason();
-        if (row.mode == nullptr || !outcome.ok()) {
-            EXPECT_EQ(outcome.status(), kSCStatusFailed);
-            EXPECT_TRUE(!row.key || outcome.reason().find(*row.key) == std::string::npos);
+        const JoinDecision decision = chooseNetwork(row.heard, row.key);
+        EXPECT_TRUE(!row.key || decision.reason.find(*row.key) == std::string::npos);
+        ASSERT_EQ(decision.choice.has_value(), row.mode != nullptr) << decision.reason;
+        if (row.mode == nullptr) {
+            EXPECT_NE(decision.reason, "");
             continue;
         }
-        EXPECT_EQ(verifyProfile(profile), "");
+        const WirelessLink link{decision.choice, {}};
+        const InterfacePlan plan = wireless("printer \xf0\x9f\x96\xa8", row.key);
+        const Sections profile = made(plan, &link);
         EXPECT_EQ(networkOf(profile), *plan.wireless->network);
         EXPECT_EQ(in<std::string>(profile, "802-11-wireless", "mode"), row.mode);
         EXPECT_EQ(in<std::string>(profile, "802-11-wireless-security", "key-mgmt").value_or(""),
                   row.security == nullptr ? "" : row.security);
-        const bool hidden = in<bool>(profile, "802-11-wireless", "hidden").value_or(false);
-        EXPECT_EQ(hidden, row.seen.empty() && !row.canAdHoc);
+        EXPECT_EQ(in<bool>(profile, "802-11-wireless", "hidden").value_or(false), row.hidden);
     }
 }
 
 TEST(Profile, networkNames) {
     for (const std::string& name : {std::string("x"), std::string(32, 'x'), std::string("a\"b<&>'"),
                                     std::string("\x01\x02"), std::string("\xf0\x9f\x96\xa8")}) {
-        const WirelessFacts facts;
-        EXPECT_EQ(networkOf(made(wireless(name, {}), &facts)), name);
+        const WirelessLink link{JoinChoice(), {}};
+        EXPECT_EQ(networkOf(made(wireless(name, {}), &link)), name);
     }
 }
 
@@ -181,8 +183,7 @@ TEST(Profile, keepsTheNetworkOfTheCard) {
         {"connection", {{"id", {std::string("Home")}}}},
         {"ipv4", {{"method", {std::string("auto")}}}},
     };
-    WirelessFacts facts;
-    facts.current = wirelessSections(home);
+    WirelessLink link{{}, wirelessSections(home)};
     InterfacePlan plan = wireless({}, {});
     plan.method = IPv4Method::manual;
     plan.addresses = {{address("192.0.0.199"), 24}};
@@ -190,7 +191,7 @@ TEST(Profile, keepsTheNetworkOfTheCard) {
         if (*named != '\0') {
             plan.wireless->network = named;
         }
-        const Sections profile = made(plan, &facts);
+        const Sections profile = made(plan, &link);
         EXPECT_EQ(networkOf(profile), "home");
         EXPECT_EQ(in<std::string>(profile, "802-11-wireless-security", "psk"), canary);
         EXPECT_EQ(in<std::uint32_t>(profile, "802-11-wireless-security", "psk-flags"), std::nullopt);
@@ -199,13 +200,6 @@ TEST(Profile, keepsTheNetworkOfTheCard) {
         EXPECT_EQ(in<std::string>(profile, "connection", "id"), "location-assistant wlan0");
         EXPECT_EQ(in<std::string>(profile, "ipv4", "method"), "manual");
     }
-    plan.wireless->network = "home";
-    plan.wireless->key = "another key";
-    EXPECT_EQ(in<std::string>(made(plan, &facts), "802-11-wireless-security", "psk"), "another key");
-
-    facts.current.clear();
-    Sections profile;
-    EXPECT_EQ(makeProfile(wireless({}, {}), &facts, {}, profile).status(), kSCStatusFailed);
 }
 
 }  // namespace

@@ -2,6 +2,7 @@
 // It records what it is asked for, and can fail or "crash" (throw) at any of its steps.
 #pragma once
 
+#include <chrono>
 #include <map>
 #include <set>
 #include <span>
@@ -22,46 +23,61 @@ class RecordingAgent : public platform::apply::Agent {
     explicit RecordingAgent(std::string name = "recording") : name_(std::move(name)) {}
 
     std::map<std::string, std::string> machine;  // interface -> how it is
-    std::vector<std::string> calls;              // "capture a b", "takeOver a", "giveBack a"
+    std::vector<std::string> calls;              // "capture a b", "takeOver a", "giveBack a", "settle"
     std::vector<std::string> changes;            // "a: before -> after"
     std::set<std::string> failing;               // entries of `calls` that fail, without a change
+    std::set<std::string> troubled;              // and that end in trouble, behind the change
+    std::set<std::string> foreign;               // interfaces that are left alone
+    int slow = 0;                                // how often settle has to be asked once more
+    double seconds = 0;                          // that the last start was given
     int crashAt = -1;  // throws at that step: each change has one before and one behind it
 
     [[nodiscard]] std::string_view name() const noexcept override { return name_; }
 
     platform::Outcome capture(std::span<const std::string> interfaces,
-                              std::vector<platform::apply::Captured>& captured) override {
+                              std::vector<platform::apply::Captured>& captured,
+                              std::vector<platform::apply::Trouble>& leftAlone) override {
         std::string call = "capture";
         for (const std::string& interface : interfaces) {
             call += " " + interface;
         }
         platform::Outcome done = begin(call);
         for (const std::string& interface : interfaces) {
-            if (done.ok() && machine.count(interface) != 0) {
-                platform::apply::DictionaryBuilder state;
-                state.setText(CFSTR("State"), machine[interface]);
-                captured.push_back({interface, state.take()});
+            if (!done.ok() || machine.count(interface) == 0) {
+                continue;
+            }
+            if (foreign.count(interface) != 0) {
+                leftAlone.push_back({interface, "it is somebody else's"});
+                continue;
+            }
+            platform::apply::DictionaryBuilder state;
+            state.setText(CFSTR("State"), machine[interface]);
+            captured.push_back({interface, state.take()});
+        }
+        return done;
+    }
+
+    void start(std::span<platform::apply::Task> tasks, platform::apply::Clock::time_point deadline) override {
+        const auto left = deadline - platform::apply::Clock::now();
+        seconds = std::chrono::duration_cast<std::chrono::duration<double>>(left).count();
+        for (platform::apply::Task& task : tasks) {
+            const std::string& interface = task.before->interface;
+            const std::string call = (task.plan != nullptr ? "takeOver " : "giveBack ") + interface;
+            task.refusal = begin(call);
+            task.trouble = troubled.count(call) != 0 ? call + " met trouble" : "";
+            if (task.refusal.ok() && machine.count(interface) != 0) {
+                change(interface,
+                       task.plan != nullptr
+                           ? "ours: " + describe(*task.plan)
+                           : platform::apply::textIn(task.before->state.get(), CFSTR("State")).value_or("?"));
             }
         }
-        return done;
+        unsettled_ = slow;
     }
 
-    platform::Outcome takeOver(const platform::apply::InterfacePlan& plan,
-                               const platform::apply::Captured& /*before*/) override {
-        platform::Outcome done = begin("takeOver " + plan.name);
-        if (done.ok()) {
-            change(plan.name, "ours: " + describe(plan));
-        }
-        return done;
-    }
-
-    platform::Outcome giveBack(const platform::apply::Captured& before) override {
-        platform::Outcome done = begin("giveBack " + before.interface);
-        if (done.ok() && machine.count(before.interface) != 0) {
-            change(before.interface,
-                   platform::apply::textIn(before.state.get(), CFSTR("State")).value_or("?"));
-        }
-        return done;
+    bool settle(platform::apply::Clock::time_point /*until*/) override {
+        calls.emplace_back("settle");
+        return unsettled_-- <= 0;
     }
 
     static std::string describe(const platform::apply::InterfacePlan& plan) {
@@ -96,6 +112,7 @@ class RecordingAgent : public platform::apply::Agent {
     }
 
     std::string name_;
+    int unsettled_ = 0;
 };
 
 }  // namespace testing_support

@@ -25,12 +25,11 @@ class InterruptedAgent : public testing_support::RecordingAgent {
   public:
     std::function<void()> interruption;
 
-    platform::Outcome takeOver(const platform::apply::InterfacePlan& plan,
-                               const platform::apply::Captured& before) override {
+    bool settle(platform::apply::Clock::time_point until) override {
         if (const std::function<void()> once = std::exchange(interruption, nullptr)) {
             once();
         }
-        return RecordingAgent::takeOver(plan, before);
+        return RecordingAgent::settle(until);
     }
 };
 
@@ -43,6 +42,8 @@ class ApplyTest : public StoreTest {
     static int apply(const SessionRef& session) {
         return SCPreferencesApplyChanges(session.get()) != 0 ? 0 : SCError();
     }
+    // Commits the tree as it is, and applies it.
+    static int activate(const SessionRef& session) { return commit(session) ? apply(session) : SCError(); }
     // The interfaces that are ours.
     [[nodiscard]] std::string taken() const {
         std::string names;
@@ -55,13 +56,17 @@ class ApplyTest : public StoreTest {
     std::shared_ptr<InterruptedAgent> agent = std::make_shared<InterruptedAgent>();
     platform::HostOverride withAgent{[this] {
         platform::Host made = hostIn(directory.path().string());
-        made.agent = agent;
+        made.agents = {agent};
         return made;
     }()};
 };
 
 TEST_F(ApplyTest, OnlyWhatIsCommittedIsApplied) {
     SessionRef session = open();
+    EXPECT_EQ(apply(session), 0);
+    EXPECT_EQ(taken(), "") << "without a commit there is nothing to apply, and nothing that was left undone";
+    EXPECT_EQ(activate(session), 0);
+    EXPECT_EQ(taken(), "eth0") << "a commit that changes nothing asks for just that";
     ASSERT_TRUE(SCPreferencesPathRemoveValue(session.get(), CFSTR("/NetworkServices/1/Interface")));
     EXPECT_EQ(apply(session), 0);
     EXPECT_EQ(taken(), "eth0");
@@ -71,22 +76,29 @@ TEST_F(ApplyTest, OnlyWhatIsCommittedIsApplied) {
     EXPECT_EQ(taken(), "");
 }
 
+TEST_F(ApplyTest, ACommitThatLeavesThePlanAloneLeavesTheMachineAlone) {
+    SessionRef session = open();
+    ASSERT_TRUE(set(session, "/Sets/2", "another location"));
+    EXPECT_EQ(activate(session), 0);
+    EXPECT_EQ(taken(), "");
+    EXPECT_TRUE(agent->calls.empty());
+}
+
 TEST_F(ApplyTest, ATreeCommittedInTheMiddleOfAnApplyIsAppliedAsWell) {
     agent->interruption = [this] { (void)directory.write("store/preferences.plist", locationOf("eth1")); };
-    EXPECT_EQ(apply(open()), 0);
+    EXPECT_EQ(activate(open()), 0);
     EXPECT_EQ(taken(), "eth1");
 }
 
 TEST_F(ApplyTest, FailuresAreTold) {
     agent->failing = {"takeOver eth0"};
     SessionRef session = open();
-    EXPECT_EQ(apply(session), 1001);
+    EXPECT_EQ(activate(session), 1001);
     EXPECT_TRUE(logHas("takeOver eth0 was told to fail"));
+    EXPECT_EQ(apply(session), 0) << "what is left undone is tried again in the background of the status";
     (void)directory.write("store/preferences.plist", "garbage");
     EXPECT_EQ(apply(session), 1001);
     EXPECT_TRUE(logHas("tester: " + file + ", line 1"));
-    (void)directory.write("store/preferences.plist", smallTree);
-    EXPECT_EQ(apply(session), 1004) << "there is no current location";
 }
 
 }  // namespace

@@ -1,0 +1,315 @@
+#include "platform/apply/direct/DirectInterface.h"
+
+#include <sys/socket.h>
+
+#include <algorithm>
+#include <ctime>
+
+#include "platform/Log.h"
+#include "platform/apply/direct/DhcpClient.h"
+#include "platform/apply/direct/NameServers.h"
+#include "platform/apply/direct/Supplicant.h"
+
+namespace platform::apply {
+namespace {
+
+// What is left at least to an address whose own DHCP client renews it.
+constexpr std::uint32_t shortestLife = 60;
+
+std::int64_t secondsSinceStart() {
+    timespec now{};
+    ::clock_gettime(CLOCK_BOOTTIME, &now);
+    return now.tv_sec;
+}
+
+// Does what follows even when something failed, and keeps the first failure.
+class Steps {
+  public:
+    bool take(const Outcome& outcome) {
+        if (first_.ok()) {
+            first_ = outcome;
+        }
+        return outcome.ok();
+    }
+    [[nodiscard]] bool ok() const noexcept { return first_.ok(); }
+    [[nodiscard]] Outcome first() const { return first_; }
+
+  private:
+    Outcome first_;
+};
+
+bool contains(const std::vector<Address>& list, const Address& address) {
+    return std::ranges::find(list, address) != list.end();
+}
+
+std::vector<Address> manualAddresses(const InterfacePlan& plan) {
+    std::vector<Address> addresses;
+    for (const ManualAddress& address : plan.addresses) {
+        Address made = makeAddress(plan.name, address);
+        if (!contains(addresses, made)) {
+            addresses.push_back(std::move(made));
+        }
+    }
+    return addresses;
+}
+
+DhcpSettings dhcpSettings(const InterfacePlan& plan) {
+    return {plan.name, plan.rank, plan.dhcpClientID, !plan.nameServers.empty(), plan.searchDomains};
+}
+
+// What lasts, in an order of its own: two readings of the same state are then equal.
+template <class List>
+List lasting(List list) {
+    std::erase_if(list, [](const auto& one) {
+        if constexpr (requires { one.isShared; }) {
+            return one.comesByItself || one.isShared;
+        }
+        return one.comesByItself;
+    });
+    std::ranges::sort(list, {}, [](const auto& one) { return one.key; });
+    return list;
+}
+
+}  // namespace
+
+bool isOff(const InterfacePlan& plan) noexcept {
+    return !plan.active || (plan.wireless && plan.wireless->powerEnabled == false);
+}
+
+bool joinsNetwork(const InterfacePlan& plan) noexcept {
+    return !isOff(plan) && plan.wireless && plan.wireless->network;
+}
+
+Outcome DirectInterface::open() {
+    RETURN_IF_FAILED(kernel_.open());
+    return refresh();
+}
+
+Outcome DirectInterface::takeSnapshot(Snapshot& snapshot) {
+    snapshot = {link_->up, isIPv6Disabled(interface_), {}, {}, secondsSinceStart()};
+    RETURN_IF_FAILED(kernel_.read(*link_, snapshot.state));
+    return readKnownNetworks(interface_, snapshot.networks);
+}
+
+Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Snapshot>& before,
+                               std::unique_ptr<WirelessJoin>& join, std::string& trouble) {
+    std::optional<Notes> found;
+    RETURN_IF_FAILED(readNotes(interface_, found));
+    const Notes earlier = found.value_or(Notes{});
+    const bool mayStay = joinsNetwork(plan) && earlier.joined && earlier.phase == Notes::Phase::applied &&
+                         isSameNetwork(*earlier.joined, *plan.wireless);
+    Notes applied{Notes::Phase::applied, isOff(plan), {}, {}};
+    if (!isOff(plan)) {
+        applied.addresses = manualAddresses(plan);
+    }
+    if (joinsNetwork(plan)) {
+        applied.joined = mayStay ? earlier.joined : makeJoinedNetwork(*plan.wireless);
+    }
+    // On the way everything counts as ours that is to be, or that an earlier run may have left.
+    Notes applying = applied;
+    applying.phase = Notes::Phase::applying;
+    applying.joined = applied.joined ? applied.joined : earlier.joined;
+    for (const Address& address : earlier.addresses) {
+        if (!contains(applying.addresses, address)) {
+            applying.addresses.push_back(address);
+        }
+    }
+    RETURN_IF_FAILED(writeNotes(interface_, applying));
+    std::optional<DhcpSettings> client;
+    RETURN_IF_FAILED(readDhcpSettings(interface_, client));
+    const bool wantsClient = !isOff(plan) && plan.method == IPv4Method::dhcp;
+    if (client && !(wantsClient && *client == dhcpSettings(plan))) {
+        // While the address is still there, so that the server hears of it.
+        RETURN_IF_FAILED(stopDhcpClient(interface_));
+    }
+    if (earlier.joined && !joinsNetwork(plan)) {
+        std::unique_ptr<WirelessJoin> ignored;
+        RETURN_IF_FAILED(leaveBySupplicant(interface_, before ? before->networks : std::nullopt, ignored));
+    }
+    if (isOff(plan)) {
+        RETURN_IF_FAILED(switchOff(trouble));
+    } else {
+        RETURN_IF_FAILED(switchOn(plan, trouble));
+        RETURN_IF_FAILED(startJoin(plan, mayStay, join, trouble));
+        if (wantsClient) {
+            RETURN_IF_FAILED(startClient(plan, trouble));
+        }
+    }
+    return writeNotes(interface_, applied);
+}
+
+Outcome DirectInterface::switchOff(std::string& trouble) {
+    RETURN_IF_FAILED(setInterfaceNameServers(interface_, 0, {}, trouble));
+    RETURN_IF_FAILED(kernel_.makeRoutes(*link_, {}, false));
+    RETURN_IF_FAILED(kernel_.makeAddresses(*link_, {}));
+    return setUp(false);
+}
+
+Outcome DirectInterface::switchOn(const InterfacePlan& plan, std::string& trouble) {
+    std::vector<Address> addresses = manualAddresses(plan);
+    std::vector<Route> routes = makeDefaultRoute(plan.router, plan.rank, plan.addresses);
+    if (plan.method == IPv4Method::dhcp) {
+        LeaseState held;
+        RETURN_IF_FAILED(readLease(interface_, held));
+        if (held.isTaken && held.lease) {
+            addresses = {addressOf(interface_, *held.lease)};
+            routes = routesOf(*held.lease, plan.rank);
+        }
+    }
+    // IPv6 is off in a location: it has no settings for it, and the routes of a network that the machine is
+    // only visiting would lead past the location's own.
+    RETURN_IF_FAILED(setIPv6Disabled(true));
+    RETURN_IF_FAILED(setUp(true));
+    RETURN_IF_FAILED(kernel_.makeAddresses(*link_, addresses));
+    RETURN_IF_FAILED(kernel_.makeRoutes(*link_, routes, true));
+    if (plan.method != IPv4Method::dhcp) {
+        return setInterfaceNameServers(interface_, plan.rank, {plan.nameServers, plan.searchDomains},
+                                       trouble);
+    }
+    return {};
+}
+
+Outcome DirectInterface::startJoin(const InterfacePlan& plan, bool mayStay,
+                                   std::unique_ptr<WirelessJoin>& join, std::string& trouble) {
+    if (!joinsNetwork(plan)) {
+        return {};
+    }
+    RETURN_IF_FAILED(joinBySupplicant(interface_, *plan.wireless, mayStay, join));
+    if (!join) {
+        trouble = "joining a wireless network needs NetworkManager or a wireless supplicant";
+    }
+    return {};
+}
+
+Outcome DirectInterface::startClient(const InterfacePlan& plan, std::string& trouble) {
+    bool running = false;
+    RETURN_IF_FAILED(isDhcpClientRunning(interface_, running));
+    if (!running) {
+        RETURN_IF_FAILED(stopDhcpClient(interface_));  // what one that died left behind
+    }
+    const NameService own{plan.nameServers, plan.searchDomains};
+    if (!running || !own.servers.empty()) {
+        RETURN_IF_FAILED(setInterfaceNameServers(interface_, plan.rank, own, trouble));
+    }
+    return running ? Outcome() : startDhcpClient(dhcpSettings(plan));
+}
+
+Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join,
+                                  std::string& trouble) {
+    std::optional<Notes> notes;
+    RETURN_IF_FAILED(readNotes(interface_, notes));
+    if (!notes) {
+        return {};
+    }
+    Steps steps;
+    steps.take(stopDhcpClient(interface_));
+    steps.take(setInterfaceNameServers(interface_, 0, {}, trouble));
+    if (notes->joined) {
+        steps.take(leaveBySupplicant(interface_, before.networks, join));
+    }
+    if (link_) {
+        bool taken = false;
+        if (!steps.take(isTakenOver(*notes, before, taken))) {
+            return steps.first();
+        }
+        if (taken) {
+            logLine(LogLevel::notice,
+                    interface_ + ": configured by somebody else meanwhile, and left to them");
+            steps.take(removeOurs(*notes, before));
+            join.reset();
+        } else {
+            notes->phase = Notes::Phase::restoring;
+            // For a run that is ended half-way. A runtime directory that is full does not stop the way back.
+            if (const Outcome noted = writeNotes(interface_, *notes); !noted.ok()) {
+                logLine(LogLevel::warning, interface_ + ": " + noted.reason());
+            }
+            steps.take(restore(before));
+        }
+    }
+    return steps.ok() ? removeNotes(interface_) : steps.first();
+}
+
+Outcome DirectInterface::isTakenOver(const Notes& notes, const Snapshot& before, bool& taken) {
+    InterfaceState now;
+    RETURN_IF_FAILED(kernel_.read(*link_, now));
+    const bool isForeign = std::ranges::any_of(now.addresses, [&](const Address& address) {
+        // Link-local ones are taken by daemons that watch for cards without an address, and stand for nobody.
+        return address.family() == AF_INET && address.scope() < RT_SCOPE_LINK &&
+               !contains(notes.addresses, address) && !contains(before.state.addresses, address);
+    });
+    // Half-way there or back it may be on by our own doing.
+    const bool isOn = notes.phase == Notes::Phase::applied && notes.off && link_->up;
+    taken = isForeign || isOn;
+    return {};
+}
+
+Outcome DirectInterface::removeOurs(const Notes& notes, const Snapshot& before) {
+    InterfaceState now;
+    Steps steps;
+    if (steps.take(kernel_.read(*link_, now))) {
+        for (const Route& route : now.routes) {
+            if (route.protocol() == ourRouteProtocol) {
+                steps.take(kernel_.removeRoute(*link_, route));
+            }
+        }
+        for (const Address& address : now.addresses) {
+            if (contains(notes.addresses, address) && !contains(before.state.addresses, address)) {
+                steps.take(kernel_.removeAddress(*link_, address));
+            }
+        }
+    }
+    steps.take(setIPv6Disabled(before.ipv6Disabled));
+    return steps.first();
+}
+
+Outcome DirectInterface::restore(const Snapshot& before) {
+    std::vector<Address> addresses = before.state.addresses;
+    const std::int64_t elapsed = std::max<std::int64_t>(secondsSinceStart() - before.takenAt, 0);
+    for (Address& address : addresses) {
+        const auto left = [elapsed](std::uint32_t life) {
+            return life == forever
+                       ? forever
+                       : static_cast<std::uint32_t>(std::max<std::int64_t>(life - elapsed, shortestLife));
+        };
+        address.valid = left(address.valid);
+        address.preferred = left(address.preferred);
+    }
+    // IPv6 before the link, so that the kernel makes its own addresses when the link comes up.
+    RETURN_IF_FAILED(setIPv6Disabled(before.ipv6Disabled));
+    RETURN_IF_FAILED(setUp(before.up));
+    RETURN_IF_FAILED(kernel_.makeAddresses(*link_, addresses));
+    RETURN_IF_FAILED(kernel_.makeRoutes(*link_, before.state.routes, false));
+    return compare(before);
+}
+
+Outcome DirectInterface::compare(const Snapshot& before) {
+    RETURN_IF_FAILED(refresh());
+    if (!link_) {
+        return {};
+    }
+    InterfaceState now;
+    RETURN_IF_FAILED(kernel_.read(*link_, now));
+    const char* const different =
+        link_->up != before.up || isIPv6Disabled(interface_) != before.ipv6Disabled ? "link is"
+        : lasting(now.addresses) != lasting(before.state.addresses)                 ? "addresses are"
+        : lasting(now.routes) != lasting(before.state.routes)                       ? "routes are"
+                                                                                    : nullptr;
+    return different == nullptr
+               ? Outcome()
+               : Outcome(kSCStatusFailed, std::string("the ") + different + " not as before");
+}
+
+Outcome DirectInterface::setUp(bool up) {
+    if (link_->up != up) {
+        RETURN_IF_FAILED(kernel_.setUp(*link_, up));
+        link_->up = up;
+    }
+    return {};
+}
+
+Outcome DirectInterface::setIPv6Disabled(std::optional<bool> disabled) {
+    const std::optional<bool> now = isIPv6Disabled(interface_);
+    return disabled && now && now != disabled ? disableIPv6(interface_, *disabled) : Outcome();
+}
+
+}  // namespace platform::apply

@@ -1,0 +1,59 @@
+// One interface that the direct agent configures: what is done to it at once, without waiting for anything
+// that a network has to do.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Outcome.h"
+#include "platform/apply/Plan.h"
+#include "platform/apply/direct/Kernel.h"
+#include "platform/apply/direct/Snapshot.h"
+#include "platform/apply/direct/WirelessJoin.h"
+
+namespace platform::apply {
+
+// Whether the plan asks for the interface to be off, its radio included.
+[[nodiscard]] bool isOff(const InterfacePlan& plan) noexcept;
+[[nodiscard]] bool joinsNetwork(const InterfacePlan& plan) noexcept;
+
+class DirectInterface {
+  public:
+    explicit DirectInterface(std::string interface) : interface_(std::move(interface)) {}
+
+    Outcome open();
+    // Nothing when the interface is gone; brought up to date by refresh().
+    [[nodiscard]] const std::optional<Link>& link() const noexcept { return link_; }
+    Outcome refresh() { return kernel_.findLink(interface_, link_); }
+
+    Outcome takeSnapshot(Snapshot& snapshot);
+    // Makes it what the plan says, whatever it is. `join` is the network on its way, null when there is none
+    // to wait for. trouble is told when settings stand that help nothing.
+    Outcome apply(const InterfacePlan& plan, const std::optional<Snapshot>& before,
+                  std::unique_ptr<WirelessJoin>& join, std::string& trouble);
+    // Makes it as it was, and compares. The same for `join` and trouble.
+    Outcome giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join, std::string& trouble);
+
+  private:
+    Outcome switchOff(std::string& trouble);
+    Outcome switchOn(const InterfacePlan& plan, std::string& trouble);
+    Outcome startClient(const InterfacePlan& plan, std::string& trouble);
+    Outcome startJoin(const InterfacePlan& plan, bool mayStay, std::unique_ptr<WirelessJoin>& join,
+                      std::string& trouble);
+    // Whether somebody else has configured the interface since: it has addresses that it neither had nor got
+    // from here, or was switched off here and is on.
+    Outcome isTakenOver(const Notes& notes, const Snapshot& before, bool& taken);
+    Outcome removeOurs(const Notes& notes, const Snapshot& before);
+    Outcome restore(const Snapshot& before);
+    Outcome compare(const Snapshot& before);
+    Outcome setUp(bool up);
+    Outcome setIPv6Disabled(std::optional<bool> disabled);
+
+    std::string interface_;
+    Kernel kernel_;
+    std::optional<Link> link_;
+};
+
+}  // namespace platform::apply

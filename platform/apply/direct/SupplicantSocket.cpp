@@ -1,0 +1,276 @@
+#include "platform/apply/direct/SupplicantSocket.h"
+
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <cstring>
+#include <utility>
+
+#include "platform/Host.h"
+
+namespace platform::apply {
+namespace {
+
+using std::chrono::milliseconds;
+using std::chrono::steady_clock;
+
+constexpr milliseconds answerTime{2000};
+constexpr std::size_t largestAnswer = std::size_t{64} << 10U;
+// The value of a network's "id_str", which is a note for whoever configures it.
+constexpr std::string_view ourTag = "\"location-assistant\"";
+
+std::vector<std::string_view> split(std::string_view text, char separator) {
+    std::vector<std::string_view> pieces;
+    while (!text.empty()) {
+        const std::size_t end = std::min(text.find(separator), text.size());
+        pieces.push_back(text.substr(0, end));
+        text.remove_prefix(std::min(end + 1, text.size()));
+    }
+    return pieces;
+}
+
+std::optional<int> parseNumber(std::string_view text) {
+    int number = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+    return error == std::errc() && end != text.data() && number >= 0 ? std::optional(number) : std::nullopt;
+}
+
+// The bytes of a network's name from the escaped form that the supplicant prints.
+std::string unescape(std::string_view text) {
+    const std::map<char, char> letters{{'n', '\n'},   {'r', '\r'}, {'t', '\t'},
+                                       {'e', '\033'}, {'"', '"'},  {'\\', '\\'}};
+    std::string bytes;
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        if (text[i] != '\\' || i + 1 == text.size()) {
+            bytes += text[i];
+            continue;
+        }
+        const char letter = text[++i];
+        unsigned value = 0;
+        if (const auto known = letters.find(letter); known != letters.end()) {
+            bytes += known->second;
+        } else if (letter == 'x' && i + 2 < text.size() &&
+                   std::from_chars(text.data() + i + 1, text.data() + i + 3, value, 16).ec == std::errc()) {
+            bytes += static_cast<char>(value);
+            i += 2;
+        }
+    }
+    return bytes;
+}
+
+// The value of "<name>=..." among the lines of an answer.
+std::string_view lineOf(std::string_view answer, std::string_view name) {
+    for (const std::string_view line : split(answer, '\n')) {
+        if (line.size() > name.size() && line.starts_with(name) && line[name.size()] == '=') {
+            return line.substr(name.size() + 1);
+        }
+    }
+    return {};
+}
+
+// The protection that the flags of a scan result tell of.
+Security securityOf(std::string_view flags) {
+    const auto has = [flags](const char* flag) { return flags.find(flag) != std::string_view::npos; };
+    if (has("-PSK")) {
+        return Security::wpa;
+    }
+    if (has("SAE")) {
+        return Security::sae;
+    }
+    return has("WPA") || has("RSN") ? Security::enterprise : has("[WEP]") ? Security::wep : Security::open;
+}
+
+}  // namespace
+
+Outcome SupplicantSocket::open(const std::string& interface, bool& isThere) {
+    isThere = false;
+    const std::string path = currentHost().supplicantDirectory + "/" + interface;
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    if (path.size() >= sizeof address.sun_path) {
+        return {kSCStatusFailed, "the path of the supplicant's socket is too long"};
+    }
+    std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+    FileDescriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    if (!socket.isOpen()) {
+        return Outcome::fromErrno("cannot make a socket for the wireless supplicant");
+    }
+    // Connected before it has an address of its own, so that nobody else ever reaches it.
+    if (::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+        const bool nobody = errno == ENOENT || errno == ENOTDIR || errno == ECONNREFUSED;
+        return nobody ? Outcome() : Outcome::fromErrno("cannot reach the wireless supplicant");
+    }
+    // With the family alone the kernel gives the socket an address for the answers, without a file.
+    sockaddr_un own{};
+    own.sun_family = AF_UNIX;
+    if (::bind(socket.get(), reinterpret_cast<const sockaddr*>(&own), sizeof own.sun_family) != 0) {
+        return Outcome::fromErrno("cannot make a socket for the wireless supplicant");
+    }
+    isThere = true;
+    socket_ = std::move(socket);
+    return {};
+}
+
+Outcome SupplicantSocket::receive(steady_clock::time_point deadline, std::string& message, bool& received) {
+    received = false;
+    for (;;) {
+        const auto left = std::chrono::duration_cast<milliseconds>(deadline - steady_clock::now());
+        pollfd wait{socket_.get(), POLLIN, 0};
+        const int ready = ::poll(&wait, 1, static_cast<int>(std::max<std::int64_t>(left.count(), 0)));
+        if (ready == 0 || (ready < 0 && errno != EINTR)) {
+            return ready == 0 ? Outcome() : Outcome::fromErrno("cannot wait for the wireless supplicant");
+        }
+        message.resize(largestAnswer);
+        const ssize_t size = ::recv(socket_.get(), message.data(), message.size(), 0);
+        if (size >= 0) {
+            message.resize(static_cast<std::size_t>(size));
+            received = true;
+            return {};
+        }
+        if (errno != EINTR && errno != EAGAIN) {
+            return Outcome::fromErrno("cannot hear the wireless supplicant");
+        }
+    }
+}
+
+Outcome SupplicantSocket::ask(const std::string& request, const char* what, std::string& answer) {
+    if (::send(socket_.get(), request.data(), request.size(), MSG_NOSIGNAL) < 0) {
+        return Outcome::fromErrno(std::string("cannot ask the wireless supplicant to ") + what);
+    }
+    const auto deadline = steady_clock::now() + answerTime;
+    for (;;) {
+        bool received = false;
+        Outcome done = receive(deadline, answer, received);
+        if (!done.ok()) {
+            return done;
+        }
+        if (!received) {
+            return {kSCStatusFailed,
+                    std::string("the wireless supplicant does not answer when asked to ") + what};
+        }
+        if (answer.empty() || answer.front() != '<') {
+            return {};
+        }
+        notices_.push_back(answer);
+    }
+}
+
+Outcome SupplicantSocket::order(const std::string& request, const char* what) {
+    std::string answer;
+    Outcome done = ask(request, what, answer);
+    if (done.ok() && answer.substr(0, 2) != "OK") {
+        return {kSCStatusFailed, std::string("the wireless supplicant refused to ") + what};
+    }
+    return done;
+}
+
+Outcome SupplicantSocket::listNetworks(std::vector<ConfiguredNetwork>& networks) {
+    networks.clear();
+    std::string answer;
+    RETURN_IF_FAILED(ask("LIST_NETWORKS", "list its networks", answer));
+    for (const std::string_view line : split(answer, '\n')) {
+        // number, name, bssid, flags
+        const std::vector<std::string_view> fields = split(line, '\t');
+        const auto number = fields.size() >= 3 ? parseNumber(fields[0]) : std::nullopt;
+        if (number) {
+            const bool isDisabled =
+                fields.size() > 3 && fields[3].find("[DISABLED]") != std::string_view::npos;
+            networks.push_back({*number, isDisabled, fields[1].empty()});
+        }
+    }
+    return {};
+}
+
+Outcome SupplicantSocket::findOurs(const std::vector<ConfiguredNetwork>& networks,
+                                   std::vector<ConfiguredNetwork>& ours) {
+    ours.clear();
+    for (const ConfiguredNetwork& network : networks) {
+        std::string tag;
+        RETURN_IF_FAILED(
+            ask("GET_NETWORK " + std::to_string(network.number) + " id_str", "show a network", tag));
+        if (tag == ourTag) {
+            ours.push_back(network);
+        }
+    }
+    return {};
+}
+
+Outcome SupplicantSocket::addNetwork(const std::vector<std::string>& settings, int& number) {
+    std::string answer;
+    RETURN_IF_FAILED(ask("ADD_NETWORK", "add a network", answer));
+    const auto added = parseNumber(answer.substr(0, answer.find('\n')));
+    if (!added) {
+        return {kSCStatusFailed, "the wireless supplicant refused to add a network"};
+    }
+    number = *added;
+    const std::string set = "SET_NETWORK " + std::to_string(number) + " ";
+    // The tag first, so that a run that ends here leaves nothing that is not found.
+    RETURN_IF_FAILED(order(set + "id_str " + std::string(ourTag), "mark a network"));
+    for (const std::string& setting : settings) {
+        const std::string what = "take the network's \"" + setting.substr(0, setting.find(' ')) + "\"";
+        RETURN_IF_FAILED(order(set + setting, what.c_str()));
+    }
+    return {};
+}
+
+Outcome SupplicantSocket::removeNetwork(int number) {
+    return order("REMOVE_NETWORK " + std::to_string(number), "remove a network");
+}
+
+Outcome SupplicantSocket::readStatus(std::map<std::string, std::string, std::less<>>& values) {
+    values.clear();
+    std::string answer;
+    RETURN_IF_FAILED(ask("STATUS", "tell its state", answer));
+    for (const std::string_view line : split(answer, '\n')) {
+        if (const std::size_t equals = line.find('='); equals != std::string_view::npos) {
+            values[std::string(line.substr(0, equals))] = line.substr(equals + 1);
+        }
+    }
+    return {};
+}
+
+Outcome SupplicantSocket::readHeard(const std::string& name, std::vector<HeardNetwork>& heard) {
+    heard.clear();
+    std::string answer;
+    RETURN_IF_FAILED(ask("SCAN_RESULTS", "list what it hears", answer));
+    for (const std::string_view line : split(answer, '\n')) {
+        // bssid, frequency, signal level, flags, name
+        const std::vector<std::string_view> fields = split(line, '\t');
+        if (fields.size() != 5 || unescape(fields[4]) != name) {
+            continue;
+        }
+        HeardNetwork network;
+        network.bssid = fields[0];
+        network.frequency = parseNumber(fields[1]).value_or(0);
+        // In dBm, below zero.
+        std::from_chars(fields[2].data(), fields[2].data() + fields[2].size(), network.strength);
+        network.security = securityOf(fields[3]);
+        network.isAdHoc = fields[3].find("[IBSS]") != std::string_view::npos;
+        std::string details;
+        RETURN_IF_FAILED(ask("BSS " + network.bssid, "tell about a network", details));
+        network.age = std::chrono::seconds(parseNumber(lineOf(details, "age")).value_or(0));
+        heard.push_back(std::move(network));
+    }
+    return {};
+}
+
+Outcome SupplicantSocket::takeNotices(std::vector<std::string>& notices) {
+    notices = std::exchange(notices_, {});
+    for (;;) {
+        std::string message;
+        bool received = false;
+        RETURN_IF_FAILED(receive(steady_clock::now(), message, received));
+        if (!received) {
+            return {};
+        }
+        if (!message.empty() && message.front() == '<') {
+            notices.push_back(std::move(message));
+        }
+    }
+}
+
+}  // namespace platform::apply

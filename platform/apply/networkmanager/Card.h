@@ -1,0 +1,95 @@
+// A card that NetworkManager leads, on its way to what a plan says or back to how it was.
+#pragma once
+
+#include <algorithm>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/Outcome.h"
+#include "platform/apply/Agent.h"
+#include "platform/apply/networkmanager/Daemon.h"
+#include "platform/apply/networkmanager/Profile.h"
+#include "platform/values/Fields.h"
+
+namespace platform::apply {
+
+// A card as it was captured.
+struct EarlierCard {
+    ProfileNote note;
+    bool wasUp = false;  // the profile was complete, with its addresses
+
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("UUID", self.note.earlier);
+        fields("Autoconnect", self.note.autoconnect);
+        fields("Radio", self.note.radio);
+        fields("WasUp", self.wasUp);
+    }
+};
+
+// A card's place in the order of the routes: the daemon numbers the routes of cards of one kind in the order
+// in which they get to their addresses.
+struct Place {
+    bool isTaken = false;
+    std::shared_ptr<const Place> before;  // the next better one; null for none
+};
+
+// One card's task, taken step by step: it never waits itself.
+class Card {
+  public:
+    Card(Daemon& daemon, Task& task, Clock::time_point deadline)
+        : daemon_(daemon), task_(task), interface_(task.before->interface), deadline_(deadline) {}
+    Card(const Card&) = delete;
+    Card& operator=(const Card&) = delete;
+    virtual ~Card() = default;
+
+    // Takes every step that can be taken now. True when the task is settled.
+    bool step();
+    // When to step again though no signal has come.
+    [[nodiscard]] Clock::time_point wakeAt() const noexcept { return std::min(wakeAt_, deadline_); }
+    [[nodiscard]] Task& task() noexcept { return task_; }
+
+  protected:
+    // Takes one step and sets what comes next; isWaiting() or settle() end the steps of this turn.
+    virtual Outcome advance() = 0;
+    void settle(const std::string& trouble = {});
+    void waitUntil(Clock::time_point time) {
+        isWaiting_ = true;
+        wakeAt_ = time;
+    }
+    [[nodiscard]] bool isLate() const { return Clock::now() >= deadline_; }
+    // Nothing, and success, when there is no such card.
+    Outcome findCard(std::optional<Device>& device) { return daemon_.findDevice(interface_, device); }
+    // Our profile for the card; nothing when there is none. isForeign when somebody else's has its UUID.
+    Outcome findOurProfile(std::optional<Profile>& profile, bool& isForeign);
+    Outcome removeProfile();
+
+    Daemon& daemon_;
+    Task& task_;
+    const std::string& interface_;
+    Clock::time_point deadline_;
+
+  private:
+    Clock::time_point wakeAt_;
+    bool isWaiting_ = false;
+    bool isSettled_ = false;
+};
+
+[[nodiscard]] std::unique_ptr<Card> makeGoingCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+                                                  Clock::time_point deadline);
+[[nodiscard]] std::unique_ptr<Card> makeReturningCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+                                                      std::shared_ptr<Place> place,
+                                                      Clock::time_point deadline);
+
+// How long a card that was just handed to the daemon may take until a profile can be activated on it: without
+// a carrier it never can.
+inline constexpr std::chrono::seconds readyBound{2};
+// And a wireless one whose radio was just switched on.
+inline constexpr std::chrono::seconds radioBound{5};
+// How long a card waits for the one before it to take its place.
+inline constexpr std::chrono::seconds placeBound{4};
+// What a card says about its failure comes right after what its profile says.
+inline constexpr std::chrono::milliseconds reasonBound{250};
+
+}  // namespace platform::apply

@@ -1,0 +1,295 @@
+// A card on its way to what a plan says.
+#include <algorithm>
+#include <utility>
+
+#include "platform/apply/networkmanager/Card.h"
+
+namespace platform::apply {
+namespace {
+
+// Between two looks at what is on the air when nothing tells of a change.
+constexpr std::chrono::seconds lookAgain{2};
+
+class GoingCard final : public Card {
+  public:
+    GoingCard(Daemon& daemon, Task& task, EarlierCard earlier, Clock::time_point deadline)
+        : Card(daemon, task, deadline), plan_(*task.plan), earlier_(std::move(earlier)) {}
+
+  private:
+    enum class Stage { begin, comeToRest, becomeReady, chooseLink, store, comeUp, tellFailure };
+
+    Outcome advance() override {
+        switch (stage_) {
+            case Stage::begin:
+                return begin();
+            case Stage::comeToRest:
+                return comeToRest();
+            case Stage::becomeReady:
+                return becomeReady();
+            case Stage::chooseLink:
+                return chooseLink();
+            case Stage::store:
+                return store();
+            case Stage::comeUp:
+                return comeUp();
+            case Stage::tellFailure:
+                return tellFailure();
+        }
+        return {};
+    }
+
+    [[nodiscard]] std::optional<std::string> network() const {
+        return plan_.wireless ? plan_.wireless->network : std::nullopt;
+    }
+    [[nodiscard]] std::optional<std::string> key() const {
+        return plan_.wireless ? plan_.wireless->key : std::nullopt;
+    }
+    [[nodiscard]] bool isWireless() const { return device_.kind == Device::Kind::wireless; }
+
+    Outcome begin() {
+        std::optional<Device> device;
+        RETURN_IF_FAILED(findCard(device));
+        if (!device) {
+            settle(plan_.active ? "there is no such interface" : "");
+            return {};
+        }
+        device_ = std::move(*device);
+        if (!plan_.active) {
+            stage_ = Stage::comeToRest;
+            return daemon_.disconnect(device_);
+        }
+        if (!isWireless() && network()) {
+            settle("a network to join is named, and the card is not a wireless one");
+            return {};
+        }
+        if (!device_.managed) {
+            RETURN_IF_FAILED(daemon_.setManaged(device_, true));
+        }
+        readyDeadline_ = Clock::now() + readyBound;
+        if (isWireless()) {
+            RETURN_IF_FAILED(switchRadio());
+        }
+        stage_ = Stage::becomeReady;
+        return {};
+    }
+
+    Outcome switchRadio() {
+        const bool isWanted = plan_.wireless && plan_.wireless->powerEnabled.value_or(false);
+        if (!isWanted) {
+            return {};
+        }
+        if (!daemon_.isRadioOn()) {
+            RETURN_IF_FAILED(daemon_.setRadio(true));
+            readyDeadline_ = Clock::now() + radioBound;
+        }
+        if (daemon_.isRadioBlocked()) {
+            task_.trouble = "the radio is switched off by a switch on the computer";
+            readyDeadline_ = Clock::now();
+        }
+        return {};
+    }
+
+    // Nothing is active on it any more.
+    Outcome comeToRest() {
+        std::uint32_t state = 0;
+        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
+        if (state > deviceDisconnected) {
+            if (isLate()) {
+                return {kSCStatusFailed, "NetworkManager did not switch the card off in time"};
+            }
+            waitUntil(deadline_);
+            return {};
+        }
+        // Only after it has come to rest: it then stays unmanaged through a restart of the daemon.
+        if (device_.managed) {
+            RETURN_IF_FAILED(daemon_.setManaged(device_, false));
+        }
+        RETURN_IF_FAILED(removeProfile());
+        settle();
+        return {};
+    }
+
+    Outcome becomeReady() {
+        std::uint32_t state = 0;
+        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
+        isReady_ = state >= deviceDisconnected;
+        if (!isReady_ && Clock::now() < readyDeadline_) {
+            waitUntil(readyDeadline_);
+            return {};
+        }
+        RETURN_IF_FAILED(daemon_.findActive(device_, active_));
+        stage_ = isWireless() ? Stage::chooseLink : Stage::store;
+        return {};
+    }
+
+    // How a wireless card gets onto its network. Come back to as long as the card is not on it, since what is
+    // on the air changes.
+    Outcome chooseLink() {
+        changesOnAir_ = daemon_.changesOnAir();
+        lookAgainAt_ = Clock::now() + lookAgain;
+        if (!link_ && active_ && !active_->external) {
+            std::optional<Profile> current;
+            RETURN_IF_FAILED(daemon_.findProfile(active_->uuid, current));
+            if (current) {
+                link_.emplace().current = wirelessSections(current->sections);
+                RETURN_IF_FAILED(daemon_.readSecrets(current->path, link_->current));
+            }
+        }
+        const bool isOnOne = link_ && !link_->current.empty();
+        if (!network() || (isOnOne && !key() && networkOf(link_->current) == network())) {
+            if (!isOnOne) {
+                settle("no network is named and the card is on none, so it joins none");
+                return {};
+            }
+            stage_ = Stage::store;
+            return {};
+        }
+        std::vector<HeardNetwork> heard;
+        if (isReady_) {
+            RETURN_IF_FAILED(daemon_.readHeard(device_, *network(), heard));
+        }
+        JoinDecision decision = chooseNetwork(heard, key());
+        reason_ = decision.reason;
+        if (!decision.choice) {
+            settle(reason_);
+            return holdStill();
+        }
+        if (!decision.choice->isHeard && reason_.empty()) {
+            reason_ = "the network was not found";
+        }
+        // What is not heard now may be heard again: the daemon keeps what it was told.
+        const bool isNew = !link_ || !link_->choice ||
+                           (decision.choice->isHeard && !decision.choice->isSameJoin(*link_->choice));
+        if (!isNew) {
+            stage_ = Stage::comeUp;
+            return {};
+        }
+        if (!link_) {
+            link_.emplace();
+        }
+        link_->choice = *decision.choice;
+        stage_ = Stage::store;
+        return {};
+    }
+
+    // Puts the profile into the daemon and asks for it to be activated, unless it is already.
+    Outcome store() {
+        const Sections sections = makeProfile(plan_, isWireless() ? &link_.value() : nullptr, earlier_.note);
+        const std::string secret = key().value_or("");
+        std::optional<Profile> known;
+        bool isForeign = false;
+        RETURN_IF_FAILED(findOurProfile(known, isForeign));
+        if (isForeign) {
+            return {kSCStatusFailed, "another program has a profile under this system's UUID"};
+        }
+        std::string path;
+        bool isChanged = true;
+        if (!isReady_) {
+            // The daemon activates it by itself when the card can be used.
+            if (known) {
+                RETURN_IF_FAILED(daemon_.deleteProfile(known->path));
+            }
+            RETURN_IF_FAILED(daemon_.addProfile(sections, Adding::atOnce, secret, path));
+            RETURN_IF_FAILED(daemon_.setAutoconnect(device_, true));
+            settle(isWireless() ? "the card cannot be used now" : "it has no carrier: the cable is out");
+            return {};
+        }
+        if (known) {
+            RETURN_IF_FAILED(update(*known, sections, secret, isChanged));
+            path = known->path;
+        } else {
+            RETURN_IF_FAILED(daemon_.addProfile(sections, Adding::heldBack, secret, path));
+        }
+        if (isChanged || !active_ || active_->profile != path) {
+            active_.emplace().profile = path;
+            RETURN_IF_FAILED(daemon_.activate(path, device_, active_->path));
+        }
+        stage_ = Stage::comeUp;
+        return {};
+    }
+
+    // Whether it says something new is seen by reading it twice: the daemon writes a profile its own way.
+    Outcome update(const Profile& known, const Sections& sections, const std::string& secret,
+                   bool& isChanged) {
+        Sections before = known.sections;
+        RETURN_IF_FAILED(daemon_.readSecrets(known.path, before));
+        RETURN_IF_FAILED(daemon_.updateProfile(known.path, sections, secret));
+        std::optional<Profile> after;
+        bool isForeign = false;
+        RETURN_IF_FAILED(findOurProfile(after, isForeign));
+        if (after) {
+            RETURN_IF_FAILED(daemon_.readSecrets(known.path, after->sections));
+            isChanged = after->sections != before;
+        }
+        return {};
+    }
+
+    Outcome comeUp() {
+        std::uint32_t state = 0;
+        RETURN_IF_FAILED(daemon_.activeState(active_->path, state));
+        if (state == activeActivated) {
+            settle();
+        } else if (state == activeDeactivated) {
+            stage_ = Stage::tellFailure;
+            reasonDeadline_ = Clock::now() + reasonBound;
+        } else if (isLate()) {
+            return giveUp();
+        } else if (link_ && link_->choice &&
+                   (changesOnAir_ != daemon_.changesOnAir() || Clock::now() >= lookAgainAt_)) {
+            stage_ = Stage::chooseLink;
+        } else {
+            waitUntil(link_ && link_->choice ? lookAgainAt_ : deadline_);
+        }
+        return {};
+    }
+
+    // At the deadline.
+    Outcome giveUp() {
+        std::uint32_t state = 0;
+        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
+        if (state >= deviceGetsAddresses && state <= deviceActivated && plan_.method == IPv4Method::dhcp) {
+            settle("no DHCP server answered; NetworkManager goes on asking");
+        } else {
+            settle(reason_.empty() ? "it was not up in time" : reason_);
+        }
+        return {};
+    }
+
+    Outcome tellFailure() {
+        const std::uint32_t reason = daemon_.failureOf(device_.path);
+        if (reason == 0 && Clock::now() < reasonDeadline_) {
+            waitUntil(reasonDeadline_);
+            return {};
+        }
+        settle(describeFailure(reason));
+        return isWireless() ? holdStill() : Outcome();
+    }
+
+    // The daemon would turn to another network of its own accord, and the location names this one.
+    Outcome holdStill() {
+        RETURN_IF_FAILED(daemon_.setAutoconnect(device_, false));
+        return daemon_.disconnect(device_);
+    }
+
+    const InterfacePlan& plan_;
+    const EarlierCard earlier_;
+    Stage stage_ = Stage::begin;
+    Device device_;
+    bool isReady_ = false;
+    Clock::time_point readyDeadline_;
+    Clock::time_point reasonDeadline_;
+    Clock::time_point lookAgainAt_;
+    unsigned changesOnAir_ = 0;
+    std::optional<Active> active_;
+    std::optional<WirelessLink> link_;  // of a wireless card
+    std::string reason_;                // why the card is not on its network so far
+};
+
+}  // namespace
+
+std::unique_ptr<Card> makeGoingCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+                                    Clock::time_point deadline) {
+    return std::make_unique<GoingCard>(daemon, task, earlier, deadline);
+}
+
+}  // namespace platform::apply

@@ -1,0 +1,208 @@
+// A card on its way back to how it was.
+#include <utility>
+
+#include "platform/Log.h"
+#include "platform/apply/networkmanager/Card.h"
+
+namespace platform::apply {
+namespace {
+
+class ReturningCard final : public Card {
+  public:
+    ReturningCard(Daemon& daemon, Task& task, EarlierCard earlier, std::shared_ptr<Place> place,
+                  Clock::time_point deadline)
+        : Card(daemon, task, deadline), earlier_(std::move(earlier)), place_(std::move(place)) {}
+    ReturningCard(const ReturningCard&) = delete;
+    ReturningCard& operator=(const ReturningCard&) = delete;
+    ~ReturningCard() override { place_->isTaken = true; }
+
+  private:
+    enum class Stage { begin, becomeReady, comeToRest, awaitPlace, comeUp, tellFailure, finish };
+
+    Outcome advance() override {
+        switch (stage_) {
+            case Stage::begin:
+                return begin();
+            case Stage::becomeReady:
+                return becomeReady();
+            case Stage::comeToRest:
+                return comeToRest();
+            case Stage::awaitPlace:
+                return awaitPlace();
+            case Stage::comeUp:
+                return comeUp();
+            case Stage::tellFailure:
+                return tellFailure();
+            case Stage::finish:
+                return finish();
+        }
+        return {};
+    }
+
+    [[nodiscard]] const ProfileNote& note() const { return earlier_.note; }
+
+    Outcome begin() {
+        std::optional<Device> device;
+        RETURN_IF_FAILED(findCard(device));
+        if (!device) {
+            settle();
+            return removeProfile();
+        }
+        device_ = std::move(*device);
+        RETURN_IF_FAILED(daemon_.findActive(device_, active_));
+        if (active_ && active_->uuid != note().earlier && active_->uuid != profileUUID(interface_)) {
+            logLine(LogLevel::notice,
+                    interface_ + ": somebody else has taken it over, and it is left to them");
+            settle();
+            return removeProfile();
+        }
+        readyDeadline_ = Clock::now();
+        if (!device_.managed) {
+            RETURN_IF_FAILED(daemon_.setManaged(device_, true));
+            readyDeadline_ += readyBound;
+        }
+        stage_ = Stage::becomeReady;
+        return {};
+    }
+
+    Outcome becomeReady() {
+        std::uint32_t state = 0;
+        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
+        if (state < deviceDisconnected && Clock::now() < readyDeadline_) {
+            waitUntil(readyDeadline_);
+            return {};
+        }
+        if (note().earlier.empty()) {
+            stage_ = Stage::comeToRest;
+            return daemon_.disconnect(device_);
+        }
+        return activateEarlier(state >= deviceDisconnected);
+    }
+
+    Outcome comeToRest() {
+        std::uint32_t state = 0;
+        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
+        if (state <= deviceDisconnected) {
+            stage_ = Stage::finish;
+        } else if (isLate()) {
+            return {kSCStatusFailed, "NetworkManager did not switch the card off in time"};
+        } else {
+            waitUntil(deadline_);
+        }
+        return {};
+    }
+
+    Outcome activateEarlier(bool isReady) {
+        std::optional<Profile> profile;
+        RETURN_IF_FAILED(daemon_.findProfile(note().earlier, profile));
+        if (!profile || !isReady) {
+            // What is active next is up to the daemon, as if this system had never been there.
+            task_.trouble = profile ? "no profile can be active on it now"
+                                    : "the profile that was active on it is deleted";
+            stage_ = Stage::finish;
+            return {};
+        }
+        profile_ = profile->path;
+        placeDeadline_ = Clock::now() + placeBound;
+        stage_ = Stage::awaitPlace;
+        return {};
+    }
+
+    Outcome awaitPlace() {
+        const bool isBack = active_ && active_->uuid == note().earlier;
+        if (!isBack && place_->before && !place_->before->isTaken && Clock::now() < placeDeadline_) {
+            waitUntil(placeDeadline_);
+            return {};
+        }
+        if (!isBack) {
+            active_.emplace().uuid = note().earlier;
+            RETURN_IF_FAILED(daemon_.activate(profile_, device_, active_->path));
+        }
+        placeDeadline_ = Clock::now() + placeBound;
+        stage_ = Stage::comeUp;
+        return {};
+    }
+
+    Outcome comeUp() {
+        std::uint32_t state = 0;
+        std::uint32_t cardState = 0;
+        RETURN_IF_FAILED(daemon_.activeState(active_->path, state));
+        RETURN_IF_FAILED(daemon_.deviceState(device_.path, cardState));
+        place_->isTaken =
+            place_->isTaken || (cardState >= deviceGetsAddresses && cardState <= deviceActivated);
+        // What was not up before is asked for, and waited for only as long as its place is at stake.
+        const bool isEnough = !earlier_.wasUp && (place_->isTaken || device_.kind == Device::Kind::wireless ||
+                                                  Clock::now() >= placeDeadline_);
+        if (state == activeActivated || isEnough) {
+            stage_ = Stage::finish;
+        } else if (state == activeDeactivated) {
+            stage_ = Stage::tellFailure;
+            reasonDeadline_ = Clock::now() + reasonBound;
+        } else if (isLate()) {
+            task_.trouble = "the profile that was active before is not up yet; NetworkManager goes on";
+            stage_ = Stage::finish;
+        } else {
+            waitUntil(earlier_.wasUp ? deadline_ : placeDeadline_);
+        }
+        return {};
+    }
+
+    Outcome tellFailure() {
+        const std::uint32_t reason = daemon_.failureOf(device_.path);
+        if (reason == 0 && Clock::now() < reasonDeadline_) {
+            waitUntil(reasonDeadline_);
+            return {};
+        }
+        task_.trouble = "the profile that was active before does not come up: " + describeFailure(reason);
+        stage_ = Stage::finish;
+        return {};
+    }
+
+    // Even when the earlier profile does not come up, the temporary one is not to stay in its place.
+    Outcome finish() {
+        RETURN_IF_FAILED(removeProfile());
+        // Behind that, or the daemon would activate our profile again.
+        std::optional<Device> device;
+        RETURN_IF_FAILED(findCard(device));
+        if (device && device->autoconnect != note().autoconnect) {
+            RETURN_IF_FAILED(daemon_.setAutoconnect(*device, note().autoconnect));
+        }
+        if (!note().radio && daemon_.isRadioOn()) {
+            RETURN_IF_FAILED(daemon_.setRadio(false));
+        }
+        settle();
+        return task_.trouble.empty() ? compare() : Outcome();
+    }
+
+    Outcome compare() {
+        std::optional<Device> device;
+        std::optional<Active> active;
+        RETURN_IF_FAILED(findCard(device));
+        if (!device) {
+            return {};
+        }
+        RETURN_IF_FAILED(daemon_.findActive(*device, active));
+        const bool isSame = (active ? active->uuid : "") == note().earlier && device->managed &&
+                            device->autoconnect == note().autoconnect;
+        return isSame ? Outcome() : Outcome(kSCStatusFailed, "it is not as it was before");
+    }
+
+    const EarlierCard earlier_;
+    const std::shared_ptr<Place> place_;
+    std::string profile_;  // the path of the earlier profile
+    Clock::time_point placeDeadline_;
+    Stage stage_ = Stage::begin;
+    Device device_;
+    Clock::time_point readyDeadline_;
+    Clock::time_point reasonDeadline_;
+    std::optional<Active> active_;
+};
+
+}  // namespace
+
+std::unique_ptr<Card> makeReturningCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+                                        std::shared_ptr<Place> place, Clock::time_point deadline) {
+    return std::make_unique<ReturningCard>(daemon, task, earlier, std::move(place), deadline);
+}
+
+}  // namespace platform::apply
