@@ -30,6 +30,7 @@ RUNTIME = Path("/run/location-assistant")
 NOBODY = 65534
 RESIDENT = 4242  # the user who sits at the computer
 UPDATE = "--update" in sys.argv
+DAEMON = "--networkmanager" in sys.argv  # for the tests that can do without it
 FORBID_SKIPS = os.environ.get("LA_FORBID_SKIPS") == "1"
 ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
     key: value for key, value in os.environ.items() if key.endswith("SAN_OPTIONS")}
@@ -161,7 +162,7 @@ def skip_all(reason):
 
 def main():
     enter()
-    arguments = [argument for argument in sys.argv if argument != "--update"]
+    arguments = [argument for argument in sys.argv if argument not in ("--update", "--networkmanager")]
     result = unittest.main(module="__main__", argv=arguments, exit=False, verbosity=2, warnings="ignore").result
     if not result.wasSuccessful() or (result.skipped and FORBID_SKIPS):
         sys.exit(1)
@@ -180,7 +181,8 @@ def wait_until(condition, seconds=10):
 
 class Lab:
     """One fresh machine; only one at a time. printer is a manner of printer.py or None; dhcp names the card at whose
-    other end a DHCP server answers; with daemon the network before is NetworkManager's work."""
+    other end a DHCP server answers; with daemon the network before is NetworkManager's work. A card's name ends in its
+    number."""
 
     def __init__(self, cards=("eth0", "wlan0"), printer="well", dhcp=None, daemon=False):
         # Outside, the lines below would change the machine's own network and end its processes.
@@ -200,7 +202,7 @@ class Lab:
         self.thread.start()
 
         for card in cards:
-            ip(f"link add {card} address 02:00:00:00:00:{ord(card[0]):02x} type veth peer name far-{card} netns far")
+            ip(f"link add {card} address 02:00:00:00:0{card[-1]}:{ord(card[0]):02x} type veth peer name far-{card} netns far")
             ip(f"-n far link set far-{card} up")
         # The machine before the tool comes: both cards in use, the wired one leads out.
         if "eth0" in cards:
@@ -231,7 +233,7 @@ class Lab:
             self.start_bus()
             self.start_network_manager()
         if {"eth0", "wlan0"} & set(cards):
-            wait_until(lambda: all("LOWER_UP" in link["flags"] for link in self.links()))
+            wait_until(lambda: all("LOWER_UP" in link["flags"] for link in self.links() if link["ifname"] in ("eth0", "wlan0")))
 
     def close(self):
         for process in Path("/proc").glob("[0-9]*"):
@@ -263,7 +265,7 @@ class Lab:
                  "ln -s ../../devices/virtual/net/lo class/net/lo"]
         for card in self.cards:
             kind = card.rstrip("0123456789")
-            pci, driver = PCI[kind], DRIVER[kind]
+            pci, driver = PCI[kind][:-1] + card[-1], DRIVER[kind]
             device, net = f"devices/pci0000:00/{pci}", f"devices/pci0000:00/{pci}/net/{card}"
             lines += [
                 f"mkdir -p {net} bus/pci/drivers/{driver}",
@@ -273,7 +275,7 @@ class Lab:
                 f"ln -s ../../../../../class/net {net}/subsystem",
                 f"printf 'INTERFACE={card}\\nIFINDEX=%s\\n' $(cat {net}/ifindex) >{net}/uevent",
                 f"ln -s ../../../bus/pci {device}/subsystem",
-                f"ln -s ../../../bus/pci/drivers/{driver} {device}/driver",
+                f"ln -sfn ../../../bus/pci/drivers/{driver} {device}/driver",
                 f"ln -s ../../../devices/pci0000:00/{pci} bus/pci/devices/{pci}",
                 f"echo 0x8086 >{device}/vendor",
                 f"printf 'DRIVER={driver}\\nPCI_SLOT_NAME={pci}\\n' >{device}/uevent",
@@ -324,7 +326,7 @@ class Lab:
                 (folder / f"{name}.nmconnection").chmod(0o600)
         log = (LAB / "networkmanager.log").open("ab")
         self.network_manager = self.daemon("NetworkManager", "--debug", stdout=log, stderr=log)
-        wait_until(lambda: self.nmcli("-f DEVICE,STATE device").count(":connected\n") >= len(self.cards), 20)
+        wait_until(lambda: self.nmcli("-f DEVICE,STATE device").count(":connected\n") >= len({"eth0", "wlan0"} & set(self.cards)), 20)
 
     @staticmethod
     def nmcli(arguments):

@@ -1,0 +1,199 @@
+#!/usr/bin/env python3
+"""What can go wrong on an ordinary day. After each a plain create reaches the printer, and remove leads home, within the
+time that a person waits. usage: test_troubles.py [--networkmanager]"""
+import os
+import signal
+import subprocess
+import time
+from pathlib import Path
+
+import lab
+from lab import ip, sh, wait_until
+
+SET_FILE = Path("/tmp/set.orig")
+
+
+class Troubles(lab.LabTest):
+    def setUp(self):
+        pass
+
+    def machine(self, **options):
+        self.lab = lab.Lab(daemon=lab.DAEMON, **options)
+        self.lab.transcript = ""
+
+    def timed(self, *words):
+        """Runs the tool; how long it took. Nothing but a network stood against it: every commit is a success."""
+        begin = time.monotonic()
+        _, trace = self.lab.tool(*words)
+        seconds = time.monotonic() - begin
+        self.assertNotIn("MoreSCClose() failed", trace, self.lab.syslog)
+        print(f"    {' '.join(words)}: {seconds:.1f} s", flush=True)
+        return seconds
+
+    def there_and_back(self, before):
+        self.assertLess(self.timed("create"), 12)
+        self.assertEqual(self.lab.ipv4("wlan0"), ["192.0.0.199/24"], "\n".join(self.lab.syslog))
+        self.assertIn("Demonstration printer", self.lab.fetch())
+        self.assertLess(self.timed("remove"), 10)
+        self.assert_home(before)
+
+    def assert_home(self, before):
+        after = self.lab.network()
+        for state in before, after:
+            # A card on which nothing is active keeps IPv6 off after a profile without it, as after every such profile.
+            state["routes"] = [route for route in state["routes"] if '"dst": "ff00::/8"' not in route]
+        self.assertEqual(before, after, "\n".join(self.lab.syslog))
+        self.assertFalse((lab.RUNTIME / "applied.plist").exists())
+
+    # Each trouble, and what the log says about it.
+
+    def no_server_twice(self):
+        for _ in range(2):
+            self.assertLess(self.timed("create", "auto"), 21)
+        return "eth0: no DHCP server answered"
+
+    def no_server_on_the_air(self):
+        self.assertLess(self.timed("create", "wirelessAuto"), 21)
+        return "wlan0: no DHCP server answered"
+
+    def unknown_network(self):
+        self.assertLess(self.timed("create", "from_intro", "Nowhere"), 21)
+        return "wlan0: "
+
+    def unusable_key(self):
+        self.timed("create", "from_intro", "Printer", "four")
+        return "wlan0: "
+
+    def mistyped_key(self):
+        self.timed("create", "from_intro", "Printer", "mistyped key")
+        self.timed("create", "from_intro", "Printer", "the right key")
+        return "wlan0: "
+
+    def location_that_is_gone(self):
+        self.timed("create")
+        SET_FILE.write_text("0\n")
+        self.timed("remove")
+        return '"CurrentSet" names no location'
+
+    def other_users_file(self):
+        SET_FILE.write_text("7")
+        os.chown(SET_FILE, lab.NOBODY if lab.other_users() else 0, -1)
+        SET_FILE.chmod(0o666)
+        return ""
+
+    def card_pulled_out(self):
+        self.timed("create", "auto")
+        ip("link del eth1")
+        self.timed("create", "auto")
+        return "eth1: "
+
+    def test_every_trouble(self):
+        for row in ("no_server_twice", "no_server_on_the_air", "unknown_network", "unusable_key", "mistyped_key",
+                    "location_that_is_gone", "other_users_file", "card_pulled_out"):
+            with self.subTest(row):
+                self.machine(cards=("eth0", "wlan0", "eth1")[:3 if row == "card_pulled_out" else 2])
+                try:
+                    before = self.lab.network()
+                    reason = getattr(self, row)()
+                    wait_until(lambda: not reason or any(reason in line for line in self.lab.syslog))
+                    if row == "card_pulled_out":
+                        self.lab.cards = self.lab.cards[:2]
+                        self.timed("remove")
+                        before = self.lab.network()
+                    self.there_and_back(before)
+                finally:
+                    self.lab.close()
+
+    def test_four_cards_without_a_server(self):
+        self.machine(cards=("eth0", "eth1", "eth2", "eth3", "wlan0"))
+        try:
+            before = self.lab.network()
+            for _ in range(2):
+                self.assertLess(self.timed("create", "auto"), 21)
+            self.assertLess(self.timed("remove"), 15)
+            self.assert_home(before)
+        finally:
+            self.lab.close()
+
+    def desktop_with_a_cable_to_nowhere(self):
+        self.machine()
+        try:
+            sh("nmcli connection modify office ipv4.method auto ipv4.addresses '' ipv4.gateway '' ipv6.method disabled;"
+               "nmcli -w 0 connection up office")
+            wait_until(lambda: "connecting" in self.lab.nmcli("-f GENERAL.STATE device show eth0"))
+            self.assertLess(self.timed("create"), 12)
+            self.assertIn("Demonstration printer", self.lab.fetch())
+            self.assertLess(self.timed("remove"), 10)
+            self.assertIn("connecting", self.lab.nmcli("-f GENERAL.STATE device show eth0"))
+            self.assertEqual(self.lab.ipv4("wlan0"), ["10.20.0.7/16"])
+            self.assertIn("lounge", self.lab.nmcli("-g GENERAL.CONNECTION device show wlan0"))
+        finally:
+            self.lab.close()
+
+    # What is full or away in the middle: remove alone leads home.
+
+    def fill(self, folder):
+        subprocess.run(f"cat /dev/zero >{folder}/filler", shell=True, check=False, stderr=subprocess.DEVNULL)
+
+    def test_full_folders(self):
+        for folder in lab.RUNTIME, Path("/tmp"):
+            for moment in "before", "between":
+                with self.subTest(folder=folder, moment=moment):
+                    self.machine()
+                    try:
+                        before = self.lab.network()
+                        self.lab.tool("saveZAT")
+                        folder.mkdir(mode=0o700, exist_ok=True)
+                        sh(f"mount -t tmpfs -o size=64k,mode={'700' if folder == lab.RUNTIME else '1777'} tmpfs {folder}")
+                        SET_FILE.write_text("0")
+                        SET_FILE.chmod(0o600)
+                        if moment == "between":
+                            self.lab.tool("create")
+                        self.fill(folder)
+                        if moment == "before":
+                            self.lab.tool("create")
+                        self.lab.tool("remove")
+                        self.assert_home(before)
+                        sh(f"rm -f {folder}/filler")
+                        self.there_and_back(before)
+                    finally:
+                        sh(f"umount {folder}")
+                        self.lab.close()
+
+    def daemon_away(self):
+        for sign in signal.SIGSTOP, signal.SIGKILL:
+            with self.subTest(sign.name):
+                self.machine()
+                try:
+                    before = self.lab.network()
+                    self.lab.tool("create")
+                    daemon = self.lab.network_manager
+                    daemon.send_signal(sign)
+                    if sign == signal.SIGKILL:
+                        daemon.wait()
+                    begin = time.monotonic()
+                    self.lab.tool("remove")
+                    self.assertLess(time.monotonic() - begin, 15)
+                    if sign == signal.SIGSTOP:
+                        daemon.send_signal(signal.SIGCONT)
+                    else:
+                        self.lab.daemons.remove(daemon)
+                        log = (lab.LAB / "networkmanager.log").open("ab")
+                        self.lab.network_manager = self.lab.daemon("NetworkManager", "--debug", stdout=log, stderr=log)
+                        wait_until(lambda: self.lab.nmcli("-g STARTUP general") == "started\n", 20)
+                    self.timed("remove")
+                    wait_until(lambda: "lounge" in self.lab.nmcli("-g GENERAL.CONNECTION device show wlan0"))
+                    after = self.lab.network()
+                    for key in ("links", "addresses", "profiles", "devices", "resolv.conf"):
+                        self.assertEqual(before[key], after[key], "\n".join(self.lab.syslog))
+                    self.assertFalse((lab.RUNTIME / "applied.plist").exists())
+                finally:
+                    self.lab.close()
+
+    if lab.DAEMON:
+        test_daemon_away = daemon_away
+        test_desktop_with_a_cable_to_nowhere = desktop_with_a_cable_to_nowhere
+
+
+if __name__ == "__main__":
+    lab.main()
