@@ -9,6 +9,7 @@
 
 #include <csignal>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <string>
 
@@ -153,6 +154,9 @@ void OpenStandardDescriptors() {
 }  // namespace
 
 int main(int argc, char** argv) {
+    // Libraries below take orders from the environment: where to read a time zone, or to print what they
+    // parse, passwords included.
+    clearenv();
     OpenStandardDescriptors();
     std::signal(SIGPIPE, SIG_IGN);
     umask(S_IRWXG | S_IRWXO);

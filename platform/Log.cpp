@@ -1,10 +1,17 @@
 #include "platform/Log.h"
 
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <syslog.h>
+#include <unistd.h>
 
+#include <array>
+#include <cstdio>
+#include <ctime>
 #include <utility>
 
 #include "platform/CoreServices.h"
+#include "platform/FileDescriptor.h"
 
 namespace platform {
 namespace {
@@ -14,7 +21,7 @@ std::function<void(LogLevel, std::string_view)>& sink() {
     return instead;
 }
 
-int priorityOf(LogLevel level) {
+int severityOf(LogLevel level) {
     switch (level) {
         case LogLevel::error:
             return LOG_ERR;
@@ -26,6 +33,35 @@ int priorityOf(LogLevel level) {
             return LOG_DEBUG;
     }
     return LOG_ERR;
+}
+
+// "Nov  3 09:05:07": of Greenwich, because the local zone is a file that the environment chooses. The daemons
+// put their own time.
+std::string timeStamp() {
+    constexpr std::array<const char*, 12> months = {"Jan", "Feb", "Mar", "Apr", "May", "Jun",
+                                                    "Jul", "Aug", "Sep", "Oct", "Nov", "Dec"};
+    const std::time_t now = std::time(nullptr);
+    std::tm time{};
+    gmtime_r(&now, &time);
+    std::array<char, 64> text{};
+    std::snprintf(text.data(), text.size(), "%s %2d %02d:%02d:%02d",
+                  months[static_cast<std::size_t>(time.tm_mon)], time.tm_mday, time.tm_hour, time.tm_min,
+                  time.tm_sec);
+    return text.data();
+}
+
+// What syslog(3) would send, but without waiting: a daemon that reads nothing, or a queue that somebody else
+// filled, would otherwise hold a run for ever. A socket for each line, because the daemon may be started
+// anew.
+void send(int severity, const std::string& text) {
+    const std::string datagram = "<" + std::to_string(LOG_DAEMON | severity) + ">" + timeStamp() +
+                                 " location-assistant[" + std::to_string(getpid()) + "]: " + text;
+    const FileDescriptor daemon(socket(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
+    const sockaddr_un address{AF_UNIX, "/dev/log"};
+    if (connect(daemon.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0) {
+        static_cast<void>(
+            ::send(daemon.get(), datagram.data(), datagram.size(), MSG_DONTWAIT | MSG_NOSIGNAL));
+    }
 }
 
 }  // namespace
@@ -42,12 +78,7 @@ void logLine(LogLevel level, std::string_view text) {
         sink()(level, line);
         return;
     }
-    static const bool opened = [] {
-        openlog("location-assistant", LOG_PID | LOG_NDELAY, LOG_DAEMON);
-        return true;
-    }();
-    static_cast<void>(opened);
-    syslog(priorityOf(level), "%s", line.c_str());
+    send(severityOf(level), line);
 }
 
 LogCapture::LogCapture(std::function<void(LogLevel, std::string_view)> newSink)

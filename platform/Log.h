@@ -10,7 +10,8 @@ namespace platform {
 enum class LogLevel { error, warning, notice, debug };
 
 // Writes one line to the system log under the name "location-assistant". Control bytes are shown as '?', and
-// a line is cut at 1000 bytes, so that a file's content cannot forge lines of its own.
+// a line is cut at 1000 bytes, so that a file's content cannot forge lines of its own. It never waits: a line
+// that the log daemon cannot take at once (none runs, or its queue is full) is lost.
 void logLine(LogLevel level, std::string_view text);
 
 // Takes the lines instead of the system log for one scope, for tests.
