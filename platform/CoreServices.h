@@ -92,6 +92,7 @@ inline constexpr OSStatus kURLTimedOutError = -30791;         // the server was 
 inline constexpr OSStatus kURLConnectionLostError = -30792;   // broken off before the answer was complete
 inline constexpr OSStatus kURLMalformedAnswerError = -30793;  // what came is not HTTP
 inline constexpr OSStatus kURLAnswerTooLargeError = -30794;
+inline constexpr OSStatus kURLClientError = -30795;  // the HTTP client library is missing or does not work
 // Fetches an http URL into the buffer, replacing what it holds. No proxy, no redirects, and never longer or
 // larger than the bounds of platform/services/Download.h. 0 for an answer of class 2xx; the HTTP status for
 // every other answer (404, a redirect's 302), whatever its body; a negative value when there was no answer,

@@ -1,22 +1,16 @@
+#include <arpa/inet.h>
+#include <curl/curl.h>
+#include <dlfcn.h>
+
 #include <algorithm>
 #include <array>
-#include <boost/asio/buffer.hpp>
-#include <boost/asio/io_context.hpp>
-#include <boost/asio/ip/address.hpp>
-#include <boost/asio/ip/tcp.hpp>
-#include <boost/beast/core/flat_buffer.hpp>
-#include <boost/beast/http/empty_body.hpp>
-#include <boost/beast/http/error.hpp>
-#include <boost/beast/http/message.hpp>
-#include <boost/beast/http/parser.hpp>
-#include <boost/beast/http/read.hpp>
-#include <boost/beast/http/string_body.hpp>
-#include <boost/beast/http/write.hpp>
 #include <charconv>
 #include <cstdint>
-#include <limits>
+#include <memory>
 #include <optional>
+#include <string>
 #include <utility>
+#include <vector>
 
 #include "platform/Log.h"
 #include "platform/services/Download.h"
@@ -24,19 +18,66 @@
 namespace platform::services {
 namespace {
 
-namespace asio = boost::asio;
-namespace http = boost::beast::http;
-using Error = boost::system::error_code;
-using Clock = std::chrono::steady_clock;
-
-struct Address {
-    asio::ip::tcp::endpoint endpoint;
-    std::string authority;  // as the Host field wants it
-    std::string target;
+// The operations of libcurl. It stays loaded until the process ends, as whatever it brought along has to.
+struct Curl {
+    decltype(&curl_global_init) globalInit = nullptr;
+    decltype(&curl_easy_init) init = nullptr;
+    decltype(&curl_easy_setopt) setOption = nullptr;
+    decltype(&curl_easy_perform) perform = nullptr;
+    decltype(&curl_easy_getinfo) getInfo = nullptr;
+    decltype(&curl_easy_strerror) textOf = nullptr;
+    decltype(&curl_easy_cleanup) cleanup = nullptr;
 };
 
-// 0, or a status of the download with the address unset.
-OSStatus parse(std::string_view url, Address& address) {
+template <class Function>
+bool find(void* library, const char* name, Function& function) {
+    function = reinterpret_cast<Function>(dlsym(library, name));
+    return function != nullptr;
+}
+
+// Nothing, with the reason, when none of the libraries is there.
+std::optional<Curl> load(const std::vector<std::string>& libraries, std::string& reason) {
+    for (const std::string& name : libraries) {
+        void* const library = dlopen(name.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
+        Curl curl;
+        if (library != nullptr && find(library, "curl_global_init", curl.globalInit) &&
+            find(library, "curl_easy_init", curl.init) && find(library, "curl_easy_setopt", curl.setOption) &&
+            find(library, "curl_easy_perform", curl.perform) &&
+            find(library, "curl_easy_getinfo", curl.getInfo) &&
+            find(library, "curl_easy_strerror", curl.textOf) &&
+            find(library, "curl_easy_cleanup", curl.cleanup) &&
+            curl.globalInit(CURL_GLOBAL_NOTHING) == CURLE_OK) {
+            return curl;
+        }
+        const char* const error = dlerror();
+        reason = error != nullptr ? error : name + " cannot be started";
+    }
+    return std::nullopt;
+}
+
+// Whether the text is the numeric address of a host, a port of 1 to 65535 where one is given, or both.
+bool isNumericAuthority(std::string_view text) {
+    const bool isBracketed = text.starts_with('[');
+    const std::size_t hostEnd = isBracketed ? text.find(']') : std::min(text.find(':'), text.size());
+    if (hostEnd == std::string_view::npos) {
+        return false;
+    }
+    const std::string host(text.substr(isBracketed ? 1 : 0, hostEnd - (isBracketed ? 1 : 0)));
+    const std::string_view port = text.substr(hostEnd + (isBracketed ? 1 : 0));
+    if (!port.empty()) {
+        std::uint16_t number = 0;
+        const char* const end = port.data() + port.size();
+        const auto [stop, error] = std::from_chars(port.data() + 1, end, number);
+        if (port.front() != ':' || error != std::errc() || stop != end || number == 0) {
+            return false;
+        }
+    }
+    in6_addr address{};
+    return inet_pton(isBracketed ? AF_INET6 : AF_INET, host.c_str(), &address) == 1;
+}
+
+// 0 for a URL that may be fetched.
+OSStatus judge(std::string_view url) {
     constexpr std::size_t longest = 2048;
     constexpr std::string_view scheme = "http://";
     const bool isPlain = url.size() <= longest &&
@@ -44,212 +85,166 @@ OSStatus parse(std::string_view url, Address& address) {
     if (!isPlain) {
         return kURLInvalidURLError;
     }
-    const auto sameLetter = [](char lhs, char rhs) {
-        return (lhs >= 'A' && lhs <= 'Z' ? lhs + 32 : lhs) == rhs;
-    };
-    if (url.size() < scheme.size() || !std::equal(scheme.begin(), scheme.end(), url.begin(),
-                                                  [&](char lhs, char rhs) { return sameLetter(rhs, lhs); })) {
+    const auto isLetter = [](char wanted, char c) { return (c >= 'A' && c <= 'Z' ? c + 32 : c) == wanted; };
+    if (url.size() < scheme.size() || !std::equal(scheme.begin(), scheme.end(), url.begin(), isLetter)) {
         return kURLUnsupportedSchemeError;
     }
     url.remove_prefix(scheme.size());
-    url = url.substr(0, url.find('#'));
-    const std::size_t authorityEnd = std::min(url.find_first_of("/?"), url.size());
-    const std::string_view authority = url.substr(0, authorityEnd);
-    const std::string_view rest = url.substr(authorityEnd);
-
-    const bool isBracketed = authority.starts_with('[');
-    const std::size_t hostEnd =
-        isBracketed ? authority.find(']') : std::min(authority.find(':'), authority.size());
-    if (hostEnd == std::string_view::npos) {
-        return kURLInvalidURLError;
-    }
-    const std::string_view host = authority.substr(isBracketed ? 1 : 0, hostEnd - (isBracketed ? 1 : 0));
-    std::string_view port = authority.substr(hostEnd + (isBracketed ? 1 : 0));
-    std::uint16_t portNumber = 80;
-    if (!port.empty()) {
-        const char* end = port.data() + port.size();
-        const auto [stop, error] = std::from_chars(port.data() + 1, end, portNumber);
-        if (port.front() != ':' || error != std::errc() || stop != end || portNumber == 0) {
-            return kURLInvalidURLError;
-        }
-    }
-    Error error;
-    const asio::ip::address ip = isBracketed
-                                     ? asio::ip::address(asio::ip::make_address_v6(std::string(host), error))
-                                     : asio::ip::address(asio::ip::make_address_v4(std::string(host), error));
-    if (error) {
-        return kURLInvalidURLError;
-    }
-    address.endpoint = {ip, portNumber};
-    address.authority = authority;
-    address.target = rest.starts_with('/') ? rest : "/" + std::string(rest);
-    return 0;
+    return isNumericAuthority(url.substr(0, url.find_first_of("/?#"))) ? 0 : kURLInvalidURLError;
 }
 
-OSStatus statusFor(const Error& error) {
-    if (error == asio::error::timed_out) {
-        return kURLTimedOutError;
-    }
-    if (error == http::error::header_limit || error == http::error::body_limit ||
-        error == http::error::buffer_overflow) {
-        return kURLAnswerTooLargeError;
-    }
-    if (error == http::error::end_of_stream || error == http::error::partial_message ||
-        error == asio::error::connection_reset || error == asio::error::eof ||
-        error == asio::error::broken_pipe) {
-        return kURLConnectionLostError;
-    }
-    if (error.category() == make_error_code(http::error::bad_version).category()) {
-        return kURLMalformedAnswerError;
-    }
-    return kURLUnreachableError;
-}
-
-// One document over one connection. Every step is given up at its deadline.
+// One document over one connection.
 class Transfer {
   public:
-    Transfer(const Address& address, const DownloadBounds& bounds)
-        : address_(address),
-          bounds_(bounds),
-          end_(Clock::now() + bounds.whole),
-          buffer_(bounds.headerBytes) {}
+    Transfer(const Curl& curl, const DownloadBounds& bounds, std::string& body)
+        : curl_(curl), bounds_(bounds), body_(body), easy_(curl.init(), curl.cleanup) {}
 
-    // The HTTP status, or nothing with the error set.
-    std::optional<unsigned> run(std::string& body, Error& error) {
-        error = connect();
-        if (!error) {
-            error = sendRequest();
-        }
-        for (int interim = 0; !error && interim <= bounds_.interimAnswers; ++interim) {
-            error = readHeader();
-            const unsigned status = error ? 0 : parser_->get().result_int();
-            constexpr unsigned switchingProtocols = 101;
-            if (error || (status >= 100 && status < 200 && status != switchingProtocols)) {
-                continue;
+    // The HTTP status, or nothing with the status of the download and the reason.
+    std::optional<long> run(const std::string& url, OSStatus& failure, std::string& reason) {
+        std::array<char, CURL_ERROR_SIZE> text{};
+        CURLcode result = prepare(url, text.data());
+        if (result != CURLE_OK) {
+            failure = kURLClientError;
+        } else {
+            result = curl_.perform(easy_.get());
+            const long status = statusNow();
+            if (isFinal(status) || (result == CURLE_OK && status != 0)) {
+                return status;
             }
-            if (status >= 200 && status < 300) {
-                error = readBody(body);
-            }
-            return error ? std::nullopt : std::optional(status);
+            failure = statusFor(result);
         }
-        if (!error) {
-            error = http::error::header_limit;
-        }
+        reason = isTooLarge_       ? "the answer is too large"
+                 : text[0] != '\0' ? text.data()
+                                   : curl_.textOf(result);
         return std::nullopt;
     }
 
   private:
-    using Parser = http::response_parser<http::string_body>;
-
-    // Starts an operation and waits until it is done or the deadline has passed.
-    template <class Start>
-    Error await(Clock::time_point deadline, Start start) {
-        std::optional<Error> done;
-        start([&done](const Error& error, auto&&...) { done = error; });
-        context_.restart();
-        context_.run_until(std::min(deadline, end_));
-        if (done) {
-            return *done;
+    template <class Value>
+    void set(CURLcode& result, CURLoption option, Value value) {
+        if (result == CURLE_OK) {
+            result = curl_.setOption(easy_.get(), option, value);
         }
-        // Closing the socket ends the operation, and its handler must have run before what it refers to goes.
-        Error ignored;
-        socket_.close(ignored);
-        context_.restart();
-        context_.run();
-        return asio::error::timed_out;
     }
-    Error connect() {
-        return await(Clock::now() + bounds_.connecting,
-                     [this](auto handler) { socket_.async_connect(address_.endpoint, std::move(handler)); });
-    }
-    Error sendRequest() {
-        http::request<http::empty_body> request(http::verb::get, address_.target, 11);
-        request.set(http::field::host, address_.authority);
-        request.set(http::field::user_agent, "location-assistant");
-        request.set(http::field::accept, "*/*");
-        request.set(http::field::connection, "close");
-        return await(end_, [this, &request](auto handler) {
-            http::async_write(socket_, request, std::move(handler));
-        });
-    }
-    Error readHeader() {
-        const Error error = readHeaderOnce();
-        return error && mendStatusLine() ? readHeaderOnce() : error;
-    }
-    Error readHeaderOnce() {
-        parser_.emplace();
-        parser_->header_limit(static_cast<std::uint32_t>(bounds_.headerBytes));
-        // A large body announced must not hide the status; readBody looks at the length.
-        parser_->body_limit(std::numeric_limits<std::uint64_t>::max());
-        return await(end_, [this](auto handler) {
-            http::async_read_header(socket_, buffer_, *parser_, std::move(handler));
-        });
-    }
-    // The servers in small devices end the line right behind the status; the parser insists on the blank that
-    // belongs there even without a reason.
-    bool mendStatusLine() {
-        constexpr std::string_view example = "HTTP/1.0 404";
-        const auto held = buffer_.cdata();
-        std::string text(static_cast<const char*>(held.data()), held.size());
-        if (text.size() <= example.size() || text.size() == buffer_.max_size() ||
-            !text.starts_with("HTTP/1.") || text[example.size()] != '\r') {
-            return false;
-        }
-        text.insert(example.size(), 1, ' ');
-        buffer_.clear();
-        buffer_.commit(asio::buffer_copy(buffer_.prepare(text.size()), asio::buffer(text)));
-        return true;
-    }
-    Error readBody(std::string& body) {
-        if (parser_->content_length().value_or(0) > bounds_.bodyBytes) {
-            return http::error::body_limit;
-        }
-        parser_->body_limit(bounds_.bodyBytes);
-        const Error error = await(
-            end_, [this](auto handler) { http::async_read(socket_, buffer_, *parser_, std::move(handler)); });
-        if (!error) {
-            body = std::move(parser_->get().body());
-        }
-        return error;
+    CURLcode prepare(const std::string& url, char* reason) {
+        CURLcode result = easy_ ? CURLE_OK : CURLE_OUT_OF_MEMORY;
+        set(result, CURLOPT_ERRORBUFFER, reason);
+        set(result, CURLOPT_URL, url.c_str());
+        set(result, CURLOPT_PROTOCOLS_STR, "http");
+        set(result, CURLOPT_USERAGENT, "location-assistant");
+        set(result, CURLOPT_HTTP_VERSION, long{CURL_HTTP_VERSION_1_1});
+        // The server is asked directly, whatever the environment says, and nowhere else than here.
+        set(result, CURLOPT_PROXY, "");
+        set(result, CURLOPT_NOPROXY, "*");
+        set(result, CURLOPT_FOLLOWLOCATION, 0L);
+        set(result, CURLOPT_NETRC, long{CURL_NETRC_IGNORED});
+        set(result, CURLOPT_NOSIGNAL, 1L);
+        set(result, CURLOPT_CONNECTTIMEOUT_MS, static_cast<long>(bounds_.connecting.count()));
+        set(result, CURLOPT_TIMEOUT_MS, static_cast<long>(bounds_.whole.count()));
+        set(result, CURLOPT_MAXFILESIZE_LARGE, static_cast<curl_off_t>(bounds_.bodyBytes));
+        set(result, CURLOPT_HEADERFUNCTION, &Transfer::takeHeader);
+        set(result, CURLOPT_HEADERDATA, this);
+        set(result, CURLOPT_WRITEFUNCTION, &Transfer::takeBody);
+        set(result, CURLOPT_WRITEDATA, this);
+        return result;
     }
 
-    const Address& address_;
+    [[nodiscard]] long statusNow() const {
+        long status = 0;
+        return curl_.getInfo(easy_.get(), CURLINFO_RESPONSE_CODE, &status) == CURLE_OK ? status : 0;
+    }
+    // Whether the status is an answer whatever follows it: neither that of an interim answer nor of one whose
+    // body is wanted.
+    static bool isFinal(long status) { return status >= 300; }
+
+    // Both take the bytes by returning their number; any other number ends the transfer.
+    static std::size_t takeHeader(const char* /*line*/, std::size_t size, std::size_t count, void* transfer) {
+        auto& self = *static_cast<Transfer*>(transfer);
+        self.headerBytes_ += size * count;
+        self.isTooLarge_ = self.headerBytes_ > self.bounds_.headerBytes;
+        return isFinal(self.statusNow()) || self.isTooLarge_ ? 0 : size * count;
+    }
+    static std::size_t takeBody(const char* bytes, std::size_t size, std::size_t count, void* transfer) {
+        auto& self = *static_cast<Transfer*>(transfer);
+        self.isTooLarge_ = self.body_.size() + size * count > self.bounds_.bodyBytes;
+        if (self.isTooLarge_) {
+            return 0;
+        }
+        self.body_.append(bytes, size * count);
+        return size * count;
+    }
+
+    [[nodiscard]] OSStatus statusFor(CURLcode result) const {
+        switch (result) {
+            case CURLE_OPERATION_TIMEDOUT:
+                return kURLTimedOutError;
+            case CURLE_WRITE_ERROR:
+            case CURLE_FILESIZE_EXCEEDED:
+            case CURLE_OUT_OF_MEMORY:  // a line of more than 100 KB
+                return kURLAnswerTooLargeError;
+            case CURLE_OK:  // without a status
+            case CURLE_GOT_NOTHING:
+            case CURLE_PARTIAL_FILE:
+            case CURLE_RECV_ERROR:
+            case CURLE_SEND_ERROR:
+                return kURLConnectionLostError;
+            case CURLE_UNSUPPORTED_PROTOCOL:
+            case CURLE_WEIRD_SERVER_REPLY:
+            case CURLE_BAD_CONTENT_ENCODING:
+                return kURLMalformedAnswerError;
+            default:
+                return kURLUnreachableError;
+        }
+    }
+
+    const Curl& curl_;
     const DownloadBounds& bounds_;
-    Clock::time_point end_;
-    asio::io_context context_{1};
-    asio::ip::tcp::socket socket_{context_};
-    boost::beast::flat_buffer buffer_;
-    std::optional<Parser> parser_;
+    std::string& body_;
+    std::unique_ptr<CURL, void (*)(CURL*)> easy_;
+    std::size_t headerBytes_ = 0;
+    bool isTooLarge_ = false;
 };
 
 class HttpDownloader : public Downloader {
   public:
-    explicit HttpDownloader(const DownloadBounds& bounds) : bounds_(bounds) {}
+    HttpDownloader(const DownloadBounds& bounds, std::vector<std::string> libraries)
+        : bounds_(bounds), libraries_(std::move(libraries)) {}
 
     OSStatus fetch(std::string_view url, std::string& body) override {
         body.clear();
-        Address address;
-        if (const OSStatus err = parse(url, address); err != 0) {
+        if (const OSStatus err = judge(url); err != 0) {
             logLine(LogLevel::notice, "download: not an http URL with a numeric address");
             return err;
         }
-        Error error;
-        const auto status = Transfer(address, bounds_).run(body, error);
-        if (!status) {
-            logLine(LogLevel::notice, "download from " + address.authority + ": " + error.message());
-            return statusFor(error);
+        std::string reason;
+        const auto curl = load(libraries_, reason);
+        if (!curl) {
+            logLine(LogLevel::error, "download: no HTTP client library: " + reason);
+            return kURLClientError;
         }
-        return *status >= 200 && *status < 300 ? 0 : static_cast<OSStatus>(*status);
+        OSStatus failure = 0;
+        const auto status = Transfer(*curl, bounds_, body).run(std::string(url), failure, reason);
+        const bool isWhole = status && *status >= 200 && *status < 300;
+        if (!isWhole) {
+            body.clear();
+        }
+        if (!status) {
+            logLine(LogLevel::notice, "download: " + reason);
+            return failure;
+        }
+        return isWhole ? 0 : static_cast<OSStatus>(*status);
     }
 
   private:
     DownloadBounds bounds_;
+    std::vector<std::string> libraries_;
 };
 
 }  // namespace
 
-std::shared_ptr<Downloader> makeHttpDownloader(const DownloadBounds& bounds) {
-    return std::make_shared<HttpDownloader>(bounds);
+std::shared_ptr<Downloader> makeHttpDownloader(const DownloadBounds& bounds,
+                                               std::vector<std::string> libraries) {
+    return std::make_shared<HttpDownloader>(bounds, std::move(libraries));
 }
 
 }  // namespace platform::services
