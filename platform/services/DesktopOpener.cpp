@@ -9,25 +9,26 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <chrono>
 #include <csignal>
 #include <optional>
+#include <string>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 #include "platform/FileDescriptor.h"
-#include "platform/Host.h"
 #include "platform/Log.h"
-#include "platform/services/Bus.h"
 #include "platform/services/DesktopSession.h"
 #include "platform/services/Opener.h"
 
 namespace platform::services {
 namespace {
 
-constexpr std::chrono::milliseconds findingBound{1500};
+using Clock = std::chrono::steady_clock;
+
+// Asking the user's service manager is a part of it.
 constexpr std::chrono::milliseconds handOverBound{1500};
-// Asking the user's service manager is a part of handing over, and may fail.
-constexpr std::chrono::milliseconds askingBound{1000};
 // The end of a child that hangs on its way to the program, in seconds.
 constexpr unsigned lifetimeBeforeProgram = 10;
 
@@ -70,30 +71,6 @@ bool belongsToDisplay(std::string_view name) {
     return std::find(names.begin(), names.end(), name) != names.end();
 }
 
-// What the user's service manager has in its environment about the display; empty when it does not answer.
-std::vector<std::string> displayEnvironment(const std::string& busSocket) {
-    std::vector<std::string> environment;
-    std::string reason;
-    const auto bus = Bus::connect(busSocket, Clock::now() + askingBound, reason);
-    if (!bus) {
-        return environment;
-    }
-    const Message answer = bus->read({"org.freedesktop.systemd1", "/org/freedesktop/systemd1",
-                                      "org.freedesktop.systemd1.Manager", "Environment", "as"},
-                                     reason);
-    if (!answer || sd_bus_message_enter_container(answer.get(), SD_BUS_TYPE_ARRAY, "s") <= 0) {
-        return environment;
-    }
-    const char* entry = nullptr;
-    while (sd_bus_message_read(answer.get(), "s", &entry) > 0) {
-        const std::string_view text = entry;
-        if (belongsToDisplay(text.substr(0, text.find('=')))) {
-            environment.emplace_back(text);
-        }
-    }
-    return environment;
-}
-
 bool names(const std::string& entry, std::string_view name) {
     return entry.size() > name.size() && entry.starts_with(name) && entry[name.size()] == '=';
 }
@@ -101,7 +78,10 @@ bool names(const std::string& entry, std::string_view name) {
 std::vector<std::string> environmentFor(const User& user, const DesktopSession& session,
                                         const std::string& runtimeRoot) {
     const std::string runtime = runtimeRoot + "/" + std::to_string(user.id);
-    std::vector<std::string> environment = displayEnvironment(runtime + "/bus");
+    std::vector<std::string> environment = managerEnvironment(runtime + "/bus");
+    std::erase_if(environment, [](const std::string& entry) {
+        return !belongsToDisplay(std::string_view(entry).substr(0, entry.find('=')));
+    });
     const auto isSet = [&environment](std::string_view name) {
         return std::any_of(environment.begin(), environment.end(),
                            [name](const std::string& entry) { return names(entry, name); });
@@ -267,8 +247,7 @@ class DesktopOpener : public Opener {
 
     OSStatus open(const std::string& url) override {
         std::string reason;
-        const auto session =
-            findDesktopSession(currentHost().systemBusSocket, Clock::now() + findingBound, reason);
+        const auto session = findDesktopSession(reason);
         if (!session) {
             return failed(fnfErr, reason);
         }

@@ -1,12 +1,11 @@
-// Who sits at the computer.
+// Who sits at the computer, and on what display.
 #pragma once
 
 #include <sys/types.h>
 
 #include <optional>
 #include <string>
-
-#include "platform/services/Bus.h"
+#include <vector>
 
 namespace platform::services {
 
@@ -18,8 +17,10 @@ struct DesktopSession {
 
 // The session that is active on the first seat, when it is the graphical one of a user (a log-in screen and a
 // text console are not). Nothing, with the reason, when there is none.
-[[nodiscard]] std::optional<DesktopSession> findDesktopSession(const std::string& busSocket,
-                                                               Clock::time_point deadline,
-                                                               std::string& reason);
+[[nodiscard]] std::optional<DesktopSession> findDesktopSession(std::string& reason);
+
+// The environment of the service manager that answers on a user's bus, entries as in "DISPLAY=:0"; empty when
+// none answers within a second.
+[[nodiscard]] std::vector<std::string> managerEnvironment(const std::string& busSocket);
 
 }  // namespace platform::services

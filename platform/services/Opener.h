@@ -27,13 +27,12 @@ struct Desktop {
     std::vector<std::vector<std::string>> programs = {{"/usr/bin/xdg-open"}, {"/usr/bin/gio", "open"}};
 };
 
-// An opener that finds the active graphical session of the first seat through the login manager on the host's
-// system bus, and runs the desktop's opening program in it: as the session's user, never as root, with an
+// An opener that finds the active graphical session of the first seat as the login manager keeps it under
+// /run/systemd, and runs the desktop's opening program in it: as the session's user, never as root, with an
 // environment made anew (the user's name, home and buses, a fixed path, and what the user's own service
 // manager says about the display), without descriptors of ours, in a process session of its own.
 //
-// Nobody waits for the program, and nothing is left to reap. Looking for the session takes at most 1.5
-// seconds, handing over another 1.5.
+// Nobody waits for the program, and nothing is left to reap. Handing over takes at most 1.5 seconds.
 [[nodiscard]] std::shared_ptr<Opener> makeDesktopOpener(Desktop desktop = {});
 
 }  // namespace platform::services

@@ -309,12 +309,10 @@ class Lab:
 
     def start_desktop(self):
         """Lets the resident sit at the computer; what their browser is told goes to /tmp/browser."""
-        if not Path("/run/dbus/system_bus_socket").exists():
-            self.start_bus()
-        manager = self.daemon(BUILD / "tests/system/login_manager", "/run/dbus/system_bus_socket", RESIDENT,
-                              stdout=subprocess.PIPE)
-        if manager.stdout.readline() != b"ready\n":
-            raise RuntimeError("no login manager")
+        for path, fields in {"seats/seat0": f"ACTIVE=1\nACTIVE_UID={RESIDENT}\n", "sessions/1":
+                             f"UID={RESIDENT}\nCLASS=user\nSTATE=active\nTYPE=x11\nDISPLAY=:0\n"}.items():
+            (file := Path("/run/systemd", path)).parent.mkdir(parents=True, exist_ok=True)
+            file.write_text(fields)
 
     def start_network_manager(self):
         folder = Path("/etc/NetworkManager/system-connections")

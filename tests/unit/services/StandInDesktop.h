@@ -1,7 +1,10 @@
-// A desktop to open pages on: a private message bus that is both the system's and the user's, with stand-ins
-// for the login manager and the user's service manager on it, and room for a program that opens URLs.
+// A desktop to open pages on, in a mount namespace of the test's own: what the login manager keeps under
+// /run/systemd, a user's bus with a stand-in for the user's service manager, and room for a program that
+// opens URLs. Needs root.
 #pragma once
 
+#include <sched.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <systemd/sd-bus.h>
@@ -15,7 +18,6 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
-#include <map>
 #include <memory>
 #include <stdexcept>
 #include <string>
@@ -49,74 +51,46 @@ class Process {
 };
 
 inline bool waitFor(const std::function<bool()>& condition) {
-    for (int i = 0; i < 500 && !condition(); ++i) {
+    for (int i = 0; i < 500; ++i) {
+        if (condition()) {
+            return true;
+        }
         std::this_thread::sleep_for(std::chrono::milliseconds(10));
     }
-    return condition();
+    return false;
 }
-
-// Somebody, or nobody, at the computer.
-struct Session {
-    std::string path = "/org/freedesktop/login1/session/_32";  // "/": nobody
-    std::uint32_t user = 65534;
-    std::map<std::string, std::string> texts = {};  // beside those of an active X11 session on ":7"
-    std::vector<const char*> environment = {};      // what the user's service manager has
-
-    // Answers the properties that are asked for where the real managers have them.
-    static int answer(sd_bus_message* call, void* context, sd_bus_error* /*error*/) {
-        auto& session = *static_cast<Session*>(context);
-        const char* interface = nullptr;
-        const char* name = nullptr;
-        if (sd_bus_message_is_method_call(call, "org.freedesktop.DBus.Properties", "Get") <= 0 ||
-            sd_bus_message_read(call, "ss", &interface, &name) <= 0) {
-            return 0;
-        }
-        session.texts.merge(std::map<std::string, std::string>{
-            {"Class", "user"}, {"State", "active"}, {"Type", "x11"}, {"Display", ":7"}});
-        const std::string asked = std::string(sd_bus_message_get_path(call)) + " " + interface + " " + name;
-        const std::string inSession = session.path + " org.freedesktop.login1.Session ";
-        const char* path = session.path.c_str();
-        if (asked == "/org/freedesktop/login1/seat/seat0 org.freedesktop.login1.Seat ActiveSession") {
-            return sd_bus_reply_method_return(call, "v", "(so)", path[1] == 0 ? "" : "2", path);
-        }
-        if (asked == inSession + "User") {
-            return sd_bus_reply_method_return(call, "v", "(uo)", session.user, "/user");
-        }
-        if (asked == "/org/freedesktop/systemd1 org.freedesktop.systemd1.Manager Environment") {
-            return answerEnvironment(call, session.environment);
-        }
-        return asked == inSession + name && session.texts.contains(name)
-                   ? sd_bus_reply_method_return(call, "v", "s", session.texts.at(name).c_str())
-                   : sd_bus_reply_method_errorf(call, SD_BUS_ERROR_UNKNOWN_PROPERTY, "%s", name);
-    }
-
-  private:
-    static int answerEnvironment(sd_bus_message* call, std::vector<const char*> entries) {
-        entries.push_back(nullptr);
-        sd_bus_message* reply = nullptr;
-        sd_bus_message_new_method_return(call, &reply);
-        sd_bus_message_open_container(reply, 'v', "as");
-        sd_bus_message_append_strv(reply, const_cast<char**>(entries.data()));
-        sd_bus_message_close_container(reply);
-        const int sent = sd_bus_send(nullptr, reply, nullptr);
-        sd_bus_message_unref(reply);
-        return sent;
-    }
-};
 
 class StandInDesktop {
   public:
-    // Starts the bus; every user may talk to it and see the directory.
     StandInDesktop() {
+        if (unshare(CLONE_NEWNS) != 0 || mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
+            mount("tmpfs", "/run", "tmpfs", 0, "mode=755") != 0) {
+            throw std::runtime_error("no mount namespace");
+        }
         chmod(directory_.path().c_str(), 0755);
         for (const char* folder : {"run/65534", "out"}) {
             std::filesystem::create_directories(at(folder));
             chmod(at(folder).c_str(), 0777);
         }
-        std::filesystem::create_symlink(systemBus(), at("run/65534/bus"));
+    }
+
+    // Puts somebody, or nobody, at the computer: the fields of the seat and of its session "2", as in
+    // "UID=0\n", beside those of an active X11 session of user 65534 on ":7".
+    static void seat(const std::string& session, const std::string& seat = "ACTIVE=2\n") {
+        for (const char* folder : {"/run/systemd/seats", "/run/systemd/sessions"}) {
+            std::filesystem::create_directories(folder);
+        }
+        std::ofstream("/run/systemd/seats/seat0") << seat;
+        // Of a field that is there twice the last one counts.
+        std::ofstream("/run/systemd/sessions/2")
+            << "UID=65534\nCLASS=user\nSTATE=active\nTYPE=x11\nDISPLAY=:7\n"
+            << session;
+    }
+    // Starts the user's bus, which every user may talk to, with a service manager of this environment on it.
+    void manage(const std::vector<const char*>& environment) {
         const std::string option =
             "--config-file=" +
-            directory_.write("bus.conf", "<busconfig><listen>unix:path=" + systemBus() +
+            directory_.write("bus.conf", "<busconfig><listen>unix:path=" + userBus() +
                                              "</listen><policy context=\"default\"><allow user=\"*\"/>"
                                              "<allow own=\"*\"/><allow send_destination=\"*\"/>"
                                              "<allow receive_sender=\"*\"/></policy></busconfig>\n");
@@ -129,17 +103,11 @@ class StandInDesktop {
             execle("/usr/bin/dbus-daemon", "dbus-daemon", option.c_str(), "--nofork", "--nopidfile", nullptr,
                    none);
         });
-        waitFor([this] { return std::filesystem::exists(systemBus()); });
-    }
-
-    // Serves the session until the end of the returned scope.
-    [[nodiscard]] std::unique_ptr<Process> serve(Session session) const {
         const std::string ready = directory_.write("ready", "");
-        auto process = std::make_unique<Process>([&] { serveForEver(session, ready); });
+        manager_ = std::make_unique<Process>([&] { serveForEver(environment, ready); });
         if (!waitFor([&] { return !std::filesystem::exists(ready); })) {
-            throw std::runtime_error("the stand-in managers are not up");
+            throw std::runtime_error("the stand-in manager is not up");
         }
-        return process;
     }
     // The desktop with the script as its opening program, after one that is not installed.
     [[nodiscard]] platform::services::Desktop withProgram(const std::string& script) const {
@@ -160,17 +128,39 @@ class StandInDesktop {
     }
     [[nodiscard]] std::string at(std::string_view name) const { return directory_.at(name); }
     [[nodiscard]] std::string record() const { return at("out/record"); }
-    [[nodiscard]] std::string systemBus() const { return at("system_bus"); }
+    [[nodiscard]] std::string userBus() const { return at("run/65534/bus"); }
 
   private:
+    static int answer(sd_bus_message* call, void* context, sd_bus_error* /*error*/) {
+        const char* interface = nullptr;
+        const char* name = nullptr;
+        if (sd_bus_message_is_method_call(call, "org.freedesktop.DBus.Properties", "Get") <= 0 ||
+            sd_bus_message_read(call, "ss", &interface, &name) <= 0 ||
+            std::string(sd_bus_message_get_path(call)) + " " + interface + " " + name !=
+                "/org/freedesktop/systemd1 org.freedesktop.systemd1.Manager Environment") {
+            return 0;
+        }
+        std::vector<const char*> entries = *static_cast<const std::vector<const char*>*>(context);
+        entries.push_back(nullptr);
+        sd_bus_message* reply = nullptr;
+        sd_bus_message_new_method_return(call, &reply);
+        sd_bus_message_open_container(reply, 'v', "as");
+        sd_bus_message_append_strv(reply, const_cast<char**>(entries.data()));
+        sd_bus_message_close_container(reply);
+        const int sent = sd_bus_send(nullptr, reply, nullptr);
+        sd_bus_message_unref(reply);
+        return sent;
+    }
     // Removes the file once it can be asked.
-    void serveForEver(Session& session, const std::string& ready) const {
-        const std::string address = "unix:path=" + systemBus();
+    void serveForEver(std::vector<const char*> environment, const std::string& ready) const {
+        const std::string address = "unix:path=" + userBus();
         sd_bus* bus = nullptr;
-        const bool isUp = sd_bus_new(&bus) >= 0 && sd_bus_set_address(bus, address.c_str()) >= 0 &&
-                          sd_bus_set_bus_client(bus, 1) >= 0 && sd_bus_start(bus) >= 0 &&
-                          sd_bus_add_filter(bus, nullptr, Session::answer, &session) >= 0 &&
-                          sd_bus_request_name(bus, "org.freedesktop.login1", 0) >= 0 &&
+        // The bus is there a moment before it listens.
+        const auto connect = [&] {
+            return sd_bus_new(&bus) >= 0 && sd_bus_set_address(bus, address.c_str()) >= 0 &&
+                   sd_bus_set_bus_client(bus, 1) >= 0 && sd_bus_start(bus) >= 0;
+        };
+        const bool isUp = waitFor(connect) && sd_bus_add_filter(bus, nullptr, answer, &environment) >= 0 &&
                           sd_bus_request_name(bus, "org.freedesktop.systemd1", 0) >= 0 &&
                           std::filesystem::remove(ready);
         while (isUp && sd_bus_process(bus, nullptr) >= 0 && sd_bus_wait(bus, UINT64_MAX) >= 0) {
@@ -179,6 +169,7 @@ class StandInDesktop {
 
     TemporaryDirectory directory_;
     std::unique_ptr<Process> bus_;
+    std::unique_ptr<Process> manager_;
 };
 
 }  // namespace testing_support

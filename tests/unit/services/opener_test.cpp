@@ -60,10 +60,10 @@ class DesktopTest : public testing::Test {
         if (geteuid() != 0) {
             LA_SKIP("becoming another user needs root");
         }
+        made = std::make_unique<StandInDesktop>();
     }
-    OSStatus openOn(const platform::services::Desktop& on, const std::string& bus, const char* url = page) {
+    OSStatus openOn(const platform::services::Desktop& on, const char* url = page) {
         platform::Host host;
-        host.systemBusSocket = bus;
         host.opener = platform::services::makeDesktopOpener(on);
         const platform::HostOverride override(host);
         const platform::LogCapture capture(
@@ -72,18 +72,19 @@ class DesktopTest : public testing::Test {
     }
     // A program that records what the commands write.
     [[nodiscard]] std::string recorder(const std::string& commands) const {
-        return "{ " + commands + "; } > " + desktop.record() + ".part && mv " + desktop.record() + ".part " +
-               desktop.record() + "\n";
+        return "{ " + commands + "; } > " + desktop().record() + ".part && mv " + desktop().record() +
+               ".part " + desktop().record() + "\n";
     }
+    [[nodiscard]] StandInDesktop& desktop() const { return *made; }
 
-    StandInDesktop desktop;
+    std::unique_ptr<StandInDesktop> made;
     Lines log;
 };
 
 TEST_F(DesktopTest, RunsTheProgramAsTheUserWithNothingOfOurs) {
-    const auto session = desktop.serve({.environment = {"DISPLAY=:3", "XAUTHORITY=/run/x",
-                                                        "LD_PRELOAD=/evil.so", "PATH=/evil", "DISPLAYS=no"}});
-    const auto on = desktop.withProgram(
+    StandInDesktop::seat("");
+    desktop().manage({"DISPLAY=:3", "XAUTHORITY=/run/x", "LD_PRELOAD=/evil.so", "PATH=/evil", "DISPLAYS=no"});
+    const auto on = desktop().withProgram(
         recorder("id -u; id -g; id -G; cut -d' ' -f6 /proc/$$/stat | grep -vx " + std::to_string(getsid(0)) +
                  " | wc -l; pwd; printf '%s\\n' \"$@\"; readlink /proc/self/fd/0; ls /proc/self/fd | "
                  "tr '\\n' ' '; echo; grep SigIgn /proc/$$/status; umask; "
@@ -98,14 +99,14 @@ TEST_F(DesktopTest, RunsTheProgramAsTheUserWithNothingOfOurs) {
         for (const int stream : {0, 1, 2}) {
             close(stream);
         }
-        return isReady && openOn(on, desktop.systemBus()) == 0 && log.empty() ? 0 : 1;
+        return isReady && openOn(on) == 0 && log.empty() ? 0 : 1;
     });
     EXPECT_EQ(child.wait(), 0);
     std::string told;
-    for (const std::string& line : desktop.recorded()) {
+    for (const std::string& line : desktop().recorded()) {
         told += line + "\n";
     }
-    const std::string runtime = desktop.at("run/65534");
+    const std::string runtime = desktop().at("run/65534");
     EXPECT_EQ(told,
               "65534\n65534\n65534\n1\n/\nfirst argument\n" + std::string(page) +
                   "\n/dev/null\n0 1 2 3 \nSigIgn:\t0000000000000000\n0022\n"
@@ -117,57 +118,52 @@ TEST_F(DesktopTest, RunsTheProgramAsTheUserWithNothingOfOurs) {
 }
 
 TEST_F(DesktopTest, WaitsNeitherForTheUsersManagerNorForTheProgram) {
-    const auto session = desktop.serve({});
-    std::filesystem::remove(desktop.at("run/65534/bus"));
-    const auto bus = muteSocket(desktop.at("run/65534/bus"));
-    const auto on = desktop.withProgram(recorder("echo $$; echo $DISPLAY") + "exec sleep 60\n");
-    EXPECT_EQ(openOn(on, desktop.systemBus()), 0);
-    const Lines lines = desktop.recorded();
+    StandInDesktop::seat("");
+    const auto bus = muteSocket(desktop().userBus());
+    const auto on = desktop().withProgram(recorder("echo $$; echo $DISPLAY") + "exec sleep 60\n");
+    EXPECT_EQ(openOn(on), 0);
+    const Lines lines = desktop().recorded();
     ASSERT_EQ(lines.size(), 2U);
     EXPECT_EQ(lines[1], ":7");
     siginfo_t ended{};
-    EXPECT_EQ(waitid(P_ALL, 0, &ended, WEXITED | WNOHANG | WNOWAIT), 0);
-    EXPECT_EQ(ended.si_pid, 0) << "a child is left to reap";
+    EXPECT_EQ(waitid(P_ALL, 0, &ended, WEXITED | WNOHANG | WNOWAIT), -1) << "a child is left to reap";
+    EXPECT_EQ(errno, ECHILD);
     EXPECT_EQ(kill(std::stoi(lines[0]), SIGKILL), 0);
 }
 
 TEST_F(DesktopTest, OpensNothingWithoutAUsersDesktop) {
-    const auto on = desktop.withProgram(recorder("echo opened"));
-    struct Row {
-        const char* what;
-        Session session;
-        OSStatus status;
-        const char* reason;
-    };
-    const Row rows[] = {
-        {"nobody", {.path = "/"}, fnfErr, "nobody sits at the computer"},
-        {"log-in screen", {.texts = {{"Class", "greeter"}}}, fnfErr, "class greeter"},
-        {"text console", {.texts = {{"Type", "tty"}}}, fnfErr, "type tty"},
-        {"being closed", {.texts = {{"State", "closing"}}}, fnfErr, "state closing"},
-        {"root", {.user = 0}, permErr, "no browser runs as root"},
-        {"no such user", {.user = 64999}, fnfErr, "no user 64999"},
-    };
-    for (const auto& [what, served, status, reason] : rows) {
+    const auto on = desktop().withProgram(recorder("echo opened"));
+    const auto opens = [&](const char* what, OSStatus status, const char* reason) {
         SCOPED_TRACE(what);
-        const auto session = desktop.serve(served);
         log.clear();
-        EXPECT_EQ(openOn(on, desktop.systemBus()), status);
+        EXPECT_EQ(openOn(on), status);
         ASSERT_EQ(log.size(), 1U);
         EXPECT_NE(log[0].find(reason), std::string::npos) << log[0];
+    };
+    opens("no login manager", fnfErr, "nobody sits at the computer");
+    StandInDesktop::seat("", "IS_SEAT0=1\n");
+    opens("nobody", fnfErr, "nobody sits at the computer");
+    const struct {
+        const char* session;
+        OSStatus status;
+        const char* reason;
+    } rows[] = {
+        {"CLASS=greeter\n", fnfErr, "class greeter"}, {"TYPE=tty\n", fnfErr, "type tty"},
+        {"STATE=closing\n", fnfErr, "state closing"}, {"UID=0\n", permErr, "no browser runs as root"},
+        {"UID=64999\n", fnfErr, "no user 64999"},
+    };
+    for (const auto& [session, status, reason] : rows) {
+        StandInDesktop::seat(session);
+        opens(session, status, reason);
     }
-    const auto mute = muteSocket(desktop.at("mute"));
-    for (const std::string& bus : {desktop.systemBus(), desktop.at("no bus"), desktop.at("mute")}) {
-        EXPECT_EQ(openOn(on, bus), fnfErr) << bus;
-    }
-    EXPECT_NE(log.back().find("timed out"), std::string::npos) << log.back();
 
-    const auto session = desktop.serve({});
+    StandInDesktop::seat("");
     for (const char* url : {"file:///etc/passwd", "httpx://192.0.0.192/", "http:opaque", "mailto:a@b.c"}) {
-        EXPECT_EQ(openOn(on, desktop.systemBus(), url), paramErr) << url;
+        EXPECT_EQ(openOn(on, url), paramErr) << url;
     }
-    EXPECT_NE(access(desktop.record().c_str(), F_OK), 0);
-    EXPECT_EQ(openOn({desktop.at("run"), {{desktop.at("not-installed")}}}, desktop.systemBus()), fnfErr);
-    EXPECT_EQ(openOn({desktop.at("run"), {{desktop.systemBus()}}}, desktop.systemBus()), permErr);
+    EXPECT_NE(access(desktop().record().c_str(), F_OK), 0);
+    EXPECT_EQ(openOn({desktop().at("run"), {{desktop().at("not-installed")}}}), fnfErr);
+    EXPECT_EQ(openOn({desktop().at("run"), {{desktop().at("out")}}}), permErr);
 }
 
 }  // namespace
