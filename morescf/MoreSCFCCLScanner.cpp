@@ -73,31 +73,23 @@ OSStatus AddCCLsInFolderToArray(const FSRef* folder, CFMutableArrayRef result) {
     return err;
 }
 
-// Whether the name at the index stands already among those before it that compare equal to it. They need not
-// be neighbours: the sort takes names of different case for equal and leaves them in the order of the
-// folders.
-bool IsDuplicate(CFArrayRef names, CFIndex index) {
-    CFTypeRef name = CFArrayGetValueAtIndex(names, index);
-    bool isDuplicate = false;
-    for (CFIndex i = index - 1; !isDuplicate && i >= 0; --i) {
-        CFTypeRef earlier = CFArrayGetValueAtIndex(names, i);
-        if (CompareNames(earlier, name, nullptr) != kCFCompareEqualTo) {
-            break;
-        }
-        isDuplicate = CFEqual(earlier, name);
-    }
-    return isDuplicate;
-}
-
-void RemoveDuplicates(CFMutableArrayRef names) {
-    CFIndex index = 1;
-    while (index < CFArrayGetCount(names)) {
-        if (IsDuplicate(names, index)) {
+// Keeps the first of equal names. They need not be neighbours: the sort takes names of different case for
+// equal and leaves them in the order of the folders.
+OSStatus RemoveDuplicates(CFMutableArrayRef names) {
+    CFMutableDictionaryRef seen = nullptr;
+    const OSStatus err = CFQDictionaryCreateMutable(&seen);
+    CFIndex index = 0;
+    while (err == 0 && index < CFArrayGetCount(names)) {
+        CFTypeRef name = CFArrayGetValueAtIndex(names, index);
+        if (CFDictionaryContainsKey(seen, name)) {
             CFArrayRemoveValueAtIndex(names, index);
         } else {
+            CFDictionarySetValue(seen, name, name);
             ++index;
         }
     }
+    CFQRelease(seen);
+    return err;
 }
 
 }  // namespace
@@ -113,7 +105,7 @@ OSStatus MoreSCCreateCCLArray(CFArrayRef* result, CFIndex* indexOfDefaultCCL) {
     }
     if (err == 0) {
         CFArraySortValues(names, CFRangeMake(0, CFArrayGetCount(names)), CompareNames, nullptr);
-        RemoveDuplicates(names);
+        err = RemoveDuplicates(names);
     }
     if (err == 0 && indexOfDefaultCCL != nullptr) {
         const CFIndex count = CFArrayGetCount(names);

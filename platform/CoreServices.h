@@ -54,8 +54,9 @@ inline constexpr OSErr errFSNoMoreItems = -1417;
 OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator);
 // Up to maximumItems references and names, in no order. errFSNoMoreItems marks the last batch, which may hold
 // items; what actualItems tells was delivered even when the status is another failure. A name that is not
-// UTF-8, or longer than 255 units, is passed over: it could not be named in a location. whichInfo is
-// kFSCatInfoNone; containerChanged, catalogInfos and specs are null; refs and names may be.
+// printable UTF-8 of at most 64 bytes is passed over: it could not be named in a location. More than 4096
+// items are ioErr. whichInfo is kFSCatInfoNone; containerChanged, catalogInfos and specs are null; refs and
+// names may be.
 OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems,
                            Boolean* containerChanged, UInt32 whichInfo, void* catalogInfos, FSRef* refs,
                            void* specs, HFSUniStr255* names);

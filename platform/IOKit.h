@@ -21,7 +21,8 @@
 //   The type is "IOModemSerialStream" for a USB modem (base name "usbmodem") and a Bluetooth serial port
 //   (base name "Bluetooth-Modem"), else "IORS232SerialStream" with the kernel's name for a base name.
 //   - Its parent, the device: "Product Name", from USB.
-// A device whose name is not UTF-8 has no entry.
+// Names and texts are printable UTF-8 of at most 64 bytes: a device whose name is not has no entry, and what
+// does not print of a product's text is a '?'.
 #pragma once
 
 #include "platform/CoreFoundation.h"
@@ -52,8 +53,8 @@ kern_return_t IOMasterPort(mach_port_t bootstrapPort, mach_port_t* masterPort);
 CFMutableDictionaryRef IOServiceMatching(const char* className);
 // Consumes one reference of the matching dictionary, on failure too. Matches the entries of the class under
 // "IOProviderClass" whose properties equal whatever else the dictionary holds; nothing when there is no such
-// class. They come in the order of the kernel's names, numbers in them by value. The output is untouched on
-// failure.
+// class. They come in the order of the kernel's names, numbers in them by value. Hardware that cannot be
+// listed whole, or of more than 4096 devices, is kIOReturnError. The output is untouched on failure.
 kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryRef matching,
                                            io_iterator_t* iterator);
 // The next entry, which the caller releases, or 0 at the end.

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -24,8 +25,9 @@ struct Entry {
 };
 using EntryRef = std::shared_ptr<const Entry>;
 
-// Both are in the order of the names, numbers in them by value, and empty where sysfs cannot be read.
-[[nodiscard]] std::vector<EntryRef> scanEthernet(const std::string& sysfsRoot);
-[[nodiscard]] std::vector<EntryRef> scanSerial(const std::string& sysfsRoot);
+// Both are in the order of the names, numbers in them by value, and empty where there is no sysfs. Nothing
+// when a class cannot be read whole.
+[[nodiscard]] std::optional<std::vector<EntryRef>> scanEthernet(const std::string& sysfsRoot);
+[[nodiscard]] std::optional<std::vector<EntryRef>> scanSerial(const std::string& sysfsRoot);
 
 }  // namespace platform::hardware

@@ -7,6 +7,7 @@
 #include <tuple>
 #include <utility>
 
+#include "platform/DeviceText.h"
 #include "platform/hardware/Entry.h"
 #include "platform/hardware/Properties.h"
 #include "platform/hardware/Sysfs.h"
@@ -164,19 +165,16 @@ void numberPorts(std::vector<Port>& ports) {
 
 // Firmware text goes into a name that the user sees, and is decoded as Mac OS Roman: ASCII reads the same in
 // every encoding.
-bool isPlainText(std::string_view text) {
-    constexpr std::size_t longest = 64;
-    return !text.empty() && text.size() <= longest &&
-           std::all_of(text.begin(), text.end(), [](char c) { return c >= 0x20 && c < 0x7F; });
+bool isLabel(std::string_view text) {
+    return isDeviceText(text) && std::all_of(text.begin(), text.end(), [](char c) { return static_cast<unsigned char>(c) < 0x80; });
 }
 
 // The address that each slot is at, by the firmware's label for it.
 std::map<std::string, std::string> labelsOfSlots(const std::string& root) {
     std::map<std::string, std::string> labels;
     const std::string slots = root + "/bus/pci/slots";
-    for (const std::string& label : namesIn(slots)) {
-        const auto address = readAttribute(slots + "/" + label + "/address");
-        if (address && isPlainText(label)) {
+    for (const std::string& label : namesIn(slots, isLabel).value_or(std::vector<std::string>())) {
+        if (const auto address = readAttribute(slots + "/" + label + "/address")) {
             labels.emplace(*address, label);
         }
     }
@@ -188,10 +186,10 @@ std::string slotLabelOf(const Port& port, const std::map<std::string, std::strin
         return slot->second;
     }
     // A device on the main board sits in no slot, and has a label of its own.
-    if (const auto label = readAttribute(port.busDevice + "/label"); label && isPlainText(*label)) {
+    if (const auto label = readAttribute(port.busDevice + "/label"); label && isLabel(*label)) {
         return *label;
     }
-    if (const auto number = readAttribute(port.busDevice + "/acpi_index"); number && isPlainText(*number)) {
+    if (const auto number = readAttribute(port.busDevice + "/acpi_index"); number && isLabel(*number)) {
         return "onboard " + *number;
     }
     return std::string(lastComponent(port.busDevice));
@@ -228,14 +226,18 @@ EntryRef controllerEntry(const Port& port, EntryRef bus) {
 
 }  // namespace
 
-std::vector<EntryRef> scanEthernet(const std::string& sysfsRoot) {
+std::optional<std::vector<EntryRef>> scanEthernet(const std::string& sysfsRoot) {
     std::vector<EntryRef> entries;
     const auto root = resolved(sysfsRoot);
     if (!root) {
         return entries;
     }
+    const auto names = namesInClass(*root + "/class/net");
+    if (!names) {
+        return std::nullopt;
+    }
     std::vector<Port> ports;
-    for (const std::string& name : namesIn(*root + "/class/net")) {
+    for (const std::string& name : *names) {
         if (auto port = portNamed(name, *root)) {
             ports.push_back(std::move(*port));
         }
@@ -244,9 +246,7 @@ std::vector<EntryRef> scanEthernet(const std::string& sysfsRoot) {
     const auto slots = labelsOfSlots(*root);
     for (const Port& port : ports) {
         Properties properties;
-        if (!properties.setText(CFSTR("BSD Name"), port.name)) {
-            continue;
-        }
+        properties.setText(CFSTR("BSD Name"), port.name);
         entries.push_back(std::make_shared<const Entry>(
             Entry{ethernetClass, properties.take(), controllerEntry(port, busEntry(port, slots))}));
     }

@@ -72,16 +72,19 @@ bool matches(const Entry& entry, CFDictionaryRef matching) {
     return true;
 }
 
-std::vector<EntryRef> matchingEntries(CFDictionaryRef matching) {
+// Nothing when the hardware cannot be listed whole.
+std::optional<std::vector<EntryRef>> matchingEntries(CFDictionaryRef matching) {
     const std::string& root = currentHost().sysfsRoot;
     const std::string_view className = wantedClass(matching);
-    std::vector<EntryRef> entries;
+    std::optional<std::vector<EntryRef>> entries{std::in_place};
     if (className == ethernetClass) {
         entries = scanEthernet(root);
     } else if (className == serialClass) {
         entries = scanSerial(root);
     }
-    std::erase_if(entries, [matching](const EntryRef& entry) { return !matches(*entry, matching); });
+    if (entries) {
+        std::erase_if(*entries, [matching](const EntryRef& entry) { return !matches(*entry, matching); });
+    }
     return entries;
 }
 
@@ -135,7 +138,11 @@ kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryR
         return kIOReturnBadArgument;
     }
     return guarded([matching, iterator] {
-        *iterator = addHandle(Iterator{matchingEntries(matching)});
+        auto entries = matchingEntries(matching);
+        if (!entries) {
+            return kIOReturnError;
+        }
+        *iterator = addHandle(Iterator{std::move(*entries)});
         return KERN_SUCCESS;
     });
 }

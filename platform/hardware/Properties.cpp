@@ -22,13 +22,10 @@ Properties::Properties()
     : dictionary_(made(values::Owned<CFMutableDictionaryRef>::adopt(CFDictionaryCreateMutable(
           kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks)))) {}
 
-bool Properties::setText(CFStringRef key, std::string_view text) {
-    const values::Owned<CFStringRef> string = values::makeString(text);
-    if (!string) {
-        return false;
+void Properties::setText(CFStringRef key, std::string_view text) {
+    if (const values::Owned<CFStringRef> string = values::makeString(text)) {
+        CFDictionarySetValue(dictionary_.get(), key, string.get());
     }
-    CFDictionarySetValue(dictionary_.get(), key, string.get());
-    return true;
 }
 
 void Properties::setNumber(CFStringRef key, std::int64_t number) {

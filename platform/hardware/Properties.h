@@ -14,8 +14,8 @@ class Properties {
   public:
     Properties();
 
-    // False, with nothing set, when the text is not UTF-8.
-    bool setText(CFStringRef key, std::string_view text);
+    // Sets nothing when the text is not UTF-8.
+    void setText(CFStringRef key, std::string_view text);
     void setNumber(CFStringRef key, std::int64_t number);
     void setData(CFStringRef key, std::span<const std::uint8_t> bytes);
     // The text and a NUL behind it, as firmware gives its names.

@@ -1,7 +1,7 @@
 #include <algorithm>
 #include <sstream>
-#include <utility>
 
+#include "platform/DeviceText.h"
 #include "platform/hardware/Entry.h"
 #include "platform/hardware/Properties.h"
 #include "platform/hardware/Sysfs.h"
@@ -24,16 +24,13 @@ Stream streamOf(const std::string& name) {
     return {"IORS232SerialStream", name};
 }
 
-// A device's product text, with the blanks that firmware pads it with taken off; empty when there is none.
+// A device's product text; empty when there is none.
 std::string productOf(const std::string& device, const std::string& root) {
     for (const std::string& above : upwards(device, root)) {
         // The first one with an ID is the USB device itself: beyond it are the hubs that it is plugged into.
-        if (!exists(above + "/idVendor")) {
-            continue;
+        if (exists(above + "/idVendor")) {
+            return deviceText(readAttribute(above + "/product").value_or(""));
         }
-        const std::string text = readAttribute(above + "/product").value_or("");
-        const std::size_t first = text.find_first_not_of(" \t");
-        return first == std::string::npos ? "" : text.substr(first, text.find_last_not_of(" \t") - first + 1);
     }
     return {};
 }
@@ -50,10 +47,8 @@ std::vector<std::string> activeConsoles(const std::string& root) {
 EntryRef serialEntry(const std::string& name, const std::string& device, const std::string& root) {
     const Stream stream = streamOf(name);
     Properties properties;
-    if (!properties.setText(CFSTR("IOTTYDevice"), name) ||
-        !properties.setText(CFSTR("IOTTYBaseName"), stream.baseName)) {
-        return nullptr;
-    }
+    properties.setText(CFSTR("IOTTYDevice"), name);
+    properties.setText(CFSTR("IOTTYBaseName"), stream.baseName);
     properties.setText(CFSTR("IOSerialBSDClientType"), stream.type);
     Properties deviceProperties;
     if (const std::string product = productOf(device, root); !product.empty()) {
@@ -66,28 +61,26 @@ EntryRef serialEntry(const std::string& name, const std::string& device, const s
 
 }  // namespace
 
-std::vector<EntryRef> scanSerial(const std::string& sysfsRoot) {
+std::optional<std::vector<EntryRef>> scanSerial(const std::string& sysfsRoot) {
     std::vector<EntryRef> entries;
     const auto root = resolved(sysfsRoot);
     if (!root) {
         return entries;
     }
+    const auto names = namesInClass(*root + "/class/tty");
+    if (!names) {
+        return std::nullopt;
+    }
     const std::vector<std::string> consoles = activeConsoles(*root);
-    for (const std::string& name : namesIn(*root + "/class/tty")) {
+    for (const std::string& name : *names) {
         const std::string node = *root + "/class/tty/" + name;
-        // Most terminals have no hardware, and asking is cheaper than following every link on the way.
-        if (!exists(node + "/device")) {
-            continue;
-        }
         const auto device = resolved(node + "/device");
         constexpr std::string_view noUart = "0";
         if (!device || readAttribute(node + "/type") == noUart ||
             std::find(consoles.begin(), consoles.end(), name) != consoles.end()) {
             continue;
         }
-        if (EntryRef entry = serialEntry(name, *device, *root)) {
-            entries.push_back(std::move(entry));
-        }
+        entries.push_back(serialEntry(name, *device, *root));
     }
     return entries;
 }

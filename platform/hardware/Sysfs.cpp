@@ -11,7 +11,9 @@
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <utility>
 
+#include "platform/DeviceText.h"
 #include "platform/FileDescriptor.h"
 
 namespace platform::hardware {
@@ -83,23 +85,38 @@ std::vector<std::string> upwards(const std::string& path, const std::string& roo
     return found;
 }
 
-std::vector<std::string> namesIn(const std::string& folder) {
+std::optional<std::vector<std::string>> namesIn(const std::string& folder,
+                                                const std::function<bool(const std::string&)>& isWanted) {
     constexpr std::size_t most = 4096;
     std::vector<std::string> names;
     const std::unique_ptr<DIR, Closer> directory(opendir(folder.c_str()));
     if (!directory) {
-        return names;
+        return errno == ENOENT || errno == ENOTDIR ? std::optional(names) : std::nullopt;
     }
+    errno = 0;
     while (const dirent* entry = readdir(directory.get())) {
-        const std::string_view name = entry->d_name;
-        if (name != "." && name != ".." && names.size() < most) {
-            names.emplace_back(name);
+        std::string name = entry->d_name;
+        if (name != "." && name != ".." && isWanted(name)) {
+            names.push_back(std::move(name));
         }
+        if (names.size() > most) {
+            return std::nullopt;
+        }
+        errno = 0;
+    }
+    if (errno != 0) {
+        return std::nullopt;
     }
     std::sort(names.begin(), names.end(), [](const std::string& lhs, const std::string& rhs) {
         return strverscmp(lhs.c_str(), rhs.c_str()) < 0;
     });
     return names;
+}
+
+std::optional<std::vector<std::string>> namesInClass(const std::string& folder) {
+    return namesIn(folder, [&folder](const std::string& name) {
+        return exists(folder + "/" + name + "/device") && isDeviceText(name);
+    });
 }
 
 }  // namespace platform::hardware

@@ -3,6 +3,7 @@
 // Whatever cannot be read is simply not there: a device that is pulled out in mid-scan fails nobody.
 #pragma once
 
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -28,7 +29,13 @@ namespace platform::hardware {
 // devices that a device hangs on are the folders above it.
 [[nodiscard]] std::vector<std::string> upwards(const std::string& path, const std::string& root);
 
-// The names in a folder, numbers in them ordered by value (eth2 before eth10). Not more than 4096.
-[[nodiscard]] std::vector<std::string> namesIn(const std::string& folder);
+// The names in a folder that are wanted, numbers in them ordered by value (eth2 before eth10); none when
+// there is no such folder. Nothing when it cannot be read, or more than 4096 are wanted: a part of a list
+// would be taken for the whole.
+[[nodiscard]] std::optional<std::vector<std::string>> namesIn(
+    const std::string& folder, const std::function<bool(const std::string&)>& isWanted);
+
+// The same of a class of devices: those that have hardware behind them, by names that may be shown.
+[[nodiscard]] std::optional<std::vector<std::string>> namesInClass(const std::string& folder);
 
 }  // namespace platform::hardware

@@ -6,6 +6,7 @@
 #include <optional>
 #include <utility>
 
+#include "platform/DeviceText.h"
 #include "platform/preferences/Store.h"
 #include "platform/values/Values.h"
 
@@ -140,7 +141,7 @@ Outcome LiveView::globalIPv4(Value& value) const {
     CFMutableDictionaryRef const dictionary = CFDictionaryCreateMutable(
         kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
     value = Value::adopt(dictionary);
-    setText(dictionary, CFSTR("PrimaryInterface"), route->interface);
+    setText(dictionary, CFSTR("PrimaryInterface"), deviceText(route->interface));
     if (route->router) {
         setText(dictionary, CFSTR("Router"), dottedQuad(*route->router));
     }

@@ -17,6 +17,7 @@
 #include <vector>
 
 #include "platform/CoreServices.h"
+#include "platform/DeviceText.h"
 #include "platform/Host.h"
 #include "platform/values/Values.h"
 
@@ -27,6 +28,7 @@ struct OpaqueFSIterator {
     };
     std::string path;
     std::unique_ptr<DIR, Closer> directory;
+    std::size_t delivered = 0;
 };
 
 namespace platform::services {
@@ -143,17 +145,16 @@ std::map<FSIterator, std::unique_ptr<OpaqueFSIterator>>& iterators() {
     return open;
 }
 
-// False for a name that a file of names cannot hold.
-bool toUnicode(std::string_view name, HFSUniStr255& unicode) {
+// The name must be one that may be shown, which is also short enough.
+void toUnicode(std::string_view name, HFSUniStr255& unicode) {
     const values::Owned<CFStringRef> string = values::makeString(name);
-    const CFIndex length = string ? CFStringGetLength(string.get()) : 0;
-    if (length == 0 || length > static_cast<CFIndex>(std::size(unicode.unicode))) {
-        return false;
-    }
+    const CFIndex length = CFStringGetLength(string.get());
+    static_assert(longestDeviceText <= std::size(HFSUniStr255{}.unicode));
     unicode.length = static_cast<UInt16>(length);
     CFStringGetCharacters(string.get(), CFRangeMake(0, length), unicode.unicode);
-    return true;
 }
+
+constexpr std::size_t mostItems = 4096;
 
 // The next item that can be named; noErr, errFSNoMoreItems, or a failure.
 OSErr nextItem(OpaqueFSIterator& iterator, std::string& name, HFSUniStr255& unicode) {
@@ -164,9 +165,15 @@ OSErr nextItem(OpaqueFSIterator& iterator, std::string& name, HFSUniStr255& unic
             return errno == 0 ? errFSNoMoreItems : errorFor(errno);
         }
         name = entry->d_name;
-        if (name != "." && name != ".." && toUnicode(name, unicode)) {
-            return noErr;
+        if (name == "." || name == ".." || !isDeviceText(name)) {
+            continue;
         }
+        if (iterator.delivered == mostItems) {
+            return ioErr;
+        }
+        ++iterator.delivered;
+        toUnicode(name, unicode);
+        return noErr;
     }
 }
 

@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <cstdint>
+#include <filesystem>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -125,6 +126,7 @@ TEST_F(Registry, PassesOverWhatIsNoEthernetHardware) {
     sysfs.addPciEthernet("ib0", "0000:06:00.0");
     sysfs.attribute("class/net/ib0/type", "32");
     sysfs.addPciEthernet("eth\xFF", "0000:07:00.0");
+    sysfs.addPciEthernet("eth\x1b[1m", "0000:07:00.1");
     sysfs.addPciEthernet("eth0", "0000:08:00.0");
     sysfs.remove("devices/pci0000:00/0000:08:00.0");
     sysfs.link("class/net/loop", "class/net/loop");
@@ -179,8 +181,10 @@ TEST_F(Registry, TakesALabelOnlyWhenItReadsTheSameEverywhere) {
     };
     sysfs.attribute(device + "/acpi_index", "2");
     EXPECT_EQ(slot(), "SLOT-onboard\\202\\0");
-    sysfs.attribute(device + "/label", "Port \xC3\xA9");
-    EXPECT_EQ(slot(), "SLOT-onboard\\202\\0");
+    for (const char* label : {"Port \xC3\xA9", "Port \x1b[1m"}) {
+        sysfs.attribute(device + "/label", label);
+        EXPECT_EQ(slot(), "SLOT-onboard\\202\\0");
+    }
     sysfs.addSlot("3-1", "0000:03:00");
     EXPECT_EQ(slot(), "SLOT-3-1\\0");
 }
@@ -193,7 +197,7 @@ TEST_F(Registry, TellsSerialPortsByTheirKind) {
     sysfs.attribute("class/tty/console/active", "tty0 ttyS2");
     sysfs.addUsbSerial("ttyUSB0", "1-1", "USB-Serial Controller");
     sysfs.addUsbSerial("ttyACM0", "1-3", "  56K Modem ");
-    sysfs.addUsbSerial("ttyACM2", "1-5", "\xFF");
+    sysfs.addUsbSerial("ttyACM2", "1-5", "");
     sysfs.addBluetoothSerial("rfcomm0");
     sysfs.addBluetoothSerial("rfcomm1", false);
     EXPECT_EQ(
@@ -210,6 +214,54 @@ TEST_F(Registry, TellsSerialPortsByTheirKind) {
             "IOTTYDevice=ttyUSB0 IOTTYBaseName=ttyUSB0 IOSerialBSDClientType=IORS232SerialStream < Product "
             "Name=USB-Serial Controller"}));
     EXPECT_EQ(linesOf(find(IOServiceMatching("IOSerialBSDClient"))).size(), 5U);
+}
+
+TEST_F(Registry, ShowsOfAProductsTextWhatPrints) {
+    const std::string fill(62, 'x');
+    const struct {
+        std::string text;
+        std::string shown;
+    } rows[] = {
+        {"\t Caf\xC3\xA9 \xE6\x95\xB0 \r\n", "Caf\xC3\xA9 \xE6\x95\xB0"},
+        {"\x1b]0;root\x07 \x01\x7F", "?]0;root? ??"},
+        {"csi \xC2\x9B", "csi ?"},
+        {"override \xE2\x80\xAE isolate \xE2\x81\xA7 mark \xE2\x80\x8F", "override ? isolate ? mark ?"},
+        {"line\nbreak \xE2\x80\xA8 \xE2\x80\xA9", "line?break ? ?"},
+        {"private \xEE\x80\x80 none \xEF\xBF\xBF tag \xF3\xA0\x81\x81", "private ? none ? tag ?"},
+        {"bad \xFF \xC3( \xC0\x80 \xED\xA0\x80", "bad ? ?( ?? ???"},
+        {fill + "\xC3\xA9tail", fill + "\xC3\xA9"},
+        {fill + "x\xC3\xA9tail", fill + "x"},
+        {fill + " \xF0\x9F\x96\xA8", fill},
+        {std::string(4000, '\x01') + "x", ""},
+        {" \x01 \xFF ", ""},
+    };
+    for (const auto& [text, shown] : rows) {
+        sysfs.addUsbSerial("ttyACM0", "1-3", text);
+        const std::string line = linesOf(findSerial(CFSTR("IOModemSerialStream"))).at(0);
+        EXPECT_EQ(line.substr(line.find("< ") + 2), shown.empty() ? "" : "Product Name=" + shown);
+    }
+}
+
+TEST_F(Registry, GivesNoPartOfAList) {
+    // Links to one device each, as quick as thousands of them have to be.
+    const auto addPorts = [this](const std::string& kind, int first, int last) {
+        sysfs.folder("class/net");
+        for (int i = first; i < last; ++i) {
+            std::filesystem::create_symlink("../../devices/" + kind,
+                                            sysfs.root() + "/class/net/" + kind + std::to_string(i));
+        }
+    };
+    sysfs.folder("devices/virtual");
+    sysfs.folder("devices/real/device");
+    addPorts("virtual", 0, 9);
+    addPorts("real", 1, 4096);
+    sysfs.addPciEthernet("zzz", "0000:03:00.0");
+    EXPECT_EQ(linesOf(findEthernet()).size(), 1U);
+    addPorts("real", 0, 1);
+    io_iterator_t iterator = 77;
+    EXPECT_EQ(IOServiceGetMatchingServices(master, IOServiceMatching("IOEthernetInterface"), &iterator),
+              kIOReturnError);
+    EXPECT_EQ(iterator, 77U);
 }
 
 TEST_F(Registry, KeepsItsSnapshotWhenTheDeviceIsPulledOut) {

@@ -126,6 +126,7 @@ TEST_F(LiveViewTest, ThePrimaryServiceIsTheFirstInOrderThatNamesTheInterface) {
         {routeOver("wlan0"), "{PrimaryInterface = wlan0; PrimaryService = local}"},
         {routeOver("eth1", 0x0A000001), "{PrimaryInterface = eth1; Router = 10.0.0.1}"},  // switched off
         {routeOver("ppp0"), "{PrimaryInterface = ppp0}"},
+        {routeOver("ppp\x1b[1m"), "{PrimaryInterface = ppp?[1m}"},
     };
     for (const auto& row : rows) {
         network->primary = row.route;

@@ -83,7 +83,10 @@ TEST_F(Folders, TellsWhatEachItemIsAndPassesOverNamesThatCannotBeDelivered) {
         {u"round", 0},
         {u"fifo", 0},
     };
-    for (const char* file : {"plain", ".hidden", "Caf\xC3\xA9 \xF0\x9F\x98\x80", "bad\xFF", "folder/inner"}) {
+    for (const char* file :
+         {"plain", ".hidden", "Caf\xC3\xA9 \xF0\x9F\x98\x80", "bad\xFF", "bell\x07",
+          "longer than the 64 bytes that a name may have so that it can be shown \xF0\x9F\x98\x80",
+          "folder/inner"}) {
         directory.write("system/" + std::string(file), "");
     }
     for (int i = 0; i < 110; ++i) {
@@ -98,6 +101,24 @@ TEST_F(Folders, TellsWhatEachItemIsAndPassesOverNamesThatCannotBeDelivered) {
     }
     ASSERT_EQ(mkfifo(directory.at("system/fifo").c_str(), 0600), 0);
     EXPECT_EQ(itemsIn(kSystemDomain), expected);
+}
+
+TEST_F(Folders, GiveNoPartOfAList) {
+    FSRef folder{};
+    FSIterator iterator = nullptr;
+    UInt32 count = 0;
+    for (const OSErr expected : {errFSNoMoreItems, ioErr}) {
+        for (int i = 0; i < 4096 + (expected == ioErr ? 1 : 0); ++i) {
+            directory.write("local/" + std::to_string(i), "");
+        }
+        ASSERT_EQ(FSFindFolder(kLocalDomain, kModemScriptsFolderType, false, &folder), noErr);
+        ASSERT_EQ(FSOpenIterator(&folder, kFSIterateFlat, &iterator), noErr);
+        EXPECT_EQ(FSGetCatalogInfoBulk(iterator, 5000, &count, nullptr, kFSCatInfoNone, nullptr, nullptr,
+                                       nullptr, nullptr),
+                  expected);
+        EXPECT_EQ(count, 4096U);
+        FSCloseIterator(iterator);
+    }
 }
 
 }  // namespace
