@@ -3,6 +3,7 @@
 #include <sys/socket.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <utility>
 #include <vector>
 
@@ -93,7 +94,9 @@ Outcome KernelNetworkState::routeTo(const Destination& destination, Route& route
 
 Outcome KernelNetworkState::subscribe(std::unique_ptr<Notices>& notices) {
     Socket socket;
-    Outcome done = socket.open(RTMGRP_LINK | RTMGRP_IPV4_IFADDR | RTMGRP_IPV4_ROUTE);
+    // A route that goes with its next-hop object goes without a notice of its own.
+    constexpr std::uint32_t nextHops = std::uint32_t{1} << (RTNLGRP_NEXTHOP - 1U);
+    Outcome done = socket.open(RTMGRP_LINK | RTMGRP_IPV4_IFADDR | RTMGRP_IPV4_ROUTE | nextHops);
     if (done.ok()) {
         notices = std::make_unique<KernelNotices>(std::move(socket));
     }

@@ -61,7 +61,8 @@ class NetworkState {
 
     // The default route of IPv4 with the lowest metric, over an interface that is up; nothing without one.
     virtual Outcome primaryRoute(std::optional<PrimaryRoute>& route) = 0;
-    // Fails only when the question could not be asked; having no route is an answer.
+    // Fails only when the question could not be asked; having no route is an answer, and a route over a link
+    // that is down or without a carrier is none.
     virtual Outcome routeTo(const Destination& destination, Route& route) = 0;
     // From then on no change of the primary route goes without news.
     virtual Outcome subscribe(std::unique_ptr<Notices>& notices) = 0;

@@ -23,12 +23,14 @@ ByteView addressOf(const Destination& destination) {
 
 struct NextHop {
     int interfaceIndex = 0;
-    std::optional<in_addr> gateway;
+    std::optional<in_addr> gateway;  // of IPv4
+    bool isDirect = true;
 };
 
-std::optional<in_addr> gatewayIn(const Attributes& attributes) {
+NextHop hopOver(int interfaceIndex, const Attributes& attributes) {
     const std::optional<Attribute> gateway = attributes.find(RTA_GATEWAY);
-    return gateway ? valueFrom<in_addr>(gateway->payload) : std::nullopt;
+    return {interfaceIndex, gateway ? valueFrom<in_addr>(gateway->payload) : std::nullopt,
+            !gateway && !attributes.find(RTA_VIA)};
 }
 
 // A row of next hops: each a header with a length of its own, and attributes.
@@ -39,14 +41,15 @@ std::optional<NextHop> workingHopIn(ByteView hops) {
             return std::nullopt;
         }
         if ((header->rtnh_flags & brokenHop) == 0) {
-            const Attributes attributes(hops.subspan(sizeof(rtnexthop), length - sizeof(rtnexthop)));
-            return NextHop{header->rtnh_ifindex, gatewayIn(attributes)};
+            return hopOver(header->rtnh_ifindex,
+                           Attributes(hops.subspan(sizeof(rtnexthop), length - sizeof(rtnexthop))));
         }
         hops = hops.subspan(std::min((length + 3U) & ~std::size_t{3U}, hops.size()));
     }
     return std::nullopt;
 }
 
+// Nothing when none of them works.
 std::optional<NextHop> hopIn(const rtmsg& route, const Attributes& attributes) {
     if (const std::optional<Attribute> several = attributes.find(RTA_MULTIPATH)) {
         return workingHopIn(several->payload);
@@ -56,7 +59,7 @@ std::optional<NextHop> hopIn(const rtmsg& route, const Attributes& attributes) {
     if (!index || (route.rtm_flags & brokenHop) != 0) {
         return std::nullopt;
     }
-    return NextHop{static_cast<int>(*index), gatewayIn(attributes)};
+    return hopOver(static_cast<int>(*index), attributes);
 }
 
 std::uint32_t tableOf(const rtmsg& route, const Attributes& attributes) {
@@ -110,6 +113,8 @@ Message askForRouteTo(const Destination& destination) {
     rtmsg route{};
     route.rtm_family = static_cast<unsigned char>(destination.family);
     route.rtm_dst_len = static_cast<unsigned char>(address.size() * 8);
+    // The route itself with the state of its next hops, not what the kernel made of it for this destination.
+    route.rtm_flags = RTM_F_FIB_MATCH;
     Message message(RTM_GETROUTE, NLM_F_REQUEST | NLM_F_ACK, route);
     message.add(RTA_DST, address);
     if (destination.interfaceIndex != 0) {
@@ -144,12 +149,12 @@ Route routeIn(const MessageView& answer) {
     if (answer.type() != RTM_NEWROUTE || !header) {
         return {};
     }
-    const Attributes attributes = answer.attributes<rtmsg>();
-    Route route;
-    route.isLocal = header->rtm_type == RTN_LOCAL;
-    route.isReachable = route.isLocal || header->rtm_type == RTN_UNICAST;
-    route.isDirect = route.isReachable && !attributes.find(RTA_GATEWAY) && !attributes.find(RTA_VIA);
-    return route;
+    if (header->rtm_type == RTN_LOCAL) {
+        return {.isReachable = true, .isLocal = true, .isDirect = true};
+    }
+    const std::optional<NextHop> hop =
+        header->rtm_type == RTN_UNICAST ? hopIn(*header, answer.attributes<rtmsg>()) : std::nullopt;
+    return {.isReachable = hop.has_value(), .isLocal = false, .isDirect = hop && hop->isDirect};
 }
 
 }  // namespace platform::live

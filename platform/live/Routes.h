@@ -38,7 +38,7 @@ struct Link {
 // Nothing when the message describes no link.
 [[nodiscard]] std::optional<Link> linkIn(const netlink::MessageView& answer);
 
-// Only a unicast or a local route reaches anything.
+// Only a local route reaches anything, or a unicast one over a link that has its carrier.
 [[nodiscard]] Route routeIn(const netlink::MessageView& answer);
 
 }  // namespace platform::live

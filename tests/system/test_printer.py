@@ -83,6 +83,13 @@ class Misbehaving(lab.LabTest):
     def test_refused(self):
         self.probe(None, "-[0-9]+")
 
+    def test_switched_off(self):
+        lab.ip("-n far link set far-wlan0 down")
+        _, trace = self.lab.tool("test", stdin=subprocess.DEVNULL)
+        self.assertIn("try 4\n", trace)
+        self.assertIn("IsWirelessPrinterReachableViaSCF(): reachable=0\nPrinter is reachable: FALSE\nDeleting", trace)
+        self.lab.tool("remove")
+
     def test_ends_by_itself(self):
         for manner, result in {"redirect": "302", "big": "(0|-[0-9]+)", "reset": "-[0-9]+"}.items():
             self.probe(manner, result)

@@ -83,13 +83,25 @@ TEST_F(KernelNetworkTest, TheGlobalStateFollowsTheDefaultRoute) {
     });
 }
 
-TEST_F(KernelNetworkTest, ARouteThatGoesWithItsAddressIsNoticed) {
+TEST_F(KernelNetworkTest, ARouteThatGoesWithSomethingElseIsNoticed) {
     run([] {
-        shell("ip address add 10.0.0.50/32 dev card0 && ip route add default dev card0 src 10.0.0.50");
-        Watcher watcher({globalKey});
-        shell("ip address del 10.0.0.50/32 dev card0");
-        watcher.waitFor(1);
-        EXPECT_EQ(watcher.notices, std::vector<std::string>{std::string(globalKey) + " = status 1004"});
+        const struct {
+            const char* come;
+            const char* go;
+        } rows[] = {
+            {"ip address add 10.0.0.50/32 dev card0 && ip route add default dev card0 src 10.0.0.50",
+             "ip address del 10.0.0.50/32 dev card0"},
+            {"ip nexthop add id 7 via 10.0.0.1 dev card0 && ip route add default nhid 7",
+             "ip nexthop del id 7"},
+        };
+        for (const auto& row : rows) {
+            shell(row.come);
+            Watcher watcher({globalKey});
+            shell(row.go);
+            watcher.waitFor(1);
+            EXPECT_EQ(watcher.notices, std::vector<std::string>{std::string(globalKey) + " = status 1004"})
+                << row.go;
+        }
     });
 }
 
@@ -137,21 +149,39 @@ TEST_F(KernelNetworkTest, ReachabilityIsTheKernelsAnswer) {
         shell(
             "ip route add 172.16.0.0/24 via 10.0.0.1 && ip route add unreachable 172.16.1.0/24 && "
             "ip address add fd00::2/64 dev card0 nodad && ip -6 route add fd01::/64 via fd00::1 && "
-            "ip -6 route add unreachable fd02::/64");
-        const struct {
-            const char* name;
-            SCNetworkConnectionFlags flags;
-        } rows[] = {
-            {"10.0.0.1", 0x20002}, {"10.0.0.2", 0x30002}, {"127.0.0.1", 0x30002},     {"172.16.0.9", 2},
-            {"172.16.1.9", 0},     {"192.0.2.1", 0},      {"10.0.0.255", 0},          {"224.0.0.1", 0},
-            {"fd00::1", 0x20002},  {"fd00::2", 0x30002},  {"::1", 0x30002},           {"fd01::1", 2},
-            {"fd02::1", 0},        {"2001:db8::1", 0},    {"fe80::1%card0", 0x20002},
+            "ip -6 route add unreachable fd02::/64 && ip address add fd03::2/64 dev card1 nodad && "
+            "ip route add 172.16.2.0/24 nexthop via 10.0.1.1 dev card1 nexthop via 10.0.0.1 dev card0");
+        using Flags = std::vector<std::pair<const char*, SCNetworkConnectionFlags>>;
+        const auto expect = [](const char* when, const Flags& rows) {
+            for (const auto& [name, expected] : rows) {
+                SCNetworkConnectionFlags flags = 77;
+                EXPECT_TRUE(SCNetworkCheckReachabilityByName(name, &flags)) << name << when;
+                EXPECT_EQ(flags, expected) << name << when;
+            }
         };
-        for (const auto& row : rows) {
-            SCNetworkConnectionFlags flags = 77;
-            EXPECT_TRUE(SCNetworkCheckReachabilityByName(row.name, &flags)) << row.name;
-            EXPECT_EQ(flags, row.flags) << row.name;
-        }
+        expect("", {{"10.0.0.1", 0x20002},
+                    {"10.0.0.2", 0x30002},
+                    {"127.0.0.1", 0x30002},
+                    {"172.16.0.9", 2},
+                    {"172.16.1.9", 0},
+                    {"192.0.2.1", 0},
+                    {"10.0.0.255", 0},
+                    {"224.0.0.1", 0},
+                    {"fd00::1", 0x20002},
+                    {"fd00::2", 0x30002},
+                    {"::1", 0x30002},
+                    {"fd01::1", 2},
+                    {"fd02::1", 0},
+                    {"2001:db8::1", 0},
+                    {"10.0.1.1", 0x20002},
+                    {"172.16.2.9", 2},
+                    {"fd03::1", 0x20002},
+                    {"fe80::1%card0", 0x20002}});
+        shell("ip link set other1 down");
+        expect(" without a carrier",
+               {{"10.0.1.1", 0}, {"fd03::1", 0}, {"10.0.1.2", 0x30002}, {"172.16.2.9", 2}});
+        shell("ip link set card1 down");
+        expect(" with the link down", {{"10.0.1.1", 0}, {"fd03::1", 0}});
     });
 }
 
