@@ -28,9 +28,15 @@ CFDictionaryRef CopyDictionary(SCDynamicStoreRef session, CFStringRef key) {
     return static_cast<CFDictionaryRef>(value);
 }
 
+// A string as it is, of any other value a textual form in one line.
+CFStringRef CopyText(CFTypeRef value) {
+    return CFGetTypeID(value) == CFStringGetTypeID() ? static_cast<CFStringRef>(CFQRetain(value))
+                                                     : CFCopyDescription(value);
+}
+
 void TracePair(CFTypeRef key, CFTypeRef value) {
-    const CFStringRef keyText = CFCopyDescription(key);
-    const CFStringRef valueText = CFCopyDescription(value);
+    const CFStringRef keyText = CopyText(key);
+    const CFStringRef valueText = CopyText(value);
     TRACE("key=\"%s\", value=\"%s\"\n", SystemText(keyText).c_str(), SystemText(valueText).c_str());
     CFQRelease(keyText);
     CFQRelease(valueText);

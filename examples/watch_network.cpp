@@ -4,6 +4,7 @@
 //
 // The watcher traces on standard output by itself; a program of your own starts it and runs the run loop of
 // the thread that did.
+#include <algorithm>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
@@ -14,8 +15,10 @@
 namespace {
 
 CFRunLoopRef gLoop = nullptr;
+volatile std::sig_atomic_t gIsInterrupted = 0;
 
 void Interrupted(int /*signal*/) {
+    gIsInterrupted = 1;
     CFRunLoopStop(gLoop);
 }
 
@@ -35,10 +38,13 @@ int main(int argc, char** argv) {
     watchForNetworkChanges();
     std::puts("watching");
     std::fflush(stdout);
-    if (seconds > 0) {
-        CFRunLoopRunInMode(kCFRunLoopDefaultMode, seconds, false);
-    } else {
-        CFRunLoopRun();
+    // A loop that does not run yet cannot be stopped, so it is left once a second to see whether it was.
+    SInt32 ended = kCFRunLoopRunTimedOut;
+    for (double waited = 0;
+         gIsInterrupted == 0 && ended == kCFRunLoopRunTimedOut && (seconds == 0 || waited < seconds);
+         ++waited) {
+        ended = CFRunLoopRunInMode(kCFRunLoopDefaultMode, seconds == 0 ? 1 : std::min(1.0, seconds - waited),
+                                   false);
     }
     stopWatchingForNetworkChanges();
     std::printf("the network is %s\n", gIsNetworkReady ? "ready" : "not ready, or nothing changed");

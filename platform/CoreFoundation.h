@@ -275,16 +275,17 @@ inline constexpr SInt32 kCFRunLoopRunTimedOut = 3;
 inline constexpr SInt32 kCFRunLoopRunHandledSource = 4;
 
 // The run loop of the calling thread; it lives as long as the thread. Only the default mode exists.
-CFRunLoopRef CFRunLoopGetCurrent();
+CFRunLoopRef CFRunLoopGetCurrent() noexcept;
 // The loop retains the source until it is removed. Adding a source twice, or removing one that is not there,
 // does nothing.
-void CFRunLoopAddSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode);
-void CFRunLoopRemoveSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode);
+void CFRunLoopAddSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) noexcept;
+void CFRunLoopRemoveSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) noexcept;
 // Runs the calling thread's loop until it is stopped or has no source left.
-void CFRunLoopRun();
+void CFRunLoopRun() noexcept;
 // The same for at most that many seconds (0: what is ready now), or until one source was handled when asked
 // so.
-SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds, Boolean returnAfterSourceHandled);
-// Makes a running loop return; one that does not run returns from its next run at once. Safe from another
-// thread and from a signal handler.
-void CFRunLoopStop(CFRunLoopRef loop);
+SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds,
+                          Boolean returnAfterSourceHandled) noexcept;
+// Makes the innermost run of the loop that is under way return; it does nothing to a loop that does not run.
+// Safe from another thread and from a signal handler.
+void CFRunLoopStop(CFRunLoopRef loop) noexcept;

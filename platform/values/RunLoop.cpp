@@ -11,7 +11,6 @@
 #include <cmath>
 #include <memory>
 #include <optional>
-#include <system_error>
 #include <vector>
 
 #include "platform/FileDescriptor.h"
@@ -33,11 +32,8 @@ struct OpaqueCFRunLoop final : Object {
     using Clock = std::chrono::steady_clock;
     using Source = Owned<CFRunLoopSourceRef>;
 
-    OpaqueCFRunLoop() : Object(Type::runLoop), wake_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
-        if (!wake_.isOpen()) {
-            throw std::system_error(errno, std::generic_category(), "eventfd");
-        }
-    }
+    // Without a descriptor to be had, stopping from another thread takes effect a moment later.
+    OpaqueCFRunLoop() : Object(Type::runLoop), wake_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
 
     void add(CFRunLoopSourceRef source) {
         if (!holds(source)) {
@@ -47,7 +43,8 @@ struct OpaqueCFRunLoop final : Object {
     void remove(CFRunLoopSourceRef source) {
         std::erase_if(sources_, [source](const Source& held) { return held.get() == source; });
     }
-    // Only an atomic flag and a write, so that a signal handler may call it.
+    // Stops the innermost run that is under way. Only an atomic flag and a write, so that a signal handler
+    // may call it.
     void stop() noexcept {
         const int error = errno;
         isStopped_.store(true);
@@ -64,6 +61,7 @@ struct OpaqueCFRunLoop final : Object {
         return std::ranges::any_of(sources_, [source](const Source& held) { return held.get() == source; });
     }
     [[nodiscard]] bool takeStop() noexcept { return isStopped_.exchange(false); }
+    [[nodiscard]] int waitingTime(std::optional<Clock::time_point> deadline) const;
     bool handleReady(std::optional<Clock::time_point> deadline, bool onlyOne);
 
     std::vector<Source> sources_;
@@ -80,19 +78,17 @@ bool isDefaultMode(CFStringRef mode) {
     return mode != nullptr && mode->equals(*kCFRunLoopDefaultMode);
 }
 
-// poll's waiting time, rounded up so that the loop does not spin through the last millisecond.
-int millisecondsUntil(std::optional<OpaqueCFRunLoop::Clock::time_point> deadline) {
-    using std::chrono::milliseconds;
-    if (!deadline.has_value()) {
-        return -1;
-    }
-    const auto left = std::chrono::ceil<milliseconds>(*deadline - OpaqueCFRunLoop::Clock::now());
-    return static_cast<int>(std::clamp(left, milliseconds(0), milliseconds(3'600'000)).count());
-}
-
 }  // namespace
 
 const CFStringRef kCFRunLoopDefaultMode = &defaultMode.value;
+
+// poll's, rounded up so that the loop does not spin through the last millisecond.
+int OpaqueCFRunLoop::waitingTime(std::optional<Clock::time_point> deadline) const {
+    using std::chrono::milliseconds;
+    const milliseconds longest(wake_.isOpen() ? 3'600'000 : 100);
+    const milliseconds left = deadline ? std::chrono::ceil<milliseconds>(*deadline - Clock::now()) : longest;
+    return static_cast<int>(std::clamp(left, milliseconds(0), longest).count());
+}
 
 // Waits, and calls the sources that are ready; whether there was one.
 bool OpaqueCFRunLoop::handleReady(std::optional<Clock::time_point> deadline, bool onlyOne) {
@@ -104,7 +100,7 @@ bool OpaqueCFRunLoop::handleReady(std::optional<Clock::time_point> deadline, boo
         polled.push_back({source.get()->descriptor, source.get()->events, 0});
     }
     polled.push_back({wake_.get(), POLLIN, 0});
-    if (::poll(polled.data(), polled.size(), millisecondsUntil(deadline)) <= 0) {
+    if (::poll(polled.data(), polled.size(), waitingTime(deadline)) <= 0) {
         return false;
     }
     if (polled.back().revents != 0) {
@@ -128,10 +124,13 @@ bool OpaqueCFRunLoop::handleReady(std::optional<Clock::time_point> deadline, boo
 }
 
 SInt32 OpaqueCFRunLoop::run(std::optional<Clock::time_point> deadline, bool returnAfterSourceHandled) {
+    // What was stopped before this run began is an outer run, which learns of it when this one has ended.
+    struct Outer {
+        std::atomic<bool>& flag;
+        bool isStopped = flag.exchange(false);
+        ~Outer() { flag.store(isStopped); }
+    } const outer{isStopped_};
     while (true) {
-        if (takeStop()) {
-            return kCFRunLoopRunStopped;
-        }
         if (sources_.empty()) {
             return kCFRunLoopRunFinished;
         }
@@ -154,28 +153,29 @@ Owned<CFRunLoopSourceRef> platform::values::makeRunLoopSource(int descriptor, sh
         new OpaqueCFRunLoopSource(descriptor, events, std::move(perform)));
 }
 
-CFRunLoopRef CFRunLoopGetCurrent() {
+CFRunLoopRef CFRunLoopGetCurrent() noexcept {
     thread_local const auto loop = Owned<CFRunLoopRef>::adopt(new OpaqueCFRunLoop);
     return loop.get();
 }
 
-void CFRunLoopAddSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) {
+void CFRunLoopAddSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) noexcept {
     if (isDefaultMode(mode)) {
         loop->add(source);
     }
 }
 
-void CFRunLoopRemoveSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) {
+void CFRunLoopRemoveSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) noexcept {
     if (isDefaultMode(mode)) {
         loop->remove(source);
     }
 }
 
-void CFRunLoopRun() {
+void CFRunLoopRun() noexcept {
     CFRunLoopGetCurrent()->run(std::nullopt, false);
 }
 
-SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds, Boolean returnAfterSourceHandled) {
+SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds,
+                          Boolean returnAfterSourceHandled) noexcept {
     if (!isDefaultMode(mode)) {
         return kCFRunLoopRunFinished;
     }
@@ -190,6 +190,6 @@ SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds, Boolean retu
     return CFRunLoopGetCurrent()->run(deadline, returnAfterSourceHandled != 0);
 }
 
-void CFRunLoopStop(CFRunLoopRef loop) {
+void CFRunLoopStop(CFRunLoopRef loop) noexcept {
     loop->stop();
 }

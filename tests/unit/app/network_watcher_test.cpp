@@ -1,5 +1,6 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <unistd.h>
 
 #include <memory>
@@ -10,6 +11,7 @@
 #include "morecfq/MoreCFQ.h"
 #include "platform/Host.h"
 #include "platform/live/NetworkState.h"
+#include "platform/values/RunLoop.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
 namespace {
@@ -100,26 +102,47 @@ TEST_F(NetworkWatcher, TellsWhatComesAndWhatGoes) {
               "\n");
     EXPECT_FALSE(gIsNetworkReady);
 
-    stopWatchingForNetworkChanges();
+    // Stopped from within the run, it ends the run and hears nothing more.
+    const values::Owned<CFRunLoopSourceRef> always =
+        values::makeRunLoopSource(STDOUT_FILENO, POLLOUT, [](short) { stopWatchingForNetworkChanges(); });
+    CFRunLoopAddSource(CFRunLoopGetCurrent(), always.get(), kCFRunLoopDefaultMode);
+    EXPECT_EQ(CFRunLoopRunInMode(kCFRunLoopDefaultMode, 10, false), kCFRunLoopRunStopped);
+    CFRunLoopRemoveSource(CFRunLoopGetCurrent(), always.get(), kCFRunLoopDefaultMode);
     network_->become(live::PrimaryRoute{"eth7", std::nullopt});
     EXPECT_EQ(traceOfOneRun(), "");
+    watchForNetworkChanges();
+    network_->become(std::nullopt);
+    EXPECT_NE(traceOfOneRun(), "") << "it watches again";
+    stopWatchingForNetworkChanges();
 }
 
-TEST_F(NetworkWatcher, OneMissingValueMakesTheRestOfTheCallNotReady) {
+TEST_F(NetworkWatcher, TracesStringsAsTheyAreAndReportsNotReadyBehindAMissingValue) {
+    directory_.write(
+        "preferences/preferences.plist",
+        "<plist version=\"1.0\"><dict><key>CurrentSet</key><string>/Sets/0</string><key>Sets</key>"
+        "<dict><key>0</key><dict><key>Network</key><dict><key>Global</key><dict><key>DNS</key>"
+        "<dict><key>a\nb</key><string>c\n\"d\"</string><key>e</key><array><string>f\ng</string>"
+        "</array></dict></dict></dict></dict></dict></dict></plist>");
     network_->become(live::PrimaryRoute{"eth7", std::nullopt});
     const SCDynamicStoreRef session = SCDynamicStoreCreate(nullptr, CFSTR("test"), nullptr, nullptr);
     CFMutableArrayRef keys = nullptr;
     ASSERT_EQ(CFQArrayCreateMutable(&keys), 0);
+    CFArrayAppendValue(keys, CFSTR("Setup:/Network/Global/DNS"));
     CFArrayAppendValue(keys, CFSTR("State:/Network/Global/None"));
     CFArrayAppendValue(keys, CFSTR("State:/Network/Global/IPv4"));
     testing::internal::CaptureStdout();
     networkChanged(session, keys, nullptr);
     EXPECT_EQ(testing::internal::GetCapturedStdout(),
               "the network configuration changed!\n"
-              "Main Key 0=\"State:/Network/Global/None\"\n"
+              "Main Key 0=\"Setup:/Network/Global/DNS\"\n"
+              "setting gIsNetworkReady to TRUE\n"
+              "Main Key Dict:\n"
+              "key=\"a\nb\", value=\"c\n\"d\"\"\n"
+              "key=\"e\", value=\"(f g)\"\n"
+              "Main Key 1=\"State:/Network/Global/None\"\n"
               "Main Key Dict is nil\n"
               "setting gIsNetworkReady to FALSE\n"
-              "Main Key 1=\"State:/Network/Global/IPv4\"\n"
+              "Main Key 2=\"State:/Network/Global/IPv4\"\n"
               "setting gIsNetworkReady to FALSE\n"
               "\n");
     CFQRelease(keys);

@@ -2,6 +2,7 @@
 #include <poll.h>
 #include <signal.h>
 #include <sys/eventfd.h>
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -66,8 +67,7 @@ TEST_F(RunLoop, ReturnsForEachOfItsReasons) {
     EXPECT_EQ(runFor(0), kCFRunLoopRunTimedOut);
     EXPECT_EQ(calls, 2);
     CFRunLoopStop(loop);
-    EXPECT_EQ(runFor(10), kCFRunLoopRunStopped);
-    EXPECT_EQ(runFor(0), kCFRunLoopRunTimedOut);
+    EXPECT_EQ(runFor(0), kCFRunLoopRunTimedOut) << "it was stopped before it ran";
     remove(source);
     remove(source);
     EXPECT_EQ(CFGetRetainCount(source.get()), 1);
@@ -98,10 +98,11 @@ TEST_F(RunLoop, StopsFromACallbackAndASignalHandler) {
     const auto source = bell.source([&] {
         bell.receive();
         CFRunLoopStop(loop);
+        EXPECT_EQ(runFor(0), kCFRunLoopRunTimedOut) << "the outer run is the one that was stopped";
     });
     add(source);
     bell.send();
-    CFRunLoopRun();
+    EXPECT_EQ(runFor(10), kCFRunLoopRunStopped);
     static CFRunLoopRef signalled;
     signalled = loop;
     struct sigaction action {};
@@ -116,6 +117,25 @@ TEST_F(RunLoop, StopsFromACallbackAndASignalHandler) {
     sender.join();
     ::sigaction(SIGUSR1, &previous, nullptr);
     remove(source);
+}
+
+TEST_F(RunLoop, WorksWithoutADescriptorOfItsOwn) {
+    std::thread([&] {
+        rlimit limit{};
+        ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &limit), 0);
+        const rlimit none{0, limit.rlim_max};
+        ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &none), 0);
+        const CFRunLoopRef own = CFRunLoopGetCurrent();
+        EXPECT_EQ(::setrlimit(RLIMIT_NOFILE, &limit), 0);
+        const auto source = bell.source([] {});
+        CFRunLoopAddSource(own, source.get(), kCFRunLoopDefaultMode);
+        std::thread sender([own] {
+            std::this_thread::sleep_for(std::chrono::milliseconds(20));
+            CFRunLoopStop(own);
+        });
+        EXPECT_EQ(runFor(10), kCFRunLoopRunStopped);
+        sender.join();
+    }).join();
 }
 
 TEST_F(RunLoop, DropsASourceWhoseDescriptorIsClosed) {
