@@ -133,8 +133,9 @@ OSStatus ArvAssistant::Run() {
         ConfigureWirelessPrinter();
     }
 
-    // The object remembers the original location, which is not the temporary one, so neither step changes
-    // anything here: leading back is left to the "remove" of a later process.
+    // The object still remembers the location from before, so nothing is switched back, and the temporary one
+    // cannot be deleted while it is current: that is left to the "remove" of a later process. One that could
+    // not be made current is deleted here.
     RestoreOriginalSet();
     DestroyTemporarySet();
     CleanUp();

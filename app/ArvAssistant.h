@@ -23,7 +23,7 @@ inline constexpr const char* kZATSetFile = "/tmp/zat.orig";
 inline constexpr OSStatus kNoOriginalSetErr = -1234;
 
 // Every operation returns 0 or a status of the network-configuration library, unless it says otherwise, and
-// tells what it does through TRACE.
+// traces its steps.
 class ArvAssistant {
   public:
     ArvAssistant() = default;

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <csignal>
 #include <cstdio>
 #include <cstring>
 
@@ -115,6 +116,8 @@ void OpenConfigurationPage() {
 }
 
 OSStatus WaitForUserToBeDone() {
+    // At the end of the input it asks for ever, so a reader who goes has to end it: nobody else would.
+    const auto atBrokenPipe = std::signal(SIGPIPE, SIG_DFL);
     bool done = false;
     while (!done) {
         std::printf("Done yet? <y/n>");
@@ -131,5 +134,6 @@ OSStatus WaitForUserToBeDone() {
         // The line break that ends the answer.
         std::getchar();
     }
+    std::signal(SIGPIPE, atBrokenPipe);
     return 0;
 }

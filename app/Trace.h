@@ -1,4 +1,4 @@
-// The trace log: everything the tool does, told on standard output as it happens.
+// The trace log: the steps of a command, on standard output as they happen.
 #pragma once
 
 #include <cstdio>

@@ -2,6 +2,7 @@
 """The assisted run: the printer found, the prompt, the browser, and every way in which a printer can misbehave."""
 import os
 import re
+import signal
 import socket
 import subprocess
 import time
@@ -36,8 +37,9 @@ class Printer(lab.LabTest):
         for _ in range(100_000):
             last = run.stdout.read(15)
         self.assertEqual((None, 15), (run.poll(), len(last)))
-        run.kill()
-        run.communicate()
+        run.stdout.close()
+        self.assertEqual(-signal.SIGPIPE, run.wait(10))
+        run.stderr.close()
 
 
     def test_log_that_nobody_reads(self):
