@@ -5,16 +5,11 @@ usage: printer.py MANNER LOGFILE
 
     well      a front page, a configuration page, and 404 for everything else
     silent    takes the connection and never answers
-    endless   an answer that never ends
     redirect  to a page that does not exist
-    reset     breaks the connection in mid-header
-    big       ten megabytes
 
 Every request line goes to LOGFILE.
 """
 import http.server
-import socket
-import struct
 import sys
 import time
 
@@ -45,21 +40,8 @@ class Printer(http.server.BaseHTTPRequestHandler):
     def silent(self):
         time.sleep(3600)
 
-    def endless(self):
-        self.answer(200, length=str(1 << 40))
-        while True:
-            self.wfile.write(b"page " * 1000)
-
     def redirect(self):
         self.answer(302 if self.path == "/mactestfoo.html" else 404, Location="http://192.0.0.192/moved.html")
-
-    def reset(self):
-        self.wfile.write(b"HTTP/1.1 404 Not")
-        self.connection.setsockopt(socket.SOL_SOCKET, socket.SO_LINGER, struct.pack("ii", 1, 0))
-        self.connection.close()
-
-    def big(self):
-        self.answer(200, b"x" * 10_000_000)
 
     def log_message(self, *_):
         pass

@@ -1,4 +1,3 @@
-#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <unistd.h>
@@ -9,56 +8,12 @@
 
 #include "app/NetworkWatcher.h"
 #include "morecfq/MoreCFQ.h"
-#include "platform/Host.h"
-#include "platform/live/NetworkState.h"
 #include "platform/values/RunLoop.h"
-#include "tests/unit/support/TemporaryDirectory.h"
+#include "tests/unit/live/Fixture.h"
 
 namespace {
 
 using namespace platform;
-
-// A network whose primary route the test sets, with news on a pipe.
-class Network : public live::NetworkState {
-  public:
-    Network() { EXPECT_EQ(pipe2(pipe_, O_NONBLOCK | O_CLOEXEC), 0); }
-    ~Network() override {
-        close(pipe_[0]);
-        close(pipe_[1]);
-    }
-    void become(std::optional<live::PrimaryRoute> route) {
-        route_ = std::move(route);
-        EXPECT_EQ(write(pipe_[1], "!", 1), 1);
-    }
-    Outcome primaryRoute(std::optional<live::PrimaryRoute>& route) override {
-        route = route_;
-        return {};
-    }
-    Outcome routeTo(const live::Destination&, live::Route&) override { return {}; }
-    Outcome subscribe(std::unique_ptr<live::Notices>& notices) override {
-        if (refuses) {
-            return {kSCStatusFailed, "no news today"};
-        }
-        notices = std::make_unique<News>(pipe_[0]);
-        return {};
-    }
-
-    bool refuses = false;
-
-  private:
-    struct News : live::Notices {
-        explicit News(int descriptor) : end(descriptor) {}
-        [[nodiscard]] int descriptor() const noexcept override { return end; }
-        bool drain() override {
-            char byte = 0;
-            return read(end, &byte, 1) == 1;
-        }
-        int end;
-    };
-
-    int pipe_[2] = {-1, -1};
-    std::optional<live::PrimaryRoute> route_;
-};
 
 class NetworkWatcher : public testing::Test {
   protected:
@@ -76,13 +31,13 @@ class NetworkWatcher : public testing::Test {
     }
 
     testing_support::TemporaryDirectory directory_;
-    std::shared_ptr<Network> network_ = std::make_shared<Network>();
+    std::shared_ptr<live_test::FakeNetworkState> network_ = std::make_shared<live_test::FakeNetworkState>();
     std::unique_ptr<HostOverride> override_;
 };
 
 TEST_F(NetworkWatcher, TellsWhatComesAndWhatGoes) {
     watchForNetworkChanges();
-    network_->become(live::PrimaryRoute{"eth7", in_addr{htonl(0xC0A80001)}});
+    network_->change(live::PrimaryRoute{"eth7", in_addr{htonl(0xC0A80001)}});
     EXPECT_EQ(traceOfOneRun(),
               "the network configuration changed!\n"
               "Main Key 0=\"State:/Network/Global/IPv4\"\n"
@@ -93,7 +48,7 @@ TEST_F(NetworkWatcher, TellsWhatComesAndWhatGoes) {
               "\n");
     EXPECT_TRUE(gIsNetworkReady);
 
-    network_->become(std::nullopt);
+    network_->change(std::nullopt);
     EXPECT_EQ(traceOfOneRun(),
               "the network configuration changed!\n"
               "Main Key 0=\"State:/Network/Global/IPv4\"\n"
@@ -108,10 +63,10 @@ TEST_F(NetworkWatcher, TellsWhatComesAndWhatGoes) {
     CFRunLoopAddSource(CFRunLoopGetCurrent(), always.get(), kCFRunLoopDefaultMode);
     EXPECT_EQ(CFRunLoopRunInMode(kCFRunLoopDefaultMode, 10, false), kCFRunLoopRunStopped);
     CFRunLoopRemoveSource(CFRunLoopGetCurrent(), always.get(), kCFRunLoopDefaultMode);
-    network_->become(live::PrimaryRoute{"eth7", std::nullopt});
+    network_->change(live::PrimaryRoute{"eth7", std::nullopt});
     EXPECT_EQ(traceOfOneRun(), "");
     watchForNetworkChanges();
-    network_->become(std::nullopt);
+    network_->change(std::nullopt);
     EXPECT_NE(traceOfOneRun(), "") << "it watches again";
     stopWatchingForNetworkChanges();
 }
@@ -123,7 +78,7 @@ TEST_F(NetworkWatcher, TracesStringsAsTheyAreAndReportsNotReadyBehindAMissingVal
         "<dict><key>0</key><dict><key>Network</key><dict><key>Global</key><dict><key>DNS</key>"
         "<dict><key>a\nb</key><string>c\n\"d\"</string><key>e</key><array><string>f\ng</string>"
         "</array></dict></dict></dict></dict></dict></dict></plist>");
-    network_->become(live::PrimaryRoute{"eth7", std::nullopt});
+    network_->change(live::PrimaryRoute{"eth7", std::nullopt});
     const SCDynamicStoreRef session = SCDynamicStoreCreate(nullptr, CFSTR("test"), nullptr, nullptr);
     CFMutableArrayRef keys = nullptr;
     ASSERT_EQ(CFQArrayCreateMutable(&keys), 0);
@@ -150,7 +105,7 @@ TEST_F(NetworkWatcher, TracesStringsAsTheyAreAndReportsNotReadyBehindAMissingVal
 }
 
 TEST_F(NetworkWatcher, FailureToStartIsToldInTwoLines) {
-    network_->refuses = true;
+    network_->isFailing = true;
     testing::internal::CaptureStderr();
     watchForNetworkChanges();
     const std::string told = testing::internal::GetCapturedStderr();

@@ -75,21 +75,6 @@ TEST_F(Printer, IsAskedForByNameAndThenByAddressUntilThereIsARoute) {
     EXPECT_EQ(reachable, 1);
 }
 
-TEST_F(Printer, IsGivenUpAfterTheLastTry) {
-    int reachable = -1;
-    const std::string trace = traceOf(IsWirelessPrinterReachableViaSCF, 5, &reachable);
-    EXPECT_EQ(reachable, 0);
-    EXPECT_EQ(answers_->queries, 10U);
-    EXPECT_NE(trace.find("try 4\n"), std::string::npos);
-    EXPECT_EQ(trace.find("try 5\n"), std::string::npos);
-
-    testing::internal::CaptureStdout();
-    EXPECT_EQ(ArvAssistant().IsWirelessPrinterReachable(), 0);
-    EXPECT_NE(testing::internal::GetCapturedStdout().find("Printer is reachable: FALSE\n"),
-              std::string::npos);
-    EXPECT_EQ(answers_->probes, 0U);
-}
-
 TEST_F(Printer, IsFoundByTheAnswerThatItHasNoSuchPage) {
     answers_->downloads = {-1, 404};
     int reachable = -1;

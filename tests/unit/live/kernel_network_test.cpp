@@ -28,13 +28,17 @@ class KernelNetworkTest : public testing_support::PrivateNetworkTest {
                 shell("ip address add 10.0." + number + ".2/24 dev card" + number);
             }
             // The carrier comes a moment later, and with it the routes of IPv6.
-            for (int i = 0; i < 500 && shell("ip -6 route show fe80::/64 dev card0").empty(); ++i) {
-                usleep(10'000);
-            }
+            waitForOutput("ip -6 route show fe80::/64 dev card0");
             body();
         });
     }
 
+    // For what the kernel does a moment later.
+    static void waitForOutput(const std::string& command) {
+        for (int i = 0; i < 500 && shell(command).empty(); ++i) {
+            usleep(10'000);
+        }
+    }
     static std::string now() { return valueAt(openStore().get(), globalKey); }
     static StoreRef openStore() {
         return StoreRef::adopt(SCDynamicStoreCreate(nullptr, CFSTR("tester"), nullptr, nullptr));
@@ -56,6 +60,12 @@ TEST_F(KernelNetworkTest, TheGlobalStateFollowsTheDefaultRoute) {
             {"ip route add default dev card0 metric 100", overCard("0")},
             {"ip route add default via 10.0.1.7 metric 300", overCard("0")},
             {"ip route add default via 10.0.1.9 table 99", overCard("0")},
+            {"ip route add default via 10.0.1.9 tos 0x10 metric 1", overCard("0")},
+            {"ip route add default metric 50 nexthop via 10.0.0.5 dev card0 nexthop via 10.0.1.5 dev card1",
+             overCard("0", "10.0.0.5")},
+            {"ip link set other0 down", overCard("1", "10.0.1.5")},
+            {"ip link set other0 up", overCard("0", "10.0.0.5")},
+            {"ip route del default metric 50", overCard("0")},
             {"ip link set other0 down", overCard("1", "10.0.1.1")},
             {"ip link set other0 up", overCard("0")},
             {"ip link set card0 down", overCard("1", "10.0.1.1")},
@@ -151,6 +161,7 @@ TEST_F(KernelNetworkTest, ReachabilityIsTheKernelsAnswer) {
             "ip address add fd00::2/64 dev card0 nodad && ip -6 route add fd01::/64 via fd00::1 && "
             "ip -6 route add unreachable fd02::/64 && ip address add fd03::2/64 dev card1 nodad && "
             "ip route add 172.16.2.0/24 nexthop via 10.0.1.1 dev card1 nexthop via 10.0.0.1 dev card0");
+        waitForOutput("ip -6 route show table local fd00::2");
         using Flags = std::vector<std::pair<const char*, SCNetworkConnectionFlags>>;
         const auto expect = [](const char* when, const Flags& rows) {
             for (const auto& [name, expected] : rows) {
@@ -178,6 +189,8 @@ TEST_F(KernelNetworkTest, ReachabilityIsTheKernelsAnswer) {
                     {"fd03::1", 0x20002},
                     {"fe80::1%card0", 0x20002}});
         shell("ip link set other1 down");
+        waitForOutput("ip route show dev card1 | grep linkdown || true");
+        waitForOutput("ip -6 route show dev card1 | grep linkdown || true");
         expect(" without a carrier",
                {{"10.0.1.1", 0}, {"fd03::1", 0}, {"10.0.1.2", 0x30002}, {"172.16.2.9", 2}});
         shell("ip link set card1 down");
