@@ -1,12 +1,14 @@
 #include "platform/netlink/Message.h"
 
+#include <libmnl/libmnl.h>
+
 #include <algorithm>
+#include <string>
 
 namespace platform::netlink {
 namespace {
 
-constexpr std::size_t attributeHeader = sizeof(nlattr);
-
+// libmnl's own macro is one of signed numbers.
 constexpr std::size_t aligned(std::size_t length) {
     return (length + 3U) & ~std::size_t{3U};
 }
@@ -15,6 +17,10 @@ constexpr std::size_t aligned(std::size_t length) {
 
 std::optional<std::uint32_t> Attribute::u32() const noexcept {
     return payload.size() == sizeof(std::uint32_t) ? valueFrom<std::uint32_t>(payload) : std::nullopt;
+}
+
+std::optional<std::uint16_t> Attribute::u16() const noexcept {
+    return payload.size() == sizeof(std::uint16_t) ? valueFrom<std::uint16_t>(payload) : std::nullopt;
 }
 
 std::optional<std::uint8_t> Attribute::u8() const noexcept {
@@ -26,29 +32,25 @@ std::string_view Attribute::text() const noexcept {
     return all.substr(0, all.find('\0'));
 }
 
-void Attributes::Iterator::read() noexcept {
-    const std::optional<nlattr> header = valueFrom<nlattr>(rest_);
-    valid_ = header && header->nla_len >= attributeHeader && header->nla_len <= rest_.size();
-    if (valid_) {
-        current_.type = static_cast<std::uint16_t>(header->nla_type & NLA_TYPE_MASK);
-        current_.payload = rest_.subspan(attributeHeader, header->nla_len - attributeHeader);
-    }
+Attributes Attribute::nested() const {
+    return Attributes(payload);
 }
 
-Attributes::Iterator& Attributes::Iterator::operator++() noexcept {
-    const std::size_t length = aligned(current_.payload.size() + attributeHeader);
-    rest_ = rest_.subspan(std::min(length, rest_.size()));
-    read();
-    return *this;
+Attributes::Attributes(ByteView bytes) {
+    const auto* attribute = reinterpret_cast<const nlattr*>(bytes.data());
+    const std::byte* const end = bytes.data() + bytes.size();
+    const auto left = [&attribute, end] {
+        return static_cast<int>(end - reinterpret_cast<const std::byte*>(attribute));
+    };
+    for (; mnl_attr_ok(attribute, left()); attribute = mnl_attr_next(attribute)) {
+        const auto* const payload = static_cast<const std::byte*>(mnl_attr_get_payload(attribute));
+        list_.push_back({mnl_attr_get_type(attribute), {payload, mnl_attr_get_payload_len(attribute)}});
+    }
 }
 
 std::optional<Attribute> Attributes::find(std::uint16_t type) const noexcept {
-    for (const Attribute& attribute : *this) {
-        if (attribute.type == type) {
-            return attribute;
-        }
-    }
-    return std::nullopt;
+    const auto found = std::ranges::find(list_, type, &Attribute::type);
+    return found == list_.end() ? std::nullopt : std::optional(*found);
 }
 
 std::optional<MessageView> takeMessage(ByteView& datagram) noexcept {
@@ -62,43 +64,30 @@ std::optional<MessageView> takeMessage(ByteView& datagram) noexcept {
     return message;
 }
 
-void Message::start(std::uint16_t type, std::uint16_t flags, ByteView family) {
-    nlmsghdr header{};
-    header.nlmsg_type = type;
-    header.nlmsg_flags = flags;
-    append(bytesOf(header));
-    append(family);
+nlmsghdr* Message::makeRoom(std::size_t size) {
+    bytes_.resize(bytes_.size() + aligned(size));
+    return reinterpret_cast<nlmsghdr*>(bytes_.data());
 }
 
-void Message::append(ByteView bytes) {
-    bytes_.insert(bytes_.end(), bytes.begin(), bytes.end());
-    bytes_.resize(aligned(bytes_.size()));
-    const auto length = static_cast<std::uint32_t>(bytes_.size());
-    std::memcpy(bytes_.data() + offsetof(nlmsghdr, nlmsg_len), &length, sizeof length);
+void Message::start(std::uint16_t type, std::uint16_t flags, ByteView family) {
+    nlmsghdr* const header = mnl_nlmsg_put_header(makeRoom(NLMSG_HDRLEN + family.size()));
+    header->nlmsg_type = type;
+    header->nlmsg_flags = flags;
+    std::memcpy(mnl_nlmsg_put_extra_header(header, family.size()), family.data(), family.size());
 }
 
 Message& Message::add(std::uint16_t type, ByteView payload) {
-    nlattr header{};
-    header.nla_type = type;
-    header.nla_len = static_cast<std::uint16_t>(attributeHeader + payload.size());
-    append(bytesOf(header));
-    append(payload);
+    mnl_attr_put(makeRoom(sizeof(nlattr) + payload.size()), type, payload.size(), payload.data());
     return *this;
 }
 
 Message& Message::addText(std::uint16_t type, std::string_view text) {
-    Bytes payload(text.size() + 1);
-    std::memcpy(payload.data(), text.data(), text.size());
-    return add(type, payload);
-}
-
-Message& Message::addRaw(ByteView attributes) {
-    append(attributes);
+    mnl_attr_put_strz(makeRoom(sizeof(nlattr) + text.size() + 1), type, std::string(text).c_str());
     return *this;
 }
 
 void Message::setSequence(std::uint32_t sequence) noexcept {
-    std::memcpy(bytes_.data() + offsetof(nlmsghdr, nlmsg_seq), &sequence, sizeof sequence);
+    reinterpret_cast<nlmsghdr*>(bytes_.data())->nlmsg_seq = sequence;
 }
 
 }  // namespace platform::netlink

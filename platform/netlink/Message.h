@@ -1,8 +1,8 @@
 // Netlink messages: built and taken apart as pure functions, without a socket.
 //
 // Everything is in the kernel's layout: integers in host byte order unless an attribute says otherwise,
-// addresses in network byte order, every attribute padded to four bytes. What comes from the kernel is read
-// through copies, so that no view depends on alignment, and a length that leaves the message ends the walk.
+// addresses in network byte order, every attribute padded to four bytes. A length that leaves the message
+// ends the walk.
 #pragma once
 
 #include <linux/netlink.h>
@@ -11,7 +11,6 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
-#include <iterator>
 #include <optional>
 #include <span>
 #include <string_view>
@@ -42,49 +41,34 @@ template <class T>
     return value;
 }
 
+class Attributes;
+
 struct Attribute {
     std::uint16_t type = 0;  // without the flag bits
     ByteView payload;
 
     // The payload as an integer of exactly this width.
     [[nodiscard]] std::optional<std::uint32_t> u32() const noexcept;
+    [[nodiscard]] std::optional<std::uint16_t> u16() const noexcept;
     [[nodiscard]] std::optional<std::uint8_t> u8() const noexcept;
     // The payload up to its first NUL.
     [[nodiscard]] std::string_view text() const noexcept;
+    // The payload as attributes of its own.
+    [[nodiscard]] Attributes nested() const;
 };
 
-// A walk over a row of attributes; it ends at the first one that does not fit.
+// A row of attributes up to the first one that does not fit; their payloads are borrowed from the bytes,
+// which begin at a multiple of four as everything in a message does.
 class Attributes {
   public:
-    class Iterator {
-      public:
-        using value_type = Attribute;
-        using difference_type = std::ptrdiff_t;
-
-        Iterator() = default;
-        explicit Iterator(ByteView rest) noexcept : rest_(rest) { read(); }
-        const Attribute& operator*() const noexcept { return current_; }
-        const Attribute* operator->() const noexcept { return &current_; }
-        Iterator& operator++() noexcept;
-        void operator++(int) noexcept { ++*this; }
-        bool operator==(std::default_sentinel_t) const noexcept { return !valid_; }
-
-      private:
-        void read() noexcept;
-
-        ByteView rest_;
-        Attribute current_;
-        bool valid_ = false;
-    };
-
-    explicit Attributes(ByteView bytes) noexcept : bytes_(bytes) {}
-    [[nodiscard]] Iterator begin() const noexcept { return Iterator(bytes_); }
-    [[nodiscard]] std::default_sentinel_t end() const noexcept { return {}; }
+    explicit Attributes(ByteView bytes);
+    [[nodiscard]] auto begin() const noexcept { return list_.begin(); }
+    [[nodiscard]] auto end() const noexcept { return list_.end(); }
     // The first attribute of a type.
     [[nodiscard]] std::optional<Attribute> find(std::uint16_t type) const noexcept;
 
   private:
-    ByteView bytes_;
+    std::vector<Attribute> list_;
 };
 
 // One message as it came, borrowed from the buffer that it came in.
@@ -93,6 +77,7 @@ class MessageView {
     MessageView() = default;
     MessageView(const nlmsghdr& header, ByteView payload) noexcept : header_(header), payload_(payload) {}
 
+    [[nodiscard]] const nlmsghdr& header() const noexcept { return header_; }
     [[nodiscard]] std::uint16_t type() const noexcept { return header_.nlmsg_type; }
     [[nodiscard]] std::uint16_t flags() const noexcept { return header_.nlmsg_flags; }
     [[nodiscard]] std::uint32_t sequence() const noexcept { return header_.nlmsg_seq; }
@@ -136,8 +121,16 @@ class Message {
     }
     // With its final NUL.
     Message& addText(std::uint16_t type, std::string_view text);
-    // Attributes that are there already, each with its header and padding, as a message carried them.
-    Message& addRaw(ByteView attributes);
+    // An attribute that holds those which `fill` adds to the message.
+    template <class Fill>
+    Message& addNested(std::uint16_t type, const Fill& fill) {
+        const std::size_t start = bytes_.size();
+        add(type | NLA_F_NESTED, {});
+        fill(*this);
+        const auto length = static_cast<std::uint16_t>(bytes_.size() - start);
+        std::memcpy(bytes_.data() + start + offsetof(nlattr, nla_len), &length, sizeof length);
+        return *this;
+    }
 
     void setSequence(std::uint32_t sequence) noexcept;
     [[nodiscard]] ByteView bytes() const noexcept { return bytes_; }
@@ -146,9 +139,10 @@ class Message {
 
   private:
     void start(std::uint16_t type, std::uint16_t flags, ByteView family);
-    void append(ByteView bytes);
+    // Room for so many bytes more behind the message.
+    nlmsghdr* makeRoom(std::size_t size);
 
-    Bytes bytes_;
+    Bytes bytes_;  // as long as the message, which libmnl pads
 };
 
 }  // namespace platform::netlink

@@ -1,11 +1,13 @@
 #include "platform/netlink/Socket.h"
 
+#include <libmnl/libmnl.h>
 #include <poll.h>
 #include <sys/socket.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <string>
+#include <utility>
 
 namespace platform::netlink {
 namespace {
@@ -13,6 +15,7 @@ namespace {
 // The largest datagram that the kernel makes for a dump.
 constexpr std::size_t largestDatagram = std::size_t{64} << 10U;
 constexpr int dumpTries = 5;
+constexpr int mostNotices = 1000;
 
 // An NLMSG_ERROR as an outcome: the errno, and the text that the kernel puts behind it when the socket asks
 // for it.
@@ -42,75 +45,105 @@ Outcome outcomeOfError(const MessageView& message, std::initializer_list<int> to
 
 }  // namespace
 
-Outcome Socket::open(std::uint32_t groups) {
-    FileDescriptor descriptor(::socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC, NETLINK_ROUTE));
-    if (!descriptor.isOpen()) {
+void Socket::Close::operator()(mnl_socket* socket) const noexcept {
+    (void)mnl_socket_close(socket);
+}
+
+OwnedMessage::OwnedMessage(const MessageView& view)
+    : header(view.header()), payload(view.payload().begin(), view.payload().end()) {}
+
+int Socket::descriptor() const noexcept {
+    return socket_ ? mnl_socket_get_fd(socket_.get()) : -1;
+}
+
+Outcome Socket::open(int protocol, std::uint32_t groups) {
+    decltype(socket_) socket(mnl_socket_open2(protocol, SOCK_CLOEXEC));
+    if (!socket) {
         return Outcome::fromErrno("cannot open a netlink socket");
     }
     // Kernels that lack one of these still answer every request, only with fewer words or less strictness.
-    const int on = 1;
-    (void)::setsockopt(descriptor.get(), SOL_NETLINK, NETLINK_EXT_ACK, &on, sizeof on);
-    (void)::setsockopt(descriptor.get(), SOL_NETLINK, NETLINK_CAP_ACK, &on, sizeof on);
-    (void)::setsockopt(descriptor.get(), SOL_NETLINK, NETLINK_GET_STRICT_CHK, &on, sizeof on);
-    sockaddr_nl address{};
-    address.nl_family = AF_NETLINK;
-    address.nl_groups = groups;
-    if (::bind(descriptor.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    int on = 1;
+    for (const int option : {NETLINK_EXT_ACK, NETLINK_CAP_ACK, NETLINK_GET_STRICT_CHK}) {
+        (void)mnl_socket_setsockopt(socket.get(), option, &on, sizeof on);
+    }
+    if (mnl_socket_bind(socket.get(), groups, MNL_SOCKET_AUTOPID) != 0) {
         return Outcome::fromErrno("cannot bind a netlink socket");
     }
-    descriptor_ = std::move(descriptor);
+    socket_ = std::move(socket);
+    return {};
+}
+
+Outcome Socket::joinGroup(std::uint32_t group) {
+    if (mnl_socket_setsockopt(socket_.get(), NETLINK_ADD_MEMBERSHIP, &group, sizeof group) != 0) {
+        return Outcome::fromErrno("cannot ask for netlink notices");
+    }
     return {};
 }
 
 Outcome Socket::send(Message& message) {
     message.setSequence(++sequence_);
-    sockaddr_nl kernel{};
-    kernel.nl_family = AF_NETLINK;
-    const ByteView bytes = message.bytes();
     ssize_t sent = 0;
     do {
-        sent = ::sendto(descriptor_.get(), bytes.data(), bytes.size(), 0,
-                        reinterpret_cast<const sockaddr*>(&kernel), sizeof kernel);
+        sent = mnl_socket_sendto(socket_.get(), message.bytes().data(), message.bytes().size());
     } while (sent < 0 && errno == EINTR);
-    if (sent < 0) {
-        return Outcome::fromErrno("cannot send a netlink request");
-    }
-    return {};
+    return sent < 0 ? Outcome::fromErrno("cannot send a netlink request") : Outcome();
 }
 
-Outcome Socket::receive(std::chrono::steady_clock::time_point deadline, Bytes& datagram) {
-    datagram.resize(largestDatagram);
+Outcome Socket::receive(Deadline deadline, Bytes& datagram) {
     for (;;) {
-        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-            deadline - std::chrono::steady_clock::now());
-        if (left.count() <= 0) {
-            return {kSCStatusFailed, "the kernel did not answer a netlink request"};
-        }
-        pollfd wait{descriptor_.get(), POLLIN, 0};
-        const int ready = ::poll(&wait, 1, static_cast<int>(left.count()));
+        const auto left =
+            std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
+        datagram.clear();
+        pollfd wait{descriptor(), POLLIN, 0};
+        const int ready = ::poll(&wait, 1, static_cast<int>(std::max(left.count(), std::int64_t{0})));
         if (ready < 0 && errno != EINTR) {
             return Outcome::fromErrno("cannot wait for a netlink answer");
         }
-        if (ready <= 0) {
-            continue;
+        if (ready == 0) {
+            return {};
         }
+        // Not libmnl's own receiving: it does not tell who sent a datagram.
+        datagram.resize(largestDatagram);
         sockaddr_nl sender{};
         socklen_t senderSize = sizeof sender;
         const ssize_t size =
-            ::recvfrom(descriptor_.get(), datagram.data(), datagram.size(), MSG_DONTWAIT | MSG_TRUNC,
+            ::recvfrom(descriptor(), datagram.data(), datagram.size(), MSG_DONTWAIT | MSG_TRUNC,
                        reinterpret_cast<sockaddr*>(&sender), &senderSize);
-        if (size < 0) {
-            if (errno == EINTR || errno == EAGAIN) {
-                continue;
-            }
+        if (size < 0 && errno != EINTR && errno != EAGAIN) {
             return Outcome::fromErrno("cannot read a netlink answer");
         }
-        if (static_cast<std::size_t>(size) > datagram.size()) {
+        if (size > static_cast<ssize_t>(largestDatagram)) {
             return {kSCStatusFailed, "the kernel sent a netlink answer that is too large"};
         }
-        if (sender.nl_pid == 0) {
+        if (size > 0 && sender.nl_pid == 0) {
             datagram.resize(static_cast<std::size_t>(size));
             return {};
+        }
+    }
+}
+
+template <class Each>
+Outcome Socket::receiveAnswers(const Each& each) {
+    const auto deadline = std::chrono::steady_clock::now() + answerTime;
+    std::size_t total = 0;
+    Bytes datagram;
+    for (;;) {
+        Outcome received = receive(deadline, datagram);
+        if (!received.ok()) {
+            return received;
+        }
+        if (datagram.empty()) {
+            return {kSCStatusFailed, "the kernel did not answer a netlink request"};
+        }
+        total += datagram.size();
+        if (total > largestDump) {
+            return {kSCStatusFailed, "the kernel's netlink dump is too large"};
+        }
+        ByteView rest = datagram;
+        while (const auto part = takeMessage(rest)) {
+            if (part->sequence() == sequence_ && each(*part)) {
+                return {};
+            }
         }
     }
 }
@@ -122,31 +155,21 @@ Outcome Socket::request(Message message, std::initializer_list<int> tolerated) {
 
 Outcome Socket::ask(Message message, OwnedMessage& answer, std::initializer_list<int> tolerated) {
     answer = {};
-    Outcome sent = send(message);
-    if (!sent.ok()) {
-        return sent;
+    Outcome done = send(message);
+    if (!done.ok()) {
+        return done;
     }
-    const auto deadline = std::chrono::steady_clock::now() + answerTime;
-    Bytes datagram;
-    for (;;) {
-        Outcome received = receive(deadline, datagram);
-        if (!received.ok()) {
-            return received;
+    Outcome end;
+    done = receiveAnswers([&](const MessageView& part) {
+        const bool isEnd = part.type() == NLMSG_ERROR;
+        if (isEnd) {
+            end = outcomeOfError(part, tolerated);
+        } else {
+            answer = OwnedMessage(part);
         }
-        ByteView rest = datagram;
-        while (const auto part = takeMessage(rest)) {
-            if (part->sequence() != sequence_) {
-                continue;
-            }
-            if (part->type() == NLMSG_ERROR) {
-                return outcomeOfError(*part, tolerated);
-            }
-            answer.header.nlmsg_type = part->type();
-            answer.header.nlmsg_flags = part->flags();
-            answer.header.nlmsg_seq = part->sequence();
-            answer.payload.assign(part->payload().begin(), part->payload().end());
-        }
-    }
+        return isEnd;
+    });
+    return done.ok() ? end : done;
 }
 
 Outcome Socket::dump(const Message& message, std::vector<OwnedMessage>& answers,
@@ -168,80 +191,46 @@ Outcome Socket::dumpOnce(Message message, std::vector<OwnedMessage>& answers,
                          std::initializer_list<int> tolerated, bool& interrupted) {
     answers.clear();
     interrupted = false;
-    Outcome sent = send(message);
-    if (!sent.ok()) {
-        return sent;
+    Outcome done = send(message);
+    if (!done.ok()) {
+        return done;
     }
-    const auto deadline = std::chrono::steady_clock::now() + answerTime;
-    std::size_t total = 0;
-    Bytes datagram;
-    for (;;) {
-        Outcome received = receive(deadline, datagram);
-        if (!received.ok()) {
-            return received;
+    Outcome end;
+    done = receiveAnswers([&](const MessageView& part) {
+        interrupted = interrupted || (part.flags() & NLM_F_DUMP_INTR) != 0;
+        if (part.type() == NLMSG_ERROR) {
+            end = outcomeOfError(part, tolerated);
+        } else if (part.type() == NLMSG_DONE) {
+            const int error = -valueFrom<std::int32_t>(part.payload()).value_or(0);
+            const bool isFine =
+                error <= 0 || std::find(tolerated.begin(), tolerated.end(), error) != tolerated.end();
+            end = isFine ? Outcome() : Outcome::fromErrno("the kernel ended a netlink dump", error);
+        } else {
+            answers.emplace_back(part);
+            return false;
         }
-        total += datagram.size();
-        if (total > largestDump) {
-            return {kSCStatusFailed, "the kernel's netlink dump is too large"};
-        }
-        ByteView rest = datagram;
-        while (const auto part = takeMessage(rest)) {
-            if (part->sequence() != sequence_) {
-                continue;
-            }
-            interrupted = interrupted || (part->flags() & NLM_F_DUMP_INTR) != 0;
-            if (part->type() == NLMSG_ERROR) {
-                return outcomeOfError(*part, tolerated);
-            }
-            if (part->type() == NLMSG_DONE) {
-                const int error = -valueFrom<std::int32_t>(part->payload()).value_or(0);
-                const bool isFine =
-                    error <= 0 || std::find(tolerated.begin(), tolerated.end(), error) != tolerated.end();
-                return isFine ? Outcome() : Outcome::fromErrno("the kernel ended a netlink dump", error);
-            }
-            OwnedMessage& owned = answers.emplace_back();
-            owned.header.nlmsg_type = part->type();
-            owned.header.nlmsg_flags = part->flags();
-            owned.header.nlmsg_seq = part->sequence();
-            owned.payload.assign(part->payload().begin(), part->payload().end());
-        }
-    }
+        return true;
+    });
+    return done.ok() ? end : done;
 }
 
-Outcome Socket::receiveNotices(Bytes& datagram, bool& received, bool& overrun) {
-    received = false;
+std::vector<OwnedMessage> Socket::takeNotices(bool& overrun) {
+    std::vector<OwnedMessage> notices;
     overrun = false;
-    datagram.resize(largestDatagram);
-    for (;;) {
-        sockaddr_nl sender{};
-        socklen_t senderSize = sizeof sender;
-        const ssize_t size =
-            ::recvfrom(descriptor_.get(), datagram.data(), datagram.size(), MSG_DONTWAIT | MSG_TRUNC,
-                       reinterpret_cast<sockaddr*>(&sender), &senderSize);
-        if (size < 0 && errno == EINTR) {
-            continue;
+    Bytes datagram;
+    for (int i = 0; i < mostNotices; ++i) {
+        // The one error that a socket for notices knows is that there were too many of them.
+        const bool received = receive(Deadline{}, datagram).ok();
+        overrun = overrun || !received;
+        if (received && datagram.empty()) {
+            break;
         }
-        if (size < 0 && errno == EAGAIN) {
-            return {};
+        ByteView rest = datagram;
+        while (const auto notice = takeMessage(rest)) {
+            notices.emplace_back(*notice);
         }
-        if (size < 0 && errno == ENOBUFS) {
-            overrun = true;
-            return {};
-        }
-        if (size < 0) {
-            return Outcome::fromErrno("cannot read netlink notices");
-        }
-        if (sender.nl_pid != 0) {
-            continue;
-        }
-        if (static_cast<std::size_t>(size) > datagram.size()) {
-            overrun = true;
-            return {};
-        }
-        datagram.resize(static_cast<std::size_t>(size));
-        received = true;
-        return {};
     }
+    return notices;
 }
 
 }  // namespace platform::netlink

@@ -1,14 +1,17 @@
-// A socket to the kernel's routing tables: requests with their answers, dumps, and change notices.
+// A socket to the kernel's routing tables, or to its generic netlink: requests with their answers, dumps, and
+// notices.
 #pragma once
 
 #include <chrono>
 #include <cstdint>
 #include <initializer_list>
+#include <memory>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
 #include "platform/Outcome.h"
 #include "platform/netlink/Message.h"
+
+struct mnl_socket;
 
 namespace platform::netlink {
 
@@ -16,6 +19,9 @@ namespace platform::netlink {
 struct OwnedMessage {
     nlmsghdr header{};
     Bytes payload;
+
+    OwnedMessage() = default;
+    explicit OwnedMessage(const MessageView& view);
     [[nodiscard]] MessageView view() const noexcept { return {header, payload}; }
 };
 
@@ -27,10 +33,14 @@ class Socket {
     static constexpr std::chrono::milliseconds answerTime{5000};
     static constexpr std::size_t largestDump = std::size_t{64} << 20U;
 
-    // groups are RTMGRP_ bits for the notices to receive; a socket for requests takes none.
-    Outcome open(std::uint32_t groups = 0);
-    [[nodiscard]] bool isOpen() const noexcept { return descriptor_.isOpen(); }
-    [[nodiscard]] int descriptor() const noexcept { return descriptor_.get(); }
+    // To the routing tables. groups are RTMGRP_ bits for the notices to receive; a socket for requests takes
+    // none.
+    Outcome open(std::uint32_t groups = 0) { return open(NETLINK_ROUTE, groups); }
+    // To generic netlink, whose families and groups of notices have numbers of their own.
+    Outcome openGeneric() { return open(NETLINK_GENERIC, 0); }
+    Outcome joinGroup(std::uint32_t group);
+    [[nodiscard]] bool isOpen() const noexcept { return socket_ != nullptr; }
+    [[nodiscard]] int descriptor() const noexcept;
 
     // Sends a request and waits for the acknowledgement. The kernel's errors in `tolerated` count as success.
     Outcome request(Message message, std::initializer_list<int> tolerated = {});
@@ -42,17 +52,28 @@ class Socket {
     Outcome dump(const Message& message, std::vector<OwnedMessage>& answers,
                  std::initializer_list<int> tolerated = {});
 
-    // For a socket with groups: reads what is there without waiting, one datagram a call. received tells
-    // whether there was one. overrun: the kernel dropped notices, so what is known has to be looked up anew.
-    Outcome receiveNotices(Bytes& datagram, bool& received, bool& overrun);
+    // For a socket with groups: takes the notices that are there, without waiting. overrun: the kernel
+    // dropped some, so what is known has to be looked up anew.
+    [[nodiscard]] std::vector<OwnedMessage> takeNotices(bool& overrun);
 
   private:
+    using Deadline = std::chrono::steady_clock::time_point;
+
+    Outcome open(int protocol, std::uint32_t groups);
     Outcome send(Message& message);
-    Outcome receive(std::chrono::steady_clock::time_point deadline, Bytes& datagram);
+    // One datagram of the kernel's; empty when none has come by the deadline.
+    Outcome receive(Deadline deadline, Bytes& datagram);
+    // Calls `each` with every message that answers the request sent last, until it says that this was the
+    // last.
+    template <class Each>
+    Outcome receiveAnswers(const Each& each);
     Outcome dumpOnce(Message message, std::vector<OwnedMessage>& answers,
                      std::initializer_list<int> tolerated, bool& interrupted);
 
-    FileDescriptor descriptor_;
+    struct Close {
+        void operator()(mnl_socket* socket) const noexcept;
+    };
+    std::unique_ptr<mnl_socket, Close> socket_;
     std::uint32_t sequence_ = 0;
 };
 

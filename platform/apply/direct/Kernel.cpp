@@ -119,7 +119,9 @@ Message requestFor(std::uint16_t type, std::uint16_t flags, const Address& addre
     auto header = netlink::valueFrom<ifaddrmsg>(address.key).value_or(ifaddrmsg{});
     header.ifa_index = static_cast<unsigned>(link.index);
     Message message(type, static_cast<std::uint16_t>(NLM_F_REQUEST | NLM_F_ACK | flags), header);
-    message.addRaw(ByteView(address.key).subspan(std::min(address.key.size(), sizeof header)));
+    for (const Attribute& attribute : attributesOf<ifaddrmsg>(address.key)) {
+        message.add(attribute.type, attribute.payload);
+    }
     return message;
 }
 

@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/netlink/Generic.h"
 #include "tests/unit/support/PrivateNetwork.h"
 
 namespace platform::netlink {
@@ -48,20 +49,27 @@ TEST_F(SocketTest, AsksDumpsAndExplains) {
     });
 }
 
-TEST_F(SocketTest, ReceivesNotices) {
+TEST_F(SocketTest, TakesNoticesAndFindsFamilies) {
     PrivateNetwork::run([] {
         Socket socket;
-        ASSERT_TRUE(socket.open(RTMGRP_IPV4_IFADDR).ok());
-        Bytes datagram;
-        bool received = true;
         bool overrun = true;
-        EXPECT_TRUE(socket.receiveNotices(datagram, received, overrun).ok());
-        EXPECT_FALSE(received || overrun);
+        ASSERT_TRUE(socket.open(RTMGRP_IPV4_IFADDR).ok());
+        EXPECT_TRUE(socket.takeNotices(overrun).empty());
         shell("ip addr add 10.0.0.1/8 dev lo");
-        EXPECT_TRUE(socket.receiveNotices(datagram, received, overrun).ok());
-        ASSERT_TRUE(received);
-        ByteView rest = datagram;
-        EXPECT_EQ(RTM_NEWADDR, takeMessage(rest)->type());
+        const std::vector<OwnedMessage> notices = socket.takeNotices(overrun);
+        ASSERT_EQ(1U, notices.size());
+        EXPECT_EQ(RTM_NEWADDR, notices[0].view().type());
+        EXPECT_FALSE(overrun);
+
+        std::optional<GenericFamily> family;
+        ASSERT_TRUE(socket.openGeneric().ok());
+        EXPECT_TRUE(findFamily(socket, "nlctrl", family).ok());
+        ASSERT_TRUE(family);
+        EXPECT_EQ(GENL_ID_CTRL, family->type);
+        ASSERT_EQ(1U, family->groups.count("notify"));
+        EXPECT_TRUE(socket.joinGroup(family->groups["notify"]).ok());
+        EXPECT_TRUE(findFamily(socket, "nobody", family).ok());
+        EXPECT_FALSE(family);
     });
 }
 
