@@ -267,8 +267,8 @@ Outcome DirectInterface::restore(const Snapshot& before) {
     const std::int64_t elapsed = std::max<std::int64_t>(secondsSinceStart() - before.takenAt, 0);
     for (Address& address : addresses) {
         const auto left = [elapsed](std::uint32_t life) {
-            return life == forever
-                       ? forever
+            return life == forever || life == 0
+                       ? life
                        : static_cast<std::uint32_t>(std::max<std::int64_t>(life - elapsed, shortestLife));
         };
         address.valid = left(address.valid);

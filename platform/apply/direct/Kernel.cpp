@@ -7,7 +7,10 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
+#include <ctime>
 #include <map>
+#include <thread>
 #include <utility>
 
 namespace platform::apply {
@@ -24,6 +27,10 @@ using netlink::OwnedMessage;
 // Not in every distribution's kernel headers yet.
 constexpr std::uint16_t addressProtocol = 11;  // IFA_PROTO
 constexpr std::uint8_t lastKernelProtocol = 3;
+
+constexpr int ticksPerSecond = 100;  // USER_HZ, of RTA_CACHEINFO
+constexpr std::chrono::milliseconds confirmationTime{3000};
+constexpr std::chrono::milliseconds lookAgain{50};
 
 constexpr std::uint32_t lastingAddressFlags =
     IFA_F_NODAD | IFA_F_HOMEADDRESS | IFA_F_MANAGETEMPADDR | IFA_F_NOPREFIXROUTE | IFA_F_MCAUTOJOIN;
@@ -145,6 +152,18 @@ Message requestFor(std::uint16_t type, std::uint16_t flags, const Route& route, 
     return message;
 }
 
+// The kernel takes no IPv6 address for a route's source before the network has confirmed that nobody else has
+// it, which takes a second or two with a carrier.
+bool needsConfirmedSource(const Route& route) {
+    return route.family() == AF_INET6 && attributesOf<rtmsg>(route.key).find(RTA_PREFSRC);
+}
+
+std::int64_t secondsSinceStart() {
+    timespec now{};
+    ::clock_gettime(CLOCK_BOOTTIME, &now);
+    return now.tv_sec;
+}
+
 std::uint32_t maskOf(unsigned prefixLength) {
     return prefixLength == 0 ? 0 : htonl(0xFFFFFFFFU << (32U - std::min(prefixLength, 32U)));
 }
@@ -187,8 +206,9 @@ std::optional<Address> decodeAddress(const MessageView& message, int index) {
     }
     if (const auto times = all.find(IFA_CACHEINFO)) {
         const auto cache = netlink::valueFrom<ifa_cacheinfo>(times->payload).value_or(ifa_cacheinfo{});
-        address.valid = (flags & IFA_F_PERMANENT) != 0 ? forever : cache.ifa_valid;
-        address.preferred = (flags & IFA_F_PERMANENT) != 0 ? forever : cache.ifa_prefered;
+        address.valid = cache.ifa_valid;
+        // Of a lasting IPv4 address only the flag says that no new connection is to use it.
+        address.preferred = (flags & IFA_F_DEPRECATED) != 0 ? 0 : cache.ifa_prefered;
     }
     const bool fromKernel = address.protocol != 0 && address.protocol <= lastKernelProtocol;
     const bool advertised = (flags & IFA_F_PERMANENT) == 0 &&
@@ -237,15 +257,24 @@ std::optional<Route> decodeRoute(const MessageView& message, int index,
                                        source->second.end());
         });
         route.isShared = route.isElsewhere = isOurs;
+    } else if (source != attributes.end() && header->rtm_family == AF_INET6) {
+        route.isShared = true;
     }
     if (!isOurs) {
         return std::nullopt;
     }
     if (attributes.count(RTA_NH_ID) != 0) {
+        route.isShared = true;
         // A route by next-hop object may not repeat what the object says.
         for (const std::uint16_t type : {RTA_OIF, RTA_GATEWAY, RTA_VIA, RTA_MULTIPATH}) {
             attributes.erase(type);
         }
+    }
+    if (const auto times = all.find(RTA_CACHEINFO); times && header->rtm_family == AF_INET6) {
+        const auto cache = netlink::valueFrom<rta_cacheinfo>(times->payload).value_or(rta_cacheinfo{});
+        route.endsAt = cache.rta_expires == 0
+                           ? 0
+                           : secondsSinceStart() + std::max(cache.rta_expires, 0) / ticksPerSecond;
     }
     attributes.erase(RTA_CACHEINFO);
     header->rtm_flags &= RTNH_F_ONLINK;
@@ -383,7 +412,7 @@ Outcome Kernel::addAddress(const Link& link, const Address& address) {
     if (address.protocol != 0) {
         message.addValue(addressProtocol, address.protocol);
     }
-    if (address.valid != forever) {
+    if (address.valid != forever || address.preferred != forever) {
         ifa_cacheinfo times{};
         times.ifa_valid = address.valid;
         times.ifa_prefered = std::min(address.preferred, address.valid);
@@ -398,7 +427,12 @@ Outcome Kernel::removeAddress(const Link& link, const Address& address) {
 
 Outcome Kernel::addRoute(const Link& link, const Route& route) {
     const auto flags = static_cast<std::uint16_t>(NLM_F_CREATE | (route.preceded ? NLM_F_APPEND : 0));
-    return socket_.request(requestFor(RTM_NEWROUTE, flags, route, link), {EEXIST});
+    Message message = requestFor(RTM_NEWROUTE, flags, route, link);
+    if (route.endsAt != 0) {
+        const std::int64_t left = std::max<std::int64_t>(route.endsAt - secondsSinceStart(), 1);
+        message.addValue(RTA_EXPIRES, static_cast<std::uint32_t>(left));
+    }
+    return socket_.request(std::move(message), {EEXIST});
 }
 
 Outcome Kernel::removeRoute(const Link& link, const Route& route) {
@@ -445,6 +479,7 @@ Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, b
             done = removeRoute(link, route);
         }
     }
+    const auto deadline = std::chrono::steady_clock::now() + confirmationTime;
     // The ways to the neighbours first: a route through one of them is refused until then.
     for (const bool throughGateway : {false, true}) {
         for (const Route& route : wanted) {
@@ -453,6 +488,11 @@ Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, b
                 continue;
             }
             Outcome added = addRoute(link, route);
+            while (!added.ok() && needsConfirmedSource(route) &&
+                   std::chrono::steady_clock::now() < deadline) {
+                std::this_thread::sleep_for(lookAgain);
+                added = addRoute(link, route);
+            }
             // A route that other interfaces share is complete only when the last of them is up again, which
             // then adds it.
             done = route.isShared ? Outcome() : added;

@@ -1,8 +1,22 @@
 // One network interface as the kernel has it: link state, addresses and routes, read, compared and made.
 //
 // An address or a route is kept as the message that the kernel gave for it, in a form that two readings of
-// the same thing have in common (what comes and goes by itself is taken out, the interface's own index is 0),
-// so that nothing of it is lost on the way to the record and back.
+// the same thing have in common (the interface's own index is 0), so that every attribute, also one that this
+// system does not know, is recorded, made again and compared. What is not:
+//
+// - IFA_CACHEINFO: lifetimes are kept beside and made again, but run, so they are not compared; when the
+// address
+//   was made and changed is the kernel's own matter.
+// - IFA_FLAGS: what a lifetime or the network makes of an address (secondary, tentative, deprecated).
+// - RTA_CACHEINFO: the end of an IPv6 route is kept beside and made again; the rest is statistics.
+// - RTNH_F_DEAD and such: what the kernel finds out about a next hop.
+// - RTA_OIF, RTA_GATEWAY, RTA_VIA, RTA_MULTIPATH of a route with RTA_NH_ID: the next-hop object says them.
+// The
+//   object itself, which goes when its interface is switched off, is its maker's to make.
+// - RTA_IIF, RTA_UID, RTA_MARK, RTA_IP_PROTO, RTA_SPORT, RTA_DPORT, IFA_TARGET_NETNSID: they are of
+// questions,
+//   never of a route or an address.
+// - Local tables: the kernel fills them by itself.
 #pragma once
 
 #include <cstdint>
@@ -39,7 +53,9 @@ struct Address {
 
     [[nodiscard]] int family() const noexcept;
     [[nodiscard]] std::uint8_t scope() const noexcept;  // RT_SCOPE_
-    bool operator==(const Address& other) const noexcept { return key == other.key; }
+    bool operator==(const Address& other) const noexcept {
+        return key == other.key && protocol == other.protocol;
+    }
     template <class Self, class Fields>
     static void listFields(Self& self, Fields& fields) {
         fields("Message", self.key);
@@ -54,7 +70,10 @@ struct Route {
     netlink::Bytes key;     // rtmsg and attributes
     bool preceded = false;  // an equally good route to the same place stood before it
     bool comesByItself = false;
-    bool isShared = false;     // it needs other interfaces too
+    // It needs more than this interface: other ones, a next-hop object, a source address that the network has
+    // to confirm first.
+    bool isShared = false;
+    std::int64_t endsAt = 0;   // in seconds since the machine's start, sleep included; 0 for never
     bool isElsewhere = false;  // it goes through another interface, but from one of this one's addresses
 
     [[nodiscard]] int family() const noexcept;
@@ -67,6 +86,7 @@ struct Route {
         fields("Preceded", self.preceded);
         fields("ComesByItself", self.comesByItself);
         fields("Shared", self.isShared);
+        fields("EndsAt", self.endsAt);
         fields("Elsewhere", self.isElsewhere);
     }
 };

@@ -158,6 +158,14 @@ TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
          "ip addr add 10.1.0.5/24 brd + dev card0; ip addr add 10.1.0.6/24 dev card0 label card0:x;"
          "ip addr add 10.2.0.1/16 dev card0; ip addr add 10.3.0.1 peer 10.3.0.2 dev card0;"
          "ip addr add 169.254.7.7/16 scope link dev card0; ip link set card0 up"},
+        {"addresses with metrics, flags and lifetimes",
+         "ip link set card0 up; ip addr add 10.1.0.5/24 dev card0 metric 1024 valid_lft 4000 preferred_lft "
+         "3000;"
+         "ip addr add 10.4.0.5/24 dev card0 noprefixroute; ip addr add 10.5.0.5/24 dev card0 preferred_lft 0;"
+         "ip -6 addr add 2001:db8::5/64 dev card0 nodad metric 1025 preferred_lft 0"},
+        {"a source that the network has to confirm",
+         "ip link set card0 up; ip -6 addr add 2001:db8::5/64 dev card0; sleep 2.5;"
+         "ip -6 route add 2001:db8:9::/48 via 2001:db8::1 src 2001:db8::5"},
         {"static IPv6",
          "ip link set card0 up; ip -6 addr add 2001:db8::5/64 dev card0 nodad;"
          "ip -6 route add default via 2001:db8::1 dev card0 metric 77"},
@@ -167,6 +175,11 @@ TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
          "ip route add default via 10.1.0.1 dev card0 metric 100; ip route add default via 10.1.0.2 dev "
          "card0 metric 200;"
          "ip route add 10.9.0.0/16 via 10.1.0.3 src 10.1.0.6 mtu 1300;"
+         "ip route add 10.46.0.0/16 via 10.1.0.2 realm 3 mtu lock 1200 congctl reno quickack 1 tos 0x10;"
+         "ip route add 10.45.0.0/16 nexthop via 10.1.0.2 weight 2 nexthop via 10.1.0.3 onlink dev card0;"
+         "ip route add 10.44.0.0/16 via inet6 fe80::1 dev card0;"
+         "ip route add 10.43.0.0/16 encap ip id 5 dst 1.2.3.4 dev card0;"
+         "ip -6 route add 2001:db8:7::/48 dev card0 metric 9 pref high;"
          "ip route add 10.8.0.0/16 dev card0 scope link table 42; ip route add 10.7.0.0/16 via 10.5.5.5 dev "
          "card0 onlink"},
         {"a connected route that was taken away",
