@@ -19,12 +19,12 @@ constexpr int mostNotices = 1000;
 
 // An NLMSG_ERROR as an outcome: the errno, and the text that the kernel puts behind it when the socket asks
 // for it.
-Outcome outcomeOfError(const MessageView& message, std::initializer_list<int> tolerated) {
+Outcome outcomeOfError(const MessageView& message, std::initializer_list<int> tolerated, int& code) {
     const auto error = message.family<nlmsgerr>();
     if (!error) {
         return {kSCStatusFailed, "the kernel sent a short netlink answer"};
     }
-    const int code = -error->error;
+    code = -error->error;
     if (code == 0 || std::find(tolerated.begin(), tolerated.end(), code) != tolerated.end()) {
         return {};
     }
@@ -82,6 +82,7 @@ Outcome Socket::joinGroup(std::uint32_t group) {
 
 Outcome Socket::send(Message& message) {
     message.setSequence(++sequence_);
+    error_ = 0;
     ssize_t sent = 0;
     do {
         sent = mnl_socket_sendto(socket_.get(), message.bytes().data(), message.bytes().size());
@@ -163,7 +164,7 @@ Outcome Socket::ask(Message message, OwnedMessage& answer, std::initializer_list
     done = receiveAnswers([&](const MessageView& part) {
         const bool isEnd = part.type() == NLMSG_ERROR;
         if (isEnd) {
-            end = outcomeOfError(part, tolerated);
+            end = outcomeOfError(part, tolerated, error_);
         } else {
             answer = OwnedMessage(part);
         }
@@ -199,7 +200,7 @@ Outcome Socket::dumpOnce(Message message, std::vector<OwnedMessage>& answers,
     done = receiveAnswers([&](const MessageView& part) {
         interrupted = interrupted || (part.flags() & NLM_F_DUMP_INTR) != 0;
         if (part.type() == NLMSG_ERROR) {
-            end = outcomeOfError(part, tolerated);
+            end = outcomeOfError(part, tolerated, error_);
         } else if (part.type() == NLMSG_DONE) {
             const int error = -valueFrom<std::int32_t>(part.payload()).value_or(0);
             const bool isFine =

@@ -44,6 +44,9 @@ class Socket {
 
     // Sends a request and waits for the acknowledgement. The kernel's errors in `tolerated` count as success.
     Outcome request(Message message, std::initializer_list<int> tolerated = {});
+    // The errno that the kernel answered the last request with, tolerated or not; 0 when it took the request,
+    // or did not answer.
+    [[nodiscard]] int error() const noexcept { return error_; }
     // The one message that answers a request (RTM_GETLINK for one link, RTM_GETROUTE for one destination). An
     // error in `tolerated` leaves the answer with type 0.
     Outcome ask(Message message, OwnedMessage& answer, std::initializer_list<int> tolerated = {});
@@ -75,6 +78,7 @@ class Socket {
     };
     std::unique_ptr<mnl_socket, Close> socket_;
     std::uint32_t sequence_ = 0;
+    int error_ = 0;
 };
 
 }  // namespace platform::netlink

@@ -5,17 +5,14 @@
 // system does not know, is recorded, made again and compared. What is not:
 //
 // - IFA_CACHEINFO: lifetimes are kept beside and made again, but run, so they are not compared; when the
-// address
-//   was made and changed is the kernel's own matter.
+//   address was made and changed is the kernel's own matter.
 // - IFA_FLAGS: what a lifetime or the network makes of an address (secondary, tentative, deprecated).
 // - RTA_CACHEINFO: the end of an IPv6 route is kept beside and made again; the rest is statistics.
 // - RTNH_F_DEAD and such: what the kernel finds out about a next hop.
 // - RTA_OIF, RTA_GATEWAY, RTA_VIA, RTA_MULTIPATH of a route with RTA_NH_ID: the next-hop object says them.
-// The
-//   object itself, which goes when its interface is switched off, is its maker's to make.
+//   The object itself, which goes when its interface is switched off, is its maker's to make.
 // - RTA_IIF, RTA_UID, RTA_MARK, RTA_IP_PROTO, RTA_SPORT, RTA_DPORT, IFA_TARGET_NETNSID: they are of
-// questions,
-//   never of a route or an address.
+//   questions, never of a route or an address.
 // - Local tables: the kernel fills them by itself.
 #pragma once
 

@@ -1,0 +1,195 @@
+#include "platform/apply/direct/WirelessMessages.h"
+
+#include <gtest/gtest.h>
+#include <linux/nl80211.h>
+
+#include <string>
+#include <vector>
+
+#include "platform/apply/direct/KernelWireless.h"
+#include "tests/unit/support/Hexadecimal.h"
+
+namespace platform::apply {
+namespace {
+
+using netlink::Bytes;
+using netlink::MessageView;
+using testing_support::fromHex;
+using testing_support::toHex;
+
+// Entries of a scan as a kernel of the 6.1 series gave them for simulated radios.
+const std::string openAccessPoint =
+    "2201000008002e009800000008000300020000000c0099000100000000000000dc002f000a00010002000000020000000400"
+    "0e000c0003009022a622cd6006003200060000084f70656e486f6d65010882848b960c1218240301062a010432043048606c"
+    "3b0251007f08040040020000004000000c000d00c580a622cd60060038000b0000084f70656e486f6d65010882848b960c12"
+    "18240301060504000200002a010432043048606c3b0251007f08040040020000004006000400640000000600050001040000"
+    "0800020085090000080014000000000008000c000000000008000a00140000000c000f00ec3147f01e0000000800070048f4"
+    "ffff";
+const std::string cellWithWEP =
+    "2201000008002e000301000008000300020000000c0099000100000000000000d8002f000a0001001e148525540d00000400"
+    "0e000c00030003ec912ccd6006002e000600000857657043656c6c31010882848b960c121824030101060200003204304860"
+    "6cdd070050f20200010000000c000d00cb40962ccd6006002e000b00000857657043656c6c31010882848b960c1218240301"
+    "010602000032043048606cdd070050f202000100000006000400640000000600050012000000080002006c09000008001400"
+    "0000000008000c000000000008000a00881100000c000f003b3f8dbf190000000800070048f4ffff0800090002000000";
+const std::string accessPointWithSAE =
+    "2201000008002e009800000008000300020000000c009900010000000000000008012f000a00010002000000010000000400"
+    "0e000c0003009140a122cd600600470006000007577061334e6574010882848b960c1218240301012a010432043048606c30"
+    "140100000fac040100000fac040100000fac08c0003b0251007f080400400200000040000c000d00cc60d522cd6006004d00"
+    "0b000007577061334e6574010882848b960c1218240301010504000200002a010432043048606c30140100000fac04010000"
+    "0fac040100000fac08c0003b0251007f08040040020000004000000006000400640000000600050011040000080002006c09"
+    "0000080014000000000008000c000000000008000a00140000000c000f00f24b62a71f0000000800070048f4ffff";
+
+std::string with(std::string message, const std::string& from, const std::string& to) {
+    for (std::size_t at = 0; (at = message.find(from, at)) != std::string::npos; at += to.size()) {
+        message.replace(at, from.size(), to);
+    }
+    return message;
+}
+
+std::string describe(const Bytes& payload) {
+    const auto network = decodeHeardNetwork(MessageView({}, payload));
+    if (!network) {
+        return "nothing";
+    }
+    return network->network + " " + toHex(network->bssid) + (network->isAdHoc ? " cell " : " access point ") +
+           std::to_string(network->frequency) + " MHz " + std::to_string(network->signal) + " mBm " +
+           std::to_string(network->age.count()) + " ms" + (network->isCurrent ? " current" : "") +
+           " security " + std::to_string(static_cast<int>(network->security)) + " keys " +
+           std::to_string(network->keyManagement);
+}
+
+TEST(WirelessMessages, TellsWhatAScanHeard) {
+    const struct {
+        std::string message;
+        const char* meaning;
+    } rows[] = {
+        {openAccessPoint, "OpenHome 020000000200 access point 2437 MHz -3000 mBm 20 ms security 0 keys 0"},
+        {cellWithWEP, "WepCell1 1e148525540d cell 2412 MHz -3000 mBm 4488 ms current security 1 keys 0"},
+        {accessPointWithSAE, "Wpa3Net 020000000100 access point 2412 MHz -3000 mBm 20 ms security 2 keys 2"},
+        // One that hides its name.
+        {with(openAccessPoint, "4f70656e486f6d65", "0000000000000000"),
+         " 020000000200 access point 2437 MHz -3000 mBm 20 ms security 0 keys 0"},
+        // PSK and 802.1X; more suites than bytes; WPA's own element; an element that leaves the row.
+        {with(accessPointWithSAE, "0fac08c0", "0fac02c0"),
+         "Wpa3Net 020000000100 access point 2412 MHz -3000 mBm 20 ms security 2 keys 1"},
+        {with(accessPointWithSAE, "0fac08c0", "0fac01c0"),
+         "Wpa3Net 020000000100 access point 2412 MHz -3000 mBm 20 ms security 2 keys 4"},
+        {with(accessPointWithSAE, "0100000fac08", "ffff000fac08"),
+         "Wpa3Net 020000000100 access point 2412 MHz -3000 mBm 20 ms security 2 keys 2"},
+        {with(accessPointWithSAE, "30140100000fac040100000fac040100000fac08c000",
+              "dd140050f20101000050f202000001000050f2020000"),
+         "Wpa3Net 020000000100 access point 2412 MHz -3000 mBm 20 ms security 2 keys 1"},
+        {with(accessPointWithSAE, "30140100", "30ff0100"),
+         "Wpa3Net 020000000100 access point 2412 MHz -3000 mBm 20 ms security 1 keys 0"},
+    };
+    for (const auto& row : rows) {
+        EXPECT_EQ(row.meaning, describe(fromHex(row.message)));
+    }
+    const Bytes whole = fromHex(accessPointWithSAE);
+    for (std::size_t length = 0; length < whole.size(); ++length) {
+        (void)describe(Bytes(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(length)));
+    }
+}
+
+std::string bodyOf(const netlink::Message& message) {
+    return toHex(message.payload());
+}
+
+TEST(WirelessMessages, AsksForScansAndNetworks) {
+    const WirelessRequests requests({32, {}}, 3);
+    HeardNetwork network = *decodeHeardNetwork(MessageView({}, fromHex(cellWithWEP)));
+    EXPECT_EQ("21000000080003000300000010002d800b0001005072696e74657200", bodyOf(requests.scan("Printer")));
+    EXPECT_EQ(
+        "2b00000008000300030000000c00340057657043656c6c310a0006001e148525540d0000080026006c09000004003c000400"
+        "460028005180240001800900010061626364650000000800030001ac0f00050002000000000004000500",
+        bodyOf(requests.join(network, "abcde")));
+    EXPECT_EQ("2c0000000800030003000000", bodyOf(requests.leave(true)));
+    network.isAdHoc = false;
+    EXPECT_EQ(
+        "2e00000008000300030000000c00340057657043656c6c310a0006001e148525540d0000080026006c090000040046003000"
+        "51802c000180110001006162636465666768696a6b6c6d0000000800030005ac0f00050002000000000004000500",
+        bodyOf(requests.join(network, "6162636465666768696a6b6c6d")));
+    EXPECT_EQ("2e00000008000300030000000c00340057657043656c6c310a0006001e148525540d0000080026006c090000",
+              bodyOf(requests.join(network, std::nullopt)));
+    EXPECT_EQ("300000000800030003000000", bodyOf(requests.leave(false)));
+}
+
+TEST(WirelessMessages, TellsWhatANoticeMeans) {
+    const netlink::GenericFamily family{32, {}};
+    const auto meaning = [&family](std::uint8_t command, std::uint32_t index,
+                                   std::optional<std::uint16_t> status, bool isTimedOut) {
+        netlink::Message message = family.request(command, 0);
+        message.addValue(NL80211_ATTR_IFINDEX, index);
+        if (status) {
+            message.addValue(NL80211_ATTR_STATUS_CODE, *status);
+        }
+        if (isTimedOut) {
+            message.add(NL80211_ATTR_TIMED_OUT, {});
+        }
+        const auto notice = decodeNotice(MessageView({}, message.payload()), 3);
+        return !notice              ? std::string("nothing")
+               : notice->isScanEnd  ? "scan over"
+               : notice->joinStatus ? "status " + std::to_string(*notice->joinStatus)
+                                    : "neither";
+    };
+    EXPECT_EQ("scan over", meaning(NL80211_CMD_NEW_SCAN_RESULTS, 3, {}, false));
+    EXPECT_EQ("scan over", meaning(NL80211_CMD_SCAN_ABORTED, 3, {}, false));
+    EXPECT_EQ("nothing", meaning(NL80211_CMD_SCAN_ABORTED, 4, {}, false));
+    EXPECT_EQ("nothing", meaning(NL80211_CMD_TRIGGER_SCAN, 3, {}, false));
+    EXPECT_EQ("status 0", meaning(NL80211_CMD_CONNECT, 3, 0, false));
+    EXPECT_EQ("status 15", meaning(NL80211_CMD_CONNECT, 3, 15, false));
+    EXPECT_EQ("status 65535", meaning(NL80211_CMD_CONNECT, 3, 1, true));
+}
+
+TEST(KernelWireless, ChoosesOnlyWhatWasHeardAndCanBeJoined) {
+    const auto heard = [](const char* name, Security security, int signal, int age, bool isAdHoc = false) {
+        return HeardNetwork{name,    {},    2412,     signal, std::chrono::milliseconds(age),
+                            isAdHoc, false, security, 0};
+    };
+    const struct {
+        std::vector<HeardNetwork> heard;
+        std::optional<std::string> key;
+        int signal;  // of the chosen one, or 0
+        const char* reason;
+    } rows[] = {
+        {{}, {}, 0, "no network of that name was heard"},
+        {{heard("Home", Security::open, -30, 0)}, {}, 0, "no network of that name was heard"},
+        {{heard("Printer", Security::open, -30, 101)}, {}, 0, "no network of that name was heard"},
+        {{heard("Printer", Security::open, -50, 0), heard("Printer", Security::open, -40, 100),
+          heard("Printer", Security::open, -30, 101), heard("Printer", Security::wep, -20, 0)},
+         {},
+         -40,
+         ""},
+        {{heard("Printer", Security::open, -50, 0, true)}, {}, -50, ""},
+        {{heard("Printer", Security::open, -50, 0)},
+         "abcde",
+         0,
+         "a network of that name is there, but it is open although there is a key for it"},
+        {{heard("Printer", Security::open, -30, 0), heard("Printer", Security::wep, -50, 0)},
+         "abcde",
+         -50,
+         ""},
+        {{heard("Printer", Security::wep, -50, 0)},
+         {},
+         0,
+         "the network asks for a key and the location holds none"},
+        {{heard("Printer", Security::wep, -50, 0)},
+         "abcdef",
+         0,
+         "the key fits no WEP network, whose keys have 5 or 13 characters or 10 or 26 hexadecimal digits"},
+        {{heard("Printer", Security::wpa, -50, 0)},
+         "long enough",
+         0,
+         "the network asks for WPA, and no wireless supplicant runs for this card"},
+    };
+    for (const auto& row : rows) {
+        const NetworkChoice choice =
+            chooseNetwork(row.heard, "Printer", row.key, std::chrono::milliseconds(100));
+        EXPECT_EQ(row.reason, choice.reason);
+        EXPECT_EQ(row.signal, choice.network ? choice.network->signal : 0) << row.reason;
+        EXPECT_EQ(choice.isHopeless, row.signal == 0 && choice.reason != "no network of that name was heard");
+    }
+}
+
+}  // namespace
+}  // namespace platform::apply
