@@ -70,7 +70,7 @@ void readElements(ByteView elements, HeardNetwork& network) {
         ByteView content = elements.subspan(2, size);
         const bool isWPA = elements[0] == elementVendor && content.size() >= vendorWPA.size() &&
                            std::equal(vendorWPA.begin(), vendorWPA.end(), content.begin());
-        if (elements[0] == elementName && network.network.empty()) {
+        if (elements[0] == elementName) {
             network.network.assign(reinterpret_cast<const char*>(content.data()), content.size());
         } else if (elements[0] == elementRSN || isWPA) {
             network.security = Security::wpa;

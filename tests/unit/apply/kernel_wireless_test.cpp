@@ -69,7 +69,7 @@ TEST(WirelessMessages, TellsWhatAScanHeard) {
         // One that hides its name.
         {with(openAccessPoint, "4f70656e486f6d65", "0000000000000000"),
          " 020000000200 access point 2437 MHz -3000 mBm 20 ms security 0 keys 0"},
-        // PSK and 802.1X; more suites than bytes; WPA's own element; an element that leaves the row.
+        // PSK and 802.1X; more suites than bytes; WPA's own element; elements that leave the row.
         {with(accessPointWithSAE, "0fac08c0", "0fac02c0"),
          "Wpa3Net 020000000100 access point 2412 MHz -3000 mBm 20 ms security 2 keys 1"},
         {with(accessPointWithSAE, "0fac08c0", "0fac01c0"),
@@ -81,6 +81,8 @@ TEST(WirelessMessages, TellsWhatAScanHeard) {
          "Wpa3Net 020000000100 access point 2412 MHz -3000 mBm 20 ms security 2 keys 1"},
         {with(accessPointWithSAE, "30140100", "30ff0100"),
          "Wpa3Net 020000000100 access point 2412 MHz -3000 mBm 20 ms security 1 keys 0"},
+        {with(openAccessPoint, "7f080400400200000040", "30090400400200000040"),
+         "OpenHome 020000000200 access point 2437 MHz -3000 mBm 20 ms security 0 keys 0"},
     };
     for (const auto& row : rows) {
         EXPECT_EQ(row.meaning, describe(fromHex(row.message)));

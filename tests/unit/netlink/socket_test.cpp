@@ -1,6 +1,7 @@
 #include "platform/netlink/Socket.h"
 
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 
 #include <cerrno>
 #include <string>
@@ -46,6 +47,13 @@ TEST_F(SocketTest, AsksDumpsAndExplains) {
         EXPECT_EQ(0, answer.header.nlmsg_type);
         EXPECT_EQ("the kernel refused a netlink request: No such device",
                   socket.request(linkCalled("none")).reason());
+        EXPECT_EQ(ENODEV, socket.error());
+        ifinfomsg odd{};
+        odd.ifi_type = 1;
+        EXPECT_EQ(
+            "the kernel refused a netlink request (Invalid values in header for get link request): "
+            "Invalid argument",
+            socket.request(Message(RTM_GETLINK, NLM_F_REQUEST | NLM_F_ACK, odd)).reason());
     });
 }
 
@@ -53,13 +61,24 @@ TEST_F(SocketTest, TakesNoticesAndFindsFamilies) {
     PrivateNetwork::run([] {
         Socket socket;
         bool overrun = true;
-        ASSERT_TRUE(socket.open(RTMGRP_IPV4_IFADDR).ok());
+        ASSERT_TRUE(socket.open().ok());
+        ASSERT_TRUE(socket.joinGroup(RTNLGRP_IPV4_IFADDR).ok());
         EXPECT_TRUE(socket.takeNotices(overrun).empty());
         shell("ip addr add 10.0.0.1/8 dev lo");
         const std::vector<OwnedMessage> notices = socket.takeNotices(overrun);
         ASSERT_EQ(1U, notices.size());
         EXPECT_EQ(RTM_NEWADDR, notices[0].view().type());
         EXPECT_FALSE(overrun);
+        // A notice that is there is no answer.
+        OwnedMessage answer;
+        shell("ip addr add 10.0.0.2/8 dev lo");
+        EXPECT_TRUE(socket.ask(linkCalled("none"), answer, {ENODEV}).ok());
+        EXPECT_EQ(0, answer.header.nlmsg_type);
+        const int smallest = 1;
+        setsockopt(socket.descriptor(), SOL_SOCKET, SO_RCVBUF, &smallest, sizeof smallest);
+        shell("for n in 3 4 5 6 7 8 9; do ip addr add 10.0.0.$n/8 dev lo; done");
+        EXPECT_GT(7U, socket.takeNotices(overrun).size());
+        EXPECT_TRUE(overrun);
 
         std::optional<GenericFamily> family;
         ASSERT_TRUE(socket.openGeneric().ok());
