@@ -2,14 +2,16 @@
 
 #include <linux/nl80211.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <utility>
+#include <vector>
+
+#include "platform/apply/WirelessKey.h"
 
 namespace platform::apply {
 namespace {
 
-using netlink::OwnedMessage;
+using Clock = std::chrono::steady_clock;
 
 // After these a notice is taken for lost. A card looks through both bands in 3 to 10 s.
 constexpr std::chrono::seconds longestScan{15};
@@ -20,6 +22,7 @@ constexpr int goodSignal = -6500;
 constexpr std::chrono::seconds pauseAfterRefusal{1};
 // The kernel counts an entry's age in ticks of its clock.
 constexpr std::chrono::milliseconds ageError{20};
+constexpr const char* notHeard = "no network of that name was heard";
 
 std::string describe(unsigned keyManagement) {
     std::string text;
@@ -33,309 +36,141 @@ std::string describe(unsigned keyManagement) {
     return text;
 }
 
-// Why this network can't be joined with that key, or without one; empty when it can.
-std::string obstacleTo(const HeardNetwork& network, const std::optional<std::string>& key) {
-    if (network.security == Security::wpa) {
-        return "the network asks for WPA" + describe(network.keyManagement) +
-               ", and no wireless supplicant runs for this card";
+// Why a network can't be joined with that key, or without one; empty when it can.
+std::string obstacleTo(const ScanEntry& entry, const std::optional<std::string>& key) {
+    if (entry.security == Security::open) {
+        return key ? "an open network of that name is on the air, and with a key none is joined" : "";
     }
-    if (network.security == Security::open && key) {
-        return "a network of that name is there, but it is open although there is a key for it";
+    if (entry.security == Security::wep) {
+        return !key ? "the network asks for a key and the location holds none"
+               : !fitsWEP(*key)
+                   ? "the key fits no WEP network, whose keys have 5 or 13 characters or 10 or 26 "
+                     "hexadecimal digits"
+                   : "";
     }
-    Security security = network.security;
-    return chooseSecurity(network.security, key, security).reason();
+    return "the network asks for WPA" + describe(entry.keyManagement) +
+           ", and no wireless supplicant runs for this card";
 }
 
-}  // namespace
+class KernelJoin : public WirelessJoin {
+  public:
+    // The card is on no network.
+    KernelJoin(WirelessCard card, std::string network, std::optional<std::string> key)
+        : card_(std::move(card)), network_(std::move(network)), key_(std::move(key)) {}
+    // Joined already, or, for a reason, given up.
+    explicit KernelJoin(std::string reason)
+        : phase_(reason.empty() ? Phase::joined : Phase::givenUp), reason_(std::move(reason)) {}
 
-NetworkChoice chooseNetwork(const std::vector<HeardNetwork>& heard, const std::string& name,
-                            const std::optional<std::string>& key, std::chrono::milliseconds age) {
-    NetworkChoice choice{std::nullopt, false, "no network of that name was heard"};
-    for (const HeardNetwork& network : heard) {
-        if (network.network != name || network.age > age) {
-            continue;
-        }
-        std::string obstacle = obstacleTo(network, key);
-        if (!obstacle.empty()) {
-            choice.isHopeless = true;
-            choice.reason = std::move(obstacle);
-        } else if (!choice.network || network.signal > choice.network->signal) {
-            choice.network = network;
-        }
-    }
-    if (choice.network) {
-        choice.isHopeless = false;
-        choice.reason.clear();
-    }
-    return choice;
-}
+    Outcome poll(State& state, std::string& reason) override;
 
-Outcome KernelWireless::open(const std::string& interface, bool& isWireless) {
-    isWireless = false;
-    interface_ = interface;
-    Outcome done = kernel_.open();
-    if (done.ok()) {
-        done = kernel_.findLink(interface, link_);
+  private:
+    // idle: a scan is to be started.
+    enum class Phase { idle, scanning, joining, joined, givenUp };
+
+    Outcome goOn();
+    Outcome scan();
+    Outcome choose(EntryChoice& choice);
+    Outcome endScanEarly();
+    Outcome join();
+    Outcome checkJoined(std::optional<std::uint16_t> joinStatus);
+
+    WirelessCard card_;
+    std::string network_;
+    std::optional<std::string> key_;
+    Phase phase_ = Phase::idle;
+    std::optional<ScanEntry> chosen_;
+    Clock::time_point since_;      // of the scan, or of the joining
+    Clock::time_point notBefore_;  // of the next scan
+    bool isScanEnding_ = false;
+    std::string reason_ = notHeard;
+};
+
+Outcome KernelJoin::poll(State& state, std::string& reason) {
+    Outcome done = phase_ == Phase::joined || phase_ == Phase::givenUp ? Outcome() : goOn();
+    // What the kernel refuses, other than for lack of rights, is what this card or network can't do.
+    if (!done.ok() && card_.error() != 0 && done.status() != kSCStatusAccessError) {
+        phase_ = Phase::givenUp;
+        reason_ = done.reason();
+        done = {};
     }
-    if (done.ok()) {
-        done = socket_.openGeneric();
-    }
-    if (done.ok()) {
-        done = netlink::findFamily(socket_, NL80211_GENL_NAME, family_);
-    }
-    if (!done.ok() || !link_ || !family_) {
-        return done;
-    }
-    OwnedMessage answer;
-    done = socket_.ask(requests().getInterface(), answer, {ENODEV, EINVAL, EOPNOTSUPP});
-    isWireless = done.ok() && decodeInterfaceType(answer.view()).has_value();
+    state = phase_ == Phase::joined    ? State::joined
+            : phase_ == Phase::givenUp ? State::givenUp
+                                       : State::waiting;
+    reason = reason_;
     return done;
 }
 
-Outcome KernelWireless::read(WirelessState& state) {
-    state = {};
-    OwnedMessage answer;
-    Outcome done = socket_.ask(requests().getInterface(), answer);
-    if (!done.ok()) {
-        return done;
-    }
-    state.type = decodeInterfaceType(answer.view()).value_or(NL80211_IFTYPE_UNSPECIFIED);
-    std::optional<HeardNetwork> current;
-    done = readCurrent(current);
-    if (done.ok() && current) {
-        state.network = current->network;
-        state.isProtected = current->security != Security::open;
-    }
-    return done;
-}
-
-Outcome KernelWireless::readHeard(std::vector<HeardNetwork>& heard) {
-    heard.clear();
-    std::vector<OwnedMessage> messages;
-    Outcome done = socket_.dump(requests().getHeard(), messages);
-    for (const OwnedMessage& message : messages) {
-        if (auto network = decodeHeardNetwork(message.view())) {
-            heard.push_back(std::move(*network));
-        }
-    }
-    return done;
-}
-
-Outcome KernelWireless::readCurrent(std::optional<HeardNetwork>& current) {
-    std::vector<HeardNetwork> heard;
-    Outcome done = readHeard(heard);
-    const auto found = std::ranges::find(heard, true, &HeardNetwork::isCurrent);
-    current = found == heard.end() ? std::nullopt : std::optional(*found);
-    return done;
-}
-
-Outcome KernelWireless::listen() {
-    if (notices_.isOpen()) {
-        return {};
-    }
-    Outcome done = notices_.openGeneric();
-    for (const char* group : {NL80211_MULTICAST_GROUP_SCAN, NL80211_MULTICAST_GROUP_MLME}) {
-        const auto found = family_->groups.find(group);
-        if (done.ok() && found != family_->groups.end()) {
-            done = notices_.joinGroup(found->second);
-        }
-    }
-    return done;
-}
-
-Outcome KernelWireless::leave() {
-    WirelessState now;
-    Outcome done = read(now);
-    if (done.ok()) {
-        // What it is not on, or has no part in, it need not leave.
-        done = socket_.request(requests().leave(now.type == NL80211_IFTYPE_ADHOC),
-                               {ENOTCONN, ENOLINK, ENETDOWN, EOPNOTSUPP});
-    }
-    return done;
-}
-
-// Cards of many makers change only while they are down.
-Outcome KernelWireless::setType(std::uint32_t type) {
-    WirelessState now;
-    Outcome done = read(now);
-    if (!done.ok() || now.type == type) {
-        return done;
-    }
-    done = kernel_.findLink(interface_, link_);
-    if (!done.ok() || !link_) {
-        return done;
-    }
-    done = link_->up ? kernel_.setUp(*link_, false) : Outcome();
-    if (done.ok()) {
-        done = socket_.request(requests().setType(type));
-    }
-    const Outcome up = link_->up ? kernel_.setUp(*link_, true) : Outcome();
-    return done.ok() ? up : done;
-}
-
-Outcome KernelWireless::look(const std::string& network, const std::optional<std::string>& key) {
-    network_ = network;
-    key_ = key;
-    phase_ = Phase::idle;
-    notBefore_ = {};
-    reason_ = "no network of that name was heard";
-    return listen();
-}
-
-Outcome KernelWireless::startJoining(const std::string& network, const std::optional<std::string>& key,
-                                     bool mayStay) {
-    WirelessState now;
-    Outcome done = read(now);
-    if (done.ok() && mayStay && now.network == network) {
-        phase_ = Phase::done;
-        return listen();
-    }
-    if (done.ok()) {
-        done = leave();
-    }
-    if (done.ok() && now.type != NL80211_IFTYPE_ADHOC) {
-        done = setType(NL80211_IFTYPE_STATION);
-    }
-    return done.ok() ? look(network, key) : done;
-}
-
-Outcome KernelWireless::startRestoring(const WirelessState& before) {
-    WirelessState now;
-    Outcome done = read(now);
-    phase_ = Phase::done;
-    if (!done.ok() || now == before) {
-        return done;
-    }
-    done = leave();
-    if (done.ok()) {
-        done = refuse(setType(before.type));
-    }
-    if (done.ok() && phase_ != Phase::refused && before.isProtected) {
-        phase_ = Phase::refused;
-        reason_ = "it was on a network with a key, which only the one who joined it has";
-        return done;
-    }
-    return done.ok() && phase_ != Phase::refused && !before.network.empty()
-               ? look(before.network, std::nullopt)
-               : done;
-}
-
-Outcome KernelWireless::refuse(Outcome refused) {
-    if (refused.ok() || socket_.error() == 0 || refused.status() == kSCStatusAccessError) {
-        return refused;
-    }
-    phase_ = Phase::refused;
-    reason_ = refused.reason();
-    return {};
-}
-
-void KernelWireless::takeNotices(bool& isScanOver, std::optional<std::uint16_t>& joinStatus) {
-    for (const OwnedMessage& message : notices_.takeNotices(isScanOver)) {
-        if (const auto notice = decodeNotice(message.view(), link_->index)) {
-            isScanOver = isScanOver || notice->isScanEnd;
-            joinStatus = notice->joinStatus ? notice->joinStatus : joinStatus;
-        }
-    }
-}
-
-Outcome KernelWireless::goOn(Progress& progress) {
+Outcome KernelJoin::goOn() {
     bool isScanOver = false;
     std::optional<std::uint16_t> joinStatus;
-    if (phase_ != Phase::done && phase_ != Phase::refused) {
-        takeNotices(isScanOver, joinStatus);
+    card_.takeNotices(isScanOver, joinStatus);
+    if (phase_ == Phase::joining) {
+        return checkJoined(joinStatus);
     }
-    Outcome done;
-    if (phase_ == Phase::scanning && (isScanOver || Clock::now() - since_ > longestScan)) {
-        done = join();
-    } else if (phase_ == Phase::scanning && !isScanEnding_) {
-        done = endScanEarly();
-    } else if (phase_ == Phase::joining) {
-        done = checkJoined(joinStatus);
+    if (phase_ == Phase::scanning) {
+        if (isScanOver || Clock::now() - since_ > longestScan) {
+            RETURN_IF_FAILED(join());
+        } else if (!isScanEnding_) {
+            RETURN_IF_FAILED(endScanEarly());
+        }
     }
-    if (done.ok() && phase_ == Phase::idle && Clock::now() >= notBefore_) {
-        done = scan();
-    }
-    switch (phase_) {
-        case Phase::idle:
-        case Phase::scanning:
-            progress = Progress::looking;
-            break;
-        case Phase::joining:
-            progress = Progress::joining;
-            break;
-        case Phase::done:
-            progress = Progress::done;
-            break;
-        case Phase::refused:
-            progress = Progress::refused;
-            break;
-    }
-    return done;
+    return phase_ == Phase::idle && Clock::now() >= notBefore_ ? scan() : Outcome();
 }
 
-Outcome KernelWireless::scan() {
+Outcome KernelJoin::scan() {
     since_ = Clock::now();
     // Somebody else's scan goes on, or the link is down for a moment: asked again the next time.
-    Outcome done = socket_.request(requests().scan(network_), {EBUSY, ENETDOWN});
-    if (done.ok() && socket_.error() == 0) {
+    RETURN_IF_FAILED(card_.request(card_.requests().scan(network_), {EBUSY, ENETDOWN}));
+    if (card_.error() == 0) {
         phase_ = Phase::scanning;
         isScanEnding_ = false;
     }
-    return refuse(std::move(done));
+    return {};
 }
 
 // Only what was heard since this scan began: the kernel remembers for long what has gone since.
-Outcome KernelWireless::choose(NetworkChoice& choice) {
-    std::vector<HeardNetwork> heard;
-    Outcome done = readHeard(heard);
+Outcome KernelJoin::choose(EntryChoice& choice) {
+    std::vector<ScanEntry> entries;
+    RETURN_IF_FAILED(card_.readEntries(entries));
     const auto age = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - since_);
-    choice = chooseNetwork(heard, network_, key_, age + ageError);
-    return refuse(std::move(done));
+    choice = chooseEntry(entries, network_, key_, age + ageError);
+    return {};
 }
 
-Outcome KernelWireless::endScanEarly() {
-    NetworkChoice choice;
-    Outcome done = choose(choice);
-    if (done.ok() && choice.network && choice.network->signal >= goodSignal) {
+Outcome KernelJoin::endScanEarly() {
+    EntryChoice choice;
+    RETURN_IF_FAILED(choose(choice));
+    if (choice.entry && choice.entry->signal >= goodSignal) {
         isScanEnding_ = true;
         // A card that can't end it sends its notice later.
-        (void)socket_.request(requests().endScan());
+        (void)card_.request(card_.requests().endScan());
     }
-    return done;
+    return {};
 }
 
-Outcome KernelWireless::join() {
-    NetworkChoice choice;
-    Outcome done = choose(choice);
-    if (!done.ok() || phase_ == Phase::refused) {
-        return done;
-    }
+Outcome KernelJoin::join() {
+    EntryChoice choice;
+    RETURN_IF_FAILED(choose(choice));
     reason_ = choice.reason;
-    phase_ = choice.isHopeless ? Phase::refused : Phase::idle;
-    if (!choice.network) {
+    phase_ = choice.isHopeless ? Phase::givenUp : Phase::idle;
+    if (!choice.entry) {
         return {};
     }
-    chosen_ = std::move(choice.network);
-    done = refuse(setType(chosen_->isAdHoc ? NL80211_IFTYPE_ADHOC : NL80211_IFTYPE_STATION));
-    if (done.ok() && phase_ != Phase::refused) {
-        phase_ = Phase::joining;
-        since_ = Clock::now();
-        reason_ = "the network did not let the card in yet";
-        done = refuse(socket_.request(requests().join(*chosen_, key_)));
-    }
-    return done;
+    chosen_ = std::move(choice.entry);
+    RETURN_IF_FAILED(card_.setType(chosen_->isAdHoc ? NL80211_IFTYPE_ADHOC : NL80211_IFTYPE_STATION));
+    phase_ = Phase::joining;
+    since_ = Clock::now();
+    reason_ = "the network was heard and has not let the card in yet";
+    return card_.request(card_.requests().join(*chosen_, key_));
 }
 
-Outcome KernelWireless::checkJoined(std::optional<std::uint16_t> joinStatus) {
-    std::optional<HeardNetwork> current;
-    Outcome done = readCurrent(current);
-    if (!done.ok()) {
-        return refuse(std::move(done));
-    }
+Outcome KernelJoin::checkJoined(std::optional<std::uint16_t> joinStatus) {
+    std::optional<ScanEntry> current;
+    RETURN_IF_FAILED(card_.readCurrent(current));
     const bool isThere = current && current->network == network_ && current->bssid == chosen_->bssid;
     // A card that joins a cell whose last member has just left forms it anew, and hears nobody then.
     if (isThere && (!current->isAdHoc || current->age + ageError < Clock::now() - since_)) {
-        phase_ = Phase::done;
+        phase_ = Phase::joined;
         reason_.clear();
     } else if (joinStatus.value_or(0) != 0 || Clock::now() - since_ > longestJoining) {
         reason_ = joinStatus.value_or(WirelessNotice::noAnswer) == WirelessNotice::noAnswer
@@ -343,9 +178,95 @@ Outcome KernelWireless::checkJoined(std::optional<std::uint16_t> joinStatus) {
                       : "the network did not let the card in (status " + std::to_string(*joinStatus) + ")";
         phase_ = Phase::idle;
         notBefore_ = Clock::now() + pauseAfterRefusal;
-        done = leave();
+        return card_.leave();
     }
-    return done;
+    return {};
+}
+
+}  // namespace
+
+EntryChoice chooseEntry(std::span<const ScanEntry> entries, const std::string& network,
+                        const std::optional<std::string>& key, std::chrono::milliseconds age) {
+    EntryChoice choice{std::nullopt, false, notHeard};
+    for (const ScanEntry& entry : entries) {
+        if (entry.network != network || entry.age > age) {
+            continue;
+        }
+        std::string obstacle = obstacleTo(entry, key);
+        if (!obstacle.empty()) {
+            // An open network may be anybody's: the one that the key is for may still appear.
+            choice.isHopeless = choice.isHopeless || entry.security != Security::open;
+            choice.reason = std::move(obstacle);
+        } else if (!choice.entry || entry.signal > choice.entry->signal) {
+            choice.entry = entry;
+        }
+    }
+    if (choice.entry) {
+        choice.isHopeless = false;
+        choice.reason.clear();
+    }
+    return choice;
+}
+
+Outcome readWirelessState(const std::string& interface, std::optional<WirelessState>& state) {
+    state.reset();
+    WirelessCard card;
+    bool isWireless = false;
+    RETURN_IF_FAILED(card.open(interface, isWireless));
+    return isWireless ? card.read(state.emplace()) : Outcome();
+}
+
+Outcome joinByKernel(const std::string& interface, const WirelessSettings& settings, bool mayStay,
+                     std::unique_ptr<WirelessJoin>& join) {
+    join.reset();
+    WirelessCard card;
+    bool isWireless = false;
+    RETURN_IF_FAILED(card.open(interface, isWireless));
+    if (!isWireless || !settings.network) {
+        return {};
+    }
+    WirelessState now;
+    RETURN_IF_FAILED(card.read(now));
+    if (mayStay && now.network == *settings.network) {
+        join = std::make_unique<KernelJoin>("");
+        return {};
+    }
+    RETURN_IF_FAILED(card.leave());
+    if (now.type != NL80211_IFTYPE_ADHOC) {
+        RETURN_IF_FAILED(card.setType(NL80211_IFTYPE_STATION));
+    }
+    RETURN_IF_FAILED(card.listen());
+    join = std::make_unique<KernelJoin>(std::move(card), *settings.network, settings.key);
+    return {};
+}
+
+Outcome leaveByKernel(const std::string& interface, const std::optional<WirelessState>& before,
+                      std::unique_ptr<WirelessJoin>& join) {
+    join.reset();
+    WirelessCard card;
+    bool isWireless = false;
+    RETURN_IF_FAILED(card.open(interface, isWireless));
+    if (!isWireless) {
+        return {};
+    }
+    WirelessState now;
+    RETURN_IF_FAILED(card.read(now));
+    if (before == now) {
+        return {};
+    }
+    RETURN_IF_FAILED(card.leave());
+    if (!before) {
+        return {};
+    }
+    RETURN_IF_FAILED(card.setType(before->type));
+    if (before->isProtected) {
+        join = std::make_unique<KernelJoin>(
+            "the network that the card was on had a key, and only whoever gave it can join it again");
+    } else if (!before->network.empty()) {
+        RETURN_IF_FAILED(card.listen());
+        join = std::make_unique<KernelJoin>(std::move(card), before->network, std::nullopt);
+    }
+    return {};
 }
 
 }  // namespace platform::apply

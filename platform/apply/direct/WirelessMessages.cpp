@@ -61,7 +61,7 @@ unsigned keyManagementIn(ByteView element) {
 }
 
 // Elements: a byte of identity, a byte of length, and so many bytes.
-void readElements(ByteView elements, HeardNetwork& network) {
+void readElements(ByteView elements, ScanEntry& network) {
     while (elements.size() >= 2) {
         const auto size = std::to_integer<std::size_t>(elements[1]);
         if (size + 2 > elements.size()) {
@@ -100,14 +100,14 @@ ByteView viewOf(const std::string& text) {
 
 }  // namespace
 
-std::optional<HeardNetwork> decodeHeardNetwork(const MessageView& message) {
+std::optional<ScanEntry> decodeScanEntry(const MessageView& message) {
     const auto entry = message.attributes<genlmsghdr>().find(NL80211_ATTR_BSS);
     if (!entry) {
         return std::nullopt;
     }
     const Attributes parts = entry->nested();
     const auto bssid = parts.find(NL80211_BSS_BSSID);
-    HeardNetwork network;
+    ScanEntry network;
     if (!bssid || bssid->payload.size() != network.bssid.size()) {
         return std::nullopt;
     }
@@ -192,11 +192,11 @@ Message WirelessRequests::endScan() const {
     return request(NL80211_CMD_ABORT_SCAN, NLM_F_ACK);
 }
 
-Message WirelessRequests::getHeard() const {
+Message WirelessRequests::getEntries() const {
     return request(NL80211_CMD_GET_SCAN, NLM_F_DUMP);
 }
 
-Message WirelessRequests::join(const HeardNetwork& network, const std::optional<std::string>& key) const {
+Message WirelessRequests::join(const ScanEntry& network, const std::optional<std::string>& key) const {
     Message message = request(network.isAdHoc ? NL80211_CMD_JOIN_IBSS : NL80211_CMD_CONNECT, NLM_F_ACK);
     message.add(NL80211_ATTR_SSID, viewOf(network.network))
         .add(NL80211_ATTR_MAC, network.bssid)

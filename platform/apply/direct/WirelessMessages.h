@@ -18,7 +18,7 @@ namespace platform::apply {
 enum KeyManagement : unsigned { managementPSK = 1, managementSAE = 2, management8021X = 4 };
 
 // An access point or an ad-hoc cell, as a scan found it.
-struct HeardNetwork {
+struct ScanEntry {
     std::string network;  // the bytes of its SSID; empty for one that hides it
     std::array<std::byte, 6> bssid{};
     std::uint32_t frequency = 0;      // MHz
@@ -30,7 +30,7 @@ struct HeardNetwork {
     unsigned keyManagement = 0;  // of Security::wpa; 0 when it offers nothing that is known here
 };
 // Nothing when the message describes none.
-[[nodiscard]] std::optional<HeardNetwork> decodeHeardNetwork(const netlink::MessageView& message);
+[[nodiscard]] std::optional<ScanEntry> decodeScanEntry(const netlink::MessageView& message);
 
 // The type of an interface, NL80211_IFTYPE_; nothing when the message does not say it.
 [[nodiscard]] std::optional<std::uint32_t> decodeInterfaceType(const netlink::MessageView& message);
@@ -56,9 +56,9 @@ class WirelessRequests {
     [[nodiscard]] netlink::Message scan(const std::string& network) const;
     [[nodiscard]] netlink::Message endScan() const;
     // A dump.
-    [[nodiscard]] netlink::Message getHeard() const;
+    [[nodiscard]] netlink::Message getEntries() const;
     // The key is one that fits WEP; none joins an open network.
-    [[nodiscard]] netlink::Message join(const HeardNetwork& network,
+    [[nodiscard]] netlink::Message join(const ScanEntry& network,
                                         const std::optional<std::string>& key) const;
     [[nodiscard]] netlink::Message leave(bool isAdHoc) const;
 

@@ -8,6 +8,7 @@
 
 #include "platform/apply/direct/KernelWireless.h"
 #include "tests/unit/support/Hexadecimal.h"
+#include "tests/unit/support/PrivateNetwork.h"
 
 namespace platform::apply {
 namespace {
@@ -15,6 +16,8 @@ namespace {
 using netlink::Bytes;
 using netlink::MessageView;
 using testing_support::fromHex;
+using testing_support::PrivateNetwork;
+using testing_support::shell;
 using testing_support::toHex;
 
 // Entries of a scan as a kernel of the 6.1 series gave them for simulated radios.
@@ -47,7 +50,7 @@ std::string with(std::string message, const std::string& from, const std::string
 }
 
 std::string describe(const Bytes& payload) {
-    const auto network = decodeHeardNetwork(MessageView({}, payload));
+    const auto network = decodeScanEntry(MessageView({}, payload));
     if (!network) {
         return "nothing";
     }
@@ -93,13 +96,15 @@ TEST(WirelessMessages, TellsWhatAScanHeard) {
     }
 }
 
+class KernelWirelessTest : public testing_support::PrivateNetworkTest {};
+
 std::string bodyOf(const netlink::Message& message) {
     return toHex(message.payload());
 }
 
 TEST(WirelessMessages, AsksForScansAndNetworks) {
     const WirelessRequests requests({32, {}}, 3);
-    HeardNetwork network = *decodeHeardNetwork(MessageView({}, fromHex(cellWithWEP)));
+    ScanEntry network = *decodeScanEntry(MessageView({}, fromHex(cellWithWEP)));
     EXPECT_EQ("21000000080003000300000010002d800b0001005072696e74657200", bodyOf(requests.scan("Printer")));
     EXPECT_EQ(
         "2b00000008000300030000000c00340057657043656c6c310a0006001e148525540d0000080026006c09000004003c000400"
@@ -144,53 +149,73 @@ TEST(WirelessMessages, TellsWhatANoticeMeans) {
 }
 
 TEST(KernelWireless, ChoosesOnlyWhatWasHeardAndCanBeJoined) {
-    const auto heard = [](const char* name, Security security, int signal, int age, bool isAdHoc = false) {
-        return HeardNetwork{name,    {},    2412,     signal, std::chrono::milliseconds(age),
-                            isAdHoc, false, security, 0};
+    const auto printer = [](Security security, int signal, int age, bool isAdHoc = false) {
+        return ScanEntry{"Printer", {},    2412,     signal,       std::chrono::milliseconds(age),
+                         isAdHoc,   false, security, managementSAE};
     };
+    const auto none = std::nullopt;
     const struct {
-        std::vector<HeardNetwork> heard;
+        std::vector<ScanEntry> heard;
         std::optional<std::string> key;
         int signal;  // of the chosen one, or 0
+        bool isHopeless;
         const char* reason;
     } rows[] = {
-        {{}, {}, 0, "no network of that name was heard"},
-        {{heard("Home", Security::open, -30, 0)}, {}, 0, "no network of that name was heard"},
-        {{heard("Printer", Security::open, -30, 101)}, {}, 0, "no network of that name was heard"},
-        {{heard("Printer", Security::open, -50, 0), heard("Printer", Security::open, -40, 100),
-          heard("Printer", Security::open, -30, 101), heard("Printer", Security::wep, -20, 0)},
-         {},
+        {{}, none, 0, false, "no network of that name was heard"},
+        {{{"Home"}}, none, 0, false, "no network of that name was heard"},
+        {{printer(Security::open, -30, 101)}, none, 0, false, "no network of that name was heard"},
+        {{printer(Security::open, -50, 0), printer(Security::open, -40, 100),
+          printer(Security::open, -30, 101), printer(Security::wep, -20, 0)},
+         none,
          -40,
+         false,
          ""},
-        {{heard("Printer", Security::open, -50, 0, true)}, {}, -50, ""},
-        {{heard("Printer", Security::open, -50, 0)},
+        {{printer(Security::open, -50, 0, true)}, none, -50, false, ""},
+        {{printer(Security::open, -50, 0)},
          "abcde",
          0,
-         "a network of that name is there, but it is open although there is a key for it"},
-        {{heard("Printer", Security::open, -30, 0), heard("Printer", Security::wep, -50, 0)},
-         "abcde",
-         -50,
-         ""},
-        {{heard("Printer", Security::wep, -50, 0)},
-         {},
+         false,
+         "an open network of that name is on the air, and with a key none is joined"},
+        {{printer(Security::open, -30, 0), printer(Security::wep, -50, 0)}, "abcde", -50, false, ""},
+        {{printer(Security::wep, -50, 0)},
+         none,
          0,
+         true,
          "the network asks for a key and the location holds none"},
-        {{heard("Printer", Security::wep, -50, 0)},
+        {{printer(Security::wep, -50, 0)},
          "abcdef",
          0,
+         true,
          "the key fits no WEP network, whose keys have 5 or 13 characters or 10 or 26 hexadecimal digits"},
-        {{heard("Printer", Security::wpa, -50, 0)},
+        {{printer(Security::wpa, -50, 0)},
          "long enough",
          0,
-         "the network asks for WPA, and no wireless supplicant runs for this card"},
+         true,
+         "the network asks for WPA by SAE, and no wireless supplicant runs for this card"},
     };
     for (const auto& row : rows) {
-        const NetworkChoice choice =
-            chooseNetwork(row.heard, "Printer", row.key, std::chrono::milliseconds(100));
+        const EntryChoice choice = chooseEntry(row.heard, "Printer", row.key, std::chrono::milliseconds(100));
         EXPECT_EQ(row.reason, choice.reason);
-        EXPECT_EQ(row.signal, choice.network ? choice.network->signal : 0) << row.reason;
-        EXPECT_EQ(choice.isHopeless, row.signal == 0 && choice.reason != "no network of that name was heard");
+        EXPECT_EQ(row.signal, choice.entry ? choice.entry->signal : 0) << row.reason;
+        EXPECT_EQ(row.isHopeless, choice.isHopeless) << row.reason;
     }
+}
+
+// A cable is no radio, and every question is answered so; who asks for one that is gone hears the same.
+TEST_F(KernelWirelessTest, WhatIsNoWirelessCardIsLeftAlone) {
+    PrivateNetwork::run([] {
+        shell("ip link add card0 type veth peer name far0; ip link set card0 up");
+        for (const char* interface : {"card0", "missing"}) {
+            std::optional<WirelessState> state = WirelessState{};
+            std::unique_ptr<WirelessJoin> join;
+            EXPECT_TRUE(readWirelessState(interface, state).ok());
+            EXPECT_FALSE(state);
+            EXPECT_TRUE(joinByKernel(interface, {{}, "Printer", {}}, false, join).ok());
+            EXPECT_FALSE(join);
+            EXPECT_TRUE(leaveByKernel(interface, WirelessState{2, "Home", false}, join).ok());
+            EXPECT_FALSE(join);
+        }
+    });
 }
 
 }  // namespace
