@@ -7,7 +7,9 @@
 
 #include "platform/Log.h"
 #include "platform/apply/direct/DhcpClient.h"
+#include "platform/apply/direct/KernelWireless.h"
 #include "platform/apply/direct/NameServers.h"
+#include "platform/apply/direct/Radio.h"
 #include "platform/apply/direct/Supplicant.h"
 
 namespace platform::apply {
@@ -86,9 +88,18 @@ Outcome DirectInterface::open() {
 }
 
 Outcome DirectInterface::takeSnapshot(Snapshot& snapshot) {
-    snapshot = {link_->up, isIPv6Disabled(interface_), {}, {}, secondsSinceStart()};
+    snapshot = {};
+    snapshot.up = link_->up;
+    snapshot.ipv6Disabled = isIPv6Disabled(interface_);
+    snapshot.takenAt = secondsSinceStart();
     RETURN_IF_FAILED(kernel_.read(*link_, snapshot.state));
-    return readKnownNetworks(interface_, snapshot.networks);
+    std::optional<Radio> radio;
+    RETURN_IF_FAILED(readRadio(interface_, radio));
+    if (radio) {
+        snapshot.radioOff = radio->isOff;
+    }
+    RETURN_IF_FAILED(readKnownNetworks(interface_, snapshot.networks));
+    return snapshot.networks ? Outcome() : readWirelessState(interface_, snapshot.wireless);
 }
 
 Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Snapshot>& before,
@@ -124,11 +135,17 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Sn
     }
     if (earlier.joined && !joinsNetwork(plan)) {
         std::unique_ptr<WirelessJoin> ignored;
-        RETURN_IF_FAILED(leaveBySupplicant(interface_, before ? before->networks : std::nullopt, ignored));
+        RETURN_IF_FAILED(leaveNetwork(before.value_or(Snapshot()), ignored));
     }
     if (isOff(plan)) {
         RETURN_IF_FAILED(switchOff(trouble));
     } else {
+        bool isUsable = true;
+        RETURN_IF_FAILED(switchRadioOn(plan, isUsable));
+        if (!isUsable) {
+            trouble = "the radio is switched off";
+            return writeNotes(interface_, applied);
+        }
         RETURN_IF_FAILED(switchOn(plan, trouble));
         RETURN_IF_FAILED(startJoin(plan, mayStay, join, trouble));
         if (wantsClient) {
@@ -169,6 +186,19 @@ Outcome DirectInterface::switchOn(const InterfacePlan& plan, std::string& troubl
     return {};
 }
 
+// A card whose radio is off cannot even be switched on.
+Outcome DirectInterface::switchRadioOn(const InterfacePlan& plan, bool& isUsable) {
+    std::optional<Radio> radio;
+    RETURN_IF_FAILED(readRadio(interface_, radio));
+    const bool isWanted = plan.wireless && plan.wireless->powerEnabled.value_or(false);
+    if (radio && radio->isOff && isWanted) {
+        RETURN_IF_FAILED(switchRadio(interface_, true));
+        radio->isOff = false;
+    }
+    isUsable = !radio || (!radio->isOff && !radio->isBlocked);
+    return {};
+}
+
 Outcome DirectInterface::startJoin(const InterfacePlan& plan, bool mayStay,
                                    std::unique_ptr<WirelessJoin>& join, std::string& trouble) {
     if (!joinsNetwork(plan)) {
@@ -176,9 +206,17 @@ Outcome DirectInterface::startJoin(const InterfacePlan& plan, bool mayStay,
     }
     RETURN_IF_FAILED(joinBySupplicant(interface_, *plan.wireless, mayStay, join));
     if (!join) {
-        trouble = "joining a wireless network needs NetworkManager or a wireless supplicant";
+        RETURN_IF_FAILED(joinByKernel(interface_, *plan.wireless, mayStay, join));
+    }
+    if (!join) {
+        trouble = "a network to join is named, and the card is not a wireless one";
     }
     return {};
+}
+
+Outcome DirectInterface::leaveNetwork(const Snapshot& before, std::unique_ptr<WirelessJoin>& join) {
+    RETURN_IF_FAILED(leaveBySupplicant(interface_, before.networks, join));
+    return before.networks ? Outcome() : leaveByKernel(interface_, before.wireless, join);
 }
 
 Outcome DirectInterface::startClient(const InterfacePlan& plan, std::string& trouble) {
@@ -205,7 +243,7 @@ Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<Wirele
     steps.take(stopDhcpClient(interface_));
     steps.take(setInterfaceNameServers(interface_, 0, {}, trouble));
     if (notes->joined) {
-        steps.take(leaveBySupplicant(interface_, before.networks, join));
+        steps.take(leaveNetwork(before, join));
     }
     if (link_) {
         bool taken = false;
@@ -224,6 +262,9 @@ Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<Wirele
                 logLine(LogLevel::warning, interface_ + ": " + noted.reason());
             }
             steps.take(restore(before));
+            if (before.radioOff.value_or(false)) {
+                steps.take(switchRadio(interface_, false));
+            }
         }
     }
     return steps.ok() ? removeNotes(interface_) : steps.first();

@@ -39,9 +39,11 @@ class DirectInterface {
   private:
     Outcome switchOff(std::string& trouble);
     Outcome switchOn(const InterfacePlan& plan, std::string& trouble);
+    Outcome switchRadioOn(const InterfacePlan& plan, bool& isUsable);
     Outcome startClient(const InterfacePlan& plan, std::string& trouble);
     Outcome startJoin(const InterfacePlan& plan, bool mayStay, std::unique_ptr<WirelessJoin>& join,
                       std::string& trouble);
+    Outcome leaveNetwork(const Snapshot& before, std::unique_ptr<WirelessJoin>& join);
     // Whether somebody else has configured the interface since: it has addresses that it neither had nor got
     // from here, or was switched off here and is on.
     Outcome isTakenOver(const Notes& notes, const Snapshot& before, bool& taken);

@@ -6,7 +6,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/apply/WirelessKey.h"
+#include "platform/apply/WirelessChoice.h"
 
 namespace platform::apply {
 namespace {

@@ -11,6 +11,7 @@
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/Kernel.h"
 #include "platform/apply/direct/Supplicant.h"
+#include "platform/apply/direct/WirelessCard.h"
 #include "platform/values/Fields.h"
 
 namespace platform::apply {
@@ -20,6 +21,8 @@ struct Snapshot {
     std::optional<bool> ipv6Disabled;  // nothing when the kernel has no IPv6
     InterfaceState state;
     std::optional<KnownNetworks> networks;  // nothing when no wireless supplicant ran
+    std::optional<WirelessState> wireless;  // of a wireless card without one
+    std::optional<bool> radioOff;           // nothing when it has no radio that can be switched
     std::int64_t takenAt = 0;               // seconds since the machine's start, sleep included
 
     template <class Self, class Fields>
@@ -29,6 +32,8 @@ struct Snapshot {
         fields("Addresses", self.state.addresses);
         fields("Routes", self.state.routes);
         fields("Networks", self.networks);
+        fields("Wireless", self.wireless);
+        fields("RadioOff", self.radioOff);
         fields("TakenAt", self.takenAt);
     }
 };

@@ -8,7 +8,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/apply/WirelessKey.h"
+#include "platform/apply/WirelessChoice.h"
 #include "platform/netlink/Generic.h"
 #include "platform/netlink/Message.h"
 

@@ -1,0 +1,21 @@
+// The switch of a wireless card's radio (rfkill).
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "platform/Outcome.h"
+
+namespace platform::apply {
+
+struct Radio {
+    bool isOff = false;      // switched off by a program, as flight mode does
+    bool isBlocked = false;  // by a switch on the computer, which no program can change
+};
+
+// Nothing, and success, for a card without such a switch.
+Outcome readRadio(const std::string& interface, std::optional<Radio>& radio);
+// Success for a card without one.
+Outcome switchRadio(const std::string& interface, bool on);
+
+}  // namespace platform::apply
