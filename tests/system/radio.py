@@ -1,0 +1,170 @@
+#!/usr/bin/env python3
+"""A whole emulated machine with a real wireless stack and simulated radios that hear each other.
+
+usage: radio.py run SCRIPT [HOST [ARGUMENT ...]]
+
+Boots the machine, plays SCRIPT in it as root and ends with SCRIPT's exit status; what it prints comes out as it is
+printed. SCRIPT is an executable file or a Python file; it sees the whole file system of this machine below /host, and
+its own root is the same file system with everything that it writes lost at the end. HOST says who runs the network
+there, joined to a network "home" when SCRIPT begins:
+
+    bare          nobody, nothing prepared: `modprobe mac80211_hwsim radios=N` is SCRIPT's own affair (the default)
+    nobody        wlan0 is down and on no network; air.py in folder radio is at hand (`import air`)
+    supplicant    a bare wpa_supplicant on wlan0
+    networkmanager, networkmanager-iwd
+
+The machine's clock counts instructions and idle time is skipped: it keeps time however busy this computer is.
+Environment: LA_BINARY, the tool; RADIO_LIMIT, after how many seconds the machine is ended (600).
+"""
+import gzip
+import os
+import shlex
+import shutil
+import subprocess
+import sys
+import tempfile
+import time
+from pathlib import Path
+
+HERE = Path(__file__).resolve().parent
+PROJECT = HERE.parents[1]
+BINARY = Path(os.environ.get("LA_BINARY", PROJECT / "build/debug/app/location-assistant")).resolve()
+LAB = PROJECT / ".lab"
+SKIP = 77
+HOSTS = ("bare", "nobody", "supplicant", "networkmanager", "networkmanager-iwd")
+
+MODULES = ("virtio_pci", "9pnet_virtio", "9p", "overlay")
+# The lower folders of the root come first to last: what is unpacked for the laboratory, then this computer's own.
+LOWER = {"host": "/lab/root:/lab/machine:/host", "debian": "/lab/machine:/lab/debian"}
+
+# Said of every hub that ends inside the machine, which is what ours is for.
+HUB_WARNING = b"qemu-system-x86_64: warning: hub 0 is not connected to host network\n"
+
+INIT = """#!/bin/busybox sh
+/bin/busybox --install -s /bin
+mount -t proc proc /proc
+for module in {modules}; do insmod /modules/$module; done
+options=trans=virtio,version=9p2000.L,msize=512000
+mount -t 9p -o ro,cache=loose,$options files /host
+mount -t 9p -o ro,cache=loose,$options lab /lab
+mount -t tmpfs -o size=60%,mode=755 tmpfs /over
+mkdir /over/upper /over/work
+mount -t overlay -o lowerdir={lower},upperdir=/over/upper,workdir=/over/work overlay /new
+mkdir -p /new/host /new/report
+mount --move /host /new/host
+mount -t 9p -o $options report /new/report
+umount /proc
+exec switch_root /new {init}
+"""
+
+
+def missing():
+    """What the machine needs and is not here, or nothing."""
+    if not shutil.which("qemu-system-x86_64"):
+        return "no qemu-system-x86_64"
+    if not list(LAB.glob("machine/boot/vmlinuz-*")):
+        return f"no kernel in {LAB}/machine"
+    return None
+
+
+def initial_root(folder, distribution, init):
+    """Writes the initial root file system; returns its path."""
+    root = folder / "initial"
+    (version,) = (path.name for path in (LAB / "machine/usr/lib/modules").iterdir())
+    for name in ("bin", "dev", "host", "lab", "modules", "new", "over", "proc", "sys"):
+        (root / name).mkdir(parents=True)
+    shutil.copy(LAB / "machine/usr/bin/busybox", root / "bin")
+    order = []
+    for module in MODULES:
+        shown = subprocess.run(["modprobe", "-d", LAB / "machine", "-S", version, "--show-depends", module], check=True,
+                               capture_output=True, text=True, env={"PATH": "/usr/sbin:/sbin"}).stdout
+        for line in shown.splitlines():
+            path = Path(line.split()[1])
+            if path.name not in order:
+                order.append(path.name)
+                shutil.copy(path, root / "modules")
+    (root / "init").write_text(INIT.format(modules=" ".join(order), lower=LOWER[distribution], init=init))
+    (root / "init").chmod(0o755)
+    names = subprocess.run(["find", "."], cwd=root, check=True, capture_output=True).stdout
+    archive = subprocess.run(["cpio", "-o", "-H", "newc", "-R", "0:0", "--quiet"], cwd=root, check=True, input=names,
+                             capture_output=True).stdout
+    path = folder / "initrd"
+    path.write_bytes(gzip.compress(archive, 1))
+    shutil.rmtree(root)
+    return path
+
+
+def boot(words, report, distribution="host", kernel_words="", memory=1500, limit=None, output=sys.stdout):
+    """Runs the command `words` in a machine of its own. It finds the folder `report` at /report, and may write there.
+    Returns its exit status, or None when the machine ended without one."""
+    (report / "command").write_text(
+        "export PATH=/usr/sbin:/usr/bin:/sbin:/bin LANG=C.UTF-8 PYTHONDONTWRITEBYTECODE=1 PYTHONUNBUFFERED=1\n"
+        f"export LA_BINARY=/host{shlex.quote(str(BINARY))} PYTHONPATH=/host{shlex.quote(str(HERE / 'radio'))}\n"
+        + "".join(f"export {key}={shlex.quote(value)}\n" for key, value in os.environ.items() if "SAN_OPTIONS" in key)
+        + f"exec {shlex.join(map(str, words))}\n")
+    (report / "status").unlink(missing_ok=True)
+    init = f"/bin/sh /host{shlex.quote(str(HERE / 'radio/init'))}" if distribution == "host" else "/sbin/init"
+    (kernel,) = LAB.glob("machine/boot/vmlinuz-*")
+    with tempfile.TemporaryDirectory() as folder:
+        machine = subprocess.Popen([
+            "setpriv", "--pdeathsig", "KILL",
+            "qemu-system-x86_64", "-nodefaults", "-no-user-config", "-display", "none", "-no-reboot",
+            "-accel", "tcg,thread=single", "-icount", "shift=1,sleep=off", "-rtc", "clock=vm", "-smp", "1",
+            "-m", str(memory), "-kernel", kernel, "-initrd", initial_root(Path(folder), distribution, init),
+            "-append", f"console=ttyS0 panic=-1 quiet net.ifnames=0 {kernel_words}", "-serial", "stdio",
+            "-virtfs", "local,path=/,mount_tag=files,security_model=none,readonly=on,multidevs=remap",
+            "-virtfs", f"local,path={LAB},mount_tag=lab,security_model=none,readonly=on",
+            "-virtfs", f"local,path={report},mount_tag=report,security_model=none",
+            # Two cards and a cable between them; their driver, e1000, is not loaded.
+            "-netdev", "hubport,id=near,hubid=0", "-device", "e1000,netdev=near",
+            "-netdev", "hubport,id=far,hubid=0", "-device", "e1000,netdev=far",
+        ], stdin=subprocess.DEVNULL, stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+        try:
+            watch = subprocess.Popen(["timeout", str(limit or os.environ.get("RADIO_LIMIT", 600)),
+                                      "tail", f"--pid={machine.pid}", "-f", "/dev/null"])
+            os.set_blocking(machine.stdout.fileno(), False)
+            while True:
+                data = machine.stdout.read()
+                if data:
+                    data = data.replace(HUB_WARNING, b"")
+                    output.write(data.decode("utf-8", "replace").replace("\r", ""))
+                    output.flush()
+                elif data == b"" or machine.poll() is not None:
+                    break
+                elif watch.poll() is not None:
+                    output.write("\nThe machine took too long and was ended.\n")
+                    break
+                else:
+                    time.sleep(0.05)
+        finally:
+            machine.kill()
+            machine.wait()
+            watch.kill()
+            watch.wait()
+    status = report / "status"
+    return int(status.read_text()) if status.exists() and status.read_text().strip() else None
+
+
+def main():
+    if len(sys.argv) < 3 or sys.argv[1] != "run":
+        sys.exit(__doc__)
+    if reason := missing():
+        print("LABORATORY SKIP:", reason)
+        sys.exit(1 if os.environ.get("LA_FORBID_SKIPS") == "1" else SKIP)
+    script, host, arguments = Path(sys.argv[2]).resolve(), *(sys.argv[3:4] or ["bare"]), sys.argv[4:]
+    if host not in HOSTS:
+        sys.exit(__doc__)
+    words = [f"/host{script}", *arguments]
+    if script.suffix == ".py":
+        words.insert(0, "python3")
+    if host != "bare":
+        words = ["python3", f"/host{HERE}/radio/air.py", host, *words]
+    with tempfile.TemporaryDirectory() as report:
+        status = boot(words, Path(report))
+    if status is None:
+        print("The machine ended without a result.")
+    sys.exit(1 if status is None else status)
+
+
+if __name__ == "__main__":
+    main()
