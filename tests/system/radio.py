@@ -111,7 +111,7 @@ def boot(words, report, distribution="host", kernel_words="", memory=1500, limit
             "qemu-system-x86_64", "-nodefaults", "-no-user-config", "-display", "none", "-no-reboot",
             "-accel", "tcg,thread=single", "-icount", "shift=1,sleep=off", "-rtc", "clock=vm", "-smp", "1",
             "-m", str(memory), "-kernel", kernel, "-initrd", initial_root(Path(folder), distribution, init),
-            "-append", f"console=ttyS0 panic=-1 quiet net.ifnames=0 {kernel_words}", "-serial", "stdio",
+            "-append", f"console=ttyS0 panic=-1 loglevel=3 net.ifnames=0 {kernel_words}", "-serial", "stdio",
             "-virtfs", "local,path=/,mount_tag=files,security_model=none,readonly=on,multidevs=remap",
             "-virtfs", f"local,path={LAB},mount_tag=lab,security_model=none,readonly=on",
             "-virtfs", f"local,path={report},mount_tag=report,security_model=none",
@@ -158,7 +158,7 @@ def main():
     if script.suffix == ".py":
         words.insert(0, "python3")
     if host != "bare":
-        words = ["python3", f"/host{HERE}/radio/air.py", host, *words]
+        words = ["python3", f"/host{HERE}/radio/hosts.py", host, *words]
     with tempfile.TemporaryDirectory() as report:
         status = boot(words, Path(report))
     if status is None:

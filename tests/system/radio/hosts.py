@@ -1,0 +1,266 @@
+"""Who runs the network inside the machine: nobody, a supplicant, NetworkManager with either of its supplicants."""
+import json
+import os
+import re
+import runpy
+import shlex
+import socket
+import struct
+import subprocess
+import sys
+import threading
+import time
+from pathlib import Path
+
+import air
+from air import sh, spawn, wait_until
+
+CARD = "wlan0"
+STORE = Path("/var/lib/location-assistant")
+RUNTIME = Path("/run/location-assistant")
+ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
+    key: value for key, value in os.environ.items() if key.endswith("SAN_OPTIONS")}
+
+BUS = """<busconfig>
+<type>system</type>
+<listen>unix:path=/run/dbus/system_bus_socket</listen>
+<policy context="default">
+<allow user="*"/><allow own="*"/><allow send_destination="*"/><allow receive_sender="*"/>
+</policy>
+</busconfig>
+"""
+NETWORK_MANAGER = """[main]
+plugins=keyfile
+auth-polkit=false
+[device]
+wifi.backend={}
+"""
+HOME_PROFILE = f"""[connection]
+id={air.HOME}
+uuid=22222222-3333-4444-8555-666666666666
+type=wifi
+[wifi]
+ssid={air.HOME}
+[wifi-security]
+key-mgmt=wpa-psk
+psk={air.HOME_KEY}
+[ipv4]
+method=auto
+[ipv6]
+method=link-local
+"""
+SUPPLICANT = f"""ctrl_interface=/run/wpa_supplicant
+network={{
+    ssid="{air.HOME}"
+    psk="{air.HOME_KEY}"
+}}
+"""
+
+
+class Host:
+    """The machine with nobody who runs its network, and what every machine has: the tool and the system log."""
+    home = None
+
+    def __init__(self):
+        self.syslog = []
+        listener = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
+        listener.bind("/dev/log")
+        threading.Thread(target=self._listen, args=(listener,), daemon=True).start()
+        air.make()
+        self.daemons = []
+        self.start()
+
+    def _listen(self, listener):
+        while True:
+            line = listener.recv(65536).decode("utf-8", "replace")
+            if "location-assistant" in line:
+                self.syslog.append(line.split("location-assistant", 1)[1])
+
+    def start(self):
+        pass
+
+    def stop(self):
+        for daemon in reversed(self.daemons):
+            air.end(daemon)
+        self.daemons.clear()
+
+    def begin_again(self):
+        """Makes the machine what it was at its start, whatever a row left behind."""
+        self.stop()
+        sh(f"rm -rf {STORE} {RUNTIME} /tmp/set.orig /tmp/zat.orig; pkill -x busybox || :; "
+           f"for radio in /sys/class/rfkill/*; do :; done; "
+           f"iw dev {CARD} disconnect; iw dev {CARD} ibss leave; ip link set {CARD} down; iw dev {CARD} set type managed; "
+           f"ip addr flush dev {CARD}; echo nameserver 203.0.113.53 >/etc/resolv.conf".replace("; ", " || :; "))
+        self.start()
+
+    def tool(self, *words, seconds=300, **options):
+        """Runs the tool; returns its trace and the seconds that it took."""
+        start = time.monotonic()
+        result = subprocess.run([os.environ["LA_BINARY"], *words], capture_output=True, text=True, env=ENVIRONMENT,
+                                cwd="/", timeout=seconds, check=False, **{"stdin": subprocess.DEVNULL} | options)
+        return result.stdout + result.stderr, time.monotonic() - start
+
+    def state(self):
+        """What has to be the same before and after; nothing in it tells of time."""
+        state = {"resolv.conf": [line for line in Path("/etc/resolv.conf").read_text().splitlines() if line[:1] != "#"],
+                 "network": self.joined(), "rfkill": self.switched_off()}
+        for link in json.loads(sh("ip -j addr")):
+            if link["ifname"].startswith(("wlan", "eth")):
+                state[link["ifname"]] = {
+                    "up": "UP" in link["flags"], "hardware": link["address"],
+                    "addresses": sorted(
+                        " ".join(f"{key}={value}" for key, value in address.items()
+                                 if key not in ("valid_life_time", "preferred_life_time", "tentative"))
+                        for address in link["addr_info"])}
+        state["routes"] = sorted(json.dumps(route) for family in "46"
+                                 for route in json.loads(sh(f"ip -{family} -j route show table all")))
+        return state
+
+    @staticmethod
+    def joined():
+        """The name of the network that the card is on and as what, or None."""
+        link = sh(f"iw dev {CARD} link")
+        name = re.search(r"SSID: (.*)", link)
+        return (name.group(1), "ad-hoc" if "Joined IBSS" in link else "access point") if name else None
+
+    @staticmethod
+    def _rfkill():
+        (folder,) = Path("/sys/class/ieee80211/phy0").glob("rfkill*")
+        return folder
+
+    def switched_off(self):
+        return (self._rfkill() / "soft").read_text() == "1\n"
+
+    def switch(self, off):
+        """The soft switch of the card's radio."""
+        with open("/dev/rfkill", "wb", buffering=0) as device:
+            device.write(struct.pack("=IBBBB", int(self._rfkill().name[6:]), 0, 2, off, 0))
+
+    def addresses(self):
+        (link,) = json.loads(sh(f"ip -j -4 addr show {CARD}"))
+        return [f"{each['local']}/{each['prefixlen']}" for each in link["addr_info"]]
+
+    def log(self):
+        """What the daemons said."""
+        return ""
+
+
+class Supplicant(Host):
+    """A wpa_supplicant for the one card, with a network of its own; the address is the administrator's."""
+    home = air.HOME
+
+    def start(self):
+        path = Path("/etc/wpa_supplicant/lab.conf")
+        path.parent.mkdir(exist_ok=True)
+        path.write_text(SUPPLICANT)
+        self.daemons.append(spawn("wpa_supplicant", "-i", CARD, "-c", path, "-t", log="supplicant"))
+        sh(f"ip link set {CARD} up; ip addr add 192.168.50.20/24 brd + dev {CARD}; "
+           f"ip route add default via {air.ADDRESS['home']} dev {CARD} metric 600")
+
+    def ask(self, command):
+        return sh(f"wpa_cli -p /run/wpa_supplicant -i {CARD} {command}")
+
+    def state(self):
+        status = dict(line.split("=", 1) for line in self.ask("status").splitlines() if "=" in line)
+        networks = [re.sub(r"\t\S*$", lambda flags: flags.group().replace("[CURRENT]", ""), line)
+                    for line in self.ask("list_networks").splitlines()[1:]]
+        return super().state() | {"networks": networks, "status": {
+            key: status.get(key) for key in ("wpa_state", "ssid", "mode", "key_mgmt")}}
+
+    def log(self):
+        return air.log_of("supplicant")
+
+
+class NetworkManager(Host):
+    """The desktop: NetworkManager on its bus, home by a profile that is on disk."""
+    home = air.HOME
+    backend = "wpa_supplicant"
+
+    def start(self):
+        folder = Path("/etc/NetworkManager/system-connections")
+        sh("rm -rf /etc/NetworkManager/* /run/NetworkManager /var/lib/NetworkManager /run/dbus; mkdir /run/dbus")
+        folder.mkdir()
+        Path("/etc/NetworkManager/NetworkManager.conf").write_text(NETWORK_MANAGER.format(self.backend))
+        (folder / "home.nmconnection").write_text(HOME_PROFILE)
+        (folder / "home.nmconnection").chmod(0o600)
+        Path("/run/air/bus.conf").write_text(BUS)
+        # Without udev NetworkManager takes devices for ready only where sysfs is read-only.
+        sh("mount -o remount,bind,ro /sys")
+        self.daemons.append(spawn("dbus-daemon", "--config-file=/run/air/bus.conf", "--nofork", "--nopidfile"))
+        wait_until(Path("/run/dbus/system_bus_socket").exists, 10, "the bus")
+        self.start_supplicant()
+        self.start_daemon()
+
+    def start_supplicant(self):
+        self.daemons.append(spawn("wpa_supplicant", "-u", "-t", log="supplicant"))
+
+    def start_daemon(self):
+        self.daemon = spawn("NetworkManager", "--debug", log="networkmanager")
+        self.daemons.append(self.daemon)
+
+    @staticmethod
+    def nmcli(arguments):
+        return subprocess.run(["nmcli", "-t", *shlex.split(arguments)], capture_output=True, text=True,
+                              env=ENVIRONMENT, check=False).stdout
+
+    def state(self):
+        state = super().state()
+        fields = "GENERAL.DEVICE,GENERAL.STATE,GENERAL.CONNECTION,GENERAL.AUTOCONNECT,GENERAL.NM-MANAGED"
+        # A card that is being connected goes through states by itself.
+        state["devices"] = [re.sub(r"GENERAL.STATE:(4|5|6|7|8|9)0.*", "GENERAL.STATE:connecting",
+                                   self.nmcli(f"-f {fields} device show {card}")).splitlines()
+                            for card in (CARD, "eth0") if Path("/sys/class/net", card).exists()]
+        state["profiles"] = [line for line in
+                             self.nmcli("-f NAME,UUID,AUTOCONNECT,DEVICE,FILENAME connection").splitlines()
+                             if not line.startswith("lo:")]
+        state["files"] = {str(path): path.read_text() for folder in ("/etc", "/run") for path in
+                          Path(folder, "NetworkManager/system-connections").glob("*") if "lo.nm" not in str(path)}
+        return state
+
+    def log(self):
+        return air.log_of("networkmanager")
+
+
+class Iwd(NetworkManager):
+    """The same with iwd, which wants the kernel's ciphers through sockets."""
+    backend = "iwd"
+
+    def start_supplicant(self):
+        sh("modprobe -a af_alg algif_hash algif_skcipher algif_aead des_generic ecb md4 cmac ccm sha512_generic "
+           "pkcs8_key_parser; rm -rf /var/lib/iwd")
+        self.daemons.append(spawn("/usr/libexec/iwd", log="iwd"))
+
+    def log(self):
+        return air.log_of("iwd") + super().log()
+
+
+HOSTS = {"nobody": Host, "supplicant": Supplicant, "networkmanager": NetworkManager, "networkmanager-iwd": Iwd}
+
+
+def at_home(host):
+    return host.joined() == (host.home, "access point") and any(a.startswith("192.168.50.") for a in host.addresses())
+
+
+def main():
+    """usage: hosts.py HOST SCRIPT [ARGUMENT ...]: plays SCRIPT on that host, at home; a Python script finds the host
+    as `host`."""
+    host = HOSTS[sys.argv[1]]()
+    if host.home:
+        air.home()
+        start = time.monotonic()
+        try:
+            wait_until(lambda: at_home(host), 60, "at home")
+        except TimeoutError:
+            print(host.log(), host.state())
+            raise
+        print(f"At home after {time.monotonic() - start:.1f} s", flush=True)
+    sys.argv = sys.argv[2:]
+    if sys.argv[0] == "python3":
+        sys.argv.pop(0)
+        runpy.run_path(sys.argv[0], {"host": host, "air": air}, "__main__")
+    else:
+        sys.exit(subprocess.run(sys.argv, check=False).returncode)
+
+
+if __name__ == "__main__":
+    main()
