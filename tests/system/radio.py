@@ -30,12 +30,16 @@ HERE = Path(__file__).resolve().parent
 PROJECT = HERE.parents[1]
 BINARY = Path(os.environ.get("LA_BINARY", PROJECT / "build/debug/app/location-assistant")).resolve()
 LAB = PROJECT / ".lab"
+KERNEL = LAB / "machine/boot/vmlinux"
 SKIP = 77
 HOSTS = ("bare", "nobody", "supplicant", "networkmanager", "networkmanager-iwd")
 
 MODULES = ("virtio_pci", "9pnet_virtio", "9p", "overlay")
 # The lower folders of the root come first to last: what is unpacked for the laboratory, then this computer's own.
 LOWER = {"host": "/lab/root:/lab/machine:/host", "debian": "/lab/machine:/lab/debian"}
+
+PROGRAMS = ("NetworkManager", "nmcli", "wpa_supplicant", "wpa_cli", "iwd", "hostapd", "dnsmasq", "dbus-daemon",
+            "busybox", "iw", "ip", "ss", "nsenter", "sh", "modprobe")
 
 # Said of every hub that ends inside the machine, which is what ours is for.
 HUB_WARNING = b"qemu-system-x86_64: warning: hub 0 is not connected to host network\n"
@@ -62,8 +66,8 @@ def missing():
     """What the machine needs and is not here, or nothing."""
     if not shutil.which("qemu-system-x86_64"):
         return "no qemu-system-x86_64"
-    if not list(LAB.glob("machine/boot/vmlinuz-*")):
-        return f"no kernel in {LAB}/machine"
+    if not KERNEL.exists():
+        return f"no {KERNEL}"
     return None
 
 
@@ -94,6 +98,24 @@ def initial_root(folder, distribution, init):
     return path
 
 
+def needed():
+    """The files that the machine's programs consist of, as it sees them. It reads them before anything is timed: an idle
+    machine's clock runs on while a file comes from here, by as much as this computer is slow."""
+    environment = {"LD_LIBRARY_PATH": f"{LAB}/root/usr/lib/x86_64-linux-gnu", "PATH": "/usr/sbin:/usr/bin:/sbin:/bin"}
+    programs = [BINARY, BINARY.with_name(BINARY.name + "-dhcp-hook")]
+    for name in PROGRAMS:
+        unpacked = [path for path in (LAB / "root/usr").glob(f"*/{name}")]
+        programs += unpacked or [shutil.which(name, path=environment["PATH"])]
+    programs += (LAB / "root/usr/lib/x86_64-linux-gnu/NetworkManager").glob("*/*wifi.so")
+    files = set()
+    for program in filter(None, programs):
+        listed = subprocess.run(["ldd", program], env=environment, capture_output=True, text=True, check=False).stdout
+        files |= {str(program), *(word for line in listed.splitlines() for word in line.split() if word[0] == "/")}
+    below = str(LAB / "root")
+    return sorted(file.removeprefix(below) if file.startswith(below) else f"/host{file}" if file.startswith(str(PROJECT))
+                  or file.startswith(str(BINARY.parent)) else file for file in files)
+
+
 def boot(words, report, distribution="host", kernel_words="", memory=1500, limit=None, output=sys.stdout):
     """Runs the command `words` in a machine of its own. It finds the folder `report` at /report, and may write there.
     Returns its exit status, or None when the machine ended without one."""
@@ -102,16 +124,16 @@ def boot(words, report, distribution="host", kernel_words="", memory=1500, limit
         f"export LA_BINARY=/host{shlex.quote(str(BINARY))} PYTHONPATH=/host{shlex.quote(str(HERE / 'radio'))}\n"
         + "".join(f"export {key}={shlex.quote(value)}\n" for key, value in os.environ.items() if "SAN_OPTIONS" in key)
         + f"exec {shlex.join(map(str, words))}\n")
+    (report / "needed").write_text("\n".join(needed()) + "\n")
     (report / "status").unlink(missing_ok=True)
     init = f"/bin/sh /host{shlex.quote(str(HERE / 'radio/init'))}" if distribution == "host" else "/sbin/init"
-    (kernel,) = LAB.glob("machine/boot/vmlinuz-*")
     with tempfile.TemporaryDirectory() as folder:
         machine = subprocess.Popen([
             "setpriv", "--pdeathsig", "KILL",
             "qemu-system-x86_64", "-nodefaults", "-no-user-config", "-display", "none", "-no-reboot",
             "-accel", "tcg,thread=single", "-icount", "shift=1,sleep=off", "-rtc", "clock=vm", "-smp", "1",
-            "-m", str(memory), "-kernel", kernel, "-initrd", initial_root(Path(folder), distribution, init),
-            "-append", f"console=ttyS0 panic=-1 loglevel=3 net.ifnames=0 {kernel_words}", "-serial", "stdio",
+            "-m", str(memory), "-kernel", KERNEL, "-initrd", initial_root(Path(folder), distribution, init),
+            "-append", f"console=ttyS0 panic=-1 loglevel=3 mitigations=off cryptomgr.notests net.ifnames=0 {kernel_words}", "-serial", "stdio",
             "-virtfs", "local,path=/,mount_tag=files,security_model=none,readonly=on,multidevs=remap",
             "-virtfs", f"local,path={LAB},mount_tag=lab,security_model=none,readonly=on",
             "-virtfs", f"local,path={report},mount_tag=report,security_model=none",

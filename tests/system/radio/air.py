@@ -10,6 +10,7 @@ from pathlib import Path
 
 SYSTEM = Path(__file__).resolve().parents[1]
 LOGS = Path("/run/air")
+SYSFS = LOGS / "sys"  # writable: the one at /sys need not be
 PLACES = {"printer": "wlan1", "home": "wlan2", "ear": "wlan3"}
 ADDRESS = {"printer": "192.0.0.192", "home": "192.168.50.1"}
 HOME, HOME_KEY = "Home", "home sweet home"
@@ -26,11 +27,12 @@ def sh(script):
 
 def wait_until(condition, seconds, what):
     """Waits for a condition and returns its value."""
-    deadline = time.monotonic() + seconds
+    start = time.monotonic()
     while not (value := condition()):
-        if time.monotonic() > deadline:
+        waited = time.monotonic() - start
+        if waited > seconds:
             raise TimeoutError(f"not within {seconds} s: {what}")
-        time.sleep(0.2)
+        time.sleep(0.2 + waited / 10)  # asking is what costs in an emulator
     return value
 
 
@@ -63,13 +65,30 @@ def log_of(name):
 def make():
     """Brings the radios and what answers at their places; no network is on the air yet."""
     LOGS.mkdir()
-    sh("modprobe mac80211_hwsim radios=4; modprobe -a ccm cmac gcm ctr")
+    sh(f"""
+        modprobe mac80211_hwsim radios=4
+        modprobe -a ccm cmac gcm ctr e1000
+        mkdir {SYSFS}
+        mount -t sysfs sysfs {SYSFS}
+    """)
     for place, device in PLACES.items():
         sh(f"ip netns add {place}; iw phy phy{device[-1]} set netns name {place}; ip -n {place} link set lo up")
+    # The other end of the wired card's cable: a carrier, and nobody who answers.
+    sh("ip link set eth1 netns ear; ip -n ear link set eth1 up")
+    wired_card(False)
     for place, address in ADDRESS.items():
         sh(f"ip -n {place} addr add {address}/24 dev {PLACES[place]}")
     spawn("python3", "-B", SYSTEM / "printer.py", "well", LOGS / "printer.log", place="printer")
     wait_until(lambda: ":80 " in at("printer", "ss -Hltn"), 20, "the printer's web server")
+
+
+def wired_card(present):
+    """Plugs the wired card eth0 in or out."""
+    slots = {path.name for path in Path(SYSFS, "bus/pci/devices").iterdir()
+             if (path / "device").read_text() == "0x100e\n" and (path / "net/eth0").exists() != present}
+    bound = {path.name for path in Path(SYSFS, "bus/pci/drivers/e1000").iterdir()}
+    slot = min(slots - bound if present else slots & bound)
+    Path(SYSFS, "bus/pci/drivers/e1000", "bind" if present else "unbind").write_text(slot)
 
 
 def heard():
@@ -95,9 +114,11 @@ class Network:
         self.start()
 
     def start(self):
-        (self._join_ad_hoc if self.adhoc else self._offer)()
-        wait_until(lambda: self.hidden or f"ssid {self.name}" in at(self.place, f"iw dev {self.device} info"), 20,
-                   f"{self.name} on the air")
+        if self.adhoc:
+            self._join_ad_hoc()
+            wait_until(lambda: self.name in {name for name, _, _ in heard()}, 30, f"{self.name} on the air")
+        else:
+            self._offer()
         if self.dhcp:
             net = ADDRESS[self.place].rsplit(".", 1)[0]
             self.processes.append(spawn(

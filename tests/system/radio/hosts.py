@@ -18,6 +18,7 @@ from air import sh, spawn, wait_until
 CARD = "wlan0"
 STORE = Path("/var/lib/location-assistant")
 RUNTIME = Path("/run/location-assistant")
+RESIDENT = 4242  # the user who sits at the computer
 ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
     key: value for key, value in os.environ.items() if key.endswith("SAN_OPTIONS")}
 
@@ -59,7 +60,7 @@ network={{
 
 class Host:
     """The machine with nobody who runs its network, and what every machine has: the tool and the system log."""
-    home = None
+    has_home = False
 
     def __init__(self):
         self.syslog = []
@@ -67,8 +68,11 @@ class Host:
         listener.bind("/dev/log")
         threading.Thread(target=self._listen, args=(listener,), daemon=True).start()
         air.make()
+        self.home = air.home() if self.has_home else None
         self.daemons = []
-        self.start()
+        self.begin()
+        self.pristine = self.state()
+        self.untouched = True  # the state is still that, by the last look at it
 
     def _listen(self, listener):
         while True:
@@ -76,29 +80,44 @@ class Host:
             if "location-assistant" in line:
                 self.syslog.append(line.split("location-assistant", 1)[1])
 
+    def begin(self):
+        """Starts what runs the network and waits until the card is at home."""
+        self.start()
+        if self.home:
+            wait_until(self.at_home, 90, "at home")
+
     def start(self):
         pass
 
-    def stop(self):
+    def at_home(self):
+        return self.joined() == (air.HOME, "access point") and any(a.startswith("192.168.50.") for a in self.addresses())
+
+    def begin_again(self):
+        """Makes the machine what it was at its start, whatever was left behind."""
         for daemon in reversed(self.daemons):
             air.end(daemon)
         self.daemons.clear()
-
-    def begin_again(self):
-        """Makes the machine what it was at its start, whatever a row left behind."""
-        self.stop()
-        sh(f"rm -rf {STORE} {RUNTIME} /tmp/set.orig /tmp/zat.orig; pkill -x busybox || :; "
-           f"for radio in /sys/class/rfkill/*; do :; done; "
-           f"iw dev {CARD} disconnect; iw dev {CARD} ibss leave; ip link set {CARD} down; iw dev {CARD} set type managed; "
-           f"ip addr flush dev {CARD}; echo nameserver 203.0.113.53 >/etc/resolv.conf".replace("; ", " || :; "))
-        self.start()
+        self.switch(False)
+        sh(f"rm -rf {STORE} {RUNTIME} /tmp/set.orig /tmp/zat.orig; echo nameserver 203.0.113.53 >/etc/resolv.conf")
+        for command in (f"iw dev {CARD} disconnect", f"iw dev {CARD} ibss leave", f"ip link set {CARD} down",
+                        f"iw dev {CARD} set type managed", f"ip addr flush dev {CARD}", "pkill -f udhcpc"):
+            subprocess.run(command.split(), capture_output=True, check=False)
+        self.begin()
 
     def tool(self, *words, seconds=300, **options):
         """Runs the tool; returns its trace and the seconds that it took."""
         start = time.monotonic()
-        result = subprocess.run([os.environ["LA_BINARY"], *words], capture_output=True, text=True, env=ENVIRONMENT,
-                                cwd="/", timeout=seconds, check=False, **{"stdin": subprocess.DEVNULL} | options)
-        return result.stdout + result.stderr, time.monotonic() - start
+        run = self.begin_tool(*words, **options)
+        trace = run.communicate(timeout=seconds)[0]
+        if run.returncode != 0:
+            raise AssertionError(f"exit status {run.returncode}: {trace}")
+        return trace, time.monotonic() - start
+
+    @staticmethod
+    def begin_tool(*words, **options):
+        return subprocess.Popen([os.environ["LA_BINARY"], *words], text=True, env=ENVIRONMENT, cwd="/",
+                                **{"stdin": subprocess.DEVNULL, "stdout": subprocess.PIPE, "stderr": subprocess.STDOUT}
+                                | options)
 
     def state(self):
         """What has to be the same before and after; nothing in it tells of time."""
@@ -147,7 +166,7 @@ class Host:
 
 class Supplicant(Host):
     """A wpa_supplicant for the one card, with a network of its own; the address is the administrator's."""
-    home = air.HOME
+    has_home = True
 
     def start(self):
         path = Path("/etc/wpa_supplicant/lab.conf")
@@ -173,7 +192,7 @@ class Supplicant(Host):
 
 class NetworkManager(Host):
     """The desktop: NetworkManager on its bus, home by a profile that is on disk."""
-    home = air.HOME
+    has_home = True
     backend = "wpa_supplicant"
 
     def start(self):
@@ -207,7 +226,8 @@ class NetworkManager(Host):
         state = super().state()
         fields = "GENERAL.DEVICE,GENERAL.STATE,GENERAL.CONNECTION,GENERAL.AUTOCONNECT,GENERAL.NM-MANAGED"
         # A card that is being connected goes through states by itself.
-        state["devices"] = [re.sub(r"GENERAL.STATE:(4|5|6|7|8|9)0.*", "GENERAL.STATE:connecting",
+        underway = r"GENERAL.STATE:(?:[4-9]0|120) .*"
+        state["devices"] = [re.sub(underway, "GENERAL.STATE:connecting",
                                    self.nmcli(f"-f {fields} device show {card}")).splitlines()
                             for card in (CARD, "eth0") if Path("/sys/class/net", card).exists()]
         state["profiles"] = [line for line in
@@ -216,6 +236,17 @@ class NetworkManager(Host):
         state["files"] = {str(path): path.read_text() for folder in ("/etc", "/run") for path in
                           Path(folder, "NetworkManager/system-connections").glob("*") if "lo.nm" not in str(path)}
         return state
+
+    def start_desktop(self):
+        """Lets the resident sit at the computer; what their browser is told goes to /tmp/browser."""
+        sh(f"""
+            id resident 2>/dev/null || echo 'resident:x:{RESIDENT}:{RESIDENT}::/:/bin/sh' >>/etc/passwd
+            printf '#!/bin/sh\\necho "$(id -un) opens $*" >>/tmp/browser\\n' >/usr/bin/xdg-open
+            chmod 755 /usr/bin/xdg-open
+        """)
+        manager = Path(os.environ["LA_BINARY"]).parents[1] / "tests/system/login_manager"
+        self.daemons.append(spawn(manager, "/run/dbus/system_bus_socket", RESIDENT, log="login"))
+        wait_until(lambda: "ready" in air.log_of("login"), 10, "the login manager")
 
     def log(self):
         return air.log_of("networkmanager")
@@ -230,6 +261,11 @@ class Iwd(NetworkManager):
            "pkcs8_key_parser; rm -rf /var/lib/iwd")
         self.daemons.append(spawn("/usr/libexec/iwd", log="iwd"))
 
+    def start_daemon(self):
+        super().start_daemon()
+        # iwd joins by itself what it has joined before, and NetworkManager leaves that to it.
+        wait_until(lambda: "activated" in self.nmcli(f"-w 30 connection up {air.HOME}"), 60, "home joined for the first time")
+
     def log(self):
         return air.log_of("iwd") + super().log()
 
@@ -237,23 +273,11 @@ class Iwd(NetworkManager):
 HOSTS = {"nobody": Host, "supplicant": Supplicant, "networkmanager": NetworkManager, "networkmanager-iwd": Iwd}
 
 
-def at_home(host):
-    return host.joined() == (host.home, "access point") and any(a.startswith("192.168.50.") for a in host.addresses())
-
-
 def main():
     """usage: hosts.py HOST SCRIPT [ARGUMENT ...]: plays SCRIPT on that host, at home; a Python script finds the host
     as `host`."""
     host = HOSTS[sys.argv[1]]()
-    if host.home:
-        air.home()
-        start = time.monotonic()
-        try:
-            wait_until(lambda: at_home(host), 60, "at home")
-        except TimeoutError:
-            print(host.log(), host.state())
-            raise
-        print(f"At home after {time.monotonic() - start:.1f} s", flush=True)
+    print("ready", Path("/proc/uptime").read_text(), flush=True)
     sys.argv = sys.argv[2:]
     if sys.argv[0] == "python3":
         sys.argv.pop(0)

@@ -1,0 +1,66 @@
+#!/usr/bin/env python3
+"""The rows of the radio laboratory, for the test runner.
+
+usage: radio_rows.py list               the hosts and their rows
+       radio_rows.py play HOST [ROW ...]    plays the rows in one machine and keeps each one's result and log
+       radio_rows.py judge HOST ROW     tells of the row as it was played: exit status, and the log when it failed
+"""
+import os
+import shutil
+import sys
+from pathlib import Path
+
+import radio
+
+sys.path.insert(0, str(radio.HERE / "radio"))
+import rows  # noqa: E402
+
+BUILD = Path(os.environ.get("LA_BUILD", radio.BINARY.parents[1])).resolve()
+
+
+def results(host):
+    return BUILD / "radio" / host
+
+
+def skip(reason):
+    print("LABORATORY SKIP:", reason)
+    sys.exit(1 if os.environ.get("LA_FORBID_SKIPS") == "1" else radio.SKIP)
+
+
+def play(host, *chosen):
+    folder = results(host)
+    shutil.rmtree(folder, ignore_errors=True)
+    folder.mkdir(parents=True)
+    if reason := radio.missing():
+        (folder / "skipped").write_text(reason)
+        skip(reason)
+    status = radio.boot(["python3", f"/host{radio.HERE}/radio/rows.py", host, *chosen], folder)
+    sys.exit(0 if status == 0 else 1)
+
+
+def judge(host, name):
+    folder = results(host)
+    if (folder / "skipped").exists():
+        skip((folder / "skipped").read_text())
+    result = folder / f"{name}.result"
+    if not result.exists():
+        sys.exit(f"{name} did not run: see the test that boots the machine")
+    print((folder / f"{name}.log").read_text())
+    sys.exit(0 if result.read_text() == "held" else 1)
+
+
+def main():
+    match sys.argv[1:]:
+        case ["list"]:
+            for host in rows.hosts.HOSTS:
+                print(host, *rows.rows_of(host))
+        case ["play", host, *chosen]:
+            play(host, *chosen)
+        case ["judge", host, name]:
+            judge(host, name)
+        case _:
+            sys.exit(__doc__)
+
+
+if __name__ == "__main__":
+    main()
