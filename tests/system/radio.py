@@ -104,7 +104,7 @@ def needed():
     environment = {"LD_LIBRARY_PATH": f"{LAB}/root/usr/lib/x86_64-linux-gnu", "PATH": "/usr/sbin:/usr/bin:/sbin:/bin"}
     programs = [BINARY, BINARY.with_name(BINARY.name + "-dhcp-hook")]
     for name in PROGRAMS:
-        unpacked = [path for path in (LAB / "root/usr").glob(f"*/{name}")]
+        unpacked = [path for path in (LAB / "root/usr").glob(f"*/{name}") if path.is_file()]
         programs += unpacked or [shutil.which(name, path=environment["PATH"])]
     programs += (LAB / "root/usr/lib/x86_64-linux-gnu/NetworkManager").glob("*/*wifi.so")
     files = set()

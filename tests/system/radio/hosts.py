@@ -82,9 +82,13 @@ class Host:
 
     def begin(self):
         """Starts what runs the network and waits until the card is at home."""
-        self.start()
-        if self.home:
-            wait_until(self.at_home, 90, "at home")
+        try:
+            self.start()
+            if self.home:
+                wait_until(self.at_home, 90, "at home")
+        except (RuntimeError, TimeoutError):
+            print(self.log()[-20000:])
+            raise
 
     def start(self):
         pass
@@ -263,8 +267,10 @@ class Iwd(NetworkManager):
 
     def start_daemon(self):
         super().start_daemon()
-        # iwd joins by itself what it has joined before, and NetworkManager leaves that to it.
-        wait_until(lambda: "activated" in self.nmcli(f"-w 30 connection up {air.HOME}"), 60, "home joined for the first time")
+        # iwd joins by itself what it has joined before, and NetworkManager leaves that to it. The first time counts:
+        # NetworkManager gives iwd the key of a profile that was never activated, and asks for a new one afterwards.
+        wait_until(lambda: f"{air.HOME}\n" in self.nmcli("-f SSID device wifi list"), 60, "home heard")
+        self.nmcli(f"-w 60 connection up {air.HOME}")
 
     def log(self):
         return air.log_of("iwd") + super().log()
