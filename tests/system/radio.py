@@ -16,6 +16,7 @@ there, joined to a network "home" when SCRIPT begins:
 The machine's clock counts instructions and idle time is skipped: it keeps time however busy this computer is.
 Environment: LA_BINARY, the tool; RADIO_LIMIT, after how many seconds the machine is ended (600).
 """
+import glob
 import gzip
 import os
 import shlex
@@ -39,7 +40,12 @@ MODULES = ("virtio_pci", "9pnet_virtio", "9p", "overlay")
 LOWER = {"host": "/lab/root:/lab/machine:/host", "debian": "/lab/machine:/lab/debian"}
 
 PROGRAMS = ("NetworkManager", "nmcli", "wpa_supplicant", "wpa_cli", "iwd", "hostapd", "dnsmasq", "dbus-daemon",
-            "busybox", "iw", "ip", "ss", "nsenter", "sh", "modprobe")
+            "busybox", "iw", "ip", "ss", "nsenter", "sh", "rm", "mkdir", "id", "python3", "wpa_action")
+
+READ = ("/bin", "/sbin", "/lib", "/lib64", "/etc/ld.so.cache", "/etc/nsswitch.conf", "/etc/passwd", "/etc/group", "/etc/hosts",
+        "/etc/host.conf", "/etc/gai.conf", "/etc/services", "/etc/protocols", "/etc/localtime", "/etc/ssl/openssl.cnf",
+        "/etc/iproute2/*", "/usr/lib/locale/C.utf8/*", "/usr/lib/locale/C.utf8/*/*", "/usr/lib/x86_64-linux-gnu/libnss_*",
+        "/usr/lib/x86_64-linux-gnu/gconv/gconv-modules.cache", "/usr/lib/x86_64-linux-gnu/ossl-modules/*")
 
 # Said of every hub that ends inside the machine, which is what ours is for.
 HUB_WARNING = b"qemu-system-x86_64: warning: hub 0 is not connected to host network\n"
@@ -99,32 +105,34 @@ def initial_root(folder, distribution, init):
 
 
 def needed():
-    """The files that the machine's programs consist of, as it sees them. It reads them before anything is timed: an idle
-    machine's clock runs on while a file comes from here, by as much as this computer is slow."""
-    environment = {"LD_LIBRARY_PATH": f"{LAB}/root/usr/lib/x86_64-linux-gnu", "PATH": "/usr/sbin:/usr/bin:/sbin:/bin"}
-    programs = [BINARY, BINARY.with_name(BINARY.name + "-dhcp-hook")]
+    """The files that the machine's programs consist of, as it sees them; it copies them before anything is timed. Every
+    file that is opened here asks this computer, and meanwhile the idle machine's clock runs on, by as much as this
+    computer is slow."""
+    unpacked = LAB / "root"
+    environment = {"LD_LIBRARY_PATH": f"{unpacked}/usr/lib/x86_64-linux-gnu", "PATH": "/usr/sbin:/usr/bin:/sbin:/bin"}
+    programs = [BINARY, *(unpacked / "usr/lib/x86_64-linux-gnu/NetworkManager").glob("*/*.so")]
     for name in PROGRAMS:
-        unpacked = [path for path in (LAB / "root/usr").glob(f"*/{name}") if path.is_file()]
-        programs += unpacked or [shutil.which(name, path=environment["PATH"])]
-    programs += (LAB / "root/usr/lib/x86_64-linux-gnu/NetworkManager").glob("*/*wifi.so")
-    files = set()
+        here = [path for path in (unpacked / "usr").glob(f"*/{name}") if path.is_file()]
+        programs += here or [shutil.which(name, path=environment["PATH"])]
+    files = {Path(each) for pattern in READ for each in glob.glob(pattern)}
     for program in filter(None, programs):
         listed = subprocess.run(["ldd", program], env=environment, capture_output=True, text=True, check=False).stdout
-        files |= {str(program), *(word for line in listed.splitlines() for word in line.split() if word[0] == "/")}
-    below = str(LAB / "root")
-    return sorted(file.removeprefix(below) if file.startswith(below) else f"/host{file}" if file.startswith(str(PROJECT))
-                  or file.startswith(str(BINARY.parent)) else file for file in files)
+        files |= {Path(program), *(Path(word) for line in listed.splitlines() for word in line.split() if word[0] == "/")}
+    files |= {file.resolve() for file in files}
+    return sorted(f"/{file.relative_to(unpacked)}" if file.is_relative_to(unpacked) else str(file) for file in files
+                  if not file.is_relative_to(BINARY.parent))
 
 
 def boot(words, report, distribution="host", kernel_words="", memory=1500, limit=None, output=sys.stdout):
     """Runs the command `words` in a machine of its own. It finds the folder `report` at /report, and may write there.
     Returns its exit status, or None when the machine ended without one."""
     (report / "command").write_text(
-        "export PATH=/usr/sbin:/usr/bin:/sbin:/bin LANG=C.UTF-8 PYTHONDONTWRITEBYTECODE=1 PYTHONUNBUFFERED=1\n"
-        f"export LA_BINARY=/host{shlex.quote(str(BINARY))} PYTHONPATH=/host{shlex.quote(str(HERE / 'radio'))}\n"
+        "export PATH=/usr/sbin:/usr/bin:/sbin:/bin LC_ALL=C PYTHONUTF8=1 PYTHONCOERCECLOCALE=0 PYTHONDONTWRITEBYTECODE=1 PYTHONUNBUFFERED=1\n"
+        f"export LA_BINARY=/build/app/{BINARY.name} PYTHONPATH=/host{shlex.quote(str(HERE / 'radio'))}\n"
         + "".join(f"export {key}={shlex.quote(value)}\n" for key, value in os.environ.items() if "SAN_OPTIONS" in key)
         + f"exec {shlex.join(map(str, words))}\n")
     (report / "needed").write_text("\n".join(needed()) + "\n")
+    (report / "build").write_text(str(BINARY.parents[1]))
     (report / "status").unlink(missing_ok=True)
     init = f"/bin/sh /host{shlex.quote(str(HERE / 'radio/init'))}" if distribution == "host" else "/sbin/init"
     with tempfile.TemporaryDirectory() as folder:
