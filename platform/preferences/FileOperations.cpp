@@ -16,14 +16,6 @@ int FileOperations::open(const std::string& path, int flags, mode_t mode) {
     return ::open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, mode);
 }
 
-int FileOperations::setOwner(int descriptor, uid_t user, gid_t group) {
-    return ::fchown(descriptor, user, group);
-}
-
-int FileOperations::setMode(int descriptor, mode_t mode) {
-    return ::fchmod(descriptor, mode);
-}
-
 ssize_t FileOperations::write(int descriptor, std::string_view bytes) {
     return ::write(descriptor, bytes.data(), bytes.size());
 }

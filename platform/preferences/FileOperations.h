@@ -20,8 +20,6 @@ class FileOperations {
     virtual int makeDirectory(const std::string& path, mode_t mode);
     // O_CLOEXEC, O_NOFOLLOW and O_NONBLOCK are added to the flags.
     virtual int open(const std::string& path, int flags, mode_t mode);
-    virtual int setOwner(int descriptor, uid_t user, gid_t group);
-    virtual int setMode(int descriptor, mode_t mode);
     virtual ssize_t write(int descriptor, std::string_view bytes);
     virtual int sync(int descriptor);
     // The descriptor is closed on failure too.

@@ -46,6 +46,14 @@ Outcome checkRegular(const struct stat& status, const std::string& path) {
     return {};
 }
 
+// Whether nobody but this process's user, or root, can change what is there.
+Outcome checkTrusted(const struct stat& status, const std::string& path) {
+    if ((status.st_uid != ::geteuid() && status.st_uid != 0) || (status.st_mode & (S_IWGRP | S_IWOTH)) != 0) {
+        return {kSCStatusFailed, path + " belongs to somebody else, or others may write to it"};
+    }
+    return {};
+}
+
 // Whether the directory, or the nearest one above it that exists, can be written to.
 Outcome checkCouldMake(std::string directory) {
     while (::faccessat(AT_FDCWD, directory.c_str(), W_OK | X_OK, AT_EACCESS) != 0) {
@@ -90,6 +98,17 @@ StoreFile::StoreFile(std::string directory, FileOperations& operations)
       temporaryPath_(path_ + ".new"),
       operations_(&operations) {}
 
+Outcome StoreFile::checkDirectory() const {
+    struct stat status {};
+    if (::lstat(directory_.c_str(), &status) != 0) {
+        return Outcome::fromErrno("cannot look at " + directory_);
+    }
+    if (!S_ISDIR(status.st_mode)) {
+        return {kSCStatusFailed, directory_ + " is not a directory"};
+    }
+    return checkTrusted(status, directory_);
+}
+
 Outcome StoreFile::look(std::optional<FileIdentity>& identity) const {
     identity.reset();
     struct stat status {};
@@ -107,6 +126,10 @@ Outcome StoreFile::read(std::string& content, KnownFile& known) const {
     FileDescriptor file(operations_->open(path_, O_RDONLY, 0));
     if (!file.isOpen()) {
         return Outcome::fromErrno("cannot open " + path_);
+    }
+    Outcome trusted = checkDirectory();
+    if (!trusted.ok()) {
+        return trusted;
     }
     for (int attempt = 0; attempt < readTries; ++attempt) {
         struct stat status {};
@@ -140,8 +163,12 @@ Outcome StoreFile::makeDirectories() {
         if (operations_->makeDirectory(*path, mode) != 0 && errno != EEXIST) {
             return Outcome::fromErrno("cannot make " + *path);
         }
+        Outcome synced = syncDirectory(parentOf(*path));
+        if (!synced.ok()) {
+            return synced;
+        }
     }
-    return {};
+    return checkDirectory();
 }
 
 Outcome StoreFile::lock(std::chrono::milliseconds wait, FileDescriptor& lock) {
@@ -153,6 +180,17 @@ Outcome StoreFile::lock(std::chrono::milliseconds wait, FileDescriptor& lock) {
     FileDescriptor file(operations_->open(path, O_RDWR | O_CREAT, newFileMode));
     if (!file.isOpen()) {
         return Outcome::fromErrno("cannot open " + path);
+    }
+    struct stat status {};
+    if (::fstat(file.get(), &status) != 0) {
+        return Outcome::fromErrno("cannot look at " + path);
+    }
+    Outcome usable = checkRegular(status, path);
+    if (usable.ok()) {
+        usable = checkTrusted(status, path);
+    }
+    if (!usable.ok()) {
+        return usable;
     }
     const auto deadline = std::chrono::steady_clock::now() + wait;
     while (::flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
@@ -182,26 +220,6 @@ Outcome StoreFile::fill(int descriptor, std::string_view content) {
     return {};
 }
 
-Outcome StoreFile::keepOwnership(int descriptor) {
-    struct stat before {};
-    if (::lstat(path_.c_str(), &before) != 0) {
-        return errno == ENOENT ? Outcome() : Outcome::fromErrno("cannot look at " + path_);
-    }
-    struct stat now {};
-    if (::fstat(descriptor, &now) != 0) {
-        return Outcome::fromErrno("cannot look at " + temporaryPath_);
-    }
-    const bool otherOwner = before.st_uid != now.st_uid || before.st_gid != now.st_gid;
-    if (otherOwner && operations_->setOwner(descriptor, before.st_uid, before.st_gid) != 0) {
-        return Outcome::fromErrno("cannot give " + temporaryPath_ + " its owner");
-    }
-    const mode_t permissions = before.st_mode & 07777U;
-    if (permissions != (now.st_mode & 07777U) && operations_->setMode(descriptor, permissions) != 0) {
-        return Outcome::fromErrno("cannot give " + temporaryPath_ + " its mode");
-    }
-    return {};
-}
-
 Outcome StoreFile::writeTemporary(std::string_view content, std::optional<FileIdentity>& identity) {
     // Nobody but the lock's holder makes this file, so one that is there was left behind by a crash.
     if (operations_->remove(temporaryPath_) != 0 && errno != ENOENT) {
@@ -212,9 +230,6 @@ Outcome StoreFile::writeTemporary(std::string_view content, std::optional<FileId
         return Outcome::fromErrno("cannot make " + temporaryPath_);
     }
     Outcome done = fill(file.get(), content);
-    if (done.ok()) {
-        done = keepOwnership(file.get());
-    }
     if (done.ok() && operations_->sync(file.get()) != 0) {
         done = Outcome::fromErrno("cannot put " + temporaryPath_ + " on the disk");
     }
@@ -228,10 +243,10 @@ Outcome StoreFile::writeTemporary(std::string_view content, std::optional<FileId
     return done;
 }
 
-Outcome StoreFile::syncDirectory() {
-    const FileDescriptor directory(operations_->open(directory_ + "/.", O_RDONLY | O_DIRECTORY, 0));
+Outcome StoreFile::syncDirectory(const std::string& path) {
+    const FileDescriptor directory(operations_->open(path + "/.", O_RDONLY | O_DIRECTORY, 0));
     if (!directory.isOpen() || operations_->sync(directory.get()) != 0) {
-        return Outcome::fromErrno("cannot put " + directory_ + " on the disk");
+        return Outcome::fromErrno("cannot put " + path + " on the disk");
     }
     return {};
 }
@@ -265,7 +280,7 @@ Outcome StoreFile::replace(std::string_view content, std::optional<KnownFile>& k
     if (written) {
         known = recognize(*written);
     }
-    return syncDirectory();
+    return syncDirectory(directory_);
 }
 
 }  // namespace platform::preferences

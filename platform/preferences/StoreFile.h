@@ -40,7 +40,8 @@ struct KnownFile {
 // "preferences.plist" in one directory, "preferences.lock" beside it, and "preferences.plist.new" while a
 // commit writes. A symbolic link in the place of any of them is refused, wherever it leads: the store of a
 // tool that runs as root has no business elsewhere. So is everything else that is no regular file, and none
-// of it is ever waited for.
+// of it is ever waited for. The directory and the lock must belong to this process's user or to root, and
+// nobody else may write to them: whoever could would choose the network that root configures.
 class StoreFile {
   public:
     StoreFile(std::string directory, FileOperations& operations);
@@ -53,20 +54,22 @@ class StoreFile {
     // All of the file, and what it was when it was read. Fails beyond largestPreferencesFile.
     Outcome read(std::string& content, KnownFile& known) const;
     // Takes the lock, which goes with the descriptor. Makes the directory (0700) and its parents when they
-    // are missing. 3002 when another process keeps it for the whole wait.
+    // are missing, on the disk before anything is put into them. 3002 when another process keeps it for the
+    // whole wait.
     Outcome lock(std::chrono::milliseconds wait, FileDescriptor& lock);
-    // Puts the content in the file's place, all of it or nothing, on the disk when the call returns. A new
-    // file has mode 0600, a replaced one keeps its mode and owner. The lock must be held. known is what
+    // Puts the content in the file's place, all of it or nothing, on the disk when the call returns. The file
+    // then has mode 0600, whatever it had before: it holds passwords. The lock must be held. known is what
     // the file then is: set as soon as the new content has its place, even when the call fails after that,
     // and nothing, on success too, when somebody else touched the file at that very moment.
     Outcome replace(std::string_view content, std::optional<KnownFile>& known);
 
   private:
+    // That the directory is one, and nobody else can change what is in it.
+    [[nodiscard]] Outcome checkDirectory() const;
     Outcome makeDirectories();
     Outcome writeTemporary(std::string_view content, std::optional<FileIdentity>& identity);
     Outcome fill(int descriptor, std::string_view content);
-    Outcome keepOwnership(int descriptor);
-    Outcome syncDirectory();
+    Outcome syncDirectory(const std::string& path);
     [[nodiscard]] std::optional<KnownFile> recognize(FileIdentity written) const;
 
     std::string directory_;

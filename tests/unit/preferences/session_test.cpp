@@ -83,11 +83,15 @@ TEST_F(SessionTest, TheLockKeepsOthersOut) {
     EXPECT_EQ(testing_support::Child(tryAsOther).wait(), 0);
     EXPECT_EQ(tryAsOther(), 0) << "another session of the same process";
     ASSERT_TRUE(set(session, "/Sets/3", "three") && commit(session));
+    EXPECT_TRUE(SCPreferencesLock(session.get(), 0)) << "twice, though the file is another one now";
     EXPECT_EQ(testing_support::Child(tryAsOther).wait(), 0) << "a commit keeps the lock";
     session = {};
     session = open();
     EXPECT_TRUE(SCPreferencesLock(session.get(), 0)) << "the lock ended with the session";
     EXPECT_TRUE(SCPreferencesUnlock(session.get()));
+    ASSERT_TRUE(set(session, "/Sets/4", "four") && commit(session));
+    SessionRef next = open();
+    EXPECT_TRUE(SCPreferencesLock(next.get(), 0)) << "a commit that took the lock gives it back";
 }
 
 TEST_F(SessionTest, ManyProcessesLoseNothing) {

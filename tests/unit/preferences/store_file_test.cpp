@@ -9,7 +9,10 @@
 namespace preferences_test {
 namespace {
 
-using StoreFileTest = StoreTest;
+class StoreFileTest : public StoreTest {
+  protected:
+    std::string lockFile = directory.at("store/preferences.lock");
+};
 
 TEST_F(StoreFileTest, WhatIsNoPreferencesFileIsRefusedAndLeftAlone) {
     const auto write = [this](const char* content) {
@@ -27,6 +30,9 @@ TEST_F(StoreFileTest, WhatIsNoPreferencesFileIsRefusedAndLeftAlone) {
         {"a link to a good file",
          [this] { std::filesystem::create_symlink(directory.write("good", smallTree), file); },
          "symbolic link"},
+        {"65 MiB",
+         [this] { std::filesystem::resize_file(directory.write("store/preferences.plist", ""), 65U << 20U); },
+         "larger than"},
         {"a FIFO", [this] { ASSERT_EQ(mkfifo(file.c_str(), 0600), 0); }, "not a regular file"},
     };
     for (const auto& row : rows) {
@@ -74,18 +80,61 @@ TEST_F(StoreFileTest, TheFirstRunTreeIsCommittedAsItIs) {
     EXPECT_TRUE(CFEqual(parsed(contentOf(file)).get(), expected.get())) << contentOf(file);
 }
 
-TEST_F(StoreFileTest, WhatItMakesIsPrivateAndWhatItReplacesKeepsItsMode) {
+TEST_F(StoreFileTest, WhatItWritesIsPrivate) {
     const mode_t before = umask(0);
-    SessionRef session = open();
-    ASSERT_TRUE(commit(session));
-    EXPECT_EQ(statusOf(file).st_mode & 07777U, 0600U);
-    EXPECT_EQ(statusOf(store + "/preferences.lock").st_mode & 07777U, 0600U);
-    ASSERT_EQ(chmod(file.c_str(), 0644), 0);
-    session = open();
-    umask(077);
-    ASSERT_TRUE(set(session, "/Sets/1", "a") && commit(session));
-    EXPECT_EQ(statusOf(file).st_mode & 07777U, 0644U);
+    std::filesystem::remove_all(store);
+    for (const mode_t wide : {0600U, 0666U, 0640U}) {
+        SessionRef session = open();
+        ASSERT_TRUE(set(session, "/Sets/1", std::to_string(wide)) && commit(session));
+        EXPECT_EQ(statusOf(store).st_mode & 07777U, 0700U);
+        EXPECT_EQ(statusOf(file).st_mode & 07777U, 0600U);
+        EXPECT_EQ(statusOf(lockFile).st_mode & 07777U, 0600U);
+        ASSERT_EQ(chmod(file.c_str(), wide), 0);
+    }
     umask(before);
+}
+
+// The tool runs as root: whoever can change the store, or hold its lock, decides on the network.
+TEST_F(StoreFileTest, WhatOthersCanChangeIsNotUsed) {
+    const struct {
+        const char* what;
+        std::function<void()> make;
+        bool opens;
+        const char* reason;
+    } rows[] = {
+        {"a folder that the group may write to", [this] { ASSERT_EQ(chmod(store.c_str(), 0770), 0); }, false,
+         "others may write"},
+        {"a folder that everybody may write to", [this] { ASSERT_EQ(chmod(store.c_str(), 0702), 0); }, false,
+         "others may write"},
+        {"a link to a folder",
+         [this] {
+             std::filesystem::rename(store, directory.at("real"));
+             std::filesystem::create_symlink(directory.at("real"), store);
+         },
+         false, "not a directory"},
+        {"a lock that others may write to",
+         [this] { ASSERT_EQ(chmod(directory.write("store/preferences.lock", "").c_str(), 0602), 0); }, true,
+         "others may write"},
+        {"a FIFO for a lock", [this] { ASSERT_EQ(mkfifo(lockFile.c_str(), 0600), 0); }, true,
+         "not a regular file"},
+        {"a link for a lock",
+         [this] { std::filesystem::create_symlink(directory.write("elsewhere", ""), lockFile); }, true,
+         "cannot open"},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        std::filesystem::remove_all(store);
+        makeStore();
+        ASSERT_EQ(chmod(store.c_str(), 0700), 0);
+        row.make();
+        log.clear();
+        SessionRef session = open();
+        EXPECT_EQ(static_cast<bool>(session), row.opens);
+        EXPECT_FALSE(session && set(session, "/Sets/1", "new") && commit(session));
+        EXPECT_EQ(SCError(), 1001);
+        EXPECT_TRUE(logHas(row.reason)) << (log.empty() ? "" : log[0]);
+        EXPECT_EQ(contentOf(file), smallTree);
+    }
 }
 
 }  // namespace
