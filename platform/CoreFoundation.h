@@ -6,6 +6,9 @@
 // counts are atomic; everything else is for one thread at a time. Null stands for "no value" only where a
 // function says so.
 //
+// Lack of memory ends the process: no operation of any face reports it or throws, and no list, copy or walk
+// is cut short by it.
+//
 // Strings are UTF-8 inside. Lengths, indices and characters count UTF-16 code units. The system's text
 // encoding is UTF-8, and bytes that are not well-formed UTF-8, or more than 2 GiB of them, make no string.
 #pragma once
@@ -82,20 +85,19 @@ inline CFRange CFRangeMake(CFIndex location, CFIndex length) {
 // --- Every value ---
 
 // Takes one reference and returns the value. The value must not be null.
-CFTypeRef CFRetain(CFTypeRef value);
+CFTypeRef CFRetain(CFTypeRef value) noexcept;
 // Gives one reference back; the last one destroys the value. The value must not be null.
-void CFRelease(CFTypeRef value);
+void CFRelease(CFTypeRef value) noexcept;
 // The number of references held, for tests.
-CFIndex CFGetRetainCount(CFTypeRef value);
-CFTypeID CFGetTypeID(CFTypeRef value);
+CFIndex CFGetRetainCount(CFTypeRef value) noexcept;
+CFTypeID CFGetTypeID(CFTypeRef value) noexcept;
 // Equality by content, through containers; values of different types are unequal, and so are a boolean and a
 // number. The order of a dictionary's entries does not matter. A mutable value can equal an immutable one.
-Boolean CFEqual(CFTypeRef lhs, CFTypeRef rhs);
+Boolean CFEqual(CFTypeRef lhs, CFTypeRef rhs) noexcept;
 // One line of text that tells a person what the value is: a string as it stands, a number in decimal, "true"
-// or "false", data as hexadecimal between angle brackets, a date in ISO 8601, containers as "{key = value;
-// ...}" and
-// "(a, b)"; line breaks inside are shown as spaces. Never null.
-CFStringRef CFCopyDescription(CFTypeRef value);
+// or "false", data as hexadecimal between angle brackets, a date in ISO 8601, containers as
+// "{key = value; ...}" and "(a, b)"; line breaks inside are shown as spaces. Never null.
+CFStringRef CFCopyDescription(CFTypeRef value) noexcept;
 
 // --- Strings ---
 
@@ -109,47 +111,51 @@ inline constexpr CFStringCompareFlags kCFCompareCaseInsensitive = 0x01;
 inline constexpr CFStringCompareFlags kCFCompareLocalized = 0x20;
 inline constexpr CFStringCompareFlags kCFCompareNumerically = 0x40;
 
-CFTypeID CFStringGetTypeID();
+CFTypeID CFStringGetTypeID() noexcept;
 // The encoding of the command line, of trace output and of text files: UTF-8.
-CFStringEncoding CFStringGetSystemEncoding();
+CFStringEncoding CFStringGetSystemEncoding() noexcept;
 // Null when the bytes are not text in the encoding (ASCII: a byte above 0x7F; UTF-8: an ill-formed sequence).
-CFStringRef CFStringCreateWithCString(CFAllocatorRef allocator, const char* text, CFStringEncoding encoding);
+CFStringRef CFStringCreateWithCString(CFAllocatorRef allocator, const char* text,
+                                      CFStringEncoding encoding) noexcept;
 CFStringRef CFStringCreateWithBytes(CFAllocatorRef allocator, const UInt8* bytes, CFIndex count,
-                                    CFStringEncoding encoding, Boolean isExternalRepresentation);
+                                    CFStringEncoding encoding, Boolean isExternalRepresentation) noexcept;
 // Null when the units hold an unpaired surrogate.
-CFStringRef CFStringCreateWithCharacters(CFAllocatorRef allocator, const UniChar* characters, CFIndex count);
+CFStringRef CFStringCreateWithCharacters(CFAllocatorRef allocator, const UniChar* characters,
+                                         CFIndex count) noexcept;
 // printf's conversions %d %i %u %ld %lu %s %c %x %% with flags, width and precision, and %@ for a value (its
 // CFCopyDescription; a null one gives "(null)"). formatOptions is null. Null when the result is not text.
 CFStringRef CFStringCreateWithFormat(CFAllocatorRef allocator, CFDictionaryRef formatOptions,
-                                     CFStringRef format, ...);
-CFStringRef CFStringCreateCopy(CFAllocatorRef allocator, CFStringRef string);
+                                     CFStringRef format, ...) noexcept;
+CFStringRef CFStringCreateCopy(CFAllocatorRef allocator, CFStringRef string) noexcept;
 // maxLength is a hint and may be 0.
-CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef allocator, CFIndex maxLength, CFStringRef string);
+CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef allocator, CFIndex maxLength,
+                                             CFStringRef string) noexcept;
 // Null when the range leaves the string or cuts a character of two units.
-CFStringRef CFStringCreateWithSubstring(CFAllocatorRef allocator, CFStringRef string, CFRange range);
+CFStringRef CFStringCreateWithSubstring(CFAllocatorRef allocator, CFStringRef string, CFRange range) noexcept;
 // The pieces of the string between the separators, empty ones included; a string without the separator is one
 // piece.
 CFArrayRef CFStringCreateArrayBySeparatingStrings(CFAllocatorRef allocator, CFStringRef string,
-                                                  CFStringRef separator);
-CFIndex CFStringGetLength(CFStringRef string);
+                                                  CFStringRef separator) noexcept;
+CFIndex CFStringGetLength(CFStringRef string) noexcept;
 // Copies the units of the range, in host byte order, into the buffer, which must have room for them.
-void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer);
+void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) noexcept;
 // Copies the text and a final NUL. False, with the buffer's content undefined, when it does not fit in
 // bufferSize bytes or the encoding cannot carry it.
-Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize, CFStringEncoding encoding);
+Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
+                           CFStringEncoding encoding) noexcept;
 // The string's own bytes, NUL-terminated, borrowed until it is changed or released; null when the encoding is
 // neither UTF-8 nor, for a string of ASCII characters only, ASCII or Mac OS Roman.
-const char* CFStringGetCStringPtr(CFStringRef string, CFStringEncoding encoding);
-Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix);
+const char* CFStringGetCStringPtr(CFStringRef string, CFStringEncoding encoding) noexcept;
+Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix) noexcept;
 // Without flags a literal comparison by code point. kCFCompareLocalized compares by the root collation, with
 // kCFCompareCaseInsensitive and kCFCompareNumerically as they say; the two also work without it.
-CFComparisonResult CFStringCompare(CFStringRef lhs, CFStringRef rhs, CFStringCompareFlags flags);
+CFComparisonResult CFStringCompare(CFStringRef lhs, CFStringRef rhs, CFStringCompareFlags flags) noexcept;
 // The first occurrence, searched literally, or location kCFNotFound and length 0, as for an empty string.
 // flags is 0.
-CFRange CFStringFind(CFStringRef string, CFStringRef wanted, CFStringCompareFlags flags);
-void CFStringReplace(CFMutableStringRef string, CFRange range, CFStringRef replacement);
+CFRange CFStringFind(CFStringRef string, CFStringRef wanted, CFStringCompareFlags flags) noexcept;
+void CFStringReplace(CFMutableStringRef string, CFRange range, CFStringRef replacement) noexcept;
 // Lower case by the root locale. locale is null.
-void CFStringLowercase(CFMutableStringRef string, const void* locale);
+void CFStringLowercase(CFMutableStringRef string, const void* locale) noexcept;
 
 // A constant string, made once per place in the program and never destroyed. The text is a literal in UTF-8.
 #define CFSTR(text)                                                           \
@@ -168,25 +174,25 @@ inline constexpr CFNumberType kCFNumberFloat64Type = 6;
 // The system's long integer: 32 bits, signed, whatever the machine's own long is.
 inline constexpr CFNumberType kCFNumberLongType = kCFNumberSInt32Type;
 
-CFTypeID CFNumberGetTypeID();
-CFNumberRef CFNumberCreate(CFAllocatorRef allocator, CFNumberType type, const void* value);
+CFTypeID CFNumberGetTypeID() noexcept;
+CFNumberRef CFNumberCreate(CFAllocatorRef allocator, CFNumberType type, const void* value) noexcept;
 // False when the number cannot be given in the type without loss; the value is then the nearest one of the
 // type on the way to zero.
-Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value);
+Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value) noexcept;
 // True for a number that holds a real.
-Boolean CFNumberIsFloatType(CFNumberRef number);
+Boolean CFNumberIsFloatType(CFNumberRef number) noexcept;
 
 extern const CFBooleanRef kCFBooleanTrue;
 extern const CFBooleanRef kCFBooleanFalse;
-CFTypeID CFBooleanGetTypeID();
-Boolean CFBooleanGetValue(CFBooleanRef boolean);
+CFTypeID CFBooleanGetTypeID() noexcept;
+Boolean CFBooleanGetValue(CFBooleanRef boolean) noexcept;
 
-CFTypeID CFDataGetTypeID();
-CFDataRef CFDataCreate(CFAllocatorRef allocator, const UInt8* bytes, CFIndex length);
-CFIndex CFDataGetLength(CFDataRef data);
-const UInt8* CFDataGetBytePtr(CFDataRef data);
+CFTypeID CFDataGetTypeID() noexcept;
+CFDataRef CFDataCreate(CFAllocatorRef allocator, const UInt8* bytes, CFIndex length) noexcept;
+CFIndex CFDataGetLength(CFDataRef data) noexcept;
+const UInt8* CFDataGetBytePtr(CFDataRef data) noexcept;
 
-CFTypeID CFDateGetTypeID();
+CFTypeID CFDateGetTypeID() noexcept;
 
 // --- Dictionaries and arrays ---
 
@@ -202,52 +208,56 @@ extern const CFArrayCallBacks kCFTypeArrayCallBacks;
 
 // A dictionary enumerates its entries in the order in which their keys were first added. Keys may be any
 // values; they are found by content. Copies cost nothing until one of the two is changed.
-CFTypeID CFDictionaryGetTypeID();
+CFTypeID CFDictionaryGetTypeID() noexcept;
 // Of two equal keys the first one stays. Keys must not be null.
 CFDictionaryRef CFDictionaryCreate(CFAllocatorRef allocator, const void** keys, const void** values,
                                    CFIndex count, const CFDictionaryKeyCallBacks* keyCallBacks,
-                                   const CFDictionaryValueCallBacks* valueCallBacks);
+                                   const CFDictionaryValueCallBacks* valueCallBacks) noexcept;
 // capacity is a hint and may be 0.
 CFMutableDictionaryRef CFDictionaryCreateMutable(CFAllocatorRef allocator, CFIndex capacity,
                                                  const CFDictionaryKeyCallBacks* keyCallBacks,
-                                                 const CFDictionaryValueCallBacks* valueCallBacks);
+                                                 const CFDictionaryValueCallBacks* valueCallBacks) noexcept;
 // One level deep: the copy holds the same values.
 CFMutableDictionaryRef CFDictionaryCreateMutableCopy(CFAllocatorRef allocator, CFIndex capacity,
-                                                     CFDictionaryRef dictionary);
-CFIndex CFDictionaryGetCount(CFDictionaryRef dictionary);
-const void* CFDictionaryGetValue(CFDictionaryRef dictionary, const void* key);
+                                                     CFDictionaryRef dictionary) noexcept;
+CFIndex CFDictionaryGetCount(CFDictionaryRef dictionary) noexcept;
+const void* CFDictionaryGetValue(CFDictionaryRef dictionary, const void* key) noexcept;
 // value may be null; it is written only when the key is there.
-Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* key, const void** value);
-Boolean CFDictionaryContainsKey(CFDictionaryRef dictionary, const void* key);
+Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* key,
+                                      const void** value) noexcept;
+Boolean CFDictionaryContainsKey(CFDictionaryRef dictionary, const void* key) noexcept;
 // Either buffer may be null; the others take one borrowed pointer an entry.
-void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys, const void** values);
-// Adds, or replaces in place.
-void CFDictionarySetValue(CFMutableDictionaryRef dictionary, const void* key, const void* value);
+void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys,
+                                  const void** values) noexcept;
+// Adds, or replaces in place. A key that is a mutable string is copied, here and wherever a dictionary gets a
+// key, so that changing it later does not lose the entry; other keys are retained.
+void CFDictionarySetValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) noexcept;
 // Adds; an entry that is there stays as it is.
-void CFDictionaryAddValue(CFMutableDictionaryRef dictionary, const void* key, const void* value);
-void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key);
+void CFDictionaryAddValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) noexcept;
+void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key) noexcept;
 
-CFTypeID CFArrayGetTypeID();
+CFTypeID CFArrayGetTypeID() noexcept;
 CFArrayRef CFArrayCreate(CFAllocatorRef allocator, const void** values, CFIndex count,
-                         const CFArrayCallBacks* callBacks);
+                         const CFArrayCallBacks* callBacks) noexcept;
 CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef allocator, CFIndex capacity,
-                                       const CFArrayCallBacks* callBacks);
-CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef allocator, CFIndex capacity, CFArrayRef array);
-CFIndex CFArrayGetCount(CFArrayRef array);
+                                       const CFArrayCallBacks* callBacks) noexcept;
+CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef allocator, CFIndex capacity,
+                                           CFArrayRef array) noexcept;
+CFIndex CFArrayGetCount(CFArrayRef array) noexcept;
 // The index must be inside the array.
-const void* CFArrayGetValueAtIndex(CFArrayRef array, CFIndex index);
-void CFArrayGetValues(CFArrayRef array, CFRange range, const void** values);
+const void* CFArrayGetValueAtIndex(CFArrayRef array, CFIndex index) noexcept;
+void CFArrayGetValues(CFArrayRef array, CFRange range, const void** values) noexcept;
 // The first position in the range of a value equal to this one, or kCFNotFound.
-CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void* value);
-void CFArrayAppendValue(CFMutableArrayRef array, const void* value);
-void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index);
+CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void* value) noexcept;
+void CFArrayAppendValue(CFMutableArrayRef array, const void* value) noexcept;
+void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index) noexcept;
 // Sorts the range; equal values keep their order.
 void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunction comparator,
-                       void* context);
+                       void* context) noexcept;
 // Binary search in a sorted range: the index of an equal value, or of the first greater one (which may be the
 // end of the range).
 CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value,
-                             CFComparatorFunction comparator, void* context);
+                             CFComparatorFunction comparator, void* context) noexcept;
 
 using CFPropertyListMutabilityOptions = CFOptionFlags;
 inline constexpr CFPropertyListMutabilityOptions kCFPropertyListImmutable = 0;
@@ -255,15 +265,15 @@ inline constexpr CFPropertyListMutabilityOptions kCFPropertyListMutableContainer
 // A copy of the whole value, every container and leaf in it mutable (strings and containers) or immutable as
 // asked. Null when the value is nested too deep or holds something that is not a property-list value.
 CFPropertyListRef CFPropertyListCreateDeepCopy(CFAllocatorRef allocator, CFPropertyListRef value,
-                                               CFPropertyListMutabilityOptions options);
+                                               CFPropertyListMutabilityOptions options) noexcept;
 
 // --- URLs ---
 
-CFTypeID CFURLGetTypeID();
+CFTypeID CFURLGetTypeID() noexcept;
 // Null when the text is not a URL (RFC 3986: a scheme, and no character that would have to be escaped). base
 // is null.
-CFURLRef CFURLCreateWithString(CFAllocatorRef allocator, CFStringRef text, CFURLRef base);
-CFStringRef CFURLGetString(CFURLRef url);
+CFURLRef CFURLCreateWithString(CFAllocatorRef allocator, CFStringRef text, CFURLRef base) noexcept;
+CFStringRef CFURLGetString(CFURLRef url) noexcept;
 
 // --- Run loop ---
 

@@ -27,9 +27,9 @@ inline constexpr int kSCStatusStale = 3005;  // the file is no longer the one th
 inline constexpr int kSCStatusMaxLink = 3006;
 
 // The status of this thread's last call of the preferences store, the dynamic store or reachability.
-int SCError();
+int SCError() noexcept;
 // English text for a status, never null; borrowed, constant.
-const char* SCErrorString(int status);
+const char* SCErrorString(int status) noexcept;
 
 // --- Preferences store ---
 
@@ -38,39 +38,42 @@ using SCPreferencesRef = OpaqueSCPreferences*;
 
 // A session on the network preferences as they are on disk now, released with CFRelease. name is for the log;
 // prefsID must be null. Null on failure: 1001 when the file cannot be used (not a property list, too deep,
-// too large, a symbolic link or anything else that is not a regular file), 1003 without the rights, 1002
-// without a name. Without a file the session holds the first-run tree, in memory until something commits it,
-// and whoever could not make the file is refused with 1003.
-SCPreferencesRef SCPreferencesCreate(CFAllocatorRef allocator, CFStringRef name, CFStringRef prefsID);
+// too large, a symbolic link or anything else that is not a regular file, in a directory that somebody other
+// than this user or root owns or may write to), 1003 without the rights, 1002 without a name. Without a file
+// the session holds the first-run tree, in memory until something commits it, and whoever could not make the
+// file is refused with 1003.
+SCPreferencesRef SCPreferencesCreate(CFAllocatorRef allocator, CFStringRef name,
+                                     CFStringRef prefsID) noexcept;
 // Takes the store's cross-process lock. False: 3002 when another process holds it (with wait: still holds it
-// after half a minute), 3005 when the file changed since the session read it, 1003, 3001. Locking twice
-// succeeds.
-Boolean SCPreferencesLock(SCPreferencesRef session, Boolean wait);
+// after half a minute), 3005 when the file changed since the session read it, 1003, 3001, 1001 (also for a
+// directory or a lock file that somebody else could change). Whoever waited for a process that committed gets
+// 3005, since the session read the file before: open another one. Locking twice succeeds.
+Boolean SCPreferencesLock(SCPreferencesRef session, Boolean wait) noexcept;
 // False with 1007 when the session does not hold the lock, which also ends with the session.
-Boolean SCPreferencesUnlock(SCPreferencesRef session);
+Boolean SCPreferencesUnlock(SCPreferencesRef session) noexcept;
 // A top-level value, borrowed until the session next changes the tree below this key; null when absent
 // (1004).
-CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef key);
-// Stores the value, as it is now. 1002 for a value that is no property list or is nested too deep, as in the
-// next ones.
-Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPropertyListRef value);
+CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef key) noexcept;
+// Stores the value, as it is now. 1002 for a value that is no property list, or that would make the tree
+// deeper than the 512 containers that a preferences file may have; the same holds for the next ones.
+Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPropertyListRef value) noexcept;
 // The dictionary at a path of slash-separated keys ("/Sets/0/Network"); borrowed as above. Links are not
 // followed; "/" is the whole tree. Null: 1004 when nothing is there, 1001 when what is there, or on the way,
 // is not a dictionary, 1002 for a malformed path (no leading slash, an empty key).
-CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path);
+CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path) noexcept;
 // Stores the dictionary, as it is now, at the path, making missing dictionaries on the way. 1001 when
 // something on the way is not a dictionary.
-Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path, CFDictionaryRef value);
+Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path, CFDictionaryRef value) noexcept;
 // The path that the dictionary's "__LINK__" names, borrowed; null: 1004 when the dictionary is absent or is
 // no link, 1001 when something on the way or the link itself has the wrong type.
-CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path);
+CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path) noexcept;
 // Removes whatever is at the path. False: 1004 when nothing is there, 1001, 1002.
-Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path);
+Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path) noexcept;
 // Writes the changed tree, all of it or nothing; an unchanged tree is not written again. False: 3005 when
 // the file is no longer the one that was read, 3002 when another process holds the lock for ten seconds,
 // 1003, 1001 (among other reasons when the tree holds a string that XML cannot carry). The session keeps its
 // changes then.
-Boolean SCPreferencesCommitChanges(SCPreferencesRef session);
+Boolean SCPreferencesCommitChanges(SCPreferencesRef session) noexcept;
 // Makes the current location, as it is committed now, the active configuration and returns when its
 // interfaces are up, have failed, or a bounded wait is over. False: 1001 with the reason in the system log,
 // 1003, 1004 when "CurrentSet" names no location.

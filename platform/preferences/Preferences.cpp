@@ -48,7 +48,8 @@ CFDictionaryRef dictionaryAt(SCPreferencesRef reference, CFStringRef path) {
 
 }  // namespace
 
-SCPreferencesRef SCPreferencesCreate(CFAllocatorRef /*allocator*/, CFStringRef name, CFStringRef prefsID) {
+SCPreferencesRef SCPreferencesCreate(CFAllocatorRef /*allocator*/, CFStringRef name,
+                                     CFStringRef prefsID) noexcept {
     if (as<CFStringRef>(name) == nullptr || prefsID != nullptr) {
         setStatus(kSCStatusInvalidArgument);
         return nullptr;
@@ -61,7 +62,7 @@ SCPreferencesRef SCPreferencesCreate(CFAllocatorRef /*allocator*/, CFStringRef n
     return session.take();
 }
 
-Boolean SCPreferencesLock(SCPreferencesRef session, Boolean wait) {
+Boolean SCPreferencesLock(SCPreferencesRef session, Boolean wait) noexcept {
     Session* const self = Session::from(session);
     if (self == nullptr) {
         return answer(kSCStatusNoPrefsSession);
@@ -70,12 +71,12 @@ Boolean SCPreferencesLock(SCPreferencesRef session, Boolean wait) {
     return answer(self->lock(wait != 0 ? time : std::chrono::milliseconds(0)), *self);
 }
 
-Boolean SCPreferencesUnlock(SCPreferencesRef session) {
+Boolean SCPreferencesUnlock(SCPreferencesRef session) noexcept {
     Session* const self = Session::from(session);
     return self == nullptr ? answer(kSCStatusNoPrefsSession) : answer(self->unlock(), *self);
 }
 
-CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef key) {
+CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef key) noexcept {
     Session* const self = Session::from(session);
     if (self == nullptr || as<CFStringRef>(key) == nullptr) {
         setStatus(self == nullptr ? kSCStatusNoPrefsSession : kSCStatusInvalidArgument);
@@ -86,7 +87,7 @@ CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef ke
     return value;
 }
 
-Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPropertyListRef value) {
+Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPropertyListRef value) noexcept {
     Session* const self = Session::from(session);
     if (self == nullptr) {
         return answer(kSCStatusNoPrefsSession);
@@ -98,15 +99,15 @@ Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPrope
     if (as<CFStringRef>(key) == nullptr || !ownKey || !frozen) {
         return answer(kSCStatusInvalidArgument);
     }
-    self->tree().setTopValue(ownKey.get(), frozen);
-    return answer(kSCStatusOK);
+    return answer(self->tree().setTopValue(ownKey.get(), frozen));
 }
 
-CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path) {
+CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path) noexcept {
     return dictionaryAt(session, path);
 }
 
-Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path, CFDictionaryRef value) {
+Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path,
+                                  CFDictionaryRef value) noexcept {
     Session* const self = Session::from(session);
     if (self == nullptr) {
         return answer(kSCStatusNoPrefsSession);
@@ -117,7 +118,7 @@ Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path, CF
     return answer(frozen ? self->tree().set(textOf(path), frozen) : kSCStatusInvalidArgument);
 }
 
-CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path) {
+CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path) noexcept {
     CFDictionaryRef const dictionary = dictionaryAt(session, path);
     if (dictionary == nullptr) {
         return nullptr;
@@ -128,7 +129,7 @@ CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path)
     return target;
 }
 
-Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path) {
+Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path) noexcept {
     Session* const self = Session::from(session);
     if (self == nullptr) {
         return answer(kSCStatusNoPrefsSession);
@@ -136,7 +137,7 @@ Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path)
     return answer(isPath(path) ? self->tree().remove(textOf(path)) : kSCStatusInvalidArgument);
 }
 
-Boolean SCPreferencesCommitChanges(SCPreferencesRef session) {
+Boolean SCPreferencesCommitChanges(SCPreferencesRef session) noexcept {
     Session* const self = Session::from(session);
     return self == nullptr ? answer(kSCStatusNoPrefsSession) : answer(self->commit(), *self);
 }

@@ -53,11 +53,11 @@ constexpr StatusText statusTexts[] = {
 }  // namespace
 }  // namespace platform::preferences
 
-int SCError() {
+int SCError() noexcept {
     return platform::preferences::lastStatus;
 }
 
-const char* SCErrorString(int status) {
+const char* SCErrorString(int status) noexcept {
     for (const auto& entry : platform::preferences::statusTexts) {
         if (entry.status == status) {
             return entry.text;

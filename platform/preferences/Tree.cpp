@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "platform/SystemConfiguration.h"
+#include "platform/values/PropertyListXML.h"
 #include "platform/values/Values.h"
 
 namespace platform::preferences {
@@ -53,6 +54,11 @@ int follow(CFDictionaryRef root, const Keys& keys, CFPropertyListRef& value) {
     return kSCStatusOK;
 }
 
+// Whether a tree that holds the value under so many dictionaries is one that can be written.
+bool fitsBelow(std::size_t dictionaries, CFPropertyListRef frozen) {
+    return dictionaries + static_cast<std::size_t>(values::levelsOf(frozen)) <= values::deepestPropertyList;
+}
+
 values::Owned<CFPropertyListRef> makeEmptyDictionary() {
     return values::Owned<CFPropertyListRef>::adopt(CFDictionaryCreate(kCFAllocatorDefault, nullptr, nullptr,
                                                                       0, &kCFTypeDictionaryKeyCallBacks,
@@ -81,6 +87,9 @@ int Tree::set(std::string_view path, const values::Owned<CFPropertyListRef>& val
         }
         root_ = values::Owned<CFDictionaryRef>::retained(dictionary);
         return kSCStatusOK;
+    }
+    if (!fitsBelow(keys->size(), value.get())) {
+        return kSCStatusInvalidArgument;
     }
     CFPropertyListRef present = nullptr;
     if (follow(root_.get(), *keys, present) == kSCStatusFailed) {
@@ -127,9 +136,13 @@ CFPropertyListRef Tree::topValue(CFStringRef key) const {
     return CFDictionaryGetValue(root_.get(), key);
 }
 
-void Tree::setTopValue(CFStringRef key, const values::Owned<CFPropertyListRef>& value) {
+int Tree::setTopValue(CFStringRef key, const values::Owned<CFPropertyListRef>& value) {
+    if (!fitsBelow(1, value.get())) {
+        return kSCStatusInvalidArgument;
+    }
     values::claim(root_);
     values::setClaimed(root_.get(), key, value);
+    return kSCStatusOK;
 }
 
 }  // namespace platform::preferences

@@ -12,8 +12,8 @@
 
 namespace platform::preferences {
 
-// Every status is 0, 1002 for a malformed path, 1004 for nothing there, or 1001 for something on the way that
-// is no dictionary. A failed call changes nothing.
+// Every status is 0, 1002 for a malformed path or a tree that would be nested too deep to be written, 1004
+// for nothing there, or 1001 for something on the way that is no dictionary. A failed call changes nothing.
 class Tree {
   public:
     Tree() = default;
@@ -33,7 +33,7 @@ class Tree {
 
     // The same for one key of the root, which may hold a slash or be empty.
     [[nodiscard]] CFPropertyListRef topValue(CFStringRef key) const;
-    void setTopValue(CFStringRef key, const values::Owned<CFPropertyListRef>& value);
+    [[nodiscard]] int setTopValue(CFStringRef key, const values::Owned<CFPropertyListRef>& value);
 
   private:
     values::Owned<CFDictionaryRef> root_;

@@ -33,12 +33,12 @@ std::span<const CFTypeRef> platform::values::itemsOf(CFArrayRef array) noexcept 
     return array->items();
 }
 
-CFTypeID CFArrayGetTypeID() {
+CFTypeID CFArrayGetTypeID() noexcept {
     return static_cast<CFTypeID>(Type::array);
 }
 
 CFArrayRef CFArrayCreate(CFAllocatorRef, const void** values, CFIndex count,
-                         const CFArrayCallBacks* callBacks) {
+                         const CFArrayCallBacks* callBacks) noexcept {
     auto* const array = new OpaqueCFArray(false, callBacks != nullptr, nullptr);
     for (CFIndex i = 0; i < count; ++i) {
         array->writable().append(values[i]);
@@ -46,40 +46,40 @@ CFArrayRef CFArrayCreate(CFAllocatorRef, const void** values, CFIndex count,
     return array;
 }
 
-CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef, CFIndex, const CFArrayCallBacks* callBacks) {
+CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef, CFIndex, const CFArrayCallBacks* callBacks) noexcept {
     return new OpaqueCFArray(true, callBacks != nullptr, nullptr);
 }
 
-CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef, CFIndex, CFArrayRef array) {
+CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef, CFIndex, CFArrayRef array) noexcept {
     return shareStorage(*array, true);
 }
 
-CFIndex CFArrayGetCount(CFArrayRef array) {
+CFIndex CFArrayGetCount(CFArrayRef array) noexcept {
     return static_cast<CFIndex>(array->count());
 }
 
-const void* CFArrayGetValueAtIndex(CFArrayRef array, CFIndex index) {
+const void* CFArrayGetValueAtIndex(CFArrayRef array, CFIndex index) noexcept {
     return array->items()[static_cast<std::size_t>(index)];
 }
 
-void CFArrayGetValues(CFArrayRef array, CFRange range, const void** values) {
+void CFArrayGetValues(CFArrayRef array, CFRange range, const void** values) noexcept {
     std::ranges::copy(itemsIn(array, range), values);
 }
 
-CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void* value) {
+CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void* value) noexcept {
     const std::span<const CFTypeRef> items = itemsIn(array, range);
     const auto found = std::ranges::find_if(items, [&](CFTypeRef item) { return equalValues(item, value); });
     return found == items.end() ? kCFNotFound : range.location + (found - items.begin());
 }
 
-void CFArrayAppendValue(CFMutableArrayRef array, const void* value) {
+void CFArrayAppendValue(CFMutableArrayRef array, const void* value) noexcept {
     assert(array->isMutable());
     if (array->isMutable()) {
         array->writable().append(value);
     }
 }
 
-void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index) {
+void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index) noexcept {
     assert(array->isMutable());
     if (array->isMutable() && index >= 0 && index < CFArrayGetCount(array)) {
         array->writable().removeItem(static_cast<std::size_t>(index));
@@ -87,7 +87,7 @@ void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index) {
 }
 
 void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunction comparator,
-                       void* context) {
+                       void* context) noexcept {
     assert(array->isMutable());
     if (!array->isMutable() || range.length < 2) {
         return;
@@ -102,7 +102,7 @@ void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunct
 }
 
 CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value,
-                             CFComparatorFunction comparator, void* context) {
+                             CFComparatorFunction comparator, void* context) noexcept {
     const std::span<const CFTypeRef> items = itemsIn(array, range);
     const auto found = std::ranges::lower_bound(items, value, [&](CFTypeRef lhs, CFTypeRef rhs) {
         return comparator(lhs, rhs, context) == kCFCompareLessThan;

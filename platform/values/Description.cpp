@@ -116,6 +116,6 @@ std::string platform::values::descriptionOf(CFTypeRef value) {
     return text;
 }
 
-CFStringRef CFCopyDescription(CFTypeRef value) {
+CFStringRef CFCopyDescription(CFTypeRef value) noexcept {
     return makeString(descriptionOf(value)).take();
 }

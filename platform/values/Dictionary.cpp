@@ -60,13 +60,13 @@ std::span<const Entry> platform::values::entriesOf(CFDictionaryRef dictionary) {
     return dictionary->storage() != nullptr ? dictionary->storage()->entries() : std::span<const Entry>();
 }
 
-CFTypeID CFDictionaryGetTypeID() {
+CFTypeID CFDictionaryGetTypeID() noexcept {
     return static_cast<CFTypeID>(Type::dictionary);
 }
 
 CFDictionaryRef CFDictionaryCreate(CFAllocatorRef, const void** keys, const void** values, CFIndex count,
                                    const CFDictionaryKeyCallBacks*,
-                                   const CFDictionaryValueCallBacks* valueCallBacks) {
+                                   const CFDictionaryValueCallBacks* valueCallBacks) noexcept {
     auto* const dictionary = new OpaqueCFDictionary(false, valueCallBacks != nullptr, nullptr);
     for (CFIndex i = 0; i < count; ++i) {
         dictionary->set(keys[i], values[i], false);
@@ -75,24 +75,26 @@ CFDictionaryRef CFDictionaryCreate(CFAllocatorRef, const void** keys, const void
 }
 
 CFMutableDictionaryRef CFDictionaryCreateMutable(CFAllocatorRef, CFIndex, const CFDictionaryKeyCallBacks*,
-                                                 const CFDictionaryValueCallBacks* valueCallBacks) {
+                                                 const CFDictionaryValueCallBacks* valueCallBacks) noexcept {
     return new OpaqueCFDictionary(true, valueCallBacks != nullptr, nullptr);
 }
 
-CFMutableDictionaryRef CFDictionaryCreateMutableCopy(CFAllocatorRef, CFIndex, CFDictionaryRef dictionary) {
+CFMutableDictionaryRef CFDictionaryCreateMutableCopy(CFAllocatorRef, CFIndex,
+                                                     CFDictionaryRef dictionary) noexcept {
     return shareStorage(*dictionary, true);
 }
 
-CFIndex CFDictionaryGetCount(CFDictionaryRef dictionary) {
+CFIndex CFDictionaryGetCount(CFDictionaryRef dictionary) noexcept {
     return static_cast<CFIndex>(dictionary->count());
 }
 
-const void* CFDictionaryGetValue(CFDictionaryRef dictionary, const void* key) {
+const void* CFDictionaryGetValue(CFDictionaryRef dictionary, const void* key) noexcept {
     CFTypeRef value = nullptr;
     return dictionary->find(key, &value) ? value : nullptr;
 }
 
-Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* key, const void** value) {
+Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* key,
+                                      const void** value) noexcept {
     CFTypeRef found = nullptr;
     if (!dictionary->find(key, &found)) {
         return 0;
@@ -103,11 +105,12 @@ Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* ke
     return 1;
 }
 
-Boolean CFDictionaryContainsKey(CFDictionaryRef dictionary, const void* key) {
+Boolean CFDictionaryContainsKey(CFDictionaryRef dictionary, const void* key) noexcept {
     return CFDictionaryGetValueIfPresent(dictionary, key, nullptr);
 }
 
-void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys, const void** values) {
+void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys,
+                                  const void** values) noexcept {
     for (const Entry& entry : entriesOf(dictionary)) {
         if (keys != nullptr) {
             *keys++ = entry.key;
@@ -118,21 +121,21 @@ void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys,
     }
 }
 
-void CFDictionarySetValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) {
+void CFDictionarySetValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) noexcept {
     assert(dictionary->isMutable());
     if (dictionary->isMutable()) {
         dictionary->set(key, value, true);
     }
 }
 
-void CFDictionaryAddValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) {
+void CFDictionaryAddValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) noexcept {
     assert(dictionary->isMutable());
     if (dictionary->isMutable()) {
         dictionary->set(key, value, false);
     }
 }
 
-void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key) {
+void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key) noexcept {
     assert(dictionary->isMutable());
     if (dictionary->isMutable()) {
         dictionary->remove(key);

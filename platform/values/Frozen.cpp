@@ -137,6 +137,10 @@ Owned<CFPropertyListRef> frozen(CFPropertyListRef value) {
     return copyDeep(value, Copying::frozen, 0);
 }
 
+int levelsOf(CFPropertyListRef frozen) noexcept {
+    return knownFrozenLevels(frozen);
+}
+
 void claim(Owned<CFDictionaryRef>& root) {
     if (!isClaimable(root.get())) {
         root = Owned<CFDictionaryRef>::adopt(shareStorage(*root.get(), false));
@@ -176,7 +180,7 @@ void removeClaimed(CFDictionaryRef dictionary, CFTypeRef key) {
 using namespace platform::values;
 
 CFPropertyListRef CFPropertyListCreateDeepCopy(CFAllocatorRef, CFPropertyListRef value,
-                                               CFPropertyListMutabilityOptions options) {
+                                               CFPropertyListMutabilityOptions options) noexcept {
     return copyDeep(value, options == kCFPropertyListImmutable ? Copying::frozen : Copying::allMutable, 0)
         .take();
 }

@@ -82,11 +82,11 @@ std::string platform::values::dateText(std::int64_t seconds) {
     return {buffer, static_cast<std::size_t>(size)};
 }
 
-CFTypeID CFNumberGetTypeID() {
+CFTypeID CFNumberGetTypeID() noexcept {
     return static_cast<CFTypeID>(Type::number);
 }
 
-CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* value) {
+CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* value) noexcept {
     switch (type) {
         case kCFNumberSInt32Type:
             return makeNumber(*static_cast<const SInt32*>(value)).take();
@@ -99,7 +99,7 @@ CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* value)
     }
 }
 
-Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value) {
+Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value) noexcept {
     bool exact = true;
     if (type == kCFNumberFloat64Type) {
         double real = 0;
@@ -132,36 +132,36 @@ Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value) {
     return static_cast<Boolean>(exact && fits);
 }
 
-Boolean CFNumberIsFloatType(CFNumberRef number) {
+Boolean CFNumberIsFloatType(CFNumberRef number) noexcept {
     return static_cast<Boolean>(number->isReal);
 }
 
-CFTypeID CFBooleanGetTypeID() {
+CFTypeID CFBooleanGetTypeID() noexcept {
     return static_cast<CFTypeID>(Type::boolean);
 }
 
-Boolean CFBooleanGetValue(CFBooleanRef boolean) {
+Boolean CFBooleanGetValue(CFBooleanRef boolean) noexcept {
     return static_cast<Boolean>(boolean->value);
 }
 
-CFTypeID CFDataGetTypeID() {
+CFTypeID CFDataGetTypeID() noexcept {
     return static_cast<CFTypeID>(Type::data);
 }
 
-CFDataRef CFDataCreate(CFAllocatorRef, const UInt8* bytes, CFIndex length) {
+CFDataRef CFDataCreate(CFAllocatorRef, const UInt8* bytes, CFIndex length) noexcept {
     return new OpaqueCFData(
         length > 0 ? std::string(reinterpret_cast<const char*>(bytes), static_cast<std::size_t>(length))
                    : std::string());
 }
 
-CFIndex CFDataGetLength(CFDataRef data) {
+CFIndex CFDataGetLength(CFDataRef data) noexcept {
     return static_cast<CFIndex>(data->bytes.size());
 }
 
-const UInt8* CFDataGetBytePtr(CFDataRef data) {
+const UInt8* CFDataGetBytePtr(CFDataRef data) noexcept {
     return reinterpret_cast<const UInt8*>(data->bytes.data());
 }
 
-CFTypeID CFDateGetTypeID() {
+CFTypeID CFDateGetTypeID() noexcept {
     return static_cast<CFTypeID>(Type::date);
 }

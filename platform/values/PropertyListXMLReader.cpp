@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <limits>
 #include <memory>
+#include <new>
 
 #include "platform/values/PropertyListBuilder.h"
 #include "platform/values/PropertyListXML.h"
@@ -122,8 +123,11 @@ struct ParserCloser {
 
 Owned<CFPropertyListRef> parseAnyPropertyListXML(std::string_view text, ParseError& error) {
     const std::unique_ptr<XML_ParserStruct, ParserCloser> parser(XML_ParserCreate("UTF-8"));
-    if (!parser || text.size() > static_cast<std::size_t>(std::numeric_limits<int>::max())) {
-        error = {1, 1, parser ? "too large" : "out of memory"};
+    if (!parser) {
+        throw std::bad_alloc();
+    }
+    if (text.size() > static_cast<std::size_t>(std::numeric_limits<int>::max())) {
+        error = {1, 1, "too large"};
         return {};
     }
     Reader reader(parser.get());
@@ -135,6 +139,9 @@ Owned<CFPropertyListRef> parseAnyPropertyListXML(std::string_view text, ParseErr
     XML_SetXmlDeclHandler(parser.get(), onDeclaration);
     if (XML_Parse(parser.get(), text.data(), static_cast<int>(text.size()), XML_TRUE) == XML_STATUS_OK) {
         return reader.value();
+    }
+    if (XML_GetErrorCode(parser.get()) == XML_ERROR_NO_MEMORY) {
+        throw std::bad_alloc();
     }
     const bool isRefused = reader.reason() != nullptr;
     const XML_Index place = isRefused ? reader.refusedAt() : XML_GetCurrentByteIndex(parser.get());

@@ -95,7 +95,7 @@ std::string_view platform::values::textOf(CFStringRef string) noexcept {
     return string->text();
 }
 
-CFTypeID CFStringGetTypeID() {
+CFTypeID CFStringGetTypeID() noexcept {
     return static_cast<CFTypeID>(Type::string);
 }
 
@@ -107,7 +107,7 @@ CFStringRef CFStringMakeConstant(const char* text) noexcept {
     return constant;
 }
 
-CFStringRef CFStringCreateCopy(CFAllocatorRef, CFStringRef string) {
+CFStringRef CFStringCreateCopy(CFAllocatorRef, CFStringRef string) noexcept {
     if (!string->isMutable()) {
         string->retain();
         return string;
@@ -115,11 +115,11 @@ CFStringRef CFStringCreateCopy(CFAllocatorRef, CFStringRef string) {
     return OpaqueCFString::create(string->text(), string->traits());
 }
 
-CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef, CFIndex, CFStringRef string) {
+CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef, CFIndex, CFStringRef string) noexcept {
     return new MutableString(std::string(string->text()), string->traits());
 }
 
-CFStringRef CFStringCreateWithSubstring(CFAllocatorRef, CFStringRef string, CFRange range) {
+CFStringRef CFStringCreateWithSubstring(CFAllocatorRef, CFStringRef string, CFRange range) noexcept {
     const std::string_view text = string->text();
     if (range.location < 0 || range.length < 0) {
         return nullptr;
@@ -133,7 +133,8 @@ CFStringRef CFStringCreateWithSubstring(CFAllocatorRef, CFStringRef string, CFRa
     return size.has_value() ? makeString(rest.substr(0, *size)).take() : nullptr;
 }
 
-CFArrayRef CFStringCreateArrayBySeparatingStrings(CFAllocatorRef, CFStringRef string, CFStringRef separator) {
+CFArrayRef CFStringCreateArrayBySeparatingStrings(CFAllocatorRef, CFStringRef string,
+                                                  CFStringRef separator) noexcept {
     const CFMutableArrayRef pieces = CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks);
     std::string_view rest = string->text();
     const std::string_view wanted = separator->text();
@@ -149,12 +150,12 @@ CFArrayRef CFStringCreateArrayBySeparatingStrings(CFAllocatorRef, CFStringRef st
     return pieces;
 }
 
-CFIndex CFStringGetLength(CFStringRef string) {
+CFIndex CFStringGetLength(CFStringRef string) noexcept {
     const std::string_view text = string->text();
     return static_cast<CFIndex>(string->isAscii() ? text.size() : unitCount(text));
 }
 
-void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) {
+void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) noexcept {
     const std::string_view text = string->text();
     const CFIndex end = range.location + range.length;
     CFIndex unit = 0;
@@ -175,11 +176,11 @@ void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) {
     }
 }
 
-Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix) {
+Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix) noexcept {
     return static_cast<Boolean>(string->text().starts_with(prefix->text()));
 }
 
-CFRange CFStringFind(CFStringRef string, CFStringRef wanted, CFStringCompareFlags) {
+CFRange CFStringFind(CFStringRef string, CFStringRef wanted, CFStringCompareFlags) noexcept {
     const std::string_view text = string->text();
     const std::size_t found = wanted->text().empty() ? std::string_view::npos : text.find(wanted->text());
     if (found == std::string_view::npos) {
@@ -188,7 +189,7 @@ CFRange CFStringFind(CFStringRef string, CFStringRef wanted, CFStringCompareFlag
     return CFRangeMake(static_cast<CFIndex>(unitCount(text.substr(0, found))), CFStringGetLength(wanted));
 }
 
-void CFStringReplace(CFMutableStringRef string, CFRange range, CFStringRef replacement) {
+void CFStringReplace(CFMutableStringRef string, CFRange range, CFStringRef replacement) noexcept {
     assert(string->isMutable());
     if (!string->isMutable() || range.location < 0 || range.length < 0) {
         return;

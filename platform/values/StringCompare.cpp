@@ -6,6 +6,7 @@
 #include <cassert>
 #include <memory>
 
+#include "platform/values/ICUStatus.h"
 #include "platform/values/Scalars.h"
 
 using namespace platform::values;
@@ -21,12 +22,12 @@ Collator openCollator(bool ignoreCase, bool numeric) {
     UErrorCode status = U_ZERO_ERROR;
     // The empty name is the root locale; a null one would be the environment's.
     Collator collator(ucol_open("", &status));
-    if (U_SUCCESS(status)) {
+    if (succeeded(status)) {
         ucol_setAttribute(collator.get(), UCOL_STRENGTH, ignoreCase ? UCOL_SECONDARY : UCOL_TERTIARY,
                           &status);
         ucol_setAttribute(collator.get(), UCOL_NUMERIC_COLLATION, numeric ? UCOL_ON : UCOL_OFF, &status);
     }
-    return U_SUCCESS(status) ? std::move(collator) : nullptr;
+    return succeeded(status) ? std::move(collator) : nullptr;
 }
 
 // Null when ICU has no collation data. Opened on first use: most runs compare nothing.
@@ -67,17 +68,17 @@ std::string mapCase(std::string_view text, bool isAscii, CaseFunction map) {
     UErrorCode status = U_ZERO_ERROR;
     const std::unique_ptr<UCaseMap, CaseMapCloser> root(ucasemap_open("", 0, &status));
     const auto size = static_cast<std::int32_t>(text.size());
-    if (U_FAILURE(status)) {
+    if (!succeeded(status)) {
         return mapped;
     }
     const std::int32_t needed = map(root.get(), nullptr, 0, text.data(), size, &status);
-    if (status != U_BUFFER_OVERFLOW_ERROR && U_FAILURE(status)) {
+    if (status != U_BUFFER_OVERFLOW_ERROR && !succeeded(status)) {
         return mapped;
     }
     std::string result(static_cast<std::size_t>(needed), '\0');
     status = U_ZERO_ERROR;
     map(root.get(), result.data(), needed, text.data(), size, &status);
-    return U_SUCCESS(status) ? result : mapped;
+    return succeeded(status) ? result : mapped;
 }
 
 bool isDigit(char character) {
@@ -126,7 +127,7 @@ CFComparisonResult resultOf(int order) {
 
 }  // namespace
 
-CFComparisonResult CFStringCompare(CFStringRef lhs, CFStringRef rhs, CFStringCompareFlags flags) {
+CFComparisonResult CFStringCompare(CFStringRef lhs, CFStringRef rhs, CFStringCompareFlags flags) noexcept {
     const bool ignoreCase = (flags & kCFCompareCaseInsensitive) != 0;
     const bool numeric = (flags & kCFCompareNumerically) != 0;
     const std::string_view left = lhs->text();
@@ -140,7 +141,7 @@ CFComparisonResult CFStringCompare(CFStringRef lhs, CFStringRef rhs, CFStringCom
             const UCollationResult order =
                 ucol_strcollUTF8(collator, left.data(), static_cast<std::int32_t>(left.size()), right.data(),
                                  static_cast<std::int32_t>(right.size()), &status);
-            if (U_SUCCESS(status)) {
+            if (succeeded(status)) {
                 return resultOf(order);
             }
         }
@@ -152,7 +153,7 @@ CFComparisonResult CFStringCompare(CFStringRef lhs, CFStringRef rhs, CFStringCom
                                      mapCase(right, rhs->isAscii(), ucasemap_utf8FoldCase), numeric));
 }
 
-void CFStringLowercase(CFMutableStringRef string, const void*) {
+void CFStringLowercase(CFMutableStringRef string, const void*) noexcept {
     assert(string->isMutable());
     if (string->isMutable()) {
         static_cast<MutableString*>(string)->assign(

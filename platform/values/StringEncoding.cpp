@@ -5,6 +5,7 @@
 #include <memory>
 #include <vector>
 
+#include "platform/values/ICUStatus.h"
 #include "platform/values/Scalars.h"
 #include "platform/values/Values.h"
 
@@ -23,11 +24,11 @@ using Converter = std::unique_ptr<UConverter, ConverterCloser>;
 Converter openMacRoman() {
     UErrorCode status = U_ZERO_ERROR;
     Converter converter(ucnv_open("macintosh", &status));
-    if (U_SUCCESS(status)) {
+    if (succeeded(status)) {
         ucnv_setToUCallBack(converter.get(), UCNV_TO_U_CALLBACK_STOP, nullptr, nullptr, nullptr, &status);
         ucnv_setFromUCallBack(converter.get(), UCNV_FROM_U_CALLBACK_STOP, nullptr, nullptr, nullptr, &status);
     }
-    return U_SUCCESS(status) ? std::move(converter) : nullptr;
+    return succeeded(status) ? std::move(converter) : nullptr;
 }
 
 std::vector<UniChar> unitsOf(CFStringRef string) {
@@ -46,7 +47,7 @@ CFStringRef createFromMacRoman(std::string_view bytes) {
     const auto size = static_cast<std::int32_t>(bytes.size());
     const std::int32_t count =
         ucnv_toUChars(converter.get(), units.data(), size, bytes.data(), size, &status);
-    if (U_FAILURE(status)) {
+    if (!succeeded(status)) {
         return nullptr;
     }
     return CFStringCreateWithCharacters(nullptr, reinterpret_cast<const UniChar*>(units.data()), count);
@@ -62,7 +63,7 @@ bool copyAsMacRoman(CFStringRef string, char* buffer, std::size_t bufferSize) {
     const std::int32_t size = ucnv_fromUChars(
         converter.get(), buffer, static_cast<std::int32_t>(units.size()),
         reinterpret_cast<const UChar*>(units.data()), static_cast<std::int32_t>(units.size()), &status);
-    if (U_FAILURE(status)) {
+    if (!succeeded(status)) {
         return false;
     }
     buffer[size] = '\0';
@@ -71,17 +72,18 @@ bool copyAsMacRoman(CFStringRef string, char* buffer, std::size_t bufferSize) {
 
 }  // namespace
 
-CFStringEncoding CFStringGetSystemEncoding() {
+CFStringEncoding CFStringGetSystemEncoding() noexcept {
     return kCFStringEncodingUTF8;
 }
 
-CFStringRef CFStringCreateWithCString(CFAllocatorRef allocator, const char* text, CFStringEncoding encoding) {
+CFStringRef CFStringCreateWithCString(CFAllocatorRef allocator, const char* text,
+                                      CFStringEncoding encoding) noexcept {
     return CFStringCreateWithBytes(allocator, reinterpret_cast<const UInt8*>(text),
                                    static_cast<CFIndex>(std::strlen(text)), encoding, 0);
 }
 
 CFStringRef CFStringCreateWithBytes(CFAllocatorRef, const UInt8* bytes, CFIndex count,
-                                    CFStringEncoding encoding, Boolean) {
+                                    CFStringEncoding encoding, Boolean) noexcept {
     const std::string_view text(reinterpret_cast<const char*>(bytes), static_cast<std::size_t>(count));
     const std::optional<TextTraits> traits = scanText(text);
     if (traits.has_value() && (*traits & textBeyondAscii) == 0) {
@@ -96,7 +98,7 @@ CFStringRef CFStringCreateWithBytes(CFAllocatorRef, const UInt8* bytes, CFIndex 
     return nullptr;
 }
 
-CFStringRef CFStringCreateWithCharacters(CFAllocatorRef, const UniChar* characters, CFIndex count) {
+CFStringRef CFStringCreateWithCharacters(CFAllocatorRef, const UniChar* characters, CFIndex count) noexcept {
     std::string text;
     text.reserve(static_cast<std::size_t>(count));
     for (CFIndex i = 0; i < count; ++i) {
@@ -114,7 +116,8 @@ CFStringRef CFStringCreateWithCharacters(CFAllocatorRef, const UniChar* characte
     return makeString(text).take();
 }
 
-Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize, CFStringEncoding encoding) {
+Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
+                           CFStringEncoding encoding) noexcept {
     if (!string->isAscii() && encoding == kCFStringEncodingMacRoman && bufferSize > 0) {
         return static_cast<Boolean>(copyAsMacRoman(string, buffer, static_cast<std::size_t>(bufferSize)));
     }
@@ -127,7 +130,7 @@ Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
     return 1;
 }
 
-const char* CFStringGetCStringPtr(CFStringRef string, CFStringEncoding encoding) {
+const char* CFStringGetCStringPtr(CFStringRef string, CFStringEncoding encoding) noexcept {
     const bool fits =
         encoding == kCFStringEncodingUTF8 ||
         (string->isAscii() && (encoding == kCFStringEncodingASCII || encoding == kCFStringEncodingMacRoman));

@@ -128,7 +128,7 @@ std::optional<std::string> formatted(std::string_view format, Arguments argument
 
 }  // namespace
 
-CFStringRef CFStringCreateWithFormat(CFAllocatorRef, CFDictionaryRef, CFStringRef format, ...) {
+CFStringRef CFStringCreateWithFormat(CFAllocatorRef, CFDictionaryRef, CFStringRef format, ...) noexcept {
     std::va_list list;
     va_start(list, format);
     const std::optional<std::string> text = formatted(format->text(), Arguments(&list));

@@ -76,17 +76,17 @@ bool isURL(std::string_view text) {
 
 }  // namespace
 
-CFTypeID CFURLGetTypeID() {
+CFTypeID CFURLGetTypeID() noexcept {
     return static_cast<CFTypeID>(Type::url);
 }
 
-CFURLRef CFURLCreateWithString(CFAllocatorRef, CFStringRef text, CFURLRef) {
+CFURLRef CFURLCreateWithString(CFAllocatorRef, CFStringRef text, CFURLRef) noexcept {
     if (!isURL(text->text())) {
         return nullptr;
     }
     return new OpaqueCFURL(Owned<CFStringRef>::adopt(CFStringCreateCopy(nullptr, text)));
 }
 
-CFStringRef CFURLGetString(CFURLRef url) {
+CFStringRef CFURLGetString(CFURLRef url) noexcept {
     return url->text.get();
 }

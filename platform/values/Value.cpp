@@ -151,23 +151,23 @@ std::uint32_t platform::values::hashOfValue(CFTypeRef value) noexcept {
     return hashOfInteger(static_cast<std::int64_t>(reinterpret_cast<std::intptr_t>(value)));
 }
 
-CFTypeRef CFRetain(CFTypeRef value) {
+CFTypeRef CFRetain(CFTypeRef value) noexcept {
     objectOf(value).retain();
     return value;
 }
 
-void CFRelease(CFTypeRef value) {
+void CFRelease(CFTypeRef value) noexcept {
     objectOf(value).release();
 }
 
-CFIndex CFGetRetainCount(CFTypeRef value) {
+CFIndex CFGetRetainCount(CFTypeRef value) noexcept {
     return objectOf(value).retainCount();
 }
 
-CFTypeID CFGetTypeID(CFTypeRef value) {
+CFTypeID CFGetTypeID(CFTypeRef value) noexcept {
     return static_cast<CFTypeID>(objectOf(value).type());
 }
 
-Boolean CFEqual(CFTypeRef lhs, CFTypeRef rhs) {
+Boolean CFEqual(CFTypeRef lhs, CFTypeRef rhs) noexcept {
     return static_cast<Boolean>(equalValues(lhs, rhs));
 }

@@ -67,6 +67,8 @@ struct Entry {
 // frozen remembers it. Null when the value, or something in it, is no property-list value (keys are strings),
 // or when it is nested deeper than deepestPropertyList.
 [[nodiscard]] Owned<CFPropertyListRef> frozen(CFPropertyListRef value);
+// How many containers are nested in a frozen value, itself included.
+[[nodiscard]] int levelsOf(CFPropertyListRef frozen) noexcept;
 
 // --- Editing in place ---
 //

@@ -91,6 +91,36 @@ TEST_F(TreeTest, TopLevelValuesMayBeOfAnyPropertyListType) {
     EXPECT_EQ(SCError(), 1002);
 }
 
+// What can be stored can be committed, and read again.
+TEST_F(TreeTest, NoDeeperThanAFileMayBe) {
+    const auto nested = [](int levels) {
+        return as<CFDictionaryRef>(parsed("<plist version=\"1.0\">" +
+                                          [&] {
+                                              std::string open;
+                                              std::string close;
+                                              for (int i = 1; i < levels; ++i) {
+                                                  open += "<dict><key>a</key>";
+                                                  close += "</dict>";
+                                              }
+                                              return open + "<dict/>" + close;
+                                          }() +
+                                          "</plist>")
+                                       .take());
+    };
+    for (const int levels : {510, 511, 512}) {
+        const auto value = Owned<CFDictionaryRef>::adopt(nested(levels));
+        const bool fits = levels + 2 <= 512;
+        const bool fitsAtTop = levels + 1 <= 512;
+        EXPECT_EQ(SCPreferencesPathSetValue(session.get(), CFSTR("/New/deep"), value.get()) != 0, fits);
+        EXPECT_EQ(SCError(), fits ? 0 : 1002);
+        EXPECT_EQ(SCPreferencesSetValue(session.get(), CFSTR("deep"), value.get()) != 0, fitsAtTop);
+        EXPECT_EQ(SCError(), fitsAtTop ? 0 : 1002);
+    }
+    EXPECT_TRUE(commit(session));
+    (void)directory.write("store/preferences.plist", contentOf(file));
+    EXPECT_TRUE(open());
+}
+
 TEST_F(TreeTest, StoresValuesAsTheyAreNow) {
     const auto inner = Owned<CFMutableDictionaryRef>::adopt(CFDictionaryCreateMutable(
         nullptr, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
