@@ -42,6 +42,16 @@ OSStatus CreateArrayWithKeysOrValues(CFDictionaryRef dict, bool wantKeys, CFArra
     return err;
 }
 
+// The keys that a dictionary has now, held on to whatever the walk's function does to it meanwhile. A walk
+// leaves nothing out: without memory for the keys the process ends, as it does everywhere below.
+CFArrayRef CreateArrayOfKeysForWalk(CFDictionaryRef dict) {
+    CFArrayRef keys = nullptr;
+    if (CFQArrayCreateWithDictionaryKeys(dict, &keys) != 0) {
+        std::abort();
+    }
+    return keys;
+}
+
 // The path's keys as a vector, to be freed; they stay borrowed from the array.
 OSStatus PathArrayHelper(CFArrayRef path, const void*** elements) {
     const CFIndex count = CFArrayGetCount(path);
@@ -205,10 +215,13 @@ OSStatus CFQDictionaryGetValueAtPathArray(CFDictionaryRef dict, CFArrayRef path,
 OSStatus CFQDictionarySetValueAtPath(CFMutableDictionaryRef dict, const CFTypeRef* path, CFIndex count,
                                      CFTypeRef value) {
     CFMutableDictionaryRef parent = nullptr;
+    // The value may be one of the dictionaries on the way, which the walk takes out of the tree.
+    CFQRetain(value);
     const OSStatus err = CFQMutableDictionaryGetParentForPath(dict, path, count, &parent);
     if (err == 0) {
         CFDictionarySetValue(parent, path[count - 1], value);
     }
+    CFQRelease(value);
     return err;
 }
 
@@ -246,18 +259,17 @@ OSStatus CFQDictionaryRemoveValueAtPathArray(CFMutableDictionaryRef dict, CFArra
 
 void CFQPropertyListDeepApplyFunction(CFPropertyListRef propList, CFQPropertyListDeepApplierFunction func,
                                       void* context) {
+    // func may take the node out of the container that held it.
+    CFQRetain(propList);
     func(propList, context);
     if (IsDictionary(propList)) {
         auto* const dict = static_cast<CFDictionaryRef>(propList);
-        // The array holds on to the keys, whatever func does to the dictionary meanwhile.
-        CFArrayRef keys = nullptr;
-        if (CFQArrayCreateWithDictionaryKeys(dict, &keys) == 0) {
-            const CFIndex count = CFArrayGetCount(keys);
-            for (CFIndex i = 0; i < count; ++i) {
-                CFTypeRef value = nullptr;
-                if (CFDictionaryGetValueIfPresent(dict, CFArrayGetValueAtIndex(keys, i), &value)) {
-                    CFQPropertyListDeepApplyFunction(value, func, context);
-                }
+        CFArrayRef keys = CreateArrayOfKeysForWalk(dict);
+        const CFIndex count = CFArrayGetCount(keys);
+        for (CFIndex i = 0; i < count; ++i) {
+            CFTypeRef value = nullptr;
+            if (CFDictionaryGetValueIfPresent(dict, CFArrayGetValueAtIndex(keys, i), &value)) {
+                CFQPropertyListDeepApplyFunction(value, func, context);
             }
         }
         CFQRelease(keys);
@@ -267,21 +279,23 @@ void CFQPropertyListDeepApplyFunction(CFPropertyListRef propList, CFQPropertyLis
             CFQPropertyListDeepApplyFunction(CFArrayGetValueAtIndex(array, i), func, context);
         }
     }
+    CFQRelease(propList);
 }
 
 void CFQPropertyListShallowApplyFunction(CFPropertyListRef propList,
                                          CFQPropertyListShallowApplierFunction func, void* context) {
+    CFQRetain(propList);
     if (IsDictionary(propList)) {
         auto* const dict = static_cast<CFDictionaryRef>(propList);
-        CFArrayRef keys = nullptr;
-        if (CFQArrayCreateWithDictionaryKeys(dict, &keys) == 0) {
-            const CFIndex count = CFArrayGetCount(keys);
-            for (CFIndex i = 0; i < count; ++i) {
-                CFTypeRef key = CFArrayGetValueAtIndex(keys, i);
-                CFTypeRef value = nullptr;
-                if (CFDictionaryGetValueIfPresent(dict, key, &value)) {
-                    func(key, value, context);
-                }
+        CFArrayRef keys = CreateArrayOfKeysForWalk(dict);
+        const CFIndex count = CFArrayGetCount(keys);
+        for (CFIndex i = 0; i < count; ++i) {
+            CFTypeRef key = CFArrayGetValueAtIndex(keys, i);
+            CFTypeRef value = nullptr;
+            if (CFDictionaryGetValueIfPresent(dict, key, &value)) {
+                CFQRetain(value);
+                func(key, value, context);
+                CFQRelease(value);
             }
         }
         CFQRelease(keys);
@@ -289,13 +303,14 @@ void CFQPropertyListShallowApplyFunction(CFPropertyListRef propList,
         auto* const array = static_cast<CFArrayRef>(propList);
         for (CFIndex i = 0; i < CFArrayGetCount(array); ++i) {
             const auto index = static_cast<SInt32>(i);
+            CFTypeRef value = CFQRetain(CFArrayGetValueAtIndex(array, i));
             CFNumberRef number = CFNumberCreate(kCFAllocatorDefault, kCFNumberLongType, &index);
-            if (number != nullptr) {
-                func(number, CFArrayGetValueAtIndex(array, i), context);
-            }
+            func(number, value, context);
             CFQRelease(number);
+            CFQRelease(value);
         }
     }
+    CFQRelease(propList);
 }
 
 Boolean CFQPropertyListIsLeaf(CFPropertyListRef node) {

@@ -77,8 +77,9 @@ using CFQPropertyListShallowApplierFunction = void (*)(CFTypeRef key, CFProperty
 
 // Calls func with the node itself, then with everything inside, each container before its content: a
 // dictionary's values in its order (never its keys), an array's elements by index. func may change the
-// container: keys are those that were there when the walk reached the dictionary. Without memory for the keys
-// a dictionary's content is passed over.
+// container: a dictionary's keys are those that were there when the walk reached it, each value is the one
+// that is there when its turn comes, and the walk holds on to what func is called with. Nothing is left out
+// for lack of memory, which ends the process (CoreFoundation.h).
 void CFQPropertyListDeepApplyFunction(CFPropertyListRef propList, CFQPropertyListDeepApplierFunction func,
                                       void* context);
 // The same one level deep and without the node itself; func is not called for a leaf.

@@ -125,6 +125,18 @@ TEST(Paths, EveryLevelIsReplacedEvenBeforeAFailure) {
     EXPECT_EQ(0, CFQDictionarySetValueAtPath(dict, inner, 2, CFSTR("y")));
     EXPECT_NE(after, CFDictionaryGetValue(dict, CFSTR("a")));
     EXPECT_EQ("{b = {}; s = x}", show(held.get()));
+    EXPECT_EQ(1, CFGetRetainCount(CFDictionaryGetValue(dict, CFSTR("a"))));
+    CFRelease(dict);
+}
+
+TEST(Paths, ADictionaryCanBePutIntoItsOwnCopy) {
+    auto* dict = CFDictionaryCreateMutable(nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
+                                           &kCFTypeDictionaryValueCallBacks);
+    CFDictionarySetValue(dict, CFSTR("a"), read("{b = x}").get());
+    const void* path[] = {CFSTR("a"), CFSTR("b")};
+    // Nobody but the tree holds the value, which the walk takes out of it.
+    EXPECT_EQ(0, CFQDictionarySetValueAtPath(dict, path, 2, CFDictionaryGetValue(dict, CFSTR("a"))));
+    EXPECT_EQ("{a = {b = {b = x}}}", show(dict));
     CFRelease(dict);
 }
 
@@ -172,6 +184,43 @@ TEST(Walks, DeepGoesInOrderAndShallowOneLevel) {
         CFQPropertyListShallowApplyFunction(value.get(), shallow, &seen);
         EXPECT_EQ(row.shallow, seen);
         EXPECT_EQ(row.isLeaf, CFQPropertyListIsLeaf(value.get()) != 0) << row.value;
+    }
+}
+
+struct Emptied {
+    CFMutableDictionaryRef dict;
+    CFMutableArrayRef array;
+    std::string seen;
+};
+
+void emptyContainers(CFTypeRef node, void* context) {
+    auto* emptied = static_cast<Emptied*>(context);
+    if (!CFQPropertyListIsLeaf(node)) {
+        return;
+    }
+    CFDictionaryRemoveValue(emptied->dict, CFSTR("a"));
+    CFDictionaryRemoveValue(emptied->dict, CFSTR("b"));
+    while (CFArrayGetCount(emptied->array) > 0) {
+        CFArrayRemoveValueAtIndex(emptied->array, 0);
+    }
+    emptied->seen += show(node) + " ";
+}
+
+TEST(Walks, HoldOnToWhatTheFunctionTakesOut) {
+    for (const int walk : {0, 1, 2, 3}) {
+        Emptied emptied = {CFDictionaryCreateMutableCopy(nullptr, 0, dictionary(read("{a = x; b = y}"))),
+                           CFArrayCreateMutableCopy(nullptr, 0, array(read("(x, y)"))), ""};
+        CFTypeRef walked = walk < 2 ? static_cast<CFTypeRef>(emptied.dict) : emptied.array;
+        if (walk % 2 == 0) {
+            CFQPropertyListDeepApplyFunction(walked, emptyContainers, &emptied);
+        } else {
+            CFQPropertyListShallowApplyFunction(
+                walked, [](CFTypeRef, CFTypeRef node, void* context) { emptyContainers(node, context); },
+                &emptied);
+        }
+        EXPECT_EQ("x ", emptied.seen);
+        CFRelease(emptied.dict);
+        CFRelease(emptied.array);
     }
 }
 
