@@ -40,9 +40,18 @@
 //   outermost one; "store's status" stands for any of the store's values (SystemConfiguration.h), among them
 //   1003 without the rights, 1004 for a value that is not there, 1001 for a value of the wrong type or a
 //   reason unknown.
-// - -50: a null argument, or as told. -108: no memory for a list. -4960: a value cannot be made, or one
-//   that is expected in the tree is missing or has the wrong type (a name that is no string counts as
-//   missing).
+// - -50: a null argument, or as told. -108: no memory for a list of this library's own; any other lack of
+//   memory ends the process (CoreFoundation.h). -4960: a value cannot be made, or one that is expected in the
+//   tree is missing or has the wrong type (a name that is no string counts as missing).
+// - A location without a readable "ServiceOrder" fails whatever has to know its services: listing, adding,
+//   duplicating and deleting them, and duplicating it. So does an entry of the order without a link that
+//   leads somewhere, wherever the resolved IDs are needed. Removing the services that no location lists needs
+//   those of every location, so that one such location fails every MoreSCDeleteSet and MoreSCDeleteService,
+//   after what they do besides.
+// - What an operation undoes after a failure it undoes in the session's tree, before anything is committed.
+// The
+//   services that it made are removed with those that no location lists; where that fails as told above, they
+//   stay in "NetworkServices", listed by nobody, until a removal succeeds.
 #pragma once
 
 #include "platform/CoreFoundation.h"
@@ -51,8 +60,9 @@
 // --- Session ---
 
 // Begins one use of the session, opening it when none is open. lockThePrefs takes the store's lock against
-// other processes, until the outermost close; waitForLock waits for it. Match every call with MoreSCClose,
-// a failed one too. Store's status.
+// other processes, until the outermost close; waitForLock waits for it, at most half a minute (3002). Whoever
+// waited for a process that then committed gets 3005, since the session was read before: close, and open
+// again. Match every call with MoreSCClose, a failed one too. Store's status.
 OSStatus MoreSCOpen(Boolean lockThePrefs, Boolean waitForLock);
 // Ends one use. err is the caller's status, which must not be null. dirty says that the caller changed the
 // tree: when *err is 0 the session is marked for a commit; a failed caller does not mark it, and cannot clear
@@ -96,15 +106,15 @@ OSStatus MoreSCCopyCurrentSet(CFStringRef* setID);
 OSStatus MoreSCSetCurrentSet(CFStringRef setID);
 
 // A new location with one service for each network port of the computer (MoreSCFPortScanner.h), in the ports'
-// order. On failure nothing of it is left. newSetID is optional.
+// order. On failure it is removed again. newSetID is optional.
 OSStatus MoreSCNewSet(CFStringRef userVisibleName, CFStringRef* newSetID);
 // A copy of a location with copies of the services that it lists. A null name keeps the old one's. On failure
-// nothing of it is left. newSetID is optional.
+// it is removed again. newSetID is optional.
 OSStatus MoreSCDuplicateSet(CFStringRef setID, CFStringRef newSetUserVisibleName, CFStringRef* newSetID);
 // Removes a location, and every service that no location lists any more. -50 for the current location, which
 // stays (services that no location lists are still removed from the session, but do not mark it), and for a
-// null ID, with nothing changed. A location without a readable "ServiceOrder" anywhere in the tree fails the
-// removal of services, and with it the call.
+// null ID, with nothing changed. When the removal of services fails, the location is gone from the session
+// all the same; a call that is the outermost one then commits nothing.
 OSStatus MoreSCDeleteSet(CFStringRef setID);
 OSStatus MoreSCRenameSet(CFStringRef setID, CFStringRef userVisibleName);
 
@@ -117,7 +127,8 @@ OSStatus MoreSCRenameSet(CFStringRef setID, CFStringRef userVisibleName);
 // The location's links (service ID -> link) and its service order, either optional; the order is -4960 when
 // it is missing. Both outputs are null on failure.
 OSStatus MoreSCCopyServicesDict(CFStringRef setID, CFDictionaryRef* servicesDict, CFArrayRef* serviceOrder);
-// The same as mutable copies; both must be there, even when one is wanted.
+// The same as mutable copies; both must be there, even when one is wanted. The outputs are written only on
+// success.
 OSStatus MoreSCCopyServicesDictMutable(CFStringRef setID, CFMutableDictionaryRef* servicesDict,
                                        CFMutableArrayRef* serviceOrder);
 // Replaces the links, then the service order; null leaves what is there.
@@ -139,15 +150,17 @@ OSStatus MoreSCCopyBSDNameOfService(CFStringRef setID, CFStringRef serviceID, CF
 // A new service for a port (a port dictionary of MoreSCFPortScanner.h), last in the location's order, with an
 // entity each for "Interface", "Proxies", "AppleTalk" (ports with a "MACAddress" only, off), "DNS", "IPv4"
 // ("Manual" with a "MACAddress", else "PPP"), "PPP" (off with a "MACAddress") and the hardware: "AirPort",
-// "Ethernet" or "Modem". On failure nothing of it is left. -50 when the port lacks one of "UserDefinedName",
+// "Ethernet" or "Modem". On failure it is removed again. -50 when the port lacks one of "UserDefinedName",
 // "DeviceName", "Hardware", "Type". newServiceID is optional.
 OSStatus MoreSCNewService(CFStringRef setID, CFDictionaryRef portDict, CFStringRef* newServiceID);
 // A copy of the shared service of that resolved ID, last in the location's order; a null name keeps the old
-// one's. After a failure to rename it the copy stays. newServiceID is optional.
+// one's. After a failure to rename it the copy stays. -50 for a null service ID, with nothing changed.
+// newServiceID is optional.
 OSStatus MoreSCDuplicateService(CFStringRef setID, CFStringRef serviceID, CFStringRef userVisibleName,
                                 CFStringRef* newServiceID);
 // Takes the service out of the location's links and order (one that is not in the order is only unlinked),
-// and removes every service that no location lists any more. -50 for a null service ID, with nothing changed.
+// and removes every service that no location lists any more; when that removal fails, the service is out of the
+// location, and committed so, all the same. -50 for a null service ID, with nothing changed.
 OSStatus MoreSCDeleteService(CFStringRef setID, CFStringRef serviceID);
 OSStatus MoreSCRenameService(CFStringRef setID, CFStringRef serviceID, CFStringRef userVisibleName);
 
@@ -156,6 +169,7 @@ OSStatus MoreSCRenameService(CFStringRef setID, CFStringRef serviceID, CFStringR
 // A service's whole dictionary (null service ID: the location's global entities, among them "IPv4" with the
 // service order). Null output on failure.
 OSStatus MoreSCCopyEntitiesDict(CFStringRef setID, CFStringRef serviceID, CFDictionaryRef* entitiesDict);
+// A mutable copy; the output is written only on success.
 OSStatus MoreSCCopyEntitiesDictMutable(CFStringRef setID, CFStringRef serviceID,
                                        CFMutableDictionaryRef* entitiesDict);
 // Replaces it, name and markers included.
@@ -164,6 +178,7 @@ OSStatus MoreSCSetEntitiesDict(CFStringRef setID, CFStringRef serviceID, CFDicti
 // One entity; 1004 when the service has none for the protocol. Null output on failure.
 OSStatus MoreSCCopyEntity(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                           CFDictionaryRef* entity);
+// A mutable copy; the output is written only on success.
 OSStatus MoreSCCopyEntityMutable(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                                  CFMutableDictionaryRef* entity);
 // Adds the entity or replaces it.

@@ -67,6 +67,8 @@ const MoreSCModemDigest kMoreSCModemDigestDefault = {
 
 namespace {
 
+constexpr OSStatus kUnknownProtocolErr = -1;
+
 Boolean gTenTwoOrLater = false;
 
 // One key of a record each. After an error none is written any more.
@@ -138,8 +140,16 @@ OSStatus CreateArrayWithStrings(UInt32 count, const CFStringRef* strings, CFMuta
 }
 
 OSStatus CreateStringWithASCII(const char* text, CFStringRef* result) {
-    *result = CFStringCreateWithCString(kCFAllocatorDefault, text, kCFStringEncodingASCII);
-    return *result != nullptr ? 0 : coreFoundationUnknownErr;
+    CFStringRef string = CFStringCreateWithCString(kCFAllocatorDefault, text, kCFStringEncodingASCII);
+    const OSStatus err = string != nullptr ? 0 : coreFoundationUnknownErr;
+    HandOverOrNull(err, string, result);
+    return err;
+}
+
+// The member of a union of digests; none of no union.
+template <class Union, class Digest>
+const Digest* Member(const Union* digests, Digest Union::*member) {
+    return digests != nullptr ? &(digests->*member) : nullptr;
 }
 
 // An empty record for a builder to fill; -50 without a digest.
@@ -359,35 +369,38 @@ OSStatus MoreSCCreateIPv4GlobalEntity(const MoreSCIPv4GlobalDigest* /*digest*/,
 
 OSStatus MoreSCCreateNetInfoGlobalEntity(const MoreSCNetInfoGlobalDigest* /*digest*/,
                                          CFMutableDictionaryRef* entity) {
-    return CFQDictionaryCreateMutable(entity);
+    CFMutableDictionaryRef record = nullptr;
+    const OSStatus err = CFQDictionaryCreateMutable(&record);
+    HandOverOrNull(err, record, entity);
+    return err;
 }
 
 OSStatus MoreSCCreateEntity(CFStringRef protocol, const MoreSCDigest* digest,
                             CFMutableDictionaryRef* entity) {
     OSStatus err = 0;
-    if (protocol == nullptr || digest == nullptr) {
+    if (protocol == nullptr) {
         err = paramErr;
-        *entity = nullptr;
+        HandOverOrNull<CFMutableDictionaryRef>(err, nullptr, entity);
     } else if (CFEqual(protocol, CFSTR("Interface"))) {
-        err = MoreSCCreateInterfaceEntity(&digest->interface, entity);
+        err = MoreSCCreateInterfaceEntity(Member(digest, &MoreSCDigest::interface), entity);
     } else if (CFEqual(protocol, CFSTR("Proxies"))) {
-        err = MoreSCCreateProxiesEntity(&digest->proxies, entity);
+        err = MoreSCCreateProxiesEntity(Member(digest, &MoreSCDigest::proxies), entity);
     } else if (CFEqual(protocol, CFSTR("AppleTalk"))) {
-        err = MoreSCCreateAppleTalkEntity(&digest->appleTalk, entity);
+        err = MoreSCCreateAppleTalkEntity(Member(digest, &MoreSCDigest::appleTalk), entity);
     } else if (CFEqual(protocol, CFSTR("DNS"))) {
-        err = MoreSCCreateDNSEntity(&digest->dns, entity);
+        err = MoreSCCreateDNSEntity(Member(digest, &MoreSCDigest::dns), entity);
     } else if (CFEqual(protocol, CFSTR("IPv4"))) {
-        err = MoreSCCreateIPv4Entity(&digest->ipv4, entity);
+        err = MoreSCCreateIPv4Entity(Member(digest, &MoreSCDigest::ipv4), entity);
     } else if (CFEqual(protocol, CFSTR("PPP"))) {
-        err = MoreSCCreatePPPEntity(&digest->ppp, entity);
+        err = MoreSCCreatePPPEntity(Member(digest, &MoreSCDigest::ppp), entity);
     } else if (CFEqual(protocol, CFSTR("AirPort"))) {
-        err = MoreSCCreateAirPortEntity(&digest->airPort, entity);
+        err = MoreSCCreateAirPortEntity(Member(digest, &MoreSCDigest::airPort), entity);
     } else if (CFEqual(protocol, CFSTR("Ethernet"))) {
-        err = MoreSCCreateEthernetEntity(&digest->ethernet, entity);
+        err = MoreSCCreateEthernetEntity(Member(digest, &MoreSCDigest::ethernet), entity);
     } else if (CFEqual(protocol, CFSTR("Modem"))) {
-        err = MoreSCCreateModemEntity(&digest->modem, entity);
+        err = MoreSCCreateModemEntity(Member(digest, &MoreSCDigest::modem), entity);
     } else {
-        err = -1;
+        err = kUnknownProtocolErr;
     }
     return err;
 }
@@ -395,15 +408,15 @@ OSStatus MoreSCCreateEntity(CFStringRef protocol, const MoreSCDigest* digest,
 OSStatus MoreSCCreateGlobalEntity(CFStringRef protocol, const MoreSCGlobalDigest* digest,
                                   CFMutableDictionaryRef* entity) {
     OSStatus err = 0;
-    if (protocol == nullptr || digest == nullptr) {
+    if (protocol == nullptr) {
         err = paramErr;
-        *entity = nullptr;
+        HandOverOrNull<CFMutableDictionaryRef>(err, nullptr, entity);
     } else if (CFEqual(protocol, CFSTR("IPv4"))) {
-        err = MoreSCCreateIPv4GlobalEntity(&digest->ipv4, entity);
+        err = MoreSCCreateIPv4GlobalEntity(Member(digest, &MoreSCGlobalDigest::ipv4), entity);
     } else if (CFEqual(protocol, CFSTR("NetInfo"))) {
-        err = MoreSCCreateNetInfoGlobalEntity(&digest->netInfo, entity);
+        err = MoreSCCreateNetInfoGlobalEntity(Member(digest, &MoreSCGlobalDigest::netInfo), entity);
     } else {
-        err = -1;
+        err = kUnknownProtocolErr;
     }
     return err;
 }

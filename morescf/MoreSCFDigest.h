@@ -6,9 +6,10 @@
 // retains the very objects. Flags and numbers are stored as 32-bit numbers, flags as 0 and 1, addresses as
 // dotted quads, MAC addresses as lower-case hexadecimal bytes between colons.
 //
-// Every builder's output is a new mutable dictionary of the caller's, null on failure. Statuses: -50 for a
-// null digest (the two global builders read none and take null) or a null member that must not be (marked
-// "required"), -4960 when a value cannot be made, -108 without memory. Nothing here touches the preferences.
+// Every builder's output is a new mutable dictionary of the caller's, null on failure; a null output pointer
+// means that the dictionary is not wanted, only the status. Statuses: -50 for a null digest (the two global
+// builders read none and take null) or a null member that must not be (marked "required"), -4960 when a value
+// cannot be made. Nothing here touches the preferences.
 #pragma once
 
 #include <netinet/in.h>
@@ -173,7 +174,8 @@ OSStatus MoreSCCreateNetInfoGlobalEntity(const MoreSCNetInfoGlobalDigest* digest
                                          CFMutableDictionaryRef* entity);
 
 // The builder of a protocol ("Interface", "Proxies", "AppleTalk", "DNS", "IPv4", "PPP", "AirPort",
-// "Ethernet", "Modem") with the digest's member for it. -1 for any other protocol, with the output untouched.
+// "Ethernet", "Modem") with the digest's member for it. -1 for any other protocol, whatever the digest, with
+// the output untouched; -50 for a null one.
 OSStatus MoreSCCreateEntity(CFStringRef protocol, const MoreSCDigest* digest, CFMutableDictionaryRef* entity);
 // The same for "IPv4" and "NetInfo".
 OSStatus MoreSCCreateGlobalEntity(CFStringRef protocol, const MoreSCGlobalDigest* digest,
@@ -181,7 +183,7 @@ OSStatus MoreSCCreateGlobalEntity(CFStringRef protocol, const MoreSCGlobalDigest
 
 // --- Conversions ---
 //
-// Created outputs belong to the caller and are null on failure.
+// Created outputs belong to the caller and are null on failure; they need not be wanted either.
 
 // 00 0A 95 9D 68 16 gives "00:0a:95:9d:68:16".
 OSStatus MoreSCFCreateStringWithMacAddress(const UInt8 macAddr[6], CFStringRef* result);
@@ -193,7 +195,7 @@ OSStatus MoreSCFCreateStringWithInetAddress(in_addr addr, CFStringRef* result);
 // The same for several, as an array; none gives an empty one.
 OSStatus MoreSCFCreateArrayWithInetAddresses(CFIndex count, const in_addr* addresses, CFArrayRef* result);
 // A password as it is stored under "AuthPassword": its UTF-16 code units, each as two bytes with the higher
-// one first, and nothing else. -50 for a null password.
+// one first, and nothing else. -50 for a null password, -108 without memory for the copy.
 OSStatus MoreSCFCopyEncodedPPPPassword(CFStringRef password, CFDataRef* encodedPassword);
 
 // --- Defaults ---

@@ -51,7 +51,7 @@ OSStatus MoreSCCopyEntitiesDictMutable(CFStringRef setID, CFStringRef serviceID,
     }
     CFQRelease(dict);
     MoreSCClose(&err, false);
-    HandOverOrNull(err, copy, entitiesDict);
+    HandOver(err, copy, entitiesDict);
     return err;
 }
 
@@ -102,7 +102,7 @@ OSStatus MoreSCCopyEntityMutable(CFStringRef setID, CFStringRef serviceID, CFStr
     }
     CFQRelease(dict);
     MoreSCClose(&err, false);
-    HandOverOrNull(err, copy, entity);
+    HandOver(err, copy, entity);
     return err;
 }
 

@@ -30,8 +30,8 @@ OSStatus MoreSCFindSetByUserVisibleNameAndCopyID(CFStringRef userVisibleName, CF
 // A new location in which only the modem's service is on, with entities made from the digests: "PPP" always
 // (a null digest gives one that is off, with the default options), "Modem", "IPv4" and "DNS" where a digest
 // is given, else as MoreSCNewService made them. A null modem name means the first modem of the computer;
-// without one every service is off. On failure nothing of the location is left. newSetID is optional, and
-// null on failure.
+// without one every service is off. On failure the location is removed again, as by MoreSCNewSet. newSetID is
+// optional, and null on failure.
 OSStatus MoreSCMakeNewDialupSet(CFStringRef modemBSDName, CFStringRef userVisibleName,
                                 const MoreSCModemDigest* modemDigest, const MoreSCPPPDigest* pppDigest,
                                 const MoreSCIPv4Digest* ipv4Digest, const MoreSCDNSDigest* dnsDigest,

@@ -234,8 +234,8 @@ OSStatus MoreSCCopyServicesDictMutable(CFStringRef setID, CFMutableDictionaryRef
     CFQRelease(services);
     CFQRelease(order);
     MoreSCClose(&err, false);
-    HandOverOrNull(err, servicesCopy, servicesDict);
-    HandOverOrNull(err, orderCopy, serviceOrder);
+    HandOver(err, servicesCopy, servicesDict);
+    HandOver(err, orderCopy, serviceOrder);
     return err;
 }
 
@@ -417,6 +417,9 @@ OSStatus MoreSCDuplicateService(CFStringRef setID, CFStringRef serviceID, CFStri
                                 CFStringRef* newServiceID) {
     CFStringRef copyID = nullptr;
     OSStatus err = MoreSCOpen(false, false);
+    if (err == 0 && serviceID == nullptr) {
+        err = paramErr;
+    }
     if (err == 0) {
         err = DuplicateService(serviceID, &copyID);
     }
@@ -426,7 +429,7 @@ OSStatus MoreSCDuplicateService(CFStringRef setID, CFStringRef serviceID, CFStri
     if (err == 0 && userVisibleName != nullptr) {
         err = MoreSCRenameService(setID, copyID, userVisibleName);
     }
-    if (err != 0) {
+    if (err != 0 && serviceID != nullptr) {
         DeleteUnreferencedServices();
     }
     MoreSCClose(&err, true);

@@ -7,6 +7,7 @@
 
 #include <cstdint>
 #include <fstream>
+#include <functional>
 #include <iterator>
 #include <memory>
 #include <optional>
@@ -136,7 +137,9 @@ class MoreSCFTest : public testing::Test {
     testing_support::SysfsTree sysfs;
     std::shared_ptr<testing_support::RecordingAgent> agent =
         std::make_shared<testing_support::RecordingAgent>();
-    platform::LogCapture capture{[](platform::LogLevel /*level*/, std::string_view /*line*/) {}};
+    std::string log;  // the lines, each with its line break
+    platform::LogCapture capture{
+        [this](platform::LogLevel /*level*/, std::string_view line) { log += std::string(line) + "\n"; }};
     platform::Host host;
     platform::HostOverride override;
 };

@@ -52,6 +52,10 @@ TEST_F(DigestTest, EveryMemberHasItsKeyAndPlace) {
               made(CFSTR("DNS"), [&](MoreSCDigest& digest) {
                   digest.dns = {2, servers, 2, domains};
               }));
+    EXPECT_EQ("{ServerAddresses = (192.0.0.1); SearchDomains = (example.org)}",
+              made(CFSTR("DNS"), [&](MoreSCDigest& digest) {
+                  digest.dns = {1, servers, 1, domains};
+              }));
     EXPECT_EQ("{ConfigMethod = Manual; DHCPClientID = c; Addresses = (192.0.0.1); Router = 255.255.255.255}",
               made(CFSTR("IPv4"), [&](MoreSCDigest& digest) {
                   digest.ipv4 = {CFSTR("Manual"), servers[0], {}, servers[1], CFSTR("c")};
@@ -102,6 +106,71 @@ TEST_F(DigestTest, PPPTakesTheOptionsOfTheCallerOrOfTheSystem) {
         "LCPEchoInterval = #10}",
         ppp({}));
     EXPECT_EQ(&kMoreSCPPPOptionsDefaultTenOne, MoreSCGetDefaultPPPOptions(true));
+}
+
+TEST_F(DigestTest, DispatchersAndMissingDigests) {
+    const MoreSCDigest digest = {};
+    const MoreSCGlobalDigest globals = {};
+    const struct {
+        CFStringRef protocol;
+        const char* built;    // without a digest
+        const char* unknown;  // with one, where that is no matter of the digest
+        const char* global;   // both with and without
+    } rows[] = {
+        {CFSTR("IPv4"), "-50 null", nullptr, "{PPPOverridePrimary = #0; ServiceOrder = ()}"},
+        {CFSTR("NetInfo"), "-1 untouched", "-1 untouched", "{}"},
+        {CFSTR("Modem"), "-50 null", nullptr, "-1 untouched"},
+        {CFSTR("Modem "), "-1 untouched", "-1 untouched", "-1 untouched"},
+        {nullptr, "-50 null", "-50 null", "-50 null"},
+    };
+    const auto built = [](auto create, CFStringRef protocol, const auto* from) {
+        Output<CFMutableDictionaryRef> entity;
+        const OSStatus err = create(protocol, from, &entity);
+        // An output that is not wanted changes nothing.
+        EXPECT_EQ(err, create(protocol, from, nullptr));
+        return (err != 0 ? std::to_string(err) + " " : "") + entity.shown();
+    };
+    for (const auto& row : rows) {
+        EXPECT_EQ(row.built,
+                  built(MoreSCCreateEntity, row.protocol, static_cast<const MoreSCDigest*>(nullptr)));
+        if (row.unknown != nullptr) {
+            EXPECT_EQ(row.unknown, built(MoreSCCreateEntity, row.protocol, &digest));
+        }
+        EXPECT_EQ(row.global, built(MoreSCCreateGlobalEntity, row.protocol, &globals));
+        EXPECT_EQ(row.global, built(MoreSCCreateGlobalEntity, row.protocol,
+                                    static_cast<const MoreSCGlobalDigest*>(nullptr)));
+    }
+}
+
+TEST_F(DigestTest, MacAddressesAndPasswords) {
+    const struct {
+        const char* text;
+        OSStatus err;
+        const char* again;
+    } addresses[] = {
+        {"00:0A:95:9d:68:16", 0, "00:0a:95:9d:68:16"},
+        {"0:a:95:9D:68:ff", 0, "00:0a:95:9d:68:ff"},
+        {"00:0a:95:9d:68:16 ", -4960, nullptr},
+        {"00:0a:95:9d:68", -1, nullptr},
+        {"00:0a:95:9d:68:", -1, nullptr},
+        {"00-0a-95-9d-68-16", -1, nullptr},
+        {"00:0a:95:9d:6é", -4960, nullptr},
+        {"", -1, nullptr},
+    };
+    for (const auto& row : addresses) {
+        UInt8 bytes[6] = {1, 2, 3, 4, 5, 6};
+        EXPECT_EQ(row.err, MoreSCFStringToMacAddress(Str(row.text), bytes)) << row.text;
+        Output<CFStringRef> again;
+        EXPECT_EQ(0, MoreSCFCreateStringWithMacAddress(bytes, &again));
+        EXPECT_EQ(row.err == 0 ? row.again : "01:02:03:04:05:06", again.shown());
+    }
+    const std::pair<const char*, const char*> passwords[] = {
+        {"", "<>"}, {"x", "<0078>"}, {"aé", "<006100e9>"}, {"\U0001F512", "<d83ddd12>"}};
+    for (const auto& [password, stored] : passwords) {
+        Output<CFDataRef> data;
+        EXPECT_EQ(0, MoreSCFCopyEncodedPPPPassword(Str(password), &data));
+        EXPECT_EQ(stored, data.shown());
+    }
 }
 
 }  // namespace

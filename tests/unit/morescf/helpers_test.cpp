@@ -114,7 +114,8 @@ TEST_F(HelpersTest, MakesADialupLocation) {
     const MoreSCModemDigest modem = {CFSTR("script"), 0, 0, 1, 0};
     MoreSCIPv4Digest ipv4 = {};
     ipv4.configMethod = CFSTR("Manual");
-    const MoreSCDNSDigest dns = {};
+    const CFStringRef domain = CFSTR("example.org");
+    const MoreSCDNSDigest dns = {0, nullptr, 1, &domain};
     const auto active = [](CFStringRef setID, const char* serviceID) {
         Boolean isActive = 7;
         EXPECT_EQ(0, MoreSCIsServiceActive(setID, Str(serviceID), &isActive));
@@ -133,9 +134,21 @@ TEST_F(HelpersTest, MakesADialupLocation) {
         "PulseDial = #1; Speaker = #0}",
         at("/NetworkServices/7/Modem"));
     EXPECT_EQ("{ConfigMethod = Manual}", at("/NetworkServices/7/IPv4"));
+    EXPECT_EQ("{SearchDomains = (example.org)}", at("/NetworkServices/7/DNS"));
     EXPECT_EQ(0U, at("/NetworkServices/7/PPP").find("{DialOnDemand"));
     EXPECT_NE(std::string::npos, at("/NetworkServices/7/PPP").find("AuthName = guest"));
     MoreSCClose(&err, false);
+
+    // By name, whatever comes first; a name that no port has switches all of them off.
+    setTree(twoSets);
+    EXPECT_EQ(0, MoreSCMakeNewDialupSet(CFSTR("ttyS0"), CFSTR("dial"), nullptr, &ppp, nullptr, nullptr, &id));
+    EXPECT_FALSE(active(id, "7"));
+    EXPECT_TRUE(active(id, "8"));
+    EXPECT_EQ(0,
+              MoreSCMakeNewDialupSet(CFSTR("none"), CFSTR("dial"), nullptr, nullptr, nullptr, nullptr, &id));
+    for (const char* service : {"10", "11", "12"}) {
+        EXPECT_FALSE(active(id, service)) << service;
+    }
 
     // A digest that cannot be used leaves nothing behind.
     const std::string before = tree();

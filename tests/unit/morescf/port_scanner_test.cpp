@@ -159,6 +159,12 @@ TEST(PortScanner, DescribesAndNamesEthernet) {
               scan({{{kCard, "{IOMACAddress = <000a959d6816>; IOProviderClass = IOPCIDevice}", pci}}}));
     EXPECT_EQ(ethernet("; AAPL,slot-name = 3; IOChildIndex = 2", "PCI Ethernet Slot 3, Port 2", 6),
               scan({{{kCard, kPCI, "{name = <7063>; AAPL,slot-name = <534c4f542d33>; IOChildIndex = #1}"}}}));
+    // Neither seven bytes nor a name of zero bytes is what it should be; without a slot's name it is unknown.
+    EXPECT_EQ(ethernet("; AAPL,slot-name = unknown", "PCI Ethernet Slot unknown", 6),
+              scan({{{kCard, "{IOMACAddress = <000a959d681677>; IOProviderClass = IOPCIDevice}",
+                      "{name = <0000>}"}}}));
+    EXPECT_EQ(ethernet("; AAPL,slot-name = J9", "PCI Ethernet Slot J9", 6),
+              scan({{{kCard, kPCI, "{name = <00>; AAPL,slot-name = <4a39>}"}}}));
     EXPECT_EQ(ethernet("", "Wireless Network Adaptor", 8),
               scan({{{kCard, kPCI, "{name = <726164696f0000>}"}}}));
     EXPECT_EQ(ethernet("; BSD Name = en1", "Ethernet Adaptor (en1)", 9),
@@ -183,6 +189,12 @@ TEST(PortScanner, DescribesAndNamesSerialPorts) {
         {"{IOTTYBaseName = modem; IOSerialBSDClientType = IOModemSerialStream", "{}", "0", "",
          "Internal Modem"},
         {"{IOTTYBaseName = modem; IOSerialBSDClientType = IORS232SerialStream", "{}", "4", "", "Modem Port"},
+        {"{IOTTYBaseName = Modem; IOSerialBSDClientType = IOModemSerialStream", "{}", "2",
+         "; IOTTYBaseName = modem", "modem-port"},
+        {"{IOTTYBaseName = printer; IOSerialBSDClientType = IOModemSerialStream", "{}", "2", "",
+         "Printer Port"},
+        {"{IOTTYBaseName = usbmodem; IOSerialBSDClientType = IORS232SerialStream", "{}", "1", "",
+         "USB Modem"},
         {"{IOTTYBaseName = modem-printer; IOSerialBSDClientType = IORS232SerialStream", "{}", "4", "",
          "Modem/Printer Port"},
         {"{IOTTYBaseName = usbmodem; IOSerialBSDClientType = IOModemSerialStream",
@@ -207,6 +219,10 @@ TEST(PortScanner, OnePortThatCannotBeDescribedFailsAll) {
     const std::string noDevice = std::to_string(kIOReturnNoDevice);
     const Port good = {{"{BSD Name = en0}", "{}", "{}"}};
     EXPECT_EQ("-1", scan({good, {{"{}", "{}", "{}"}}})) << "no name";
+    EXPECT_EQ("-1", scan({good, {{kCard, kPCI, "{}"}}})) << "a bus without a name";
+    EXPECT_EQ("-1",
+              scan({good, {{"{IOTTYBaseName = b; IOSerialBSDClientType = IORS232SerialStream}"}, kSerial}}))
+        << "no device";
     EXPECT_EQ(noDevice, scan({good, {{kCard}}})) << "no controller";
     EXPECT_EQ(noDevice, scan({good, {{kCard, "{}"}}})) << "no bus";
 }

@@ -41,6 +41,33 @@ TEST_F(ServicesTest, MakesWhatAPortNeeds) {
         makeService(airPort));
 }
 
+TEST_F(ServicesTest, AModemGetsTheDefaultScript) {
+    const char* modem =
+        "{UserDefinedName = Fax; DeviceName = ttyS9; Hardware = Modem; Type = PPP; SubType = PPPSerial; "
+        "HardwareVariant = IrDA-IrCOMM}";
+    const std::string start =
+        "{UserDefinedName = Fax; Interface = {DeviceName = ttyS9; UserDefinedName = Fax; Hardware = Modem; "
+        "Type = "
+        "PPP; SubType = PPPSerial; HardwareVariant = IrDA-IrCOMM}; Proxies";
+    const std::string middle =
+        "DNS = {}; IPv4 = {ConfigMethod = PPP}; PPP = {DialOnDemand = #0; DisconnectOnIdle = #1; "
+        "DisconnectOnIdleTimer = #600; ";
+    for (const std::string script : {"", "Speedy"}) {
+        setTree(twoSets);
+        if (!script.empty()) {
+            (void)directory.write("scripts/local/" + script, "");
+        }
+        const std::string made = makeService(modem);
+        EXPECT_TRUE(made.starts_with(start)) << made;
+        EXPECT_NE(std::string::npos, made.find(middle)) << made;
+        EXPECT_TRUE(
+            made.ends_with("Modem = {ConnectionScript = " + script +
+                           "; DataCompression = #1; DialMode = WaitForDialTone; ErrorCorrection = #1; "
+                           "PulseDial = #0; Speaker = #1}}"))
+            << made;
+    }
+}
+
 TEST_F(ServicesTest, DefaultsFollowTheSystemVersion) {
     const struct {
         std::optional<std::int32_t> version;
@@ -65,33 +92,6 @@ TEST_F(ServicesTest, DefaultsFollowTheSystemVersion) {
                                         std::string("Ethernet = {MACAddress = 00:0a:95:9d:68:16}")}) {
             EXPECT_NE(std::string::npos, made.find(part)) << part << " in " << made;
         }
-    }
-}
-
-TEST_F(ServicesTest, DeletingKeepsWhatAnotherLocationLists) {
-    EXPECT_EQ(0, MoreSCDeleteService(nullptr, Str("6")));
-    EXPECT_NE(std::string::npos, tree().find("6 = {UserDefinedName = Dial")) << "location 2 lists it";
-    EXPECT_EQ(0, MoreSCDeleteService(Str("2"), Str("60")));
-    EXPECT_EQ(std::string::npos, tree().find("Dial"));
-}
-
-TEST_F(ServicesTest, SwitchingAnEntityWritesOnlyAChange) {
-    const struct {
-        const char* protocol;
-        Boolean active;
-        OSStatus err;
-        bool commits;
-    } rows[] = {
-        {"IPv4", true, 0, false}, {"IPv4", false, 0, true},      {"IPv4", false, 0, false},
-        {"IPv4", true, 0, true},  {"Modem", false, 1004, false},
-    };
-    for (const auto& row : rows) {
-        const std::string before = fileIdentity();
-        EXPECT_EQ(row.err, MoreSCSetEntityActive(nullptr, Str("5"), Str(row.protocol), row.active));
-        EXPECT_EQ(row.commits, before != fileIdentity()) << row.protocol;
-        Boolean active = 9;
-        EXPECT_EQ(row.err, MoreSCIsEntityActive(nullptr, Str("5"), Str(row.protocol), &active));
-        EXPECT_EQ(row.err == 0 ? row.active : 9, active);
     }
 }
 

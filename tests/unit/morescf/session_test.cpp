@@ -1,3 +1,10 @@
+#include <fcntl.h>
+#include <sys/file.h>
+
+#include <chrono>
+#include <thread>
+
+#include "platform/FileDescriptor.h"
 #include "tests/unit/morescf/Fixture.h"
 
 namespace morescf_test {
@@ -87,20 +94,50 @@ TEST_F(SessionTest, AnOpenThatFailsIsBalanced) {
 }
 
 TEST_F(SessionTest, LocksForAsLongAsTheOutermostUse) {
-    const auto lockByAnother = [] {
-        SCPreferencesRef other = SCPreferencesCreate(nullptr, CFSTR("another"), nullptr);
-        const Boolean locked = SCPreferencesLock(other, false);
-        CFRelease(other);
-        return locked != 0;
+    const auto lockByAnother = [this] {
+        return platform::FileDescriptor(
+            ::open(directory.at("store/preferences.lock").c_str(), O_RDWR | O_CREAT, 0600));
     };
+    const auto isFree = [&] { return flock(lockByAnother().get(), LOCK_EX | LOCK_NB) == 0; };
     OSStatus err = MoreSCOpen(false, false);
-    EXPECT_TRUE(lockByAnother());
+    // Held on to, so that only giving the lock back frees it.
+    SCPreferencesRef session = MoreSCGetSCPreferencesRef();
+    CFRetain(session);
+    platform::FileDescriptor other = lockByAnother();
+    ASSERT_EQ(0, flock(other.get(), LOCK_EX));
     OSStatus inner = MoreSCOpen(true, false);
-    EXPECT_EQ(0, inner);
+    EXPECT_EQ(kSCStatusPrefsBusy, inner);
     MoreSCClose(&inner, false);
-    EXPECT_FALSE(lockByAnother());
+    std::thread release([&] {
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        other.reset();
+    });
+    EXPECT_EQ(0, inner = MoreSCOpen(true, true)) << "a failure is not taken for the lock, and waiting waits";
+    release.join();
+    MoreSCClose(&inner, false);
+    EXPECT_FALSE(isFree());
     MoreSCClose(&err, false);
-    EXPECT_TRUE(lockByAnother());
+    EXPECT_TRUE(isFree());
+    CFRelease(session);
+}
+
+TEST_F(SessionTest, TheStoresLogNamesTheClient) {
+    const auto logged = [this] {
+        log.clear();
+        (void)directory.write("store/preferences.plist", "no property list");
+        OSStatus err = MoreSCOpen(false, false);
+        MoreSCClose(&err, false);
+        return log.substr(0, log.find(':'));
+    };
+    EXPECT_EQ(nullptr, MoreSCGetClient());
+    EXPECT_EQ("MoreSCF", logged());
+    const auto name = platform::values::makeString("assistant");
+    EXPECT_EQ(0, MoreSCSetClient(name.get()));
+    EXPECT_EQ(name.get(), MoreSCGetClient());
+    EXPECT_EQ(2, CFGetRetainCount(name.get()));
+    EXPECT_EQ("assistant", logged());
+    EXPECT_EQ(0, MoreSCSetClient(nullptr));
+    EXPECT_EQ(1, CFGetRetainCount(name.get()));
 }
 
 }  // namespace

@@ -8,17 +8,6 @@ class SetsTest : public MoreSCFTest {
   protected:
     SetsTest() { setTree(twoSets); }
     ~SetsTest() override { MoreSCFSetPortNameCallback(nullptr); }
-
-    // The keys of a top-level dictionary on disk.
-    [[nodiscard]] static std::string keysOf(CFStringRef topLevel) {
-        Output<CFArrayRef> keys;
-        OSStatus err = MoreSCOpen(false, false);
-        const auto dict =
-            static_cast<CFDictionaryRef>(SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), topLevel));
-        EXPECT_EQ(0, CFQArrayCreateWithDictionaryKeys(dict, &keys));
-        MoreSCClose(&err, false);
-        return keys.shown();
-    }
 };
 
 TEST_F(SetsTest, MakesALocationFromThePorts) {
@@ -65,43 +54,6 @@ TEST_F(SetsTest, AFailedPortLeavesNothingBehind) {
     EXPECT_EQ(-50, MoreSCNewSet(CFSTR("half"), &id));
     EXPECT_EQ("untouched", id.shown());
     EXPECT_EQ(before, tree());
-}
-
-TEST_F(SetsTest, AFailedDuplicateLeavesNothingBehind) {
-    // Service 5 of location 1 is gone: the copy of 6 has to go too.
-    Output<CFStringRef> id;
-    OSStatus err = MoreSCOpen(false, false);
-    EXPECT_TRUE(SCPreferencesPathRemoveValue(MoreSCGetSCPreferencesRef(), CFSTR("/NetworkServices/5")));
-    EXPECT_EQ(kSCStatusNoKey, MoreSCDuplicateSet(Str("1"), nullptr, &id));
-    EXPECT_EQ("untouched", id.shown());
-    EXPECT_EQ("null", at("/Sets/3"));
-    EXPECT_EQ("null", at("/NetworkServices/7"));
-    MoreSCClose(&err, false);
-}
-
-TEST_F(SetsTest, DeletesWithTheServicesThatNobodyListsAnyMore) {
-    EXPECT_EQ(0, MoreSCSetCurrentSet(Str("2")));
-    EXPECT_EQ(0, MoreSCDeleteSet(Str("1")));
-    EXPECT_EQ("(2) (6)", keysOf(CFSTR("Sets")) + " " + keysOf(CFSTR("NetworkServices")));
-
-    const std::string before = tree();
-    EXPECT_EQ(-50, MoreSCDeleteSet(Str("2"))) << "the current one";
-    EXPECT_EQ(kSCStatusNoKey, MoreSCDeleteSet(Str("1")));
-    EXPECT_EQ(before, tree());
-}
-
-TEST_F(SetsTest, SweepsInAnyCaseButCommitsOnlyWithAnother) {
-    setTree(
-        "{Sets = {1 = {Network = {Service = {7 = {__LINK__ = /NetworkServices/7}}; Global = {IPv4 = "
-        "{ServiceOrder = ()}}}}}; NetworkServices = {7 = {}; 8 = {}}; CurrentSet = /Sets/1}");
-    const std::string before = tree();
-    EXPECT_EQ(-50, MoreSCDeleteSet(Str("1")));
-    EXPECT_EQ(before, tree());
-    OSStatus err = MoreSCOpen(false, false);
-    EXPECT_EQ(-50, MoreSCDeleteSet(Str("1")));
-    EXPECT_EQ(0, MoreSCSetCurrentSet(Str("1")));
-    MoreSCClose(&err, false);
-    EXPECT_EQ("()", keysOf(CFSTR("NetworkServices"))) << "a service that is only linked goes too";
 }
 
 // What somebody else may have written: a status for each, and the file stays.

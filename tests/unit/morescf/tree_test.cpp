@@ -84,5 +84,20 @@ TEST_F(TreeTest, PathsFollowTheCurrentSetAndLinks) {
         });
 }
 
+TEST_F(TreeTest, LinksStayAndMarkersChangeOnce) {
+    auto* links = CFDictionaryCreateMutableCopy(nullptr, 0, dictionary(read("{5 = {__LINK__ = /odd}}")));
+    EXPECT_EQ(0, AddServiceLinkToDict(CFSTR("5"), links));
+    EXPECT_EQ(0, AddServiceLinkToDict(CFSTR("6"), links));
+    EXPECT_EQ("{5 = {__LINK__ = /odd}; 6 = {__LINK__ = /NetworkServices/6}}", show(links));
+    Boolean changed = false;
+    EXPECT_EQ(0, SetDictionaryActive(links, true, &changed));
+    EXPECT_FALSE(changed);
+    EXPECT_EQ(0, SetDictionaryActive(links, false, &changed));
+    EXPECT_TRUE(changed);
+    EXPECT_EQ(0, SetDictionaryActive(links, 2, nullptr)) << "any flag but 0 is true";
+    EXPECT_TRUE(IsDictionaryActive(links));
+    CFRelease(links);
+}
+
 }  // namespace
 }  // namespace morescf_test
