@@ -92,14 +92,8 @@ Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPrope
     if (self == nullptr) {
         return answer(kSCStatusNoPrefsSession);
     }
-    const Owned<CFStringRef> ownKey =
-        platform::values::makeString(as<CFStringRef>(key) != nullptr ? textOf(key) : "");
-    const Owned<CFPropertyListRef> frozen =
-        value != nullptr ? platform::values::frozen(value) : Owned<CFPropertyListRef>();
-    if (as<CFStringRef>(key) == nullptr || !ownKey || !frozen) {
-        return answer(kSCStatusInvalidArgument);
-    }
-    return answer(self->tree().setTopValue(ownKey.get(), frozen));
+    const bool valid = as<CFStringRef>(key) != nullptr && value != nullptr;
+    return answer(valid ? self->tree().setTopValue(key, value) : kSCStatusInvalidArgument);
 }
 
 CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path) noexcept {
@@ -113,9 +107,7 @@ Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path,
         return answer(kSCStatusNoPrefsSession);
     }
     const bool valid = isPath(path) && as<CFDictionaryRef>(value) != nullptr;
-    const Owned<CFPropertyListRef> frozen =
-        valid ? platform::values::frozen(value) : Owned<CFPropertyListRef>();
-    return answer(frozen ? self->tree().set(textOf(path), frozen) : kSCStatusInvalidArgument);
+    return answer(valid ? self->tree().set(textOf(path), value) : kSCStatusInvalidArgument);
 }
 
 CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path) noexcept {

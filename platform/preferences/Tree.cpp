@@ -5,7 +5,6 @@
 #include <vector>
 
 #include "platform/SystemConfiguration.h"
-#include "platform/values/PropertyListXML.h"
 #include "platform/values/Values.h"
 
 namespace platform::preferences {
@@ -38,7 +37,7 @@ std::optional<Keys> keysOf(std::string_view path) {
 }
 
 // Follows the keys as far as they lead. value is what was reached, null when the next key is missing.
-int follow(CFDictionaryRef root, const Keys& keys, CFPropertyListRef& value) {
+int follow(CFDictionaryRef root, std::span<const values::Owned<CFStringRef>> keys, CFPropertyListRef& value) {
     value = root;
     for (const auto& key : keys) {
         const auto dictionary = values::as<CFDictionaryRef>(value);
@@ -54,17 +53,6 @@ int follow(CFDictionaryRef root, const Keys& keys, CFPropertyListRef& value) {
     return kSCStatusOK;
 }
 
-// Whether a tree that holds the value under so many dictionaries is one that can be written.
-bool fitsBelow(std::size_t dictionaries, CFPropertyListRef frozen) {
-    return dictionaries + static_cast<std::size_t>(values::levelsOf(frozen)) <= values::deepestPropertyList;
-}
-
-values::Owned<CFPropertyListRef> makeEmptyDictionary() {
-    return values::Owned<CFPropertyListRef>::adopt(CFDictionaryCreate(kCFAllocatorDefault, nullptr, nullptr,
-                                                                      0, &kCFTypeDictionaryKeyCallBacks,
-                                                                      &kCFTypeDictionaryValueCallBacks));
-}
-
 }  // namespace
 
 Tree::Tree(values::Owned<CFDictionaryRef> root) : root_(std::move(root)) {}
@@ -75,74 +63,53 @@ int Tree::find(std::string_view path, CFPropertyListRef& value) const {
     return keys ? follow(root_.get(), *keys, value) : kSCStatusInvalidArgument;
 }
 
-int Tree::set(std::string_view path, const values::Owned<CFPropertyListRef>& value) {
-    std::optional<Keys> keys = keysOf(path);
+int Tree::set(std::string_view path, CFPropertyListRef value) {
+    const std::optional<Keys> keys = keysOf(path);
     if (!keys) {
         return kSCStatusInvalidArgument;
     }
-    if (keys->empty()) {
-        const auto dictionary = values::as<CFDictionaryRef>(value.get());
-        if (dictionary == nullptr) {
-            return kSCStatusInvalidArgument;
-        }
-        root_ = values::Owned<CFDictionaryRef>::retained(dictionary);
-        return kSCStatusOK;
-    }
-    if (!fitsBelow(keys->size(), value.get())) {
+    return set(*keys, value);
+}
+
+int Tree::set(std::span<const values::Owned<CFStringRef>> keys, CFPropertyListRef value) {
+    // Deeper than a file may be is refused here, where the caller still knows what it is about.
+    values::Owned<CFPropertyListRef> frozen = values::frozen(value, keys.size());
+    const auto dictionary = values::as<CFDictionaryRef>(frozen.get());
+    if (!frozen || (keys.empty() && dictionary == nullptr)) {
         return kSCStatusInvalidArgument;
     }
     CFPropertyListRef present = nullptr;
-    if (follow(root_.get(), *keys, present) == kSCStatusFailed) {
+    if (follow(root_.get(), keys, present) == kSCStatusFailed) {
         return kSCStatusFailed;
     }
-    const values::Owned<CFStringRef> last = std::move(keys->back());
-    keys->pop_back();
-    values::claim(root_);
-    CFDictionaryRef dictionary = root_.get();
-    for (const auto& key : *keys) {
-        CFDictionaryRef child = values::claimedChild(dictionary, key.get());
-        if (child == nullptr) {
-            values::setClaimed(dictionary, key.get(), values::frozen(makeEmptyDictionary().get()));
-            child = values::claimedChild(dictionary, key.get());
-        }
-        dictionary = child;
+    if (keys.empty()) {
+        root_ = values::Owned<CFDictionaryRef>::retained(dictionary);
+    } else {
+        values::setAtPath(root_, keys, frozen.get());
     }
-    values::setClaimed(dictionary, last.get(), value);
     return kSCStatusOK;
 }
 
 int Tree::remove(std::string_view path) {
-    std::optional<Keys> keys = keysOf(path);
+    const std::optional<Keys> keys = keysOf(path);
     if (!keys || keys->empty()) {
         return kSCStatusInvalidArgument;
     }
     CFPropertyListRef present = nullptr;
     const int status = follow(root_.get(), *keys, present);
-    if (status != kSCStatusOK) {
-        return status;
+    if (status == kSCStatusOK) {
+        values::removeAtPath(root_, *keys);
     }
-    const values::Owned<CFStringRef> last = std::move(keys->back());
-    keys->pop_back();
-    values::claim(root_);
-    CFDictionaryRef dictionary = root_.get();
-    for (const auto& key : *keys) {
-        dictionary = values::claimedChild(dictionary, key.get());
-    }
-    values::removeClaimed(dictionary, last.get());
-    return kSCStatusOK;
+    return status;
 }
 
 CFPropertyListRef Tree::topValue(CFStringRef key) const {
     return CFDictionaryGetValue(root_.get(), key);
 }
 
-int Tree::setTopValue(CFStringRef key, const values::Owned<CFPropertyListRef>& value) {
-    if (!fitsBelow(1, value.get())) {
-        return kSCStatusInvalidArgument;
-    }
-    values::claim(root_);
-    values::setClaimed(root_.get(), key, value);
-    return kSCStatusOK;
+int Tree::setTopValue(CFStringRef key, CFPropertyListRef value) {
+    const auto ownKey = values::Owned<CFStringRef>::adopt(CFStringCreateCopy(nullptr, key));
+    return set(std::span(&ownKey, 1), value);
 }
 
 }  // namespace platform::preferences

@@ -5,6 +5,7 @@
 // handed out: nothing that somebody else holds ever changes, and what nobody else holds is changed in place.
 #pragma once
 
+#include <span>
 #include <string_view>
 
 #include "platform/CoreFoundation.h"
@@ -25,17 +26,19 @@ class Tree {
     // The value at the path, of whatever type, borrowed until the tree changes at the path or above; null on
     // failure.
     [[nodiscard]] int find(std::string_view path, CFPropertyListRef& value) const;
-    // Stores a frozen value, making dictionaries that are missing on the way. Only a dictionary can be the
-    // root.
-    [[nodiscard]] int set(std::string_view path, const values::Owned<CFPropertyListRef>& value);
+    // Stores the value as it is now, making dictionaries that are missing on the way. 1002 for a value that
+    // is no property list, or would make the tree too deep to be written; only a dictionary can be the root.
+    [[nodiscard]] int set(std::string_view path, CFPropertyListRef value);
     // The root itself cannot be removed (1002).
     [[nodiscard]] int remove(std::string_view path);
 
     // The same for one key of the root, which may hold a slash or be empty.
     [[nodiscard]] CFPropertyListRef topValue(CFStringRef key) const;
-    [[nodiscard]] int setTopValue(CFStringRef key, const values::Owned<CFPropertyListRef>& value);
+    [[nodiscard]] int setTopValue(CFStringRef key, CFPropertyListRef value);
 
   private:
+    [[nodiscard]] int set(std::span<const values::Owned<CFStringRef>> keys, CFPropertyListRef value);
+
     values::Owned<CFDictionaryRef> root_;
 };
 

@@ -26,9 +26,8 @@ class Storage {
     Storage& operator=(const Storage&) = delete;
 
     [[nodiscard]] static Storage* create(Shape shape, bool retainsValues, std::size_t capacity);
-    // With these items (for a dictionary key, value, key, value, ...), which are retained.
-    [[nodiscard]] static Storage* create(Shape shape, std::span<const CFTypeRef> slots,
-                                         std::uint16_t frozenLevels);
+    // With these items (for a dictionary key, value, key, value, ...), which it takes over.
+    [[nodiscard]] static Storage* create(Shape shape, std::span<Owned<CFTypeRef>> slots);
     void retain() noexcept { references_.fetch_add(1, std::memory_order_relaxed); }
     void release() noexcept;
     // Storage with this content and room for one more item that nobody else holds; consumes a reference.
@@ -57,14 +56,8 @@ class Storage {
     void addEntry(CFTypeRef key, CFTypeRef value);
     void replaceValue(std::size_t position, CFTypeRef value);
     void removeEntry(std::size_t position);
-    // Whether no two keys are the same object; for keys of which each text is one object, and which nobody
-    // has compared yet.
+    // Whether no two keys are equal, as they are in every dictionary that was not made from slots.
     [[nodiscard]] bool hasDistinctKeys();
-
-    // How many containers are nested here, this one included, when everything inside is known to be frozen;
-    // else 0, which is also what a change from outside makes of it. Never above deepestPropertyList.
-    [[nodiscard]] std::uint16_t frozenLevels() const noexcept { return frozenLevels_; }
-    void setFrozenLevels(std::uint16_t levels) noexcept { frozenLevels_ = levels; }
 
   private:
     Storage(Shape shape, bool retainsValues, std::uint32_t capacity) noexcept
@@ -77,7 +70,6 @@ class Storage {
     }
     [[nodiscard]] std::size_t width() const noexcept { return static_cast<std::size_t>(shape_); }
     [[nodiscard]] Storage* copy(std::size_t capacity) const;
-    void noteValue(CFTypeRef value) noexcept;
     void fillHoles() noexcept;
     void buildIndex();
     void dropIndex() noexcept;
@@ -89,7 +81,6 @@ class Storage {
     std::atomic<std::int32_t> references_{1};
     Shape shape_;
     bool retainsValues_;
-    std::uint16_t frozenLevels_ = 1;
     std::uint32_t used_ = 0;
     std::uint32_t live_ = 0;
     std::uint32_t capacity_;
@@ -155,8 +146,5 @@ namespace platform::values {
 // A second handle on the container's storage.
 [[nodiscard]] OpaqueCFDictionary* shareStorage(const OpaqueCFDictionary& dictionary, bool isMutable);
 [[nodiscard]] OpaqueCFArray* shareStorage(const OpaqueCFArray& array, bool isMutable);
-
-// The levels of containers in a value that is known to be frozen (0 for a value that is none), or -1.
-[[nodiscard]] int knownFrozenLevels(CFTypeRef value) noexcept;
 
 }  // namespace platform::values

@@ -62,45 +62,35 @@ void describe(std::string& text, CFTypeRef value, int depth) {
         text += "...";
         return;
     }
-    switch (static_cast<const Object*>(value)->type()) {
-        case Type::string:
+    switch (static_cast<const Object*>(value)->propertyListType()) {
+        case PropertyListType::string:
             describeText(text, static_cast<CFStringRef>(value)->text());
             return;
-        case Type::dictionary:
+        case PropertyListType::dictionary:
             describeDictionary(text, static_cast<CFDictionaryRef>(value), depth + 1);
             return;
-        case Type::array:
+        case PropertyListType::array:
             describeArray(text, static_cast<CFArrayRef>(value), depth + 1);
             return;
-        case Type::number: {
+        case PropertyListType::number: {
             const auto* const number = static_cast<CFNumberRef>(value);
             text += number->isReal ? realText(number->real) : std::to_string(number->integer);
             return;
         }
-        case Type::boolean:
+        case PropertyListType::boolean:
             text += static_cast<CFBooleanRef>(value)->value ? "true" : "false";
             return;
-        case Type::data:
+        case PropertyListType::data:
             describeBytes(text, static_cast<CFDataRef>(value)->bytes);
             return;
-        case Type::date:
+        case PropertyListType::date:
             text += dateText(static_cast<CFDateRef>(value)->seconds);
             return;
-        case Type::url:
-            text += static_cast<CFURLRef>(value)->text.get()->text();
+        case PropertyListType::none: {
+            const auto* const url = static_cast<CFURLRef>(value);
+            text += url->type() == Type::url ? url->text.get()->text() : "<object>";
             return;
-        case Type::runLoop:
-            text += "<run loop>";
-            return;
-        case Type::runLoopSource:
-            text += "<run-loop source>";
-            return;
-        case Type::preferences:
-            text += "<preferences session>";
-            return;
-        case Type::dynamicStore:
-            text += "<dynamic-store session>";
-            return;
+        }
     }
 }
 

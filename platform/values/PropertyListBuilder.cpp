@@ -116,11 +116,6 @@ std::optional<std::string> bytesFromBase64(std::string_view text) {
     return size == 0 ? std::optional(std::move(bytes)) : std::nullopt;
 }
 
-template <class T>
-std::string_view bytesOf(const T& value) {
-    return {reinterpret_cast<const char*>(&value), sizeof value};
-}
-
 // Null when the bytes are no text that a document can hold.
 CFStringRef xmlString(std::string_view text) {
     const std::optional<TextTraits> traits = scanText(text);
@@ -131,16 +126,16 @@ CFStringRef xmlString(std::string_view text) {
 const char* faultOf(Element leaf) {
     switch (leaf) {
         case Element::integer:
-            return "an integer that is none or does not fit 64 bits";
+            return "not an integer, or one that does not fit 64 bits";
         case Element::real:
-            return "a real that is none or is out of range";
+            return "not a real, or one that is out of range";
         case Element::trueValue:
         case Element::falseValue:
             return "a boolean with text in it";
         case Element::data:
-            return "data that is not base 64";
+            return "not data in base 64";
         case Element::date:
-            return "a date that is none";
+            return "not a date";
         case Element::key:
         case Element::string:
         case Element::unknown:
@@ -149,7 +144,7 @@ const char* faultOf(Element leaf) {
         case Element::array:
             break;
     }
-    return "text that no document can hold";
+    return "text that XML cannot carry";
 }
 
 }  // namespace
@@ -187,7 +182,7 @@ const char* PropertyListBuilder::begin(Element element) {
         return levels_.empty() ? "not a property list" : "a property list inside another";
     }
     if (element == Element::plist) {
-        levels_.push_back({element, 0, 0});
+        levels_.push_back({element, 0});
         return nullptr;
     }
     if (element == Element::unknown) {
@@ -205,19 +200,19 @@ const char* PropertyListBuilder::begin(Element element) {
     } else if (levels_.size() > deepestPropertyList) {
         return "nested too deep";
     } else {
-        levels_.push_back({element, 1, values_.size()});
+        levels_.push_back({element, values_.size()});
     }
     return nullptr;
 }
 
 const char* PropertyListBuilder::end(std::string_view text) {
     if (isInLeaf()) {
-        const CFTypeRef value = leafOf(text);
-        if (value == nullptr) {
+        Owned<CFTypeRef> value = leafOf(text);
+        if (!value) {
             return faultOf(leaf_);
         }
         leaf_ = Element::unknown;
-        add(value, 0);
+        values_.push_back(std::move(value));
         return nullptr;
     }
     if (levels_.back().element != Element::plist) {
@@ -230,95 +225,60 @@ const char* PropertyListBuilder::end(std::string_view text) {
     return nullptr;
 }
 
-void PropertyListBuilder::add(CFTypeRef value, int frozenLevels) {
-    values_.push_back(value);
-    Level& level = levels_.back();
-    level.frozenLevels = std::max(level.frozenLevels, static_cast<std::uint16_t>(frozenLevels + 1));
-}
-
-// Null when a key is there twice.
-template <class Handle>
-CFTypeRef PropertyListBuilder::containerOf(std::span<const CFTypeRef> slots, std::uint16_t frozenLevels) {
-    constexpr bool isDictionary = std::is_same_v<Handle, OpaqueCFDictionary>;
-    constexpr auto shape = isDictionary ? Storage::Shape::dictionary : Storage::Shape::array;
-    const auto isSame = [&](const Handle& pooled) {
-        const Storage* const storage = pooled.storage();
-        return std::ranges::equal(storage != nullptr ? storage->slots() : std::span<const CFTypeRef>(),
-                                  slots);
-    };
-    const auto make = [&]() -> const Handle* {
-        Storage* const storage = slots.empty() ? nullptr : Storage::create(shape, slots, frozenLevels);
-        auto made = Owned<const Handle*>::adopt(new Handle(false, true, storage));
-        return isDictionary && storage != nullptr && !storage->hasDistinctKeys() ? nullptr : made.take();
-    };
-    return pool_.getTyped<const Handle*>({reinterpret_cast<const char*>(slots.data()), slots.size_bytes()},
-                                         isSame, make);
-}
-
 const char* PropertyListBuilder::endContainer() {
     const Level level = levels_.back();
     const bool isDictionary = level.element == Element::dict;
     if (isDictionary && !wantsKey()) {
         return "a key without a value";
     }
-    const std::span<const CFTypeRef> slots = std::span<const CFTypeRef>(values_).subspan(level.firstValue);
-    const CFTypeRef container = isDictionary ? containerOf<OpaqueCFDictionary>(slots, level.frozenLevels)
-                                             : containerOf<OpaqueCFArray>(slots, level.frozenLevels);
-    if (container == nullptr) {
+    const std::span<Owned<CFTypeRef>> slots = std::span(values_).subspan(level.firstValue);
+    const auto shape = isDictionary ? Storage::Shape::dictionary : Storage::Shape::array;
+    Storage* const storage = slots.empty() ? nullptr : Storage::create(shape, slots);
+    auto container = isDictionary ? Owned<CFTypeRef>::adopt(new OpaqueCFDictionary(false, true, storage))
+                                  : Owned<CFTypeRef>::adopt(new OpaqueCFArray(false, true, storage));
+    if (isDictionary && storage != nullptr && !storage->hasDistinctKeys()) {
         return "a dictionary with the same key twice";
     }
     values_.resize(level.firstValue);
     levels_.pop_back();
-    add(container, level.frozenLevels);
+    values_.push_back(std::move(container));
     return nullptr;
 }
 
-// The value of the leaf that is open, or null when the text is none.
-CFTypeRef PropertyListBuilder::leafOf(std::string_view text) {
+// The value of the leaf that is open, or none when the text is no such value.
+Owned<CFTypeRef> PropertyListBuilder::leafOf(std::string_view text) {
+    const auto adopted = [](CFTypeRef value) { return Owned<CFTypeRef>::adopt(value); };
     switch (leaf_) {
-        case Element::key:
+        case Element::key: {
+            if (const auto known = keys_.find(text); known != keys_.end()) {
+                return known->second;
+            }
+            const auto key = Owned<CFStringRef>::adopt(xmlString(text));
+            return key ? keys_.emplace(textOf(key.get()), Owned<CFTypeRef>::retained(key.get())).first->second
+                       : Owned<CFTypeRef>();
+        }
         case Element::string:
-            return pool_.getTyped<CFStringRef>(
-                text, [&](const OpaqueCFString& pooled) { return pooled.text() == text; },
-                [&] { return xmlString(text); });
+            return adopted(xmlString(text));
         case Element::integer: {
             const auto number = numberFrom<std::int64_t>(text);
-            return !number ? nullptr
-                           : pool_.getTyped<CFNumberRef>(
-                                 bytesOf(*number),
-                                 [&](const OpaqueCFNumber& pooled) {
-                                     return !pooled.isReal && pooled.integer == *number;
-                                 },
-                                 [&] { return makeNumber(*number).take(); });
+            return adopted(number ? makeNumber(*number).take() : nullptr);
         }
         case Element::real: {
             const auto number = numberFrom<double>(text);
-            return !number ? nullptr
-                           : pool_.getTyped<CFNumberRef>(
-                                 bytesOf(*number),
-                                 [&](const OpaqueCFNumber& pooled) {
-                                     return pooled.isReal && bytesOf(pooled.real) == bytesOf(*number);
-                                 },
-                                 [&] { return makeReal(*number).take(); });
+            return adopted(number ? makeReal(*number).take() : nullptr);
         }
         case Element::trueValue:
-            return text.empty() ? kCFBooleanTrue : nullptr;
         case Element::falseValue:
-            return text.empty() ? kCFBooleanFalse : nullptr;
+            return Owned<CFTypeRef>::retained(!text.empty()                 ? nullptr
+                                              : leaf_ == Element::trueValue ? kCFBooleanTrue
+                                                                            : kCFBooleanFalse);
         case Element::data: {
             auto bytes = bytesFromBase64(text);
-            return !bytes ? nullptr
-                          : pool_.getTyped<CFDataRef>(
-                                *bytes, [&](const OpaqueCFData& pooled) { return pooled.bytes == *bytes; },
-                                [&] { return new OpaqueCFData(std::move(*bytes)); });
+            return adopted(bytes ? new OpaqueCFData(std::move(*bytes)) : nullptr);
         }
         case Element::date: {
             const auto seconds = secondsFrom(text);
-            return !seconds ? nullptr
-                            : pool_.getTyped<CFDateRef>(
-                                  bytesOf(*seconds),
-                                  [&](const OpaqueCFDate& pooled) { return pooled.seconds == *seconds; },
-                                  [&] { return makeDate(*seconds).take(); });
+            return adopted(seconds ? makeDate(*seconds).take() : nullptr);
         }
         case Element::unknown:
         case Element::plist:
@@ -326,7 +286,7 @@ CFTypeRef PropertyListBuilder::leafOf(std::string_view text) {
         case Element::array:
             break;
     }
-    return nullptr;
+    return {};
 }
 
 }  // namespace platform::values

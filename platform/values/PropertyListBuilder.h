@@ -3,6 +3,7 @@
 
 #include <cstdint>
 #include <string_view>
+#include <unordered_map>
 #include <vector>
 
 #include "platform/values/Containers.h"
@@ -32,64 +33,6 @@ enum class Element : std::uint8_t {
     return character == ' ' || character == '\n' || character == '\t' || character == '\r';
 }
 
-// Each distinct value of a document is made once, containers included: the services of a preferences file
-// repeat each other's defaults, and what is there a thousand times is then compared a thousand times instead
-// of made. It also lets keys and items be compared by address.
-class ValuePool {
-  public:
-    ValuePool() : places_(1024) {}
-
-    // The pooled value with the hash that isSame(CFTypeRef) accepts, or the one that make() hands over; null
-    // when make does not. Borrowed; the pool holds it.
-    template <class IsSame, class Make>
-    [[nodiscard]] CFTypeRef get(std::uint32_t hash, IsSame isSame, Make make) {
-        std::size_t place = hash & (places_.size() - 1);
-        for (; places_[place].value; place = (place + 1) & (places_.size() - 1)) {
-            if (places_[place].hash == hash && isSame(places_[place].value.get())) {
-                return places_[place].value.get();
-            }
-        }
-        places_[place] = {hash, Owned<CFTypeRef>::adopt(make())};
-        const CFTypeRef made = places_[place].value.get();
-        if (made != nullptr && ++count_ * 2 > places_.size()) {
-            grow();
-        }
-        return made;
-    }
-
-    // The same for one of the opaque types, from what tells its values apart. Types get hashes of their own.
-    template <class Ref, class IsSame, class Make>
-    [[nodiscard]] CFTypeRef getTyped(std::string_view bytes, IsSame isSame, Make make) {
-        return get(
-            hashOfText(bytes) + static_cast<std::uint32_t>(typeOf<Ref>),
-            [&](CFTypeRef value) { return as<Ref>(value) != nullptr && isSame(*static_cast<Ref>(value)); },
-            make);
-    }
-
-  private:
-    struct Place {
-        std::uint32_t hash = 0;
-        Owned<CFTypeRef> value;
-    };
-
-    void grow() {
-        std::vector<Place> larger(places_.size() * 2);
-        for (Place& old : places_) {
-            if (old.value) {
-                std::size_t place = old.hash & (larger.size() - 1);
-                while (larger[place].value) {
-                    place = (place + 1) & (larger.size() - 1);
-                }
-                larger[place] = std::move(old);
-            }
-        }
-        places_ = std::move(larger);
-    }
-
-    std::vector<Place> places_;
-    std::size_t count_ = 0;
-};
-
 class PropertyListBuilder {
   public:
     // Both give null, or what is wrong with the document: then the builder is of no further use.
@@ -105,32 +48,26 @@ class PropertyListBuilder {
     }
     [[nodiscard]] bool isInLeaf() const noexcept { return leaf_ != Element::unknown; }
     // Once the property list has ended.
-    [[nodiscard]] Owned<CFPropertyListRef> value() const {
-        return Owned<CFPropertyListRef>::retained(values_.back());
-    }
+    [[nodiscard]] Owned<CFPropertyListRef> value() const { return values_.back(); }
 
   private:
     struct Level {
         Element element;
-        std::uint16_t frozenLevels;
         std::size_t firstValue;
     };
 
-    void add(CFTypeRef value, int frozenLevels);
-    template <class Handle>
-    [[nodiscard]] CFTypeRef containerOf(std::span<const CFTypeRef> slots, std::uint16_t frozenLevels);
     [[nodiscard]] const char* endContainer();
-    [[nodiscard]] CFTypeRef leafOf(std::string_view text);
+    [[nodiscard]] Owned<CFTypeRef> leafOf(std::string_view text);
     // Whether the next thing in the innermost dictionary must be a key.
     [[nodiscard]] bool wantsKey() const { return (values_.size() - levels_.back().firstValue) % 2 == 0; }
 
-    // The containers that are open, plist first, and the values (and keys) in them that are complete, all
-    // held by the pool.
+    // The containers that are open, plist first, and the values (and keys) in them that are complete.
     std::vector<Level> levels_;
-    std::vector<CFTypeRef> values_;
+    std::vector<Owned<CFTypeRef>> values_;
+    // The keys so far by their text: a document has few of them, each a thousand times.
+    std::unordered_map<std::string_view, Owned<CFTypeRef>> keys_;
     // The leaf that is open, unknown when none is.
     Element leaf_ = Element::unknown;
-    ValuePool pool_;
 };
 
 }  // namespace platform::values

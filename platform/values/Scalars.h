@@ -3,6 +3,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <new>
 #include <span>
 #include <string>
@@ -33,11 +34,8 @@ struct OpaqueCFString : platform::values::Object {
     [[nodiscard]] platform::values::TextTraits traits() const noexcept { return traits_; }
     [[nodiscard]] bool isAscii() const noexcept { return (traits_ & platform::values::textBeyondAscii) == 0; }
     [[nodiscard]] bool isMutable() const noexcept { return mutable_; }
-    // Never 0, and kept once it was asked for.
-    [[nodiscard]] std::uint32_t hash() const noexcept {
-        const std::uint32_t known = hash_.load(std::memory_order_relaxed);
-        return known != 0 ? known : computeHash();
-    }
+    // Kept once it was asked for.
+    [[nodiscard]] std::uint32_t hash() const noexcept;
     [[nodiscard]] bool equals(const OpaqueCFString& other) const noexcept {
         return this == &other || text() == other.text();
     }
@@ -62,7 +60,6 @@ struct OpaqueCFString : platform::values::Object {
     static void operator delete(void* memory, Room) { ::operator delete(memory); }
     // To be made in room for the text, which it copies.
     OpaqueCFString(std::string_view text, platform::values::TextTraits traits) noexcept;
-    std::uint32_t computeHash() const noexcept;
 
     bool mutable_ = false;
     platform::values::TextTraits traits_ = 0;
@@ -85,8 +82,13 @@ class MutableString final : public OpaqueCFString {
     std::string text_;
 };
 
-// The hash of a text as OpaqueCFString gives it.
-[[nodiscard]] std::uint32_t hashOfText(std::string_view text) noexcept;
+// The one hash of everything. It need not withstand those who choose the keys: nobody but root, or the
+// process's own user, does.
+template <class T>
+[[nodiscard]] std::uint32_t hashOf(const T& value) noexcept {
+    const std::uint64_t hash = std::hash<T>()(value) * 0x9E3779B97F4A7C15U;
+    return static_cast<std::uint32_t>(hash >> 32);
+}
 
 }  // namespace platform::values
 

@@ -5,7 +5,6 @@
 #include <new>
 
 #include "platform/values/Containers.h"
-#include "platform/values/PropertyListXML.h"
 #include "platform/values/Scalars.h"
 
 namespace platform::values {
@@ -27,12 +26,11 @@ Storage* Storage::create(Shape shape, bool retainsValues, std::size_t capacity) 
     return ::new (::operator new(size)) Storage(shape, retainsValues, static_cast<std::uint32_t>(capacity));
 }
 
-Storage* Storage::create(Shape shape, std::span<const CFTypeRef> slots, std::uint16_t frozenLevels) {
+Storage* Storage::create(Shape shape, std::span<Owned<CFTypeRef>> slots) {
     const std::size_t count = slots.size() / static_cast<std::size_t>(shape);
     Storage* const storage = create(shape, true, count);
-    std::ranges::transform(slots, storage->firstSlot(), CFRetain);
+    std::ranges::transform(slots, storage->firstSlot(), [](Owned<CFTypeRef>& slot) { return slot.take(); });
     storage->used_ = storage->live_ = static_cast<std::uint32_t>(count);
-    storage->frozenLevels_ = frozenLevels;
     return storage;
 }
 
@@ -97,7 +95,6 @@ Storage* Storage::copy(std::size_t capacity) const {
         *to++ = retainsValues_ ? CFRetain(value) : value;
     }
     storage->used_ = storage->live_ = live_;
-    storage->frozenLevels_ = frozenLevels_;
     return storage;
 }
 
@@ -121,25 +118,14 @@ Storage* Storage::writable() {
     Storage* const larger = create(shape_, retainsValues_, roomy);
     std::memcpy(larger->firstSlot(), firstSlot(), live_ * width() * sizeof(CFTypeRef));
     larger->used_ = larger->live_ = live_;
-    larger->frozenLevels_ = frozenLevels_;
     used_ = live_ = 0;
     release();
     return larger;
 }
 
-void Storage::noteValue(CFTypeRef value) noexcept {
-    const int levels = retainsValues_ ? knownFrozenLevels(value) : -1;
-    if (levels < 0 || levels + 1 > deepestPropertyList) {
-        frozenLevels_ = 0;
-    } else if (frozenLevels_ != 0) {
-        frozenLevels_ = std::max(frozenLevels_, static_cast<std::uint16_t>(levels + 1));
-    }
-}
-
 void Storage::append(CFTypeRef value) {
     firstSlot()[used_++] = retainsValues_ ? CFRetain(value) : value;
     ++live_;
-    noteValue(value);
 }
 
 void Storage::removeItem(std::size_t position) {
@@ -242,19 +228,20 @@ std::size_t Storage::find(CFTypeRef key) {
 
 bool Storage::hasDistinctKeys() {
     const CFTypeRef* const slot = firstSlot();
-    if (used_ <= linearLimit) {
-        for (std::size_t later = 1; later < used_; ++later) {
-            for (std::size_t earlier = 0; earlier < later; ++earlier) {
-                if (slot[earlier * 2] == slot[later * 2]) {
-                    return false;
-                }
-            }
+    if (used_ > linearLimit) {
+        std::size_t position = 0;
+        while (position < used_ && find(slot[position * 2]) == position) {
+            ++position;
         }
-        return true;
+        return position == used_;
     }
-    for (std::size_t position = 0; position < used_; ++position) {
-        if (find(slot[position * 2]) != position) {
-            return false;
+    std::uint32_t hashes[linearLimit];
+    for (std::size_t later = 0; later < used_; ++later) {
+        hashes[later] = hashOfValue(slot[later * 2]);
+        for (std::size_t earlier = 0; earlier < later; ++earlier) {
+            if (hashes[earlier] == hashes[later] && equalValues(slot[earlier * 2], slot[later * 2])) {
+                return false;
+            }
         }
     }
     return true;
@@ -271,17 +258,12 @@ void Storage::addEntry(CFTypeRef key, CFTypeRef value) {
     }
     ++used_;
     ++live_;
-    noteValue(value);
-    if (text == nullptr) {
-        frozenLevels_ = 0;
-    }
 }
 
 void Storage::replaceValue(std::size_t position, CFTypeRef value) {
     CFTypeRef& slot = firstSlot()[position * 2 + 1];
     const CFTypeRef replaced = slot;
     slot = retainsValues_ ? CFRetain(value) : value;
-    noteValue(value);
     if (retainsValues_) {
         CFRelease(replaced);
     }
@@ -307,38 +289,6 @@ Storage& Container::writable() {
         storage_ = storage_->writable();
     }
     return *storage_;
-}
-
-int knownFrozenLevels(CFTypeRef value) noexcept {
-    const auto* const object = static_cast<const Object*>(value);
-    switch (object->type()) {
-        case Type::string:
-            return static_cast<const OpaqueCFString*>(object)->isMutable() ? -1 : 0;
-        case Type::number:
-        case Type::boolean:
-        case Type::data:
-        case Type::date:
-            return 0;
-        case Type::dictionary:
-        case Type::array: {
-            const auto* const container = static_cast<const Container*>(object);
-            if (container->isMutable() || !container->retainsValues()) {
-                return -1;
-            }
-            if (container->storage() == nullptr) {
-                return 1;
-            }
-            const int levels = container->storage()->frozenLevels();
-            return levels == 0 ? -1 : levels;
-        }
-        case Type::url:
-        case Type::runLoop:
-        case Type::runLoopSource:
-        case Type::preferences:
-        case Type::dynamicStore:
-            break;
-    }
-    return -1;
 }
 
 }  // namespace platform::values

@@ -1,5 +1,4 @@
-#include <sys/random.h>
-
+#include <algorithm>
 #include <cassert>
 #include <cstring>
 #include <exception>
@@ -8,55 +7,6 @@
 #include "platform/values/Values.h"
 
 using namespace platform::values;
-
-namespace {
-
-constexpr std::uint64_t firstOdd = 0x9E3779B97F4A7C15U;
-constexpr std::uint64_t secondOdd = 0xD1B54A32D192ED03U;
-
-std::uint64_t multiplyFold(std::uint64_t a, std::uint64_t b) noexcept {
-    __extension__ using Wide = unsigned __int128;
-    const Wide product = static_cast<Wide>(a) * b;
-    return static_cast<std::uint64_t>(product) ^ static_cast<std::uint64_t>(product >> 64);
-}
-
-template <class Word>
-std::uint64_t wordAt(const char* bytes) noexcept {
-    Word word = 0;
-    std::memcpy(&word, bytes, sizeof word);
-    return word;
-}
-
-// Up to eight bytes as one number; which of them go where matters as little as that some do so twice.
-std::uint64_t shortWord(std::string_view bytes) noexcept {
-    const char* const end = bytes.data() + bytes.size();
-    if (bytes.size() >= 4) {
-        return wordAt<std::uint32_t>(bytes.data()) << 32 | wordAt<std::uint32_t>(end - 4);
-    }
-    if (bytes.size() >= 2) {
-        return wordAt<std::uint16_t>(bytes.data()) << 16 | wordAt<std::uint16_t>(end - 2);
-    }
-    return bytes.empty() ? 0 : wordAt<std::uint8_t>(bytes.data());
-}
-
-}  // namespace
-
-std::uint32_t platform::values::hashOfText(std::string_view text) noexcept {
-    // A different one in every process, so that nobody can write a file whose keys all meet in one place of
-    // the index.
-    static const std::uint64_t seed = [] {
-        std::uint64_t random = firstOdd;
-        return ::getrandom(&random, sizeof random, GRND_NONBLOCK) == sizeof random ? random : firstOdd;
-    }();
-    std::uint64_t state = seed ^ text.size();
-    while (text.size() > 8) {
-        state = multiplyFold(state ^ wordAt<std::uint64_t>(text.data()), firstOdd);
-        text.remove_prefix(8);
-    }
-    state = multiplyFold(state ^ shortWord(text), secondOdd);
-    const auto hash = static_cast<std::uint32_t>(state ^ (state >> 32));
-    return hash != 0 ? hash : 1;
-}
 
 OpaqueCFString::OpaqueCFString(std::string_view text, TextTraits traits) noexcept
     : Object(Type::string), traits_(traits), size_(static_cast<std::uint32_t>(text.size())) {
@@ -72,9 +22,13 @@ const OpaqueCFString* OpaqueCFString::create(std::string_view text, TextTraits t
     return text.size() <= longestText ? new (Room{text.size()}) OpaqueCFString(text, traits) : nullptr;
 }
 
-std::uint32_t OpaqueCFString::computeHash() const noexcept {
-    const std::uint32_t hash = hashOfText(text());
-    hash_.store(hash, std::memory_order_relaxed);
+std::uint32_t OpaqueCFString::hash() const noexcept {
+    std::uint32_t hash = hash_.load(std::memory_order_relaxed);
+    if (hash == 0) {
+        // 0 stands for a hash that nobody has asked for yet.
+        hash = std::max(hashOf(text()), 1U);
+        hash_.store(hash, std::memory_order_relaxed);
+    }
     return hash;
 }
 

@@ -1,6 +1,12 @@
 #include "platform/values/Text.h"
 
+#include <unicode/utf8.h>
+
 #include <array>
+
+// ICU's macros are careful with each byte, but not in the way that these ask for.
+#pragma GCC diagnostic ignored "-Wconversion"
+#pragma GCC diagnostic ignored "-Wsign-conversion"
 
 namespace platform::values {
 
@@ -25,35 +31,6 @@ constexpr std::array<TextTraits, 256> makeByteTraits() {
 
 constexpr std::array<TextTraits, 256> byteTraits = makeByteTraits();
 
-constexpr unsigned byteAt(std::string_view text, std::size_t position) {
-    return static_cast<unsigned char>(text[position]);
-}
-
-// The number of bytes of the well-formed sequence that begins here, or 0.
-std::size_t sequenceLength(std::string_view text, std::size_t position) noexcept {
-    const unsigned lead = byteAt(text, position);
-    if (lead < 0x80) {
-        return 1;
-    }
-    const std::size_t length = lead < 0xC2 ? 0 : lead < 0xE0 ? 2 : lead < 0xF0 ? 3 : lead < 0xF5 ? 4 : 0;
-    if (length == 0 || text.size() - position < length) {
-        return 0;
-    }
-    // The second byte is what tells overlong forms, surrogates and what lies beyond Unicode from the rest.
-    const unsigned second = byteAt(text, position + 1);
-    const unsigned least = lead == 0xE0 ? 0xA0 : lead == 0xF0 ? 0x90 : 0x80;
-    const unsigned most = lead == 0xED ? 0x9F : lead == 0xF4 ? 0x8F : 0xBF;
-    if (second < least || second > most) {
-        return 0;
-    }
-    for (std::size_t i = 2; i < length; ++i) {
-        if ((byteAt(text, position + i) & 0xC0) != 0x80) {
-            return 0;
-        }
-    }
-    return length;
-}
-
 }  // namespace
 
 std::optional<TextTraits> scanText(std::string_view bytes) noexcept {
@@ -65,50 +42,29 @@ std::optional<TextTraits> scanText(std::string_view bytes) noexcept {
         return traits;
     }
     for (std::size_t position = 0; position < bytes.size();) {
-        const std::size_t length = sequenceLength(bytes, position);
-        if (length == 0) {
+        UChar32 codePoint = 0;
+        U8_NEXT(bytes.data(), position, bytes.size(), codePoint);
+        if (codePoint < 0) {
             return std::nullopt;
         }
-        const std::string_view sequence = bytes.substr(position, length);
-        if (sequence == "\xEF\xBF\xBE" || sequence == "\xEF\xBF\xBF") {
+        if (codePoint == 0xFFFE || codePoint == 0xFFFF) {
             traits |= textBeyondXml;
         }
-        position += length;
     }
     return traits;
 }
 
 char32_t nextCodePoint(std::string_view text, std::size_t& position) noexcept {
-    const unsigned lead = byteAt(text, position++);
-    if (lead < 0x80) {
-        return lead;
-    }
-    const int more = lead < 0xE0 ? 1 : lead < 0xF0 ? 2 : 3;
-    char32_t codePoint = lead & (0x3FU >> more);
-    for (int i = 0; i < more; ++i) {
-        codePoint = (codePoint << 6) | (byteAt(text, position++) & 0x3F);
-    }
-    return codePoint;
+    UChar32 codePoint = 0;
+    U8_NEXT_UNSAFE(text.data(), position, codePoint);
+    return static_cast<char32_t>(codePoint);
 }
 
 void appendCodePoint(std::string& text, char32_t codePoint) {
-    const auto append = [&text](char32_t byte) { text.push_back(static_cast<char>(byte)); };
-    if (codePoint < 0x80) {
-        append(codePoint);
-        return;
-    }
-    if (codePoint < 0x800) {
-        append(0xC0 | (codePoint >> 6));
-    } else {
-        if (codePoint < 0x10000) {
-            append(0xE0 | (codePoint >> 12));
-        } else {
-            append(0xF0 | (codePoint >> 18));
-            append(0x80 | ((codePoint >> 12) & 0x3F));
-        }
-        append(0x80 | ((codePoint >> 6) & 0x3F));
-    }
-    append(0x80 | (codePoint & 0x3F));
+    char bytes[U8_MAX_LENGTH];
+    std::size_t size = 0;
+    U8_APPEND_UNSAFE(bytes, size, codePoint);
+    text.append(bytes, size);
 }
 
 std::size_t unitCount(std::string_view text) noexcept {

@@ -1,6 +1,6 @@
 // What every value has in common: its references, its type, equality and hash.
+#include <bit>
 #include <cmath>
-#include <functional>
 #include <utility>
 #include <vector>
 
@@ -28,17 +28,10 @@ bool equalNumbers(const OpaqueCFNumber& lhs, const OpaqueCFNumber& rhs) {
     return CFNumberGetValue(&real, kCFNumberSInt64Type, &value) != 0 && value == integer.integer;
 }
 
-std::uint32_t hashOfInteger(std::int64_t value) {
-    const std::uint64_t mixed = static_cast<std::uint64_t>(value) * 0x9E3779B97F4A7C15U;
-    return static_cast<std::uint32_t>(mixed >> 32);
-}
-
 std::uint32_t hashOfNumber(const OpaqueCFNumber& number) {
     std::int64_t integer = 0;
-    if (CFNumberGetValue(&number, kCFNumberSInt64Type, &integer) != 0) {
-        return hashOfInteger(integer);
-    }
-    return std::isnan(number.real) ? 1 : static_cast<std::uint32_t>(std::hash<double>()(number.real));
+    const bool isInteger = CFNumberGetValue(&number, kCFNumberSInt64Type, &integer) != 0;
+    return hashOf(isInteger || std::isnan(number.real) ? integer : std::bit_cast<std::int64_t>(number.real));
 }
 
 using Pair = std::pair<CFTypeRef, CFTypeRef>;
@@ -78,29 +71,25 @@ bool equalSoFar(const Container& lhs, const Container& rhs, std::vector<Pair>& p
 
 // Whether two values of the same type are equal, as above.
 bool equalSoFar(const Object& lhs, const Object& rhs, std::vector<Pair>& pairs) {
-    switch (lhs.type()) {
-        case Type::string:
+    switch (lhs.propertyListType()) {
+        case PropertyListType::string:
             return static_cast<const OpaqueCFString&>(lhs).equals(static_cast<const OpaqueCFString&>(rhs));
-        case Type::dictionary:
-        case Type::array:
+        case PropertyListType::dictionary:
+        case PropertyListType::array:
             return equalSoFar(static_cast<const Container&>(lhs), static_cast<const Container&>(rhs), pairs);
-        case Type::number:
+        case PropertyListType::number:
             return equalNumbers(static_cast<const OpaqueCFNumber&>(lhs),
                                 static_cast<const OpaqueCFNumber&>(rhs));
-        case Type::data:
+        case PropertyListType::data:
             return static_cast<const OpaqueCFData&>(lhs).bytes == static_cast<const OpaqueCFData&>(rhs).bytes;
-        case Type::date:
+        case PropertyListType::date:
             return static_cast<const OpaqueCFDate&>(lhs).seconds ==
                    static_cast<const OpaqueCFDate&>(rhs).seconds;
-        case Type::url:
-            return equalValues(static_cast<const OpaqueCFURL&>(lhs).text.get(),
-                               static_cast<const OpaqueCFURL&>(rhs).text.get());
-        case Type::boolean:
-        case Type::runLoop:
-        case Type::runLoopSource:
-        case Type::preferences:
-        case Type::dynamicStore:
+        case PropertyListType::boolean:
             break;
+        case PropertyListType::none:
+            return lhs.type() == Type::url && equalValues(static_cast<const OpaqueCFURL&>(lhs).text.get(),
+                                                          static_cast<const OpaqueCFURL&>(rhs).text.get());
     }
     return false;
 }
@@ -127,28 +116,27 @@ bool platform::values::equalValues(CFTypeRef lhs, CFTypeRef rhs) {
 }
 
 std::uint32_t platform::values::hashOfValue(CFTypeRef value) noexcept {
-    switch (objectOf(value).type()) {
-        case Type::string:
+    switch (objectOf(value).propertyListType()) {
+        case PropertyListType::string:
             return static_cast<const OpaqueCFString*>(value)->hash();
-        case Type::dictionary:
-        case Type::array:
-            return static_cast<std::uint32_t>(static_cast<const Container*>(value)->count());
-        case Type::number:
+        case PropertyListType::dictionary:
+        case PropertyListType::array:
+            return hashOf(static_cast<const Container*>(value)->count());
+        case PropertyListType::number:
             return hashOfNumber(*static_cast<const OpaqueCFNumber*>(value));
-        case Type::data:
-            return hashOfText(static_cast<const OpaqueCFData*>(value)->bytes);
-        case Type::date:
-            return hashOfInteger(static_cast<const OpaqueCFDate*>(value)->seconds);
-        case Type::url:
-            return static_cast<const OpaqueCFURL*>(value)->text.get()->hash();
-        case Type::boolean:
-        case Type::runLoop:
-        case Type::runLoopSource:
-        case Type::preferences:
-        case Type::dynamicStore:
+        case PropertyListType::data:
+            return hashOf(std::string_view(static_cast<const OpaqueCFData*>(value)->bytes));
+        case PropertyListType::date:
+            return hashOf(static_cast<const OpaqueCFDate*>(value)->seconds);
+        case PropertyListType::boolean:
+            break;
+        case PropertyListType::none:
+            if (const auto* const url = static_cast<const OpaqueCFURL*>(value); url->type() == Type::url) {
+                return url->text.get()->hash();
+            }
             break;
     }
-    return hashOfInteger(static_cast<std::int64_t>(reinterpret_cast<std::intptr_t>(value)));
+    return hashOf(value);
 }
 
 CFTypeRef CFRetain(CFTypeRef value) noexcept {

@@ -1,7 +1,8 @@
 // What the other folders of the platform need of values beyond CoreFoundation.h: building and reading them
-// without a detour through C, values that nobody can change, and editing a tree of such values in place.
+// without a detour through C, values that nobody can change, and changing a tree of such values in place.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <span>
 #include <string>
@@ -63,37 +64,18 @@ struct Entry {
 // nothing can change it. What parsePropertyListXML returns is frozen.
 
 // A frozen value equal to the given one: the value itself, retained, when it is frozen, else a copy that
-// shares every part that is. Costs the parts that are not known to be frozen; a container that was found
-// frozen remembers it. Null when the value, or something in it, is no property-list value (keys are strings),
-// or when it is nested deeper than deepestPropertyList.
-[[nodiscard]] Owned<CFPropertyListRef> frozen(CFPropertyListRef value);
-// How many containers are nested in a frozen value, itself included.
-[[nodiscard]] int levelsOf(CFPropertyListRef frozen) noexcept;
+// shares every part that is. Null when the value, or something in it, is no property-list value (keys are
+// strings), or when containersAbove and those nested in it are more than deepestPropertyList.
+[[nodiscard]] Owned<CFPropertyListRef> frozen(CFPropertyListRef value, std::size_t containersAbove = 0);
 
-// --- Editing in place ---
-//
-// A tree of frozen dictionaries is edited without copying what nobody else holds, and without changing what
-// anybody else holds:
-//
-//     claim(root);                                      // Owned<CFDictionaryRef> root
-//     CFDictionaryRef sets = claimedChild(root.get(), CFSTR("Sets"));
-//     setClaimed(sets, CFSTR("7"), frozen(set));
-//
-// A dictionary is claimed when one single owner holds it, and everything on the way to it is claimed as well.
-// It looks immutable to everybody else, so only the tree's owner may hold claims, and a claim ends when
-// anybody takes a reference to the dictionary or to one above it. Claim anew, from the root, for each change:
-// it costs a look-up a level, plus one copy of the entries (not of what they hold) of each dictionary on the
-// way that somebody else shares.
+// A tree of frozen dictionaries is changed without copying what nobody else holds, and without changing what
+// anybody else holds: it costs a look-up a level, plus one copy of the entries (not of what they hold) of
+// each dictionary on the way that somebody else shares. The path has one key at least, and everything on it
+// but the last is a dictionary or missing.
 
-// Makes the root claimed, replacing it by a new handle on the same entries when others hold it too or it is
-// mutable.
-void claim(Owned<CFDictionaryRef>& root);
-// The dictionary under the key, claimed and borrowed from its parent; null when there is none or the value is
-// no dictionary. The parent must be claimed.
-[[nodiscard]] CFDictionaryRef claimedChild(CFDictionaryRef parent, CFTypeRef key);
-// Adds, or replaces in place. The dictionary must be claimed, the value frozen and not null.
-void setClaimed(CFDictionaryRef dictionary, CFStringRef key, const Owned<CFPropertyListRef>& value);
-// The dictionary must be claimed. Nothing happens when the key is not there.
-void removeClaimed(CFDictionaryRef dictionary, CFTypeRef key);
+// Adds, or replaces in place, making what is missing on the way. The value must be frozen.
+void setAtPath(Owned<CFDictionaryRef>& root, std::span<const Owned<CFStringRef>> path, CFTypeRef value);
+// Nothing on the way may be missing.
+void removeAtPath(Owned<CFDictionaryRef>& root, std::span<const Owned<CFStringRef>> path);
 
 }  // namespace platform::values

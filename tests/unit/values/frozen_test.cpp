@@ -1,5 +1,7 @@
 #include <gtest/gtest.h>
 
+#include <vector>
+
 #include "tests/unit/values/Values.h"
 
 using namespace values_test;
@@ -23,6 +25,8 @@ TEST(Frozen, IsARetainOfWhatNobodyCanChange) {
     const auto built = nestedArrays(deepestPropertyList);
     EXPECT_EQ(frozen(built.get()).get(), built.get());
     EXPECT_FALSE(frozen(nestedArrays(deepestPropertyList + 1).get()));
+    EXPECT_TRUE(frozen(nestedArrays(12).get(), deepestPropertyList - 12));
+    EXPECT_FALSE(frozen(nestedArrays(12).get(), deepestPropertyList - 11));
 }
 
 TEST(Frozen, FindsTheMutablePartHoweverDeepAndSharesTheRest) {
@@ -71,28 +75,31 @@ TEST(Frozen, DeepMutableCopyIsApartThroughout) {
     EXPECT_TRUE(CFEqual(tree.get(), parsed(treeText).get()));
 }
 
-TEST(Claim, WritesInPlaceWhatNobodyElseHolds) {
+void setName(Owned<CFDictionaryRef>& root, std::string_view set, std::string_view name) {
+    setAtPath(root, std::vector{str("Sets"), str(set), str("Name")}, str(name).get());
+}
+
+TEST(Editing, WritesInPlaceWhatNobodyElseHolds) {
     auto root = parsedAs<CFDictionaryRef>(treeText);
     const CFDictionaryRef handle = root.get();
     const CFDictionaryRef sets = childOf(handle, CFSTR("Sets"));
     const CFDictionaryRef set = childOf(sets, CFSTR("1"));
-    claim(root);
-    setClaimed(claimedChild(claimedChild(root.get(), CFSTR("Sets")), CFSTR("1")), CFSTR("Name"),
-               frozen(CFSTR("new")));
+    setName(root, "1", "new");
     EXPECT_EQ(root.get(), handle);
     EXPECT_EQ(childOf(sets, CFSTR("1")), set);
-    removeClaimed(claimedChild(root.get(), CFSTR("Sets")), CFSTR("0"));
-    EXPECT_EQ(descriptionOf(root.get()), "{Sets = {1 = {Name = new}}; CurrentSet = /Sets/0}");
-    EXPECT_EQ(claimedChild(root.get(), CFSTR("CurrentSet")), nullptr);
+    removeAtPath(root, std::vector{str("Sets"), str("0")});
+    setAtPath(root, std::vector{str("a"), str("b"), str("c")}, kCFBooleanTrue);
+    EXPECT_EQ(descriptionOf(root.get()),
+              "{Sets = {1 = {Name = new}}; CurrentSet = /Sets/0; a = {b = {c = true}}}");
 }
 
 // Whoever holds the root, an inner dictionary, or a copy of either sees no change.
-TEST(Claim, LeavesEveryHolderItsValue) {
+TEST(Editing, LeavesEveryHolderItsValue) {
     const auto change = [](Owned<CFDictionaryRef>& root) {
-        claim(root);
-        setClaimed(claimedChild(claimedChild(root.get(), CFSTR("Sets")), CFSTR("0")), CFSTR("Name"),
-                   frozen(CFSTR("new")));
-        removeClaimed(claimedChild(root.get(), CFSTR("Sets")), CFSTR("1"));
+        setName(root, "0", "new");
+        removeAtPath(root, std::vector{str("Sets"), str("1")});
+        setAtPath(root, std::vector{str("Sets"), str("1")}, kCFBooleanTrue);
+        removeAtPath(root, std::vector{str("Sets"), str("1")});
     };
     const auto holdRoot = [](CFDictionaryRef root) { return Owned<CFDictionaryRef>::retained(root); };
     const auto holdSet = [](CFDictionaryRef root) {
@@ -106,7 +113,6 @@ TEST(Claim, LeavesEveryHolderItsValue) {
         auto root = parsedAs<CFDictionaryRef>(treeText);
         const auto held = hold(root.get());
         const std::string before = descriptionOf(held.get());
-        change(root);
         change(root);
         EXPECT_EQ(descriptionOf(held.get()), before);
         EXPECT_EQ(descriptionOf(root.get()), "{Sets = {0 = {Name = new}}; CurrentSet = /Sets/0}");

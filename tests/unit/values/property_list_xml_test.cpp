@@ -151,7 +151,7 @@ TEST(PropertyListXML, TellsThePlaceOfAnError) {
         parsePropertyListXML("<plist><dict>\n<key>\xC3\xA4</key><integer>x</integer></dict></plist>", error));
     EXPECT_EQ(error.line, 2U);
     EXPECT_EQ(error.column, 24U);
-    EXPECT_EQ(error.reason, "an integer that is none or does not fit 64 bits");
+    EXPECT_EQ(error.reason, "not an integer, or one that does not fit 64 bits");
     EXPECT_FALSE(parsePropertyListXML("<plist version=\"1.0\">\n<true/>\n", error));
     EXPECT_EQ(error.line, 3U);
     EXPECT_EQ(error.reason, "no element found");
