@@ -34,34 +34,21 @@ TEST_F(SessionTest, CommitsAndAppliesOnceAtTheOutermostClose) {
     EXPECT_EQ(std::vector<std::string>({"eth0: idle -> ours: off"}), agent->changes);
 }
 
-TEST_F(SessionTest, OnlyAWriterWithoutAnErrorMarksAndNobodyClearsTheMark) {
-    const struct {
-        bool innerSucceeds;
-        OSStatus outerStatus;
-        bool outerDirty;
-        bool commits;
-    } rows[] = {
-        {true, 0, false, true},  {true, -1, true, true},  // a failure after a successful writer
-        {true, -1, false, true}, {false, 0, false, false}, {false, -1, true, false},
-    };
-    for (const auto& row : rows) {
-        setTree(twoSets);
-        const std::string before = fileIdentity();
-        OSStatus err = MoreSCOpen(false, false);
-        EXPECT_EQ(row.innerSucceeds ? 0 : kSCStatusNoKey,
-                  MoreSCRenameSet(Str(row.innerSucceeds ? "1" : "none"), Str("Cottage")));
-        EXPECT_EQ(kSCStatusNoKey, MoreSCRenameSet(Str("none"), Str("a failure behind it")));
-        err = row.outerStatus;
-        MoreSCClose(&err, row.outerDirty);
-        EXPECT_EQ(row.outerStatus, err);
-        EXPECT_EQ(row.commits, before != fileIdentity());
+// That a writer marks the session, and only when it succeeds, every operation shows.
+TEST_F(SessionTest, TheMarkOutlivesFailuresButNotTheSession) {
+    for (const Boolean dirty : {true, false}) {
+        for (const bool isMarked : {true, false}) {
+            setTree(twoSets);
+            const std::string before = fileIdentity();
+            OSStatus err = MoreSCOpen(false, false);
+            SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), CFSTR("CurrentSet"), CFSTR("/Sets/2"));
+            EXPECT_EQ(isMarked ? 0 : 1004, MoreSCRenameSet(Str(isMarked ? "1" : "none"), Str("Cottage")));
+            err = -1;
+            MoreSCClose(&err, dirty);
+            EXPECT_EQ(-1, err);
+            EXPECT_EQ(isMarked, before != fileIdentity());
+        }
     }
-    // The mark is gone with its session.
-    const std::string before = fileIdentity();
-    OSStatus err = MoreSCOpen(false, false);
-    SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), CFSTR("CurrentSet"), CFSTR("/Sets/2"));
-    MoreSCClose(&err, false);
-    EXPECT_EQ(before, fileIdentity());
 }
 
 TEST_F(SessionTest, AFailedCommitReplacesOnlySuccessAndIsNotApplied) {

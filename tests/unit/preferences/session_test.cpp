@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include <deque>
 #include <filesystem>
 
 #include "tests/unit/preferences/Fixture.h"
@@ -92,36 +91,6 @@ TEST_F(SessionTest, TheLockKeepsOthersOut) {
     ASSERT_TRUE(set(session, "/Sets/4", "four") && commit(session));
     SessionRef next = open();
     EXPECT_TRUE(SCPreferencesLock(next.get(), 0)) << "a commit that took the lock gives it back";
-}
-
-TEST_F(SessionTest, ManyProcessesLoseNothing) {
-    makeStore();
-    constexpr int processes = 4;
-    constexpr int rounds = 20;
-    std::deque<testing_support::Child> children;
-    for (int process = 0; process < processes; ++process) {
-        children.emplace_back([process] {
-            for (int done = 0; done < rounds;) {
-                SessionRef session = open();
-                const std::string path = "/Sets/p" + std::to_string(process) + "-" + std::to_string(done);
-                if (!session || !set(session, path, "x")) {
-                    return 1;
-                }
-                if (commit(session)) {
-                    ++done;
-                } else if (SCError() != 3005) {
-                    return 2;
-                }
-            }
-            return 0;
-        });
-    }
-    for (auto& child : children) {
-        EXPECT_EQ(child.wait(), 0);
-    }
-    SessionRef session = open();
-    EXPECT_EQ(CFDictionaryGetCount(SCPreferencesPathGetValue(session.get(), CFSTR("/Sets"))),
-              processes * rounds + 1);
 }
 
 }  // namespace

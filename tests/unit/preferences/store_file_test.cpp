@@ -5,6 +5,7 @@
 #include <functional>
 
 #include "tests/unit/preferences/Fixture.h"
+#include "tests/unit/support/Notation.h"
 
 namespace preferences_test {
 namespace {
@@ -58,26 +59,13 @@ TEST_F(StoreFileTest, TheFirstRunTreeIsCommittedAsItIs) {
     ASSERT_TRUE(session);
     EXPECT_FALSE(std::filesystem::exists(store));
     ASSERT_TRUE(commit(session));
-    const auto expected = parsed(R"(<plist version="1.0"><dict>
-        <key>CurrentSet</key><string>/Sets/0</string>
-        <key>NetworkServices</key><dict><key>0</key><dict>
-            <key>UserDefinedName</key><string>Managed by the system</string>
-            <key>Interface</key><dict>
-                <key>DeviceName</key><string>*</string>
-                <key>Hardware</key><string>System</string>
-                <key>Type</key><string>System</string></dict></dict></dict>
-        <key>Sets</key><dict><key>0</key><dict>
-            <key>UserDefinedName</key><string>Automatic</string>
-            <key>Network</key><dict>
-                <key>Global</key><dict>
-                    <key>IPv4</key><dict>
-                        <key>PPPOverridePrimary</key><integer>0</integer>
-                        <key>ServiceOrder</key><array><string>0</string></array></dict>
-                    <key>NetInfo</key><dict/></dict>
-                <key>Service</key><dict><key>0</key><dict>
-                    <key>__LINK__</key><string>/NetworkServices/0</string></dict></dict></dict></dict></dict>
-        </dict></plist>)");
-    EXPECT_TRUE(CFEqual(parsed(contentOf(file)).get(), expected.get())) << contentOf(file);
+    EXPECT_EQ(
+        testing_support::show(parsed(contentOf(file)).get()),
+        "{CurrentSet = /Sets/0; NetworkServices = {0 = {UserDefinedName = Managed by the system; Interface = "
+        "{DeviceName = *; Hardware = System; Type = System}}}; Sets = {0 = {UserDefinedName = Automatic; "
+        "Network "
+        "= {Global = {IPv4 = {PPPOverridePrimary = #0; ServiceOrder = (0)}; NetInfo = {}}; Service = {0 = "
+        "{__LINK__ = /NetworkServices/0}}}}}}");
 }
 
 TEST_F(StoreFileTest, WhatItWritesIsPrivate) {

@@ -2,24 +2,21 @@
 
 #include "platform/preferences/Tree.h"
 #include "tests/unit/preferences/Fixture.h"
+#include "tests/unit/support/Notation.h"
 
 namespace preferences_test {
 namespace {
 
-constexpr std::string_view sample = R"(<plist version="1.0"><dict>
-    <key>CurrentSet</key><string>/Sets/1</string>
-    <key>Sets</key><dict>
-        <key>1</key><dict><key>Name</key><string>one</string></dict>
-        <key>2</key><string>no dictionary</string>
-    </dict>
-    <key>Link</key><dict><key>__LINK__</key><string>/Sets/1</string></dict>
-    <key>BadLink</key><dict><key>__LINK__</key><integer>1</integer></dict>
-</dict></plist>)";
+constexpr std::string_view sample =
+    "{CurrentSet = /Sets/1; Sets = {1 = {Name = one}; 2 = no dictionary}; Link = {__LINK__ = /Sets/1}; "
+    "BadLink = "
+    "{__LINK__ = #1}}";
 
 class TreeTest : public StoreTest {
   protected:
     TreeTest() {
-        (void)directory.write("store/preferences.plist", sample);
+        (void)directory.write("store/preferences.plist",
+                              *platform::values::writePropertyListXML(testing_support::read(sample).get()));
         session = open();
     }
 
@@ -94,18 +91,14 @@ TEST_F(TreeTest, TopLevelValuesMayBeOfAnyPropertyListType) {
 // What can be stored can be committed, and read again.
 TEST_F(TreeTest, NoDeeperThanAFileMayBe) {
     const auto nested = [](int levels) {
-        return as<CFDictionaryRef>(parsed("<plist version=\"1.0\">" +
-                                          [&] {
-                                              std::string open;
-                                              std::string close;
-                                              for (int i = 1; i < levels; ++i) {
-                                                  open += "<dict><key>a</key>";
-                                                  close += "</dict>";
-                                              }
-                                              return open + "<dict/>" + close;
-                                          }() +
-                                          "</plist>")
-                                       .take());
+        auto value = testing_support::read("{}");
+        for (int i = 1; i < levels; ++i) {
+            const void* key = CFSTR("a");
+            const void* item = value.get();
+            value = testing_support::Value::adopt(CFDictionaryCreate(
+                nullptr, &key, &item, 1, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
+        }
+        return static_cast<CFDictionaryRef>(value.take());
     };
     for (const int levels : {510, 511, 512}) {
         const auto value = Owned<CFDictionaryRef>::adopt(nested(levels));

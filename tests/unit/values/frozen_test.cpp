@@ -93,30 +93,4 @@ TEST(Editing, WritesInPlaceWhatNobodyElseHolds) {
               "{Sets = {1 = {Name = new}}; CurrentSet = /Sets/0; a = {b = {c = true}}}");
 }
 
-// Whoever holds the root, an inner dictionary, or a copy of either sees no change.
-TEST(Editing, LeavesEveryHolderItsValue) {
-    const auto change = [](Owned<CFDictionaryRef>& root) {
-        setName(root, "0", "new");
-        removeAtPath(root, std::vector{str("Sets"), str("1")});
-        setAtPath(root, std::vector{str("Sets"), str("1")}, kCFBooleanTrue);
-        removeAtPath(root, std::vector{str("Sets"), str("1")});
-    };
-    const auto holdRoot = [](CFDictionaryRef root) { return Owned<CFDictionaryRef>::retained(root); };
-    const auto holdSet = [](CFDictionaryRef root) {
-        return Owned<CFDictionaryRef>::retained(childOf(childOf(root, CFSTR("Sets")), CFSTR("0")));
-    };
-    const auto copyRoot = [](CFDictionaryRef root) {
-        return Owned<CFDictionaryRef>::adopt(CFDictionaryCreateMutableCopy(nullptr, 0, root));
-    };
-    using Hold = Owned<CFDictionaryRef> (*)(CFDictionaryRef);
-    for (const Hold hold : {Hold(holdRoot), Hold(holdSet), Hold(copyRoot)}) {
-        auto root = parsedAs<CFDictionaryRef>(treeText);
-        const auto held = hold(root.get());
-        const std::string before = descriptionOf(held.get());
-        change(root);
-        EXPECT_EQ(descriptionOf(held.get()), before);
-        EXPECT_EQ(descriptionOf(root.get()), "{Sets = {0 = {Name = new}}; CurrentSet = /Sets/0}");
-    }
-}
-
 }  // namespace
