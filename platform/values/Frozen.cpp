@@ -33,21 +33,19 @@ Owned<CFTypeRef> copyContainer(const Handle& container, Storage::Shape shape, Co
             from = {&entries.front().key, entries.size() * 2};
         }
     }
-    std::vector<Owned<CFTypeRef>> copies;
-    copies.reserve(from.size());
+    std::vector<Owned<CFTypeRef>> copies(from.size());
     bool isSame = !isMutable;
     for (std::size_t i = 0; i < from.size(); ++i) {
         const bool isKeySlot = isDictionary && i % 2 == 0;
-        if (isKeySlot && !isKey(from[i])) {
+        if (!isKeySlot) {
+            copies[i] = copyDeep(from[i], how, depth + 1);
+        } else if (isKey(from[i])) {
+            copies[i] = Owned<CFTypeRef>::retained(from[i]);
+        }
+        if (!copies[i]) {
             return {};
         }
-        Owned<CFTypeRef> copy =
-            isKeySlot ? Owned<CFTypeRef>::retained(from[i]) : copyDeep(from[i], how, depth + 1);
-        if (!copy) {
-            return {};
-        }
-        isSame = isSame && copy.get() == from[i];
-        copies.push_back(std::move(copy));
+        isSame = isSame && copies[i].get() == from[i];
     }
     if (isSame && !container.isMutable()) {
         return Owned<CFTypeRef>::retained(&container);
