@@ -159,8 +159,8 @@ OSStatus MoreSCNewService(CFStringRef setID, CFDictionaryRef portDict, CFStringR
 OSStatus MoreSCDuplicateService(CFStringRef setID, CFStringRef serviceID, CFStringRef userVisibleName,
                                 CFStringRef* newServiceID);
 // Takes the service out of the location's links and order (one that is not in the order is only unlinked),
-// and removes every service that no location lists any more; when that removal fails, the service is out of the
-// location, and committed so, all the same. -50 for a null service ID, with nothing changed.
+// and removes every service that no location lists any more; when that removal fails, the service is out of
+// the location, and committed so, all the same. -50 for a null service ID, with nothing changed.
 OSStatus MoreSCDeleteService(CFStringRef setID, CFStringRef serviceID);
 OSStatus MoreSCRenameService(CFStringRef setID, CFStringRef serviceID, CFStringRef userVisibleName);
 

@@ -1,11 +1,7 @@
 #include "morescf/MoreSCFDigest.h"
 
-#include <arpa/inet.h>
-
-#include <cstdio>
-#include <cstdlib>
-
 #include "morecfq/MoreCFQ.h"
+#include "morescf/MoreSCFKeys.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
@@ -79,21 +75,29 @@ void SetNumber(OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, SInt
     }
 }
 
-void SetOptional(const OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, CFTypeRef value) {
-    if (*err == 0 && value != nullptr) {
+void SetValue(const OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, CFTypeRef value) {
+    if (*err == 0) {
         CFDictionarySetValue(dict, key, value);
     }
 }
 
+// Null leaves the key out.
+void SetOptional(const OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, CFTypeRef value) {
+    if (value != nullptr) {
+        SetValue(err, dict, key, value);
+    }
+}
+
+// Null is -50.
 void SetRequired(OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, CFTypeRef value) {
     if (*err == 0 && value == nullptr) {
         *err = paramErr;
     }
-    SetOptional(err, dict, key, value);
+    SetValue(err, dict, key, value);
 }
 
 void SetInactive(OSStatus* err, CFMutableDictionaryRef dict) {
-    SetNumber(err, dict, CFSTR("__INACTIVE__"), 1);
+    SetNumber(err, dict, kInactiveKey, 1);
 }
 
 void SetMacAddress(OSStatus* err, CFMutableDictionaryRef dict, const UInt8 macAddr[6]) {
@@ -101,7 +105,7 @@ void SetMacAddress(OSStatus* err, CFMutableDictionaryRef dict, const UInt8 macAd
     if (*err == 0) {
         *err = MoreSCFCreateStringWithMacAddress(macAddr, &text);
     }
-    SetOptional(err, dict, CFSTR("MACAddress"), text);
+    SetValue(err, dict, kMACAddressKey, text);
     CFQRelease(text);
 }
 
@@ -110,8 +114,8 @@ void SetInetAddressArray(OSStatus* err, CFMutableDictionaryRef dict, CFStringRef
     CFArrayRef addresses = nullptr;
     if (*err == 0 && address.s_addr != 0) {
         *err = MoreSCFCreateArrayWithInetAddresses(1, &address, &addresses);
+        SetValue(err, dict, key, addresses);
     }
-    SetOptional(err, dict, key, addresses);
     CFQRelease(addresses);
 }
 
@@ -139,13 +143,6 @@ OSStatus CreateArrayWithStrings(UInt32 count, const CFStringRef* strings, CFMuta
     return err;
 }
 
-OSStatus CreateStringWithASCII(const char* text, CFStringRef* result) {
-    CFStringRef string = CFStringCreateWithCString(kCFAllocatorDefault, text, kCFStringEncodingASCII);
-    const OSStatus err = string != nullptr ? 0 : coreFoundationUnknownErr;
-    HandOverOrNull(err, string, result);
-    return err;
-}
-
 // The member of a union of digests; none of no union.
 template <class Union, class Digest>
 const Digest* Member(const Union* digests, Digest Union::*member) {
@@ -163,12 +160,12 @@ OSStatus MoreSCCreateInterfaceEntity(const MoreSCInterfaceDigest* digest, CFMuta
     CFMutableDictionaryRef record = nullptr;
     OSStatus err = BeginRecord(digest, &record);
     if (err == 0) {
-        SetRequired(&err, record, CFSTR("DeviceName"), digest->deviceName);
-        SetRequired(&err, record, CFSTR("UserDefinedName"), digest->userDefinedName);
-        SetRequired(&err, record, CFSTR("Hardware"), digest->hardware);
-        SetRequired(&err, record, CFSTR("Type"), digest->type);
-        SetOptional(&err, record, CFSTR("SubType"), digest->subType);
-        SetOptional(&err, record, CFSTR("HardwareVariant"), digest->variant);
+        SetRequired(&err, record, kDeviceNameKey, digest->deviceName);
+        SetRequired(&err, record, kUserDefinedNameKey, digest->userDefinedName);
+        SetRequired(&err, record, kHardwareKey, digest->hardware);
+        SetRequired(&err, record, kTypeKey, digest->type);
+        SetOptional(&err, record, kSubTypeKey, digest->subType);
+        SetOptional(&err, record, kHardwareVariantKey, digest->variant);
     }
     HandOverOrNull(err, record, entity);
     return err;
@@ -213,7 +210,7 @@ OSStatus MoreSCCreateAppleTalkEntity(const MoreSCAppleTalkDigest* digest, CFMuta
     CFMutableDictionaryRef record = nullptr;
     OSStatus err = BeginRecord(digest, &record);
     if (err == 0) {
-        SetRequired(&err, record, CFSTR("ConfigMethod"), digest->configMethod);
+        SetRequired(&err, record, kConfigMethodKey, digest->configMethod);
         SetOptional(&err, record, CFSTR("DefaultZone"), digest->defaultZone);
         if (digest->manual) {
             SetNumber(&err, record, CFSTR("NetworkID"), digest->networkID);
@@ -235,11 +232,11 @@ OSStatus MoreSCCreateDNSEntity(const MoreSCDNSDigest* digest, CFMutableDictionar
     if (err == 0 && digest->serverAddressesCount != 0) {
         err = MoreSCFCreateArrayWithInetAddresses(static_cast<CFIndex>(digest->serverAddressesCount),
                                                   digest->serverAddresses, &servers);
-        SetOptional(&err, record, CFSTR("ServerAddresses"), servers);
+        SetValue(&err, record, CFSTR("ServerAddresses"), servers);
     }
     if (err == 0 && digest->searchDomainsCount != 0) {
         err = CreateArrayWithStrings(digest->searchDomainsCount, digest->searchDomains, &domains);
-        SetOptional(&err, record, CFSTR("SearchDomains"), domains);
+        SetValue(&err, record, CFSTR("SearchDomains"), domains);
     }
     CFQRelease(servers);
     CFQRelease(domains);
@@ -252,7 +249,7 @@ OSStatus MoreSCCreateIPv4Entity(const MoreSCIPv4Digest* digest, CFMutableDiction
     CFStringRef router = nullptr;
     OSStatus err = BeginRecord(digest, &record);
     if (err == 0) {
-        SetRequired(&err, record, CFSTR("ConfigMethod"), digest->configMethod);
+        SetRequired(&err, record, kConfigMethodKey, digest->configMethod);
         SetOptional(&err, record, CFSTR("DHCPClientID"), digest->clientID);
         SetInetAddressArray(&err, record, CFSTR("Addresses"), digest->address);
         SetInetAddressArray(&err, record, CFSTR("SubnetMasks"), digest->subnetMask);
@@ -260,7 +257,7 @@ OSStatus MoreSCCreateIPv4Entity(const MoreSCIPv4Digest* digest, CFMutableDiction
     // Unlike the other two, the router stands alone, not in an array.
     if (err == 0 && digest->router.s_addr != 0) {
         err = MoreSCFCreateStringWithInetAddress(digest->router, &router);
-        SetOptional(&err, record, CFSTR("Router"), router);
+        SetValue(&err, record, CFSTR("Router"), router);
     }
     CFQRelease(router);
     HandOverOrNull(err, record, entity);
@@ -277,7 +274,7 @@ OSStatus MoreSCCreatePPPEntity(const MoreSCPPPDigest* digest, CFMutableDictionar
         options = digest->options;
     }
     if (err == 0) {
-        SetOptional(&err, record, CFSTR("UserDefinedName"), digest->userDefinedName);
+        SetOptional(&err, record, kUserDefinedNameKey, digest->userDefinedName);
         if (!digest->active) {
             SetInactive(&err, record);
         }
@@ -287,13 +284,13 @@ OSStatus MoreSCCreatePPPEntity(const MoreSCPPPDigest* digest, CFMutableDictionar
         SetNumber(&err, record, CFSTR("DisconnectOnLogout"), options->disconnectOnLogout);
         SetNumber(&err, record, CFSTR("IdleReminder"), options->idleReminder);
         SetNumber(&err, record, CFSTR("IdleReminderTimer"), options->idleReminderTimer);
-        SetOptional(&err, record, CFSTR("Logfile"), CFSTR("/tmp/ppp.log"));
+        SetValue(&err, record, CFSTR("Logfile"), CFSTR("/tmp/ppp.log"));
         SetNumber(&err, record, CFSTR("VerboseLogging"), options->verboseLogging);
         SetOptional(&err, record, CFSTR("AuthName"), digest->authName);
     }
     if (err == 0 && digest->authPassword != nullptr) {
         err = MoreSCFCopyEncodedPPPPassword(digest->authPassword, &password);
-        SetOptional(&err, record, CFSTR("AuthPassword"), password);
+        SetValue(&err, record, CFSTR("AuthPassword"), password);
     }
     if (err == 0) {
         SetOptional(&err, record, CFSTR("CommAlternateRemoteAddress"), digest->commAlternateRemoteAddress);
@@ -342,8 +339,8 @@ OSStatus MoreSCCreateModemEntity(const MoreSCModemDigest* digest, CFMutableDicti
     if (err == 0) {
         SetRequired(&err, record, CFSTR("ConnectionScript"), digest->connectionScript);
         SetNumber(&err, record, CFSTR("DataCompression"), digest->dataCompressionErrorCorrection);
-        SetOptional(&err, record, CFSTR("DialMode"),
-                    digest->waitForDialTone ? CFSTR("WaitForDialTone") : CFSTR("IgnoreDialTone"));
+        SetValue(&err, record, CFSTR("DialMode"),
+                 digest->waitForDialTone ? CFSTR("WaitForDialTone") : CFSTR("IgnoreDialTone"));
         SetNumber(&err, record, CFSTR("ErrorCorrection"), digest->dataCompressionErrorCorrection);
         SetNumber(&err, record, CFSTR("PulseDial"), digest->pulseDial);
         SetNumber(&err, record, CFSTR("Speaker"), digest->speaker);
@@ -361,7 +358,7 @@ OSStatus MoreSCCreateIPv4GlobalEntity(const MoreSCIPv4GlobalDigest* /*digest*/,
     if (err == 0) {
         err = CFQArrayCreateMutable(&order);
     }
-    SetOptional(&err, record, CFSTR("ServiceOrder"), order);
+    SetValue(&err, record, kServiceOrderKey, order);
     CFQRelease(order);
     HandOverOrNull(err, record, entity);
     return err;
@@ -381,23 +378,23 @@ OSStatus MoreSCCreateEntity(CFStringRef protocol, const MoreSCDigest* digest,
     if (protocol == nullptr) {
         err = paramErr;
         HandOverOrNull<CFMutableDictionaryRef>(err, nullptr, entity);
-    } else if (CFEqual(protocol, CFSTR("Interface"))) {
+    } else if (CFEqual(protocol, kInterfaceProtocol)) {
         err = MoreSCCreateInterfaceEntity(Member(digest, &MoreSCDigest::interface), entity);
-    } else if (CFEqual(protocol, CFSTR("Proxies"))) {
+    } else if (CFEqual(protocol, kProxiesProtocol)) {
         err = MoreSCCreateProxiesEntity(Member(digest, &MoreSCDigest::proxies), entity);
-    } else if (CFEqual(protocol, CFSTR("AppleTalk"))) {
+    } else if (CFEqual(protocol, kAppleTalkProtocol)) {
         err = MoreSCCreateAppleTalkEntity(Member(digest, &MoreSCDigest::appleTalk), entity);
-    } else if (CFEqual(protocol, CFSTR("DNS"))) {
+    } else if (CFEqual(protocol, kDNSProtocol)) {
         err = MoreSCCreateDNSEntity(Member(digest, &MoreSCDigest::dns), entity);
-    } else if (CFEqual(protocol, CFSTR("IPv4"))) {
+    } else if (CFEqual(protocol, kIPv4Protocol)) {
         err = MoreSCCreateIPv4Entity(Member(digest, &MoreSCDigest::ipv4), entity);
-    } else if (CFEqual(protocol, CFSTR("PPP"))) {
+    } else if (CFEqual(protocol, kPPPProtocol)) {
         err = MoreSCCreatePPPEntity(Member(digest, &MoreSCDigest::ppp), entity);
-    } else if (CFEqual(protocol, CFSTR("AirPort"))) {
+    } else if (CFEqual(protocol, kAirPortProtocol)) {
         err = MoreSCCreateAirPortEntity(Member(digest, &MoreSCDigest::airPort), entity);
-    } else if (CFEqual(protocol, CFSTR("Ethernet"))) {
+    } else if (CFEqual(protocol, kEthernetProtocol)) {
         err = MoreSCCreateEthernetEntity(Member(digest, &MoreSCDigest::ethernet), entity);
-    } else if (CFEqual(protocol, CFSTR("Modem"))) {
+    } else if (CFEqual(protocol, kModemProtocol)) {
         err = MoreSCCreateModemEntity(Member(digest, &MoreSCDigest::modem), entity);
     } else {
         err = kUnknownProtocolErr;
@@ -411,103 +408,13 @@ OSStatus MoreSCCreateGlobalEntity(CFStringRef protocol, const MoreSCGlobalDigest
     if (protocol == nullptr) {
         err = paramErr;
         HandOverOrNull<CFMutableDictionaryRef>(err, nullptr, entity);
-    } else if (CFEqual(protocol, CFSTR("IPv4"))) {
+    } else if (CFEqual(protocol, kIPv4Protocol)) {
         err = MoreSCCreateIPv4GlobalEntity(Member(digest, &MoreSCGlobalDigest::ipv4), entity);
-    } else if (CFEqual(protocol, CFSTR("NetInfo"))) {
+    } else if (CFEqual(protocol, kNetInfoProtocol)) {
         err = MoreSCCreateNetInfoGlobalEntity(Member(digest, &MoreSCGlobalDigest::netInfo), entity);
     } else {
         err = kUnknownProtocolErr;
     }
-    return err;
-}
-
-OSStatus MoreSCFCreateStringWithMacAddress(const UInt8 macAddr[6], CFStringRef* result) {
-    char text[19] = "";
-    char* end = text;
-    for (int i = 0; i < 6; ++i, end += 3) {
-        std::snprintf(end, 4, "%2.2x:", static_cast<unsigned int>(macAddr[i]));
-    }
-    text[17] = '\0';
-    return CreateStringWithASCII(text, result);
-}
-
-OSStatus MoreSCFStringToMacAddress(CFStringRef str, UInt8 macAddr[6]) {
-    OSStatus err = 0;
-    char text[18];
-    unsigned int bytes[6];
-    if (str == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0 && !CFStringGetCString(str, text, sizeof(text), kCFStringEncodingASCII)) {
-        err = coreFoundationUnknownErr;
-    }
-    if (err == 0 && std::sscanf(text, "%02x:%02x:%02x:%02x:%02x:%02x", &bytes[0], &bytes[1], &bytes[2],
-                                &bytes[3], &bytes[4], &bytes[5]) != 6) {
-        err = -1;
-    }
-    if (err == 0) {
-        for (int i = 0; i < 6; ++i) {
-            macAddr[i] = static_cast<UInt8>(bytes[i] & 0xFF);
-        }
-    }
-    return err;
-}
-
-OSStatus MoreSCFCreateStringWithInetAddress(in_addr addr, CFStringRef* result) {
-    return CreateStringWithASCII(inet_ntoa(addr), result);
-}
-
-OSStatus MoreSCFCreateArrayWithInetAddresses(CFIndex count, const in_addr* addresses, CFArrayRef* result) {
-    CFMutableArrayRef array = nullptr;
-    OSStatus err = 0;
-    if (count != 0 && addresses == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = CFQArrayCreateMutable(&array);
-    }
-    for (CFIndex i = 0; err == 0 && i < count; ++i) {
-        CFStringRef text = nullptr;
-        err = MoreSCFCreateStringWithInetAddress(addresses[i], &text);
-        if (err == 0) {
-            CFArrayAppendValue(array, text);
-        }
-        CFQRelease(text);
-    }
-    HandOverOrNull<CFArrayRef>(err, array, result);
-    return err;
-}
-
-OSStatus MoreSCFCopyEncodedPPPPassword(CFStringRef password, CFDataRef* encodedPassword) {
-    OSStatus err = 0;
-    UniChar* units = nullptr;
-    CFDataRef encoded = nullptr;
-    CFIndex count = 0;
-    if (password == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        count = CFStringGetLength(password);
-        if (count > 0) {
-            units = static_cast<UniChar*>(std::malloc(static_cast<std::size_t>(count) * sizeof(UniChar)));
-            if (units == nullptr) {
-                err = memFullErr;
-            }
-        }
-    }
-    if (err == 0) {
-        CFStringGetCharacters(password, CFRangeMake(0, count), units);
-        for (CFIndex i = 0; i < count; ++i) {
-            units[i] = htons(units[i]);
-        }
-        encoded = CFDataCreate(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(units),
-                               count * static_cast<CFIndex>(sizeof(UniChar)));
-        if (encoded == nullptr) {
-            err = coreFoundationUnknownErr;
-        }
-    }
-    std::free(units);
-    HandOverOrNull(err, encoded, encodedPassword);
     return err;
 }
 

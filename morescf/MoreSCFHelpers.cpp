@@ -4,6 +4,7 @@
 
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
+#include "morescf/MoreSCFKeys.h"
 #include "morescf/MoreSCFPortScanner.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
@@ -20,7 +21,7 @@ OSStatus IsSetupConfiguredToUseDHCP(SCDynamicStoreRef store, CFStringRef key, Bo
         err = coreFoundationUnknownErr;
     }
     if (err == 0) {
-        CFStringRef method = GetStringValue(static_cast<CFDictionaryRef>(value), CFSTR("ConfigMethod"));
+        CFStringRef method = GetStringValue(static_cast<CFDictionaryRef>(value), kConfigMethodKey);
         if (method == nullptr) {
             err = kNoConfigMethodErr;
         } else {
@@ -68,10 +69,9 @@ OSStatus CopyDefaultModemPortBSDName(CFStringRef* bsdName) {
         bool found = false;
         for (CFIndex i = 0; !found && i < count; ++i) {
             auto* port = static_cast<CFDictionaryRef>(CFArrayGetValueAtIndex(ports, i));
-            CFStringRef hardware = GetStringValue(port, CFSTR("Hardware"));
-            if (hardware != nullptr && CFEqual(hardware, CFSTR("Modem"))) {
+            if (HasStringValue(port, kHardwareKey, kModemProtocol)) {
                 found = true;
-                *bsdName = static_cast<CFStringRef>(CFQRetain(GetStringValue(port, CFSTR("DeviceName"))));
+                *bsdName = static_cast<CFStringRef>(CFQRetain(GetStringValue(port, kDeviceNameKey)));
             }
         }
     }
@@ -79,12 +79,17 @@ OSStatus CopyDefaultModemPortBSDName(CFStringRef* bsdName) {
     return err;
 }
 
+// Replaces the entity by one made from the digest, or from zeros for none.
+template <class Digest>
 OSStatus SetupEntity(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
-                     const MoreSCDigest* digest) {
-    MoreSCDigest zeros;
+                     Digest MoreSCDigest::*member, const Digest* given) {
+    MoreSCDigest digest;
     CFMutableDictionaryRef entity = nullptr;
-    std::memset(&zeros, 0, sizeof(zeros));
-    OSStatus err = MoreSCCreateEntity(protocol, digest != nullptr ? digest : &zeros, &entity);
+    std::memset(&digest, 0, sizeof(digest));
+    if (given != nullptr) {
+        digest.*member = *given;
+    }
+    OSStatus err = MoreSCCreateEntity(protocol, &digest, &entity);
     if (err == 0) {
         err = MoreSCSetEntity(setID, serviceID, protocol, entity);
     }
@@ -95,23 +100,15 @@ OSStatus SetupEntity(CFStringRef setID, CFStringRef serviceID, CFStringRef proto
 OSStatus SetupModemService(CFStringRef setID, CFStringRef serviceID, const MoreSCModemDigest* modemDigest,
                            const MoreSCPPPDigest* pppDigest, const MoreSCIPv4Digest* ipv4Digest,
                            const MoreSCDNSDigest* dnsDigest) {
-    MoreSCDigest digest;
-    OSStatus err = 0;
-    if (pppDigest != nullptr) {
-        digest.ppp = *pppDigest;
-    }
-    err = SetupEntity(setID, serviceID, CFSTR("PPP"), pppDigest != nullptr ? &digest : nullptr);
+    OSStatus err = SetupEntity(setID, serviceID, kPPPProtocol, &MoreSCDigest::ppp, pppDigest);
     if (err == 0 && modemDigest != nullptr) {
-        digest.modem = *modemDigest;
-        err = SetupEntity(setID, serviceID, CFSTR("Modem"), &digest);
+        err = SetupEntity(setID, serviceID, kModemProtocol, &MoreSCDigest::modem, modemDigest);
     }
     if (err == 0 && ipv4Digest != nullptr) {
-        digest.ipv4 = *ipv4Digest;
-        err = SetupEntity(setID, serviceID, CFSTR("IPv4"), &digest);
+        err = SetupEntity(setID, serviceID, kIPv4Protocol, &MoreSCDigest::ipv4, ipv4Digest);
     }
     if (err == 0 && dnsDigest != nullptr) {
-        digest.dns = *dnsDigest;
-        err = SetupEntity(setID, serviceID, CFSTR("DNS"), &digest);
+        err = SetupEntity(setID, serviceID, kDNSProtocol, &MoreSCDigest::dns, dnsDigest);
     }
     return err;
 }
@@ -119,7 +116,7 @@ OSStatus SetupModemService(CFStringRef setID, CFStringRef serviceID, const MoreS
 OSStatus SetIPv4Active(CFStringRef serviceID, Boolean active) {
     OSStatus err = MoreSCOpen(false, false);
     if (err == 0) {
-        err = MoreSCSetEntityActive(nullptr, serviceID, CFSTR("IPv4"), active);
+        err = MoreSCSetEntityActive(nullptr, serviceID, kIPv4Protocol, active);
     }
     MoreSCClose(&err, true);
     return err;
@@ -142,7 +139,7 @@ OSStatus MoreSCIsAppleTalkActive(CFStringRef setID, Boolean* active) {
             Boolean isEntityActive = false;
             err = MoreSCIsServiceActive(setID, serviceID, &isServiceActive);
             if (err == 0 && isServiceActive) {
-                err = MoreSCIsEntityActive(setID, serviceID, CFSTR("AppleTalk"), &isEntityActive);
+                err = MoreSCIsEntityActive(setID, serviceID, kAppleTalkProtocol, &isEntityActive);
             }
             if (err == 0 && isEntityActive) {
                 *active = true;
@@ -167,9 +164,9 @@ OSStatus MoreSCSetAppleTalkActive(CFStringRef setID, Boolean active) {
             auto* serviceID = static_cast<CFStringRef>(CFArrayGetValueAtIndex(serviceIDs, i));
             Boolean isActive = false;
             // A service without AppleTalk is passed over.
-            if (MoreSCIsEntityActive(setID, serviceID, CFSTR("AppleTalk"), &isActive) == 0 &&
+            if (MoreSCIsEntityActive(setID, serviceID, kAppleTalkProtocol, &isActive) == 0 &&
                 (isActive != 0) != (active != 0)) {
-                err = MoreSCSetEntityActive(setID, serviceID, CFSTR("AppleTalk"), active);
+                err = MoreSCSetEntityActive(setID, serviceID, kAppleTalkProtocol, active);
                 if (err == 0) {
                     madeChanges = true;
                 }

@@ -1,5 +1,6 @@
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
+#include "morescf/MoreSCFKeys.h"
 #include "morescf/MoreSCFPortScanner.h"
 #include "morescf/MoreSCFTree.h"
 #include "morescf/MoreSCFValues.h"
@@ -68,7 +69,7 @@ OSStatus MarkServicesOfSet(CFStringRef setID, CFMutableDictionaryRef marks) {
 OSStatus RemoveUnmarkedServices(CFDictionaryRef marks) {
     SCPreferencesRef session = MoreSCGetSCPreferencesRef();
     CFArrayRef serviceIDs = nullptr;
-    CFTypeRef services = SCPreferencesGetValue(session, CFSTR("NetworkServices"));
+    CFTypeRef services = SCPreferencesGetValue(session, kNetworkServicesKey);
     OSStatus err = MoreSCError(services);
     if (err == 0 && !IsDictionary(services)) {
         err = coreFoundationUnknownErr;
@@ -100,7 +101,7 @@ OSStatus MoreSCCopySetsDict(CFDictionaryRef* setsDict) {
     CFTypeRef dict = nullptr;
     OSStatus err = MoreSCOpen(false, false);
     if (err == 0) {
-        dict = CFQRetain(SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), CFSTR("Sets")));
+        dict = CFQRetain(SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), kSetsKey));
         err = MoreSCError(dict);
     }
     if (err == 0 && !IsDictionary(dict)) {
@@ -117,7 +118,7 @@ OSStatus MoreSCSetSetsDict(CFDictionaryRef setsDict) {
         err = paramErr;
     }
     if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), CFSTR("Sets"), setsDict));
+        err = MoreSCErrorBoolean(SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), kSetsKey, setsDict));
     }
     MoreSCClose(&err, true);
     return err;
@@ -167,10 +168,7 @@ OSStatus MoreSCCopyUserVisibleNameOfSet(CFStringRef setID, CFStringRef* userVisi
         CFDictionaryRef dict = SCPreferencesPathGetValue(MoreSCGetSCPreferencesRef(), setPath);
         err = MoreSCError(dict);
         if (err == 0) {
-            name = static_cast<CFStringRef>(CFQRetain(GetStringValue(dict, CFSTR("UserDefinedName"))));
-            if (name == nullptr) {
-                err = coreFoundationUnknownErr;
-            }
+            err = CopyStringValue(dict, kUserDefinedNameKey, &name);
         }
     }
     CFQRelease(setPath);
@@ -202,8 +200,7 @@ OSStatus MoreSCSetCurrentSet(CFStringRef setID) {
         err = CreateSetPathWithSetID(setID, &setPath);
     }
     if (err == 0) {
-        err = MoreSCErrorBoolean(
-            SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), CFSTR("CurrentSet"), setPath));
+        err = MoreSCErrorBoolean(SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), kCurrentSetKey, setPath));
     }
     CFQRelease(setPath);
     MoreSCClose(&err, true);
@@ -219,16 +216,16 @@ OSStatus MoreSCNewSet(CFStringRef userVisibleName, CFStringRef* newSetID) {
         err = paramErr;
     }
     if (err == 0) {
-        err = MakeNewSeAndCopyIDAndPath(CFSTR("Sets"), &setID, &setPath);
+        err = MakeNewSeAndCopyIDAndPath(kSetsKey, &setID, &setPath);
     }
     if (err == 0) {
         err = MakeEmptySetContent(setID);
     }
     if (err == 0) {
-        err = AddGlobalEntityToSet(setID, CFSTR("IPv4"), &digest);
+        err = AddGlobalEntityToSet(setID, kIPv4Protocol, &digest);
     }
     if (err == 0) {
-        err = AddGlobalEntityToSet(setID, CFSTR("NetInfo"), &digest);
+        err = AddGlobalEntityToSet(setID, kNetInfoProtocol, &digest);
     }
     if (err == 0) {
         err = AddServiceForEachPort(setID);
@@ -249,28 +246,15 @@ OSStatus MoreSCDuplicateSet(CFStringRef setID, CFStringRef newSetUserVisibleName
     CFStringRef oldPath = nullptr;
     CFStringRef newID = nullptr;
     CFStringRef newPath = nullptr;
-    CFPropertyListRef copy = nullptr;
     OSStatus err = MoreSCOpen(false, false);
     if (err == 0) {
         err = CopySetPath(setID, &oldPath);
     }
     if (err == 0) {
-        err = MakeNewSeAndCopyIDAndPath(CFSTR("Sets"), &newID, &newPath);
+        err = MakeNewSeAndCopyIDAndPath(kSetsKey, &newID, &newPath);
     }
     if (err == 0) {
-        CFDictionaryRef dict = SCPreferencesPathGetValue(MoreSCGetSCPreferencesRef(), oldPath);
-        err = MoreSCError(dict);
-        if (err == 0) {
-            copy = CFPropertyListCreateDeepCopy(kCFAllocatorDefault, dict,
-                                                kCFPropertyListMutableContainersAndLeaves);
-            if (copy == nullptr) {
-                err = coreFoundationUnknownErr;
-            }
-        }
-    }
-    if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesPathSetValue(MoreSCGetSCPreferencesRef(), newPath,
-                                                           static_cast<CFDictionaryRef>(copy)));
+        err = PreferencesPathDuplicate(oldPath, newPath);
     }
     if (err == 0) {
         err = DuplicateServicesReferencedBySet(setID, newID);
@@ -283,7 +267,6 @@ OSStatus MoreSCDuplicateSet(CFStringRef setID, CFStringRef newSetUserVisibleName
     }
     CFQRelease(oldPath);
     CFQRelease(newPath);
-    CFQRelease(copy);
     MoreSCClose(&err, true);
     HandOver(err, newID, newSetID);
     return err;
@@ -330,7 +313,7 @@ OSStatus MoreSCRenameSet(CFStringRef setID, CFStringRef userVisibleName) {
         err = CopySetPath(setID, &setPath);
     }
     if (err == 0) {
-        err = PreferencesPathSetProperty(setPath, CFSTR("UserDefinedName"), userVisibleName);
+        err = PreferencesPathSetProperty(setPath, kUserDefinedNameKey, userVisibleName);
     }
     CFQRelease(setPath);
     MoreSCClose(&err, true);

@@ -7,23 +7,11 @@
 
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
+#include "morescf/MoreSCFKeys.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
 namespace {
-
-CFStringRef SetsKey() {
-    return CFSTR("Sets");
-}
-CFStringRef ServicesKey() {
-    return CFSTR("NetworkServices");
-}
-CFStringRef LinkKey() {
-    return CFSTR("__LINK__");
-}
-CFStringRef InactiveKey() {
-    return CFSTR("__INACTIVE__");
-}
 
 // "%@" would turn a null key into text, and a path to nowhere into one to "(null)".
 OSStatus CreatePath(CFStringRef format, CFStringRef first, CFStringRef second, CFStringRef* path) {
@@ -82,11 +70,11 @@ SInt32 LargestNumericKey(CFArrayRef keys) {
 }  // namespace
 
 OSStatus CreateSetPathWithSetID(CFStringRef setID, CFStringRef* setPath) {
-    return CreatePath(CFSTR("/%@/%@"), SetsKey(), setID, setPath);
+    return CreatePath(CFSTR("/%@/%@"), kSetsKey, setID, setPath);
 }
 
 OSStatus CreateServicePathWithServiceID(CFStringRef serviceID, CFStringRef* servicePath) {
-    return CreatePath(CFSTR("/%@/%@"), ServicesKey(), serviceID, servicePath);
+    return CreatePath(CFSTR("/%@/%@"), kNetworkServicesKey, serviceID, servicePath);
 }
 
 OSStatus CopySeIDFromSePath(CFStringRef sePath, CFStringRef* seID) {
@@ -106,7 +94,7 @@ OSStatus CopySeIDFromSePath(CFStringRef sePath, CFStringRef* seID) {
 OSStatus CopySetPath(CFStringRef setID, CFStringRef* setPath) {
     OSStatus err = 0;
     if (setID == nullptr) {
-        CFTypeRef current = SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), CFSTR("CurrentSet"));
+        CFTypeRef current = SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), kCurrentSetKey);
         err = MoreSCError(current);
         if (err == 0 && !IsString(current)) {
             err = coreFoundationUnknownErr;
@@ -129,7 +117,7 @@ OSStatus CopySetGlobalsPath(CFStringRef setID, CFStringRef* path) {
 }
 
 OSStatus CopySetServiceOrderPath(CFStringRef setID, CFStringRef* path) {
-    return CopyPathInSet(setID, CFSTR("%@/Network/Global/%@"), CFSTR("IPv4"), path);
+    return CopyPathInSet(setID, CFSTR("%@/Network/Global/%@"), kIPv4Protocol, path);
 }
 
 OSStatus CopyResolvedServicePath(CFStringRef setID, CFStringRef serviceID, CFStringRef* servicePath) {
@@ -181,6 +169,26 @@ OSStatus PreferencesPathSetProperty(CFStringRef path, CFStringRef key, CFPropert
     return err;
 }
 
+OSStatus PreferencesPathDuplicate(CFStringRef path, CFStringRef newPath) {
+    SCPreferencesRef session = MoreSCGetSCPreferencesRef();
+    CFPropertyListRef copy = nullptr;
+    CFDictionaryRef dict = SCPreferencesPathGetValue(session, path);
+    OSStatus err = MoreSCError(dict);
+    if (err == 0) {
+        copy = CFPropertyListCreateDeepCopy(kCFAllocatorDefault, dict,
+                                            kCFPropertyListMutableContainersAndLeaves);
+        if (copy == nullptr) {
+            err = coreFoundationUnknownErr;
+        }
+    }
+    if (err == 0) {
+        err = MoreSCErrorBoolean(
+            SCPreferencesPathSetValue(session, newPath, static_cast<CFDictionaryRef>(copy)));
+    }
+    CFQRelease(copy);
+    return err;
+}
+
 CFStringRef MySCPreferencesPathCreateUniqueChild(SCPreferencesRef session, CFStringRef prefix) {
     CFMutableDictionaryRef none = nullptr;
     CFArrayRef keys = nullptr;
@@ -197,7 +205,7 @@ CFStringRef MySCPreferencesPathCreateUniqueChild(SCPreferencesRef session, CFStr
     if (scErr == kSCStatusOK && !IsDictionary(parent)) {
         scErr = kSCStatusNoKey;
     }
-    if (scErr == kSCStatusOK && CFDictionaryContainsKey(parent, LinkKey())) {
+    if (scErr == kSCStatusOK && CFDictionaryContainsKey(parent, kLinkKey)) {
         scErr = kSCStatusFailed;
     }
     if (scErr == kSCStatusOK && CFQArrayCreateWithDictionaryKeys(parent, &keys) != 0) {
@@ -256,7 +264,7 @@ OSStatus AddServiceLinkToDict(CFStringRef serviceID, CFMutableDictionaryRef serv
         err = CFQDictionaryCreateMutable(&link);
     }
     if (err == 0) {
-        CFDictionarySetValue(link, LinkKey(), servicePath);
+        CFDictionarySetValue(link, kLinkKey, servicePath);
         CFDictionaryAddValue(servicesDict, serviceID, link);
     }
     CFQRelease(servicePath);
@@ -265,16 +273,16 @@ OSStatus AddServiceLinkToDict(CFStringRef serviceID, CFMutableDictionaryRef serv
 }
 
 Boolean IsDictionaryActive(CFDictionaryRef dict) {
-    return !CFDictionaryContainsKey(dict, InactiveKey());
+    return !CFDictionaryContainsKey(dict, kInactiveKey);
 }
 
 OSStatus SetDictionaryActive(CFMutableDictionaryRef dict, Boolean active, Boolean* changed) {
     OSStatus err = 0;
     if ((active != 0) != (IsDictionaryActive(dict) != 0)) {
         if (active) {
-            CFDictionaryRemoveValue(dict, InactiveKey());
+            CFDictionaryRemoveValue(dict, kInactiveKey);
         } else {
-            err = CFQDictionarySetNumber(dict, InactiveKey(), 1);
+            err = CFQDictionarySetNumber(dict, kInactiveKey, 1);
         }
         if (err == 0 && changed != nullptr) {
             *changed = true;

@@ -32,6 +32,9 @@ OSStatus CopyEntityPath(CFStringRef setID, CFStringRef serviceID, CFStringRef pr
 // Sets one key of the dictionary at the path, which must be there.
 OSStatus PreferencesPathSetProperty(CFStringRef path, CFStringRef key, CFPropertyListRef value);
 
+// Stores a deep, mutable copy of the dictionary at the path under the other one.
+OSStatus PreferencesPathDuplicate(CFStringRef path, CFStringRef newPath);
+
 // An empty dictionary under a new key below the path: the largest key that is a decimal number, and one. Null
 // on failure: a store's status that SCError still has, or, when that is 0, a parent that is a link or has no
 // number left.
@@ -59,6 +62,8 @@ OSStatus DuplicateServicesReferencedBySet(CFStringRef setID, CFStringRef newSetI
 OSStatus DeleteUnreferencedServices();
 
 // Of the services:
+// Links the shared service in the location, last in its order.
+OSStatus AddServiceToSet(CFStringRef setID, CFStringRef serviceID);
 // A copy of the shared service under a new ID; no location knows it yet. The output must come in as null, and
 // is null on failure.
 OSStatus DuplicateService(CFStringRef serviceID, CFStringRef* newServiceID);

@@ -3,6 +3,7 @@
 
 #include "morecfq/MoreCFQ.h"
 #include "platform/CoreFoundation.h"
+#include "platform/CoreServices.h"
 
 inline bool IsString(CFTypeRef value) {
     return value != nullptr && CFGetTypeID(value) == CFStringGetTypeID();
@@ -22,6 +23,17 @@ inline CFStringRef GetStringValue(CFDictionaryRef dict, CFStringRef key) {
 inline CFArrayRef GetArrayValue(CFDictionaryRef dict, CFStringRef key) {
     CFTypeRef value = CFDictionaryGetValue(dict, key);
     return IsArray(value) ? static_cast<CFArrayRef>(value) : nullptr;
+}
+
+// The string under the key as a new reference; -4960 when there is none.
+inline OSStatus CopyStringValue(CFDictionaryRef dict, CFStringRef key, CFStringRef* value) {
+    *value = static_cast<CFStringRef>(CFQRetain(GetStringValue(dict, key)));
+    return *value != nullptr ? 0 : coreFoundationUnknownErr;
+}
+// Whether that very string is under the key.
+inline bool HasStringValue(CFDictionaryRef dict, CFStringRef key, CFStringRef wanted) {
+    CFStringRef value = GetStringValue(dict, key);
+    return value != nullptr && CFEqual(value, wanted);
 }
 
 // Hands a reference to the caller on success, when it is wanted; else gives it back.
