@@ -21,7 +21,7 @@ inline constexpr OSStatus kCFQPathNotDictionaryErr = 5401;
 
 // Takes one reference and returns the value; null is returned as it is.
 CFTypeRef CFQRetain(CFTypeRef value);
-// Gives one reference back; null is passed over, so that clean-up needs no questions.
+// Gives one reference back; null is ignored, so that clean-up needs no questions.
 void CFQRelease(CFTypeRef value);
 
 // --- Creation ---

@@ -31,27 +31,25 @@
 //
 // Conventions for all operations:
 // - They return a status, 0 for success.
-// - Outputs come last and are written only on success, unless told otherwise. Set them to null beforehand and
+// - Outputs come last and are written only on success, unless said otherwise. Set them to null beforehand and
 //   release them with CFQRelease in any case; each is a reference of the caller's own. Outputs called
 //   optional may be null pointers, the others may not.
 // - A null set ID means the current location, a null service ID the location's global entities, except where
-//   null is told to be -50.
-// - An operation that writes gives back the status of the commit and of the apply when it is the
-//   outermost one; "store's status" stands for any of the store's values (SystemConfiguration.h), among them
-//   1003 without the rights, 1004 for a value that is not there, 1001 for a value of the wrong type or a
-//   reason unknown.
-// - -50: a null argument, or as told. -108: no memory for a list of this library's own; any other lack of
-//   memory ends the process (CoreFoundation.h). -4960: a value cannot be made, or one that is expected in the
-//   tree is missing or has the wrong type (a name that is no string counts as missing).
+//   -50 is named for it.
+// - An operation that writes gives back the status of the commit and of the apply when it is the outermost
+//   one; "store's status" is any of the store's values (SystemConfiguration.h), among them 1003 without the
+//   rights, 1004 for a value that is not there, 1001 for a value of the wrong type or a reason unknown.
+// - -50: a null argument, or as described. -108: no memory for a list of this library's own; any other lack
+//   of memory ends the process (CoreFoundation.h). -4960: a value cannot be made, or one that is expected in
+//   the tree is missing or has the wrong type (a name that is no string counts as missing).
 // - A location without a readable "ServiceOrder" fails whatever has to know its services: listing, adding,
 //   duplicating and deleting them, and duplicating it. So does an entry of the order without a link that
 //   leads somewhere, wherever the resolved IDs are needed. Removing the services that no location lists needs
 //   those of every location, so that one such location fails every MoreSCDeleteSet and MoreSCDeleteService,
 //   after what they do besides.
 // - What an operation undoes after a failure it undoes in the session's tree, before anything is committed.
-// The
-//   services that it made are removed with those that no location lists; where that fails as told above, they
-//   stay in "NetworkServices", listed by nobody, until a removal succeeds.
+//   The services that it made are removed with those that no location lists; where that fails as described
+//   above, they stay in "NetworkServices", listed by nobody, until a removal succeeds.
 #pragma once
 
 #include "platform/CoreFoundation.h"

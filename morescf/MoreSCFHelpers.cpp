@@ -163,7 +163,7 @@ OSStatus MoreSCSetAppleTalkActive(CFStringRef setID, Boolean active) {
         for (CFIndex i = 0; err == 0 && i < count; ++i) {
             auto* serviceID = static_cast<CFStringRef>(CFArrayGetValueAtIndex(serviceIDs, i));
             Boolean isActive = false;
-            // A service without AppleTalk is passed over.
+            // A service without AppleTalk is skipped.
             if (MoreSCIsEntityActive(setID, serviceID, kAppleTalkProtocol, &isActive) == 0 &&
                 (isActive != 0) != (active != 0)) {
                 err = MoreSCSetEntityActive(setID, serviceID, kAppleTalkProtocol, active);

@@ -1,7 +1,7 @@
 // Paths into the preferences tree, new keys in it, and the steps that locations, services and entities share.
 //
 // Everything here works inside a session that is open, and neither opens nor closes one. Outputs are new
-// references, written only on success unless told otherwise. Null IDs are -50 where null has no meaning.
+// references, written only on success unless said otherwise. Null IDs are -50 where null has no meaning.
 #pragma once
 
 #include "morescf/MoreSCFDigest.h"

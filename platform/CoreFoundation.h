@@ -3,7 +3,7 @@
 // Every value is reference-counted. A function whose name contains Create or Copy hands its caller one
 // reference, to be given back with CFRelease; a function whose name contains Get hands out a borrowed value
 // that lives as long as the value it was taken from holds it. Containers retain what is put into them. Retain
-// counts are atomic; everything else is for one thread at a time. Null stands for "no value" only where a
+// counts are atomic; everything else is for one thread at a time. Null means "no value" only where a
 // function says so.
 //
 // Lack of memory ends the process: no operation of any face reports it or throws, and no list, copy or walk
@@ -197,7 +197,7 @@ CFTypeID CFDateGetTypeID() noexcept;
 // --- Dictionaries and arrays ---
 
 // How a container treats what it holds. The only callbacks are the ones below (retain, release, compare by
-// content); for the values of a dictionary null stands for values that are not looked at, not even to retain
+// content); for the values of a dictionary null means values that are not looked at, not even to retain
 // them.
 struct CFDictionaryKeyCallBacks;
 struct CFDictionaryValueCallBacks;

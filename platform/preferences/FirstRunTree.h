@@ -7,7 +7,7 @@
 namespace platform::preferences {
 
 // One location, "0", named "Automatic" and current, with its IPv4 and NetInfo globals and one service, "0",
-// named "Managed by the system", whose interface "*" stands for every interface that is left to the system.
+// named "Managed by the system", whose interface "*" means every interface that is left to the system.
 // Frozen.
 [[nodiscard]] values::Owned<CFDictionaryRef> makeFirstRunTree();
 

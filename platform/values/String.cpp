@@ -25,7 +25,7 @@ const OpaqueCFString* OpaqueCFString::create(std::string_view text, TextTraits t
 std::uint32_t OpaqueCFString::hash() const noexcept {
     std::uint32_t hash = hash_.load(std::memory_order_relaxed);
     if (hash == 0) {
-        // 0 stands for a hash that nobody has asked for yet.
+        // 0 means a hash that nobody has asked for yet.
         hash = std::max(hashOf(text()), 1U);
         hash_.store(hash, std::memory_order_relaxed);
     }
