@@ -1,4 +1,5 @@
 // Every operation on locations, services and entities: what it returns, and the tree after it.
+#include "morescf/MoreSCFHelpers.h"
 #include "tests/unit/morescf/Fixture.h"
 
 namespace morescf_test {
@@ -16,6 +17,14 @@ constexpr const char* smallTree = "{Sets = {1 = {}}; CurrentSet = /Sets/1}";
 constexpr const char* noOrder =
     "{Sets = {1 = {Network = {Service = {}; Global = {IPv4 = {}}}}}; NetworkServices = {5 = {}; 7 = {}}; "
     "CurrentSet = /Sets/1}";
+// Service 5 is off and so is its AppleTalk; 6 has it on, 7 has none.
+constexpr const char* appleTalk =
+    "{Sets = {1 = {Network = {Service = {5 = {__LINK__ = /NetworkServices/5}; 6 = {__LINK__ = "
+    "/NetworkServices/6}; 7 "
+    "= {__LINK__ = /NetworkServices/7}}; Global = {IPv4 = {ServiceOrder = (5, 6, 7)}}}}}; NetworkServices = "
+    "{5 = "
+    "{__INACTIVE__ = #1; AppleTalk = {__INACTIVE__ = #1}}; 6 = {AppleTalk = {}}; 7 = {}}; CurrentSet = "
+    "/Sets/1}";
 constexpr const char* lostService =
     "{Sets = {1 = {Network = {Service = {5 = {__LINK__ = /NetworkServices/5}; 4 = {__LINK__ = "
     "/NetworkServices/4}"
@@ -42,8 +51,9 @@ std::string edited(std::string text, std::string_view edits) {
 TEST_F(OperationsTest, ChangeTheTreeAndMarkTheSession) {
     const Str s5("5"), s1("1");
     const Value values[] = {read("{8 = {__LINK__ = /x}}"), read("{a = b}"), read("(8)"), read("()"),
-                            read("(IPv6, DNS, DNS, UserDefinedName)"), read("({}, {a = b}, {}, {})")};
-    CFDictionaryRef links = dictionary(values[0]), ab = dictionary(values[1]);
+                            read("(IPv6, DNS, DNS, UserDefinedName)"), read("({}, {a = b}, {}, {})"),
+                            read("{UserDefinedName = typeless; DeviceName = eth0; Hardware = Ethernet}")};
+    CFDictionaryRef links = dictionary(values[0]), ab = dictionary(values[1]), port = dictionary(values[6]);
     CFArrayRef order = array(values[2]), none = array(values[3]), names = array(values[4]), four = array(values[5]);
     enum Mark { marked, unmarked };
     const struct { const char* tree; const char* call; std::function<OSStatus()> run; OSStatus err; Mark mark; const char* edits; } rows[] = {
@@ -84,6 +94,8 @@ TEST_F(OperationsTest, ChangeTheTreeAndMarkTheSession) {
         {oneSet, CHANGES(MoreSCDuplicateService(nullptr, Str("9"), nullptr, nullptr)), 1004, unmarked, SWEPT},
         {oneSet, CHANGES(MoreSCDuplicateService(nullptr, nullptr, nullptr, nullptr)), -50, unmarked, ""},
         {noOrder, CHANGES(MoreSCDuplicateService(nullptr, s5, nullptr, nullptr)), -4960, unmarked, "7 = {} -> 7 = {}; 8 = {}"},
+        {oneSet, CHANGES(MoreSCNewService(nullptr, ab, nullptr)), -50, marked, SWEPT},
+        {oneSet, CHANGES(MoreSCNewService(nullptr, port, nullptr)), -50, marked, SWEPT},
         {oneSet, CHANGES(MoreSCDeleteService(nullptr, s5)), 0, marked,
          "5 = {UserDefinedName = Wired; __INACTIVE__ = #1; IPv4 = {ConfigMethod = DHCP}; DNS = {}} ->  | "
          "4 = {}; ; 7 = {} ->  | 5 = {__LINK__ = /NetworkServices/5}; 4 -> 4 | (5) -> ()"},
@@ -111,6 +123,9 @@ TEST_F(OperationsTest, ChangeTheTreeAndMarkTheSession) {
         {oneSet, CHANGES(MoreSCSetEntityActive(s1, s5, CFSTR("DNS"), false)), 0, marked, "DNS = {} -> DNS = {__INACTIVE__ = #1}"},
         {oneSet, CHANGES(MoreSCSetEntityActive(s1, s5, CFSTR("DNS"), true)), 0, unmarked, ""},
         {oneSet, CHANGES(MoreSCSetEntityActive(s1, s5, CFSTR("New"), true)), 1004, unmarked, ""},
+        {appleTalk, CHANGES(MoreSCSetAppleTalkActive(nullptr, true)), 0, marked, "{__INACTIVE__ = #1} -> {}"},
+        {appleTalk, CHANGES(MoreSCSetAppleTalkActive(s1, false)), 0, marked, "AppleTalk = {}} -> AppleTalk = {__INACTIVE__ = #1}}"},
+        {oneSet, CHANGES(MoreSCSetAppleTalkActive(nullptr, true)), 0, unmarked, ""},
     };
     // clang-format on
     for (const auto& row : rows) {
@@ -182,6 +197,7 @@ TEST_F(OperationsTest, Read) {
     setTree(twoSets);
     arrays("(1, 2) untouched", READ(MoreSCCopySetIDs(out, &index)));
     EXPECT_EQ(0, index);
+    arrays("1004 untouched untouched", READ(MoreSCCopyServiceIDs(s9, out, two)));
     arrays("(60) (6)", READ(MoreSCCopyServiceIDs(s2, out, two)));
     string("ttyS0 untouched", READ(MoreSCCopyBSDNameOfService(s2, s60, out)));
     setTree("{Sets = {1 = {}}; CurrentSet = /Sets/9}");

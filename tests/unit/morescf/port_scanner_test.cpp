@@ -159,12 +159,12 @@ TEST(PortScanner, DescribesAndNamesEthernet) {
               scan({{{kCard, "{IOMACAddress = <000a959d6816>; IOProviderClass = IOPCIDevice}", pci}}}));
     EXPECT_EQ(ethernet("; AAPL,slot-name = 3; IOChildIndex = 2", "PCI Ethernet Slot 3, Port 2", 6),
               scan({{{kCard, kPCI, "{name = <7063>; AAPL,slot-name = <534c4f542d33>; IOChildIndex = #1}"}}}));
-    // Neither seven bytes nor a name of zero bytes is what it should be; without a slot's name it is unknown.
+    // Seven bytes are no address, zero bytes no name; a slot without one is unknown.
     EXPECT_EQ(ethernet("; AAPL,slot-name = unknown", "PCI Ethernet Slot unknown", 6),
               scan({{{kCard, "{IOMACAddress = <000a959d681677>; IOProviderClass = IOPCIDevice}",
                       "{name = <0000>}"}}}));
-    EXPECT_EQ(ethernet("; AAPL,slot-name = J9", "PCI Ethernet Slot J9", 6),
-              scan({{{kCard, kPCI, "{name = <00>; AAPL,slot-name = <4a39>}"}}}));
+    EXPECT_EQ(ethernet("; AAPL,slot-name = ", "PCI Ethernet Slot ", 6),
+              scan({{{kCard, kPCI, "{name = <00>; AAPL,slot-name = <0000>}"}}}));
     EXPECT_EQ(ethernet("", "Wireless Network Adaptor", 8),
               scan({{{kCard, kPCI, "{name = <726164696f0000>}"}}}));
     EXPECT_EQ(ethernet("; BSD Name = en1", "Ethernet Adaptor (en1)", 9),
