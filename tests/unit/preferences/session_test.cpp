@@ -25,6 +25,11 @@ TEST_F(SessionTest, AnUnchangedTreeIsNotWrittenAgain) {
     EXPECT_TRUE(commit(session));
     EXPECT_EQ(statusOf(file).st_ino, inode);
     EXPECT_EQ(contentOf(file), smallTree);
+    // Nor is what this process wrote read again.
+    ASSERT_TRUE(set(session, "/Sets/2", "two") && commit(session));
+    SessionRef next = open();
+    EXPECT_EQ(SCPreferencesPathGetValue(next.get(), CFSTR("/")),
+              SCPreferencesPathGetValue(session.get(), CFSTR("/")));
 }
 
 TEST_F(SessionTest, AFileThatSomebodyElseChangedIsNotOverwritten) {
@@ -82,8 +87,8 @@ TEST_F(SessionTest, TheLockKeepsOthersOut) {
     EXPECT_EQ(testing_support::Child(tryAsOther).wait(), 0);
     EXPECT_EQ(tryAsOther(), 0) << "another session of the same process";
     ASSERT_TRUE(set(session, "/Sets/3", "three") && commit(session));
-    EXPECT_TRUE(SCPreferencesLock(session.get(), 0)) << "twice, though the file is another one now";
     EXPECT_EQ(testing_support::Child(tryAsOther).wait(), 0) << "a commit keeps the lock";
+    EXPECT_TRUE(SCPreferencesLock(session.get(), 0)) << "twice";
     session = {};
     session = open();
     EXPECT_TRUE(SCPreferencesLock(session.get(), 0)) << "the lock ended with the session";

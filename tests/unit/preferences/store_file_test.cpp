@@ -90,6 +90,14 @@ TEST_F(StoreFileTest, WhatOthersCanChangeIsNotUsed) {
         bool opens;
         const char* reason;
     } rows[] = {
+        // Only root can give a folder away; others see to it that somebody else may write to it.
+        {"a folder of somebody else",
+         [this] {
+             if (chown(store.c_str(), 65534, 65534) != 0) {
+                 ASSERT_EQ(chmod(store.c_str(), 0722), 0);
+             }
+         },
+         false, "somebody else"},
         {"a folder that the group may write to", [this] { ASSERT_EQ(chmod(store.c_str(), 0770), 0); }, false,
          "others may write"},
         {"a folder that everybody may write to", [this] { ASSERT_EQ(chmod(store.c_str(), 0702), 0); }, false,
