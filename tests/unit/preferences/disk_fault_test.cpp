@@ -138,6 +138,7 @@ TEST_F(DiskFaultTest, AfterAnyFailingStepTheFileIsTheOldOneOrTheNewOne) {
                 if (!done) {
                     EXPECT_EQ(SCError(), error == EROFS ? 1003 : 1001);
                     EXPECT_FALSE(log.empty());
+                    EXPECT_FALSE(leftovers());
                     EXPECT_EQ(nameAt(session, "/Sets/1"), "new");
                     const std::string onDisk = nameAt(open(), "/Sets/1");
                     EXPECT_TRUE(onDisk == "new" || onDisk == (withStore ? "one" : "-")) << onDisk;

@@ -25,6 +25,7 @@ TEST(Number, TellsALossyReading) {
         {makeReal(-3), true, -3, true, -3},
         {makeReal(2.75), false, 2, false, 2},
         {makeReal(9223372036854775808.0), false, most32, false, most},
+        {makeReal(-9223372036854775808.0), false, -most32 - 1, true, -most - 1},
         {makeReal(std::nan("")), false, 0, false, 0},
     };
     for (const Row& row : rows) {
