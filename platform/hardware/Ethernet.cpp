@@ -166,7 +166,8 @@ void numberPorts(std::vector<Port>& ports) {
 // Firmware text goes into a name that the user sees, and is decoded as Mac OS Roman: ASCII reads the same in
 // every encoding.
 bool isLabel(std::string_view text) {
-    return isDeviceText(text) && std::all_of(text.begin(), text.end(), [](char c) { return static_cast<unsigned char>(c) < 0x80; });
+    return isDeviceText(text) &&
+           std::all_of(text.begin(), text.end(), [](char c) { return static_cast<unsigned char>(c) < 0x80; });
 }
 
 // The address that each slot is at, by the firmware's label for it.
