@@ -74,9 +74,12 @@ Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path)
 // 1003, 1001 (among other reasons when the tree holds a string that XML cannot carry). The session keeps its
 // changes then.
 Boolean SCPreferencesCommitChanges(SCPreferencesRef session) noexcept;
-// Makes the current location, as it is committed now, the active configuration and returns when its
-// interfaces are up, have failed, or a bounded wait is over. False: 1001 with the reason in the system log,
-// 1003, 1004 when "CurrentSet" names no location.
+// Makes the current location, as it is committed now, the active configuration, and returns when nothing more
+// can be expected of its interfaces or after a bounded wait. A commit of this session that left the location's
+// settings as they were changes nothing; one that changed nothing at all asks for just that: every interface is
+// looked at. Without a commit in this session only what an earlier apply left undone is finished. False: 1001
+// when this machine refused, with the reason in the system log; 1003. What a network, a cable or a key does is
+// a line in the log, and a success.
 Boolean SCPreferencesApplyChanges(SCPreferencesRef session);
 
 // --- Dynamic store: the live network state ---

@@ -16,7 +16,7 @@ class GoingCard final : public Card {
         : Card(daemon, task, deadline), plan_(*task.plan), earlier_(std::move(earlier)) {}
 
   private:
-    enum class Stage { begin, comeToRest, becomeReady, chooseLink, store, comeUp, tellFailure };
+    enum class Stage { begin, comeToRest, becomeReady, chooseLink, leaveOther, store, comeUp, tellFailure };
 
     Outcome advance() override {
         switch (stage_) {
@@ -28,6 +28,8 @@ class GoingCard final : public Card {
                 return becomeReady();
             case Stage::chooseLink:
                 return chooseLink();
+            case Stage::leaveOther:
+                return leaveOther();
             case Stage::store:
                 return store();
             case Stage::comeUp:
@@ -169,6 +171,26 @@ class GoingCard final : public Card {
         }
         link_->choice = *decision.choice;
         stage_ = Stage::store;
+        if (!link_->choice->isHeard && isReady_ && active_ && !isOurProfileActive()) {
+            stage_ = Stage::leaveOther;
+            return daemon_.disconnect(device_);
+        }
+        return {};
+    }
+
+    [[nodiscard]] bool isOurProfileActive() const { return active_->uuid == profileUUID(interface_); }
+
+    // A network that is not on the air may have to be waited for. The daemon turns to none of its own accord
+    // from which it was told to disconnect.
+    Outcome leaveOther() {
+        std::uint32_t state = 0;
+        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
+        if (state > deviceDisconnected && !isLate()) {
+            waitUntil(deadline_);
+            return {};
+        }
+        active_.reset();
+        stage_ = Stage::store;
         return {};
     }
 
@@ -202,6 +224,7 @@ class GoingCard final : public Card {
         }
         if (isChanged || !active_ || active_->profile != path) {
             active_.emplace().profile = path;
+            active_->uuid = profileUUID(interface_);
             RETURN_IF_FAILED(daemon_.activate(path, device_, active_->path));
         }
         stage_ = Stage::comeUp;
@@ -251,8 +274,22 @@ class GoingCard final : public Card {
             settle("no DHCP server answered; NetworkManager goes on asking");
         } else {
             settle(reason_.empty() ? "it was not up in time" : reason_);
+            if (link_ && link_->choice && !link_->choice->isHeard) {
+                return leaveToTheDaemon();
+            }
         }
         return {};
+    }
+
+    // The daemon joins a network by itself when it comes on the air, unless it has tried it in vain: so it
+    // gets the profile anew.
+    Outcome leaveToTheDaemon() {
+        RETURN_IF_FAILED(daemon_.disconnect(device_));
+        RETURN_IF_FAILED(removeProfile());
+        std::string path;
+        RETURN_IF_FAILED(daemon_.addProfile(makeProfile(plan_, &link_.value(), earlier_.note), Adding::atOnce,
+                                            key().value_or(""), path));
+        return daemon_.setAutoconnect(device_, true);
     }
 
     Outcome tellFailure() {

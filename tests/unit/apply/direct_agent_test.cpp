@@ -15,6 +15,7 @@
 #include "platform/apply/Agents.h"
 #include "platform/apply/Apply.h"
 #include "platform/apply/StateFile.h"
+#include "platform/apply/direct/Lease.h"
 #include "platform/apply/direct/NameServers.h"
 #include "platform/apply/direct/Supplicant.h"
 #include "tests/unit/apply/StandInSupplicant.h"
@@ -391,16 +392,77 @@ TEST_F(DirectAgentTest, TakesALeaseAndGivesItBack) {
     });
 }
 
+TEST_F(DirectAgentTest, RenewsALeaseWithOtherValues) {
+    run([] {
+        shell("ip link set card0 up; echo nameserver 9.9.9.9 > /etc/resolv.conf");
+        const std::string before = machineState();
+        const DhcpSettings settings{"card0", 0, "", false, {"own.example"}};
+        const struct {
+            Lease lease;
+            const char* addresses;
+            const char* routes;
+            const char* servers;
+        } rows[] = {
+            {{{address(10, 50, 0, 10), 24}, address(10, 50, 0, 1), {{address(10, 50, 0, 53)}, {"x"}}, 600},
+             "10.50.0.10/24 \n",
+             "default via 10.50.0.1 dev card0 proto 76 \n",
+             "search own.example\nnameserver 10.50.0.53\n"},
+            {{{address(10, 50, 0, 10), 24}, address(10, 50, 0, 2), {{address(10, 50, 0, 54)}, {}}, 600},
+             "10.50.0.10/24 \n",
+             "default via 10.50.0.2 dev card0 proto 76 \n",
+             "search own.example\nnameserver 10.50.0.54\n"},
+            {{{address(10, 51, 0, 7), 16}, 0, {}, forever}, "10.51.0.7/16 \n", "", "search own.example\n"},
+        };
+        for (const auto& row : rows) {
+            expectOk(takeLease(settings, row.lease));
+            EXPECT_EQ(row.addresses, addressesOf("card0"));
+            EXPECT_EQ(row.routes, defaultRoutes());
+            EXPECT_EQ(row.servers, shell("grep -v '^#' /etc/resolv.conf"));
+        }
+        expectOk(dropLease(settings));
+        EXPECT_EQ(before, machineState());
+    });
+}
+
+TEST_F(DirectAgentTest, LooksAtTheMachineWhenALocationIsMadeCurrentAgain) {
+    for (const char* const trouble :
+         {"ip addr flush dev card0", "ip link set card0 down", "ip route flush dev card0 table all",
+          "ip addr add 10.9.9.9/8 dev card0", "ip link set card1 up; ip addr add 10.8.8.8/8 dev card1"}) {
+        SCOPED_TRACE(trouble);
+        run([trouble] {
+            const auto there = makeTree({{"card1", switchedOff}, fixedService("card0")});
+            expectOk(activate(there.get()));
+            const std::string made = machineState();
+            shell(trouble);
+            ASSERT_NE(made, machineState());
+            expectOk(activate(there.get()));
+            EXPECT_EQ(made, machineState());
+        });
+    }
+}
+
+// What cannot be replaced is written in place, and a run may be ended in the middle of that.
 TEST_F(DirectAgentTest, WritesANameServersFileThatIsAMountInPlace) {
     run([] {
         shell(
-            "echo nameserver 9.9.9.9 > /run/outer; chmod 640 /run/outer; touch /etc/resolv.conf;"
+            "printf 'nameserver 9.9.9.9\noptions edns0\n' > /run/outer; chmod 640 /run/outer; touch "
+            "/etc/resolv.conf;"
             "mount --bind /run/outer /etc/resolv.conf");
         const std::string before = machineState();
         std::string trouble;
+        for (const char* const ended : {"true", "truncate -s 0 /run/outer", "truncate -s 9 /run/outer"}) {
+            SCOPED_TRACE(ended);
+            expectOk(setInterfaceNameServers("card0", 0, {{address(10, 0, 0, 53)}, {}}, trouble));
+            EXPECT_EQ("nameserver 10.0.0.53\n", shell("grep -v '^#' /run/outer"));
+            shell(ended);
+            expectOk(setInterfaceNameServers("card0", 0, {}, trouble));
+            EXPECT_EQ(before, machineState());
+        }
+        shell("mount -o remount,bind,ro /etc/resolv.conf");
         expectOk(setInterfaceNameServers("card0", 0, {{address(10, 0, 0, 53)}, {}}, trouble));
-        EXPECT_EQ("nameserver 10.0.0.53\n", shell("grep -v '^#' /run/outer"));
+        EXPECT_NE("", trouble) << "the addresses stand without it";
         expectOk(setInterfaceNameServers("card0", 0, {}, trouble));
+        EXPECT_EQ("", trouble);
         EXPECT_EQ(before, machineState());
     });
 }
