@@ -101,8 +101,7 @@ class Transfer {
 
     // The HTTP status, or nothing with the status of the download and the reason.
     std::optional<long> run(const std::string& url, OSStatus& failure, std::string& reason) {
-        std::array<char, CURL_ERROR_SIZE> text{};
-        CURLcode result = prepare(url, text.data());
+        CURLcode result = prepare(url);
         if (result != CURLE_OK) {
             failure = kURLClientError;
         } else {
@@ -113,9 +112,9 @@ class Transfer {
             }
             failure = statusFor(result);
         }
-        reason = isTooLarge_       ? "the answer is too large"
-                 : text[0] != '\0' ? text.data()
-                                   : curl_.textOf(result);
+        reason = isTooLarge_        ? "the answer is too large"
+                 : text_[0] != '\0' ? text_.data()
+                                    : curl_.textOf(result);
         return std::nullopt;
     }
 
@@ -126,9 +125,9 @@ class Transfer {
             result = curl_.setOption(easy_.get(), option, value);
         }
     }
-    CURLcode prepare(const std::string& url, char* reason) {
+    CURLcode prepare(const std::string& url) {
         CURLcode result = easy_ ? CURLE_OK : CURLE_OUT_OF_MEMORY;
-        set(result, CURLOPT_ERRORBUFFER, reason);
+        set(result, CURLOPT_ERRORBUFFER, text_.data());
         set(result, CURLOPT_URL, url.c_str());
         set(result, CURLOPT_PROTOCOLS_STR, "http");
         set(result, CURLOPT_USERAGENT, "location-assistant");
@@ -200,6 +199,8 @@ class Transfer {
     const Curl& curl_;
     const DownloadBounds& bounds_;
     std::string& body_;
+    // The library may write into it until it is done with.
+    std::array<char, CURL_ERROR_SIZE> text_{};
     std::unique_ptr<CURL, void (*)(CURL*)> easy_;
     std::size_t headerBytes_ = 0;
     bool isTooLarge_ = false;

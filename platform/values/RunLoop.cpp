@@ -72,6 +72,10 @@ struct OpaqueCFRunLoop final : Object {
 
 namespace {
 
+Owned<CFRunLoopRef> makeRunLoop() {
+    return Owned<CFRunLoopRef>::adopt(new OpaqueCFRunLoop);
+}
+
 constinit Immortal<OpaqueCFString> defaultMode(std::string_view("kCFRunLoopDefaultMode"));
 
 bool isDefaultMode(CFStringRef mode) {
@@ -154,7 +158,7 @@ Owned<CFRunLoopSourceRef> platform::values::makeRunLoopSource(int descriptor, sh
 }
 
 CFRunLoopRef CFRunLoopGetCurrent() noexcept {
-    thread_local const auto loop = Owned<CFRunLoopRef>::adopt(new OpaqueCFRunLoop);
+    thread_local const Owned<CFRunLoopRef> loop = makeRunLoop();
     return loop.get();
 }
 

@@ -27,7 +27,7 @@ class Printer(http.server.BaseHTTPRequestHandler):
 
     def answer(self, status, body=b"", **headers):
         self.send_response(status)
-        self.send_header("Content-Length", headers.pop("length", str(len(body))))
+        self.send_header("Content-Length", str(len(body)))
         for name, value in headers.items():
             self.send_header(name, value)
         self.end_headers()
