@@ -202,10 +202,10 @@ Outcome Socket::dumpOnce(Message message, std::vector<OwnedMessage>& answers,
         if (part.type() == NLMSG_ERROR) {
             end = outcomeOfError(part, tolerated, error_);
         } else if (part.type() == NLMSG_DONE) {
-            const int error = -valueFrom<std::int32_t>(part.payload()).value_or(0);
+            error_ = std::max(-valueFrom<std::int32_t>(part.payload()).value_or(0), 0);
             const bool isFine =
-                error <= 0 || std::find(tolerated.begin(), tolerated.end(), error) != tolerated.end();
-            end = isFine ? Outcome() : Outcome::fromErrno("the kernel ended a netlink dump", error);
+                error_ == 0 || std::find(tolerated.begin(), tolerated.end(), error_) != tolerated.end();
+            end = isFine ? Outcome() : Outcome::fromErrno("the kernel ended a netlink dump", error_);
         } else {
             answers.emplace_back(part);
             return false;

@@ -2,6 +2,7 @@
 
 #include <arpa/inet.h>
 #include <linux/if_addr.h>
+#include <linux/neighbour.h>
 #include <net/if.h>
 #include <sys/socket.h>
 
@@ -496,6 +497,27 @@ Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, b
             // A route that other interfaces share is complete only when the last of them is up again, which
             // then adds it.
             done = route.isShared ? Outcome() : added;
+        }
+    }
+    return done;
+}
+
+Outcome Kernel::forgetSilentNeighbours(const Link& link) {
+    ndmsg header{};
+    header.ndm_family = AF_INET;
+    Message message(RTM_GETNEIGH, NLM_F_REQUEST | NLM_F_DUMP, header);
+    message.addValue(NDA_IFINDEX, link.index);
+    std::vector<OwnedMessage> neighbours;
+    Outcome done = socket_.dump(message, neighbours);
+    for (const OwnedMessage& neighbour : neighbours) {
+        const auto found = neighbour.view().family<ndmsg>();
+        const auto address = neighbour.view().attributes<ndmsg>().find(NDA_DST);
+        if (done.ok() && found && address && found->ndm_ifindex == link.index &&
+            (found->ndm_state & (NUD_INCOMPLETE | NUD_FAILED)) != 0) {
+            header.ndm_ifindex = link.index;
+            Message removal(RTM_DELNEIGH, NLM_F_REQUEST | NLM_F_ACK, header);
+            removal.add(NDA_DST, address->payload);
+            done = socket_.request(std::move(removal), {ENOENT});
         }
     }
     return done;

@@ -128,6 +128,10 @@ class Kernel {
     // interface's addresses stay too.
     Outcome makeRoutes(const Link& link, const std::vector<Route>& wanted, bool keepConnected);
 
+    // Forgets the neighbours that have not answered so far. Whoever asks for one in vain keeps the kernel
+    // from asking anew for seconds, also when the interface has got onto its network in between.
+    Outcome forgetSilentNeighbours(const Link& link);
+
   private:
     Outcome dump(std::uint16_t type, int family, std::vector<netlink::OwnedMessage>& messages);
 

@@ -16,6 +16,8 @@ using Clock = std::chrono::steady_clock;
 // After these a notice is taken for lost. A card looks through both bands in 3 to 10 s.
 constexpr std::chrono::seconds longestScan{15};
 constexpr std::chrono::seconds longestJoining{10};
+// The kernel sends nothing until it has taken note of the carrier, up to a second after it is there.
+constexpr std::chrono::seconds longestCarrier{2};
 // Hundredths of a dBm: so good that it need not be compared with what the rest of a scan might find.
 constexpr int goodSignal = -6500;
 // An access point that says no is not asked again at once.
@@ -90,7 +92,7 @@ Outcome KernelJoin::poll(State& state, std::string& reason) {
     // What the kernel refuses, other than for lack of rights, is what this card or network can't do.
     if (!done.ok() && card_.error() != 0 && done.status() != kSCStatusAccessError) {
         phase_ = Phase::givenUp;
-        reason_ = done.reason();
+        reason_ = card_.error() == ENODEV ? "the card is gone" : done.reason();
         done = {};
     }
     state = phase_ == Phase::joined    ? State::joined
@@ -166,13 +168,19 @@ Outcome KernelJoin::join() {
 
 Outcome KernelJoin::checkJoined(std::optional<std::uint16_t> joinStatus) {
     std::optional<ScanEntry> current;
+    bool isRunning = false;
     RETURN_IF_FAILED(card_.readCurrent(current));
-    const bool isThere = current && current->network == network_ && current->bssid == chosen_->bssid;
+    RETURN_IF_FAILED(card_.readRunning(isRunning));
+    const auto elapsed = Clock::now() - since_;
     // A card that joins a cell whose last member has just left forms it anew, and hears nobody then.
-    if (isThere && (!current->isAdHoc || current->age + ageError < Clock::now() - since_)) {
+    const bool isThere = current && current->network == network_ && current->bssid == chosen_->bssid &&
+                         (!current->isAdHoc || current->age + ageError < elapsed);
+    if (isThere && (isRunning || elapsed > longestCarrier)) {
         phase_ = Phase::joined;
         reason_.clear();
-    } else if (joinStatus.value_or(0) != 0 || Clock::now() - since_ > longestJoining) {
+        return card_.forgetSilentNeighbours();
+    }
+    if (joinStatus.value_or(0) != 0 || elapsed > longestJoining) {
         reason_ = joinStatus.value_or(WirelessNotice::noAnswer) == WirelessNotice::noAnswer
                       ? "the network did not answer the card"
                       : "the network did not let the card in (status " + std::to_string(*joinStatus) + ")";

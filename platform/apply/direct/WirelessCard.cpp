@@ -60,24 +60,32 @@ Outcome WirelessCard::readCurrent(std::optional<ScanEntry>& current) {
     return {};
 }
 
+Outcome WirelessCard::readRunning(bool& isRunning) {
+    std::optional<Link> link;
+    RETURN_IF_FAILED(kernel_.findLink(interface_, link));
+    isRunning = link && link->running;
+    return {};
+}
+
 Outcome WirelessCard::setType(std::uint32_t type) {
     WirelessState now;
     RETURN_IF_FAILED(read(now));
-    RETURN_IF_FAILED(kernel_.findLink(interface_, link_));
-    if (now.type == type || !link_) {
+    std::optional<Link> link;
+    RETURN_IF_FAILED(kernel_.findLink(interface_, link));
+    if (now.type == type || !link) {
         return {};
     }
-    if (!link_->up) {
+    if (!link->up) {
         return socket_.request(requests().setType(type));
     }
     // Cards of many makers change only while they are down, and the routes go with the link.
     InterfaceState state;
-    RETURN_IF_FAILED(kernel_.read(*link_, state));
-    RETURN_IF_FAILED(kernel_.setUp(*link_, false));
+    RETURN_IF_FAILED(kernel_.read(*link, state));
+    RETURN_IF_FAILED(kernel_.setUp(*link, false));
     const Outcome changed = socket_.request(requests().setType(type));
-    RETURN_IF_FAILED(kernel_.setUp(*link_, true));
-    RETURN_IF_FAILED(kernel_.makeAddresses(*link_, state.addresses));
-    RETURN_IF_FAILED(kernel_.makeRoutes(*link_, state.routes, true));
+    RETURN_IF_FAILED(kernel_.setUp(*link, true));
+    RETURN_IF_FAILED(kernel_.makeAddresses(*link, state.addresses));
+    RETURN_IF_FAILED(kernel_.makeRoutes(*link, state.routes, true));
     return changed;
 }
 

@@ -41,6 +41,9 @@ class WirelessCard {
     // on.
     Outcome readEntries(std::vector<ScanEntry>& entries);
     Outcome readCurrent(std::optional<ScanEntry>& current);
+    // Whether its link has a carrier that the kernel has taken note of.
+    Outcome readRunning(bool& isRunning);
+    Outcome forgetSilentNeighbours() { return kernel_.forgetSilentNeighbours(*link_); }
 
     // Goes down for a moment to do so, and has its addresses and routes again afterwards.
     Outcome setType(std::uint32_t type);

@@ -218,5 +218,21 @@ TEST_F(KernelWirelessTest, WhatIsNoWirelessCardIsLeftAlone) {
     });
 }
 
+TEST_F(KernelWirelessTest, NeighboursThatDidNotAnswerAreForgotten) {
+    PrivateNetwork::run([] {
+        shell(
+            "ip link add card0 type veth peer name far0; ip link set far0 up; ip link set card0 up;"
+            "ip neigh add 10.1.0.1 dev card0 nud failed; ip neigh add 10.1.0.2 dev far0 nud failed;"
+            "ip neigh add 10.1.0.3 dev card0 lladdr 02:00:00:00:00:03 nud reachable;"
+            "ip neigh add 10.1.0.4 dev card0 nud incomplete");
+        Kernel kernel;
+        std::optional<Link> link;
+        ASSERT_TRUE(kernel.open().ok() && kernel.findLink("card0", link).ok() && link);
+        EXPECT_EQ("", kernel.forgetSilentNeighbours(*link).reason());
+        EXPECT_EQ("10.1.0.2 dev far0 FAILED \n10.1.0.3 dev card0 lladdr 02:00:00:00:00:03 REACHABLE \n",
+                  shell("ip -4 neigh show nud all | sort"));
+    });
+}
+
 }  // namespace
 }  // namespace platform::apply
