@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "platform/live/Routes.h"
+#include "platform/netlink/Link.h"
 #include "platform/netlink/Socket.h"
 
 namespace platform::live {
@@ -61,13 +62,9 @@ Outcome KernelNetworkState::primaryRoute(std::optional<PrimaryRoute>& route) {
     }
     for (const DefaultRoute& candidate : defaultRoutesIn(answers)) {
         // The link may have gone or gone down meanwhile, with the route still to follow it.
-        OwnedMessage answer;
-        done = socket.ask(askForLink(candidate.interfaceIndex), answer, {ENODEV});
-        if (!done.ok()) {
-            return done;
-        }
-        const std::optional<Link> link = linkIn(answer.view());
-        if (link && link->isUp) {
+        std::optional<netlink::Link> link;
+        RETURN_IF_FAILED(netlink::findLink(socket, candidate.interfaceIndex, link));
+        if (link && link->up) {
             route = PrimaryRoute{link->name, candidate.gateway};
             break;
         }

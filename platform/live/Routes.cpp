@@ -1,7 +1,5 @@
 #include "platform/live/Routes.h"
 
-#include <net/if.h>
-
 #include <algorithm>
 
 namespace platform::live {
@@ -54,17 +52,11 @@ std::optional<NextHop> hopIn(const rtmsg& route, const Attributes& attributes) {
     if (const std::optional<Attribute> several = attributes.find(RTA_MULTIPATH)) {
         return workingHopIn(several->payload);
     }
-    const std::optional<Attribute> interface = attributes.find(RTA_OIF);
-    const std::optional<std::uint32_t> index = interface ? interface->u32() : std::nullopt;
+    const std::optional<std::uint32_t> index = attributes.u32(RTA_OIF);
     if (!index || (route.rtm_flags & brokenHop) != 0) {
         return std::nullopt;
     }
     return hopOver(static_cast<int>(*index), attributes);
-}
-
-std::uint32_t tableOf(const rtmsg& route, const Attributes& attributes) {
-    const std::optional<Attribute> table = attributes.find(RTA_TABLE);
-    return table && table->u32() ? *table->u32() : route.rtm_table;
 }
 
 bool refuses(unsigned char type) {
@@ -85,11 +77,10 @@ std::optional<DefaultRoute> defaultRouteIn(const MessageView& message) {
     } else if (!refuses(route->rtm_type)) {
         return std::nullopt;
     }
-    if (!hop || tableOf(*route, attributes) != RT_TABLE_MAIN) {
+    if (!hop || attributes.u32(RTA_TABLE).value_or(route->rtm_table) != RT_TABLE_MAIN) {
         return std::nullopt;
     }
-    const std::optional<Attribute> metric = attributes.find(RTA_PRIORITY);
-    return DefaultRoute{hop->interfaceIndex, hop->gateway, metric ? metric->u32().value_or(0) : 0};
+    return DefaultRoute{hop->interfaceIndex, hop->gateway, attributes.u32(RTA_PRIORITY).value_or(0)};
 }
 
 }  // namespace
@@ -99,13 +90,6 @@ Message askForRoutes() {
     route.rtm_family = AF_INET;
     route.rtm_table = RT_TABLE_MAIN;
     return {RTM_GETROUTE, NLM_F_REQUEST | NLM_F_DUMP, route};
-}
-
-Message askForLink(int index) {
-    ifinfomsg link{};
-    link.ifi_family = AF_UNSPEC;
-    link.ifi_index = index;
-    return {RTM_GETLINK, NLM_F_REQUEST | NLM_F_ACK, link};
 }
 
 Message askForRouteTo(const Destination& destination) {
@@ -133,15 +117,6 @@ std::vector<DefaultRoute> defaultRoutesIn(std::span<const netlink::OwnedMessage>
     std::ranges::stable_sort(routes, {}, &DefaultRoute::metric);
     routes.erase(std::ranges::find(routes, 0, &DefaultRoute::interfaceIndex), routes.end());
     return routes;
-}
-
-std::optional<Link> linkIn(const MessageView& answer) {
-    const auto link = answer.family<ifinfomsg>();
-    const std::optional<Attribute> name = answer.attributes<ifinfomsg>().find(IFLA_IFNAME);
-    if (answer.type() != RTM_NEWLINK || !link || !name) {
-        return std::nullopt;
-    }
-    return Link{std::string(name->text()), (link->ifi_flags & static_cast<unsigned>(IFF_UP)) != 0};
 }
 
 Route routeIn(const MessageView& answer) {

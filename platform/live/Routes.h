@@ -15,9 +15,8 @@
 
 namespace platform::live {
 
-// A dump of the IPv4 routes of the main table, and of one link, and the way to one destination.
+// A dump of the IPv4 routes of the main table, and the way to one destination.
 [[nodiscard]] netlink::Message askForRoutes();
-[[nodiscard]] netlink::Message askForLink(int index);
 [[nodiscard]] netlink::Message askForRouteTo(const Destination& destination);
 
 struct DefaultRoute {
@@ -30,13 +29,6 @@ struct DefaultRoute {
 // prefers them, up to one that is there to refuse (unreachable, prohibit, blackhole). Of a route with several
 // next hops the first one that works counts. A gateway that is not of IPv4 is not told.
 [[nodiscard]] std::vector<DefaultRoute> defaultRoutesIn(std::span<const netlink::OwnedMessage> answers);
-
-struct Link {
-    std::string name;
-    bool isUp = false;
-};
-// Nothing when the message describes no link.
-[[nodiscard]] std::optional<Link> linkIn(const netlink::MessageView& answer);
 
 // Only a local route reaches anything, or a unicast one over a link that has its carrier.
 [[nodiscard]] Route routeIn(const netlink::MessageView& answer);

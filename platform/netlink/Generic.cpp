@@ -19,9 +19,9 @@ std::optional<GenericFamily> decodeFamily(const MessageView& message) {
         for (const Attribute& group : groups->nested()) {
             const Attributes parts = group.nested();
             const auto name = parts.find(CTRL_ATTR_MCAST_GRP_NAME);
-            const auto number = parts.find(CTRL_ATTR_MCAST_GRP_ID);
-            if (name && number && number->u32()) {
-                family.groups.emplace(name->text(), *number->u32());
+            const auto number = parts.u32(CTRL_ATTR_MCAST_GRP_ID);
+            if (name && number) {
+                family.groups.emplace(name->text(), *number);
             }
         }
     }
@@ -29,12 +29,13 @@ std::optional<GenericFamily> decodeFamily(const MessageView& message) {
 }
 
 Outcome findFamily(Socket& socket, const std::string& name, std::optional<GenericFamily>& family) {
+    family.reset();
     Message message = GenericFamily{GENL_ID_CTRL, {}}.request(CTRL_CMD_GETFAMILY, NLM_F_ACK);
     message.addText(CTRL_ATTR_FAMILY_NAME, name);
     OwnedMessage answer;
-    Outcome done = socket.ask(std::move(message), answer, {ENOENT});
-    family = done.ok() ? decodeFamily(answer.view()) : std::nullopt;
-    return done;
+    RETURN_IF_FAILED(socket.ask(std::move(message), answer, {ENOENT}));
+    family = decodeFamily(answer.view());
+    return {};
 }
 
 }  // namespace platform::netlink

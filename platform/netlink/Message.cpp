@@ -53,6 +53,11 @@ std::optional<Attribute> Attributes::find(std::uint16_t type) const noexcept {
     return found == list_.end() ? std::nullopt : std::optional(*found);
 }
 
+std::optional<std::uint32_t> Attributes::u32(std::uint16_t type) const noexcept {
+    const std::optional<Attribute> found = find(type);
+    return found ? found->u32() : std::nullopt;
+}
+
 std::optional<MessageView> takeMessage(ByteView& datagram) noexcept {
     const std::optional<nlmsghdr> header = valueFrom<nlmsghdr>(datagram);
     if (!header || header->nlmsg_len < NLMSG_HDRLEN || header->nlmsg_len > datagram.size()) {

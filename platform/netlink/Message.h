@@ -64,8 +64,9 @@ class Attributes {
     explicit Attributes(ByteView bytes);
     [[nodiscard]] auto begin() const noexcept { return list_.begin(); }
     [[nodiscard]] auto end() const noexcept { return list_.end(); }
-    // The first attribute of a type.
+    // The first attribute of a type, and its payload as an integer of this width.
     [[nodiscard]] std::optional<Attribute> find(std::uint16_t type) const noexcept;
+    [[nodiscard]] std::optional<std::uint32_t> u32(std::uint16_t type) const noexcept;
 
   private:
     std::vector<Attribute> list_;

@@ -129,10 +129,7 @@ Outcome Socket::receiveAnswers(const Each& each) {
     std::size_t total = 0;
     Bytes datagram;
     for (;;) {
-        Outcome received = receive(deadline, datagram);
-        if (!received.ok()) {
-            return received;
-        }
+        RETURN_IF_FAILED(receive(deadline, datagram));
         if (datagram.empty()) {
             return {kSCStatusFailed, "the kernel did not answer a netlink request"};
         }
@@ -156,12 +153,9 @@ Outcome Socket::request(Message message, std::initializer_list<int> tolerated) {
 
 Outcome Socket::ask(Message message, OwnedMessage& answer, std::initializer_list<int> tolerated) {
     answer = {};
-    Outcome done = send(message);
-    if (!done.ok()) {
-        return done;
-    }
+    RETURN_IF_FAILED(send(message));
     Outcome end;
-    done = receiveAnswers([&](const MessageView& part) {
+    RETURN_IF_FAILED(receiveAnswers([&](const MessageView& part) {
         const bool isEnd = part.type() == NLMSG_ERROR;
         if (isEnd) {
             end = outcomeOfError(part, tolerated, error_);
@@ -169,8 +163,8 @@ Outcome Socket::ask(Message message, OwnedMessage& answer, std::initializer_list
             answer = OwnedMessage(part);
         }
         return isEnd;
-    });
-    return done.ok() ? end : done;
+    }));
+    return end;
 }
 
 Outcome Socket::dump(const Message& message, std::vector<OwnedMessage>& answers,
@@ -192,12 +186,9 @@ Outcome Socket::dumpOnce(Message message, std::vector<OwnedMessage>& answers,
                          std::initializer_list<int> tolerated, bool& interrupted) {
     answers.clear();
     interrupted = false;
-    Outcome done = send(message);
-    if (!done.ok()) {
-        return done;
-    }
+    RETURN_IF_FAILED(send(message));
     Outcome end;
-    done = receiveAnswers([&](const MessageView& part) {
+    RETURN_IF_FAILED(receiveAnswers([&](const MessageView& part) {
         interrupted = interrupted || (part.flags() & NLM_F_DUMP_INTR) != 0;
         if (part.type() == NLMSG_ERROR) {
             end = outcomeOfError(part, tolerated, error_);
@@ -211,8 +202,8 @@ Outcome Socket::dumpOnce(Message message, std::vector<OwnedMessage>& answers,
             return false;
         }
         return true;
-    });
-    return done.ok() ? end : done;
+    }));
+    return end;
 }
 
 std::vector<OwnedMessage> Socket::takeNotices(bool& overrun) {

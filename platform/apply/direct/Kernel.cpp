@@ -67,11 +67,6 @@ Attributes attributesOf(const Bytes& key) {
     return MessageView({}, key).attributes<Family>();
 }
 
-std::uint32_t u32In(const Attributes& attributes, std::uint16_t type, std::uint32_t otherwise = 0) {
-    const auto found = attributes.find(type);
-    return found ? found->u32().value_or(otherwise) : otherwise;
-}
-
 // Calls `each` with the hops of a multipath route; what `each` changes is written back.
 template <class Each>
 void forEachHop(Bytes& hops, const Each& each) {
@@ -200,7 +195,7 @@ std::optional<Address> decodeAddress(const MessageView& message, int index) {
     }
     AttributeMap attributes = mapOf(message.attributes<ifaddrmsg>());
     const Attributes all = message.attributes<ifaddrmsg>();
-    const std::uint32_t flags = u32In(all, IFA_FLAGS, header->ifa_flags);
+    const std::uint32_t flags = all.u32(IFA_FLAGS).value_or(header->ifa_flags);
     Address address;
     if (const auto protocol = all.find(addressProtocol)) {
         address.protocol = protocol->u8().value_or(0);
@@ -233,12 +228,12 @@ std::optional<Route> decodeRoute(const MessageView& message, int index,
         return std::nullopt;
     }
     const Attributes all = message.attributes<rtmsg>();
-    if (u32In(all, RTA_TABLE, header->rtm_table) == RT_TABLE_LOCAL) {
+    if (all.u32(RTA_TABLE).value_or(header->rtm_table) == RT_TABLE_LOCAL) {
         return std::nullopt;
     }
     AttributeMap attributes = mapOf(all);
     Route route;
-    bool isOurs = u32In(all, RTA_OIF) == static_cast<std::uint32_t>(index);
+    bool isOurs = all.u32(RTA_OIF).value_or(0) == static_cast<std::uint32_t>(index);
     if (isOurs) {
         attributes[RTA_OIF] = ownBytes(std::uint32_t{0});
     }
@@ -338,20 +333,6 @@ std::vector<Route> makeDefaultRoute(IPv4Address router, unsigned metric,
     return routes;
 }
 
-Outcome Kernel::findLink(const std::string& name, std::optional<Link>& link) {
-    link.reset();
-    Message message(RTM_GETLINK, NLM_F_REQUEST | NLM_F_ACK, ifinfomsg{});
-    message.addText(IFLA_IFNAME, name);
-    OwnedMessage answer;
-    Outcome asked = socket_.ask(std::move(message), answer, {ENODEV});
-    const auto found = answer.view().family<ifinfomsg>();
-    if (asked.ok() && answer.header.nlmsg_type == RTM_NEWLINK && found) {
-        link =
-            Link{found->ifi_index, (found->ifi_flags & IFF_UP) != 0, (found->ifi_flags & IFF_RUNNING) != 0};
-    }
-    return asked;
-}
-
 Outcome Kernel::setUp(const Link& link, bool up) {
     ifinfomsg header{};
     header.ifi_index = link.index;
@@ -376,10 +357,7 @@ Outcome Kernel::read(const Link& link, InterfaceState& state) {
     state = {};
     std::vector<OwnedMessage> messages;
     for (const int family : {AF_INET, AF_INET6}) {
-        Outcome done = dump(RTM_GETADDR, family, messages);
-        if (!done.ok()) {
-            return done;
-        }
+        RETURN_IF_FAILED(dump(RTM_GETADDR, family, messages));
         for (const OwnedMessage& message : messages) {
             auto address = decodeAddress(message.view(), link.index);
             // A kernel without IPv6 answers for every family it has.
@@ -389,10 +367,7 @@ Outcome Kernel::read(const Link& link, InterfaceState& state) {
         }
     }
     for (const int family : {AF_INET, AF_INET6}) {
-        Outcome done = dump(RTM_GETROUTE, family, messages);
-        if (!done.ok()) {
-            return done;
-        }
+        RETURN_IF_FAILED(dump(RTM_GETROUTE, family, messages));
         Bytes lastPlace;
         for (const OwnedMessage& message : messages) {
             Bytes place = placeOf(message.view());
@@ -442,49 +417,49 @@ Outcome Kernel::removeRoute(const Link& link, const Route& route) {
 
 Outcome Kernel::makeAddresses(const Link& link, const std::vector<Address>& wanted) {
     InterfaceState state;
-    Outcome done = read(link, state);
+    RETURN_IF_FAILED(read(link, state));
     // The first address of a network decides which ones are secondary, so IPv4 addresses that are not exactly
     // these, in this order, are made anew.
     const std::vector<Address> now = ofFamily(state.addresses, AF_INET);
     const std::vector<Address> then = ofFamily(wanted, AF_INET);
     if (now != then) {
         for (const Address& address : now) {
-            done = done.ok() ? removeAddress(link, address) : done;
+            RETURN_IF_FAILED(removeAddress(link, address));
         }
         for (const Address& address : then) {
-            done = done.ok() ? addAddress(link, address) : done;
+            RETURN_IF_FAILED(addAddress(link, address));
         }
     }
     const std::vector<Address> now6 = ofFamily(state.addresses, AF_INET6);
     const std::vector<Address> then6 = ofFamily(wanted, AF_INET6);
     for (const Address& address : now6) {
-        if (done.ok() && !contains(then6, address)) {
-            done = removeAddress(link, address);
+        if (!contains(then6, address)) {
+            RETURN_IF_FAILED(removeAddress(link, address));
         }
     }
     for (const Address& address : then6) {
-        if (done.ok() && !contains(now6, address)) {
-            done = addAddress(link, address);
+        if (!contains(now6, address)) {
+            RETURN_IF_FAILED(addAddress(link, address));
         }
     }
-    return done;
+    return {};
 }
 
 Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, bool keepConnected) {
     InterfaceState state;
-    Outcome done = read(link, state);
+    RETURN_IF_FAILED(read(link, state));
     for (const Route& route : state.routes) {
         const bool stays = route.comesByItself || route.isElsewhere || contains(wanted, route) ||
                            (keepConnected && isConnected(route));
-        if (done.ok() && !stays) {
-            done = removeRoute(link, route);
+        if (!stays) {
+            RETURN_IF_FAILED(removeRoute(link, route));
         }
     }
     const auto deadline = std::chrono::steady_clock::now() + confirmationTime;
     // The ways to the neighbours first: a route through one of them is refused until then.
     for (const bool throughGateway : {false, true}) {
         for (const Route& route : wanted) {
-            if (!done.ok() || route.comesByItself || route.hasGateway() != throughGateway ||
+            if (route.comesByItself || route.hasGateway() != throughGateway ||
                 contains(state.routes, route)) {
                 continue;
             }
@@ -496,10 +471,12 @@ Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, b
             }
             // A route that other interfaces share is complete only when the last of them is up again, which
             // then adds it.
-            done = route.isShared ? Outcome() : added;
+            if (!route.isShared) {
+                RETURN_IF_FAILED(added);
+            }
         }
     }
-    return done;
+    return {};
 }
 
 Outcome Kernel::forgetSilentNeighbours(const Link& link) {
@@ -508,19 +485,19 @@ Outcome Kernel::forgetSilentNeighbours(const Link& link) {
     Message message(RTM_GETNEIGH, NLM_F_REQUEST | NLM_F_DUMP, header);
     message.addValue(NDA_IFINDEX, link.index);
     std::vector<OwnedMessage> neighbours;
-    Outcome done = socket_.dump(message, neighbours);
+    RETURN_IF_FAILED(socket_.dump(message, neighbours));
     for (const OwnedMessage& neighbour : neighbours) {
         const auto found = neighbour.view().family<ndmsg>();
         const auto address = neighbour.view().attributes<ndmsg>().find(NDA_DST);
-        if (done.ok() && found && address && found->ndm_ifindex == link.index &&
+        if (found && address && found->ndm_ifindex == link.index &&
             (found->ndm_state & (NUD_INCOMPLETE | NUD_FAILED)) != 0) {
             header.ndm_ifindex = link.index;
             Message removal(RTM_DELNEIGH, NLM_F_REQUEST | NLM_F_ACK, header);
             removal.add(NDA_DST, address->payload);
-            done = socket_.request(std::move(removal), {ENOENT});
+            RETURN_IF_FAILED(socket_.request(std::move(removal), {ENOENT}));
         }
     }
-    return done;
+    return {};
 }
 
 }  // namespace platform::apply

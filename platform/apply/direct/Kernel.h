@@ -23,6 +23,7 @@
 
 #include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
+#include "platform/netlink/Link.h"
 #include "platform/netlink/Message.h"
 #include "platform/netlink/Socket.h"
 
@@ -34,11 +35,7 @@ inline constexpr std::uint8_t ourRouteProtocol = 76;
 
 inline constexpr std::uint32_t forever = 0xFFFFFFFFU;
 
-struct Link {
-    int index = 0;
-    bool up = false;       // switched on
-    bool running = false;  // and with a carrier
-};
+using netlink::Link;
 
 struct Address {
     netlink::Bytes key;  // ifaddrmsg and attributes, without lifetimes
@@ -110,7 +107,9 @@ class Kernel {
     Outcome open() { return socket_.open(); }
 
     // Nothing, and success, when there is no interface of that name.
-    Outcome findLink(const std::string& name, std::optional<Link>& link);
+    Outcome findLink(const std::string& name, std::optional<Link>& link) {
+        return netlink::findLink(socket_, name, link);
+    }
     Outcome setUp(const Link& link, bool up);
     Outcome read(const Link& link, InterfaceState& state);
 

@@ -112,15 +112,11 @@ std::optional<ScanEntry> decodeScanEntry(const MessageView& message) {
         return std::nullopt;
     }
     std::copy(bssid->payload.begin(), bssid->payload.end(), network.bssid.begin());
-    const auto number = [&parts](std::uint16_t type) {
-        const auto found = parts.find(type);
-        return found ? found->u32() : std::nullopt;
-    };
-    network.frequency = number(NL80211_BSS_FREQUENCY).value_or(0);
-    network.signal = static_cast<int>(number(NL80211_BSS_SIGNAL_MBM).value_or(0));
-    network.age = std::chrono::milliseconds(number(NL80211_BSS_SEEN_MS_AGO).value_or(0));
+    network.frequency = parts.u32(NL80211_BSS_FREQUENCY).value_or(0);
+    network.signal = static_cast<int>(parts.u32(NL80211_BSS_SIGNAL_MBM).value_or(0));
+    network.age = std::chrono::milliseconds(parts.u32(NL80211_BSS_SEEN_MS_AGO).value_or(0));
     constexpr std::uint32_t notJoined = NL80211_BSS_STATUS_AUTHENTICATED;
-    network.isCurrent = number(NL80211_BSS_STATUS).value_or(notJoined) != notJoined;
+    network.isCurrent = parts.u32(NL80211_BSS_STATUS).value_or(notJoined) != notJoined;
     if (const auto capability = parts.find(NL80211_BSS_CAPABILITY)) {
         const unsigned bits = capability->u16().value_or(0);
         network.isAdHoc = (bits & capabilityAdHoc) != 0;
@@ -137,15 +133,13 @@ std::optional<ScanEntry> decodeScanEntry(const MessageView& message) {
 }
 
 std::optional<std::uint32_t> decodeInterfaceType(const MessageView& message) {
-    const auto type = message.attributes<genlmsghdr>().find(NL80211_ATTR_IFTYPE);
-    return type ? type->u32() : std::nullopt;
+    return message.attributes<genlmsghdr>().u32(NL80211_ATTR_IFTYPE);
 }
 
 std::optional<WirelessNotice> decodeNotice(const MessageView& message, int index) {
     const auto header = message.family<genlmsghdr>();
     const Attributes attributes = message.attributes<genlmsghdr>();
-    const auto interface = attributes.find(NL80211_ATTR_IFINDEX);
-    if (!header || !interface || interface->u32() != static_cast<std::uint32_t>(index)) {
+    if (!header || attributes.u32(NL80211_ATTR_IFINDEX) != static_cast<std::uint32_t>(index)) {
         return std::nullopt;
     }
     WirelessNotice notice;
