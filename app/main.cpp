@@ -142,11 +142,24 @@ int ProcessArguments(int argc, const char** argv) {
 }
 
 // A descriptor that the caller closed would be given to the next file that is opened, and the trace or a
-// message would go into that file.
+// message would go into that file. A closed standard output becomes one that nobody reads: the prompt of
+// "test" ends with it, as with every other reader that is gone.
 void OpenStandardDescriptors() {
     for (int descriptor = STDIN_FILENO; descriptor <= STDERR_FILENO; ++descriptor) {
-        if (fcntl(descriptor, F_GETFD) < 0) {
+        if (fcntl(descriptor, F_GETFD) >= 0) {
+            continue;
+        }
+        int ends[2] = {-1, -1};
+        if (descriptor != STDOUT_FILENO || pipe(ends) != 0) {
             static_cast<void>(open("/dev/null", O_RDWR | O_NOCTTY));
+            continue;
+        }
+        // The reading end takes the free place, and the writing end takes it over.
+        dup2(ends[1], descriptor);
+        for (const int end : ends) {
+            if (end != descriptor) {
+                close(end);
+            }
         }
     }
 }
