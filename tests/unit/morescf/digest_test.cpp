@@ -56,6 +56,7 @@ TEST_F(DigestTest, EveryMemberHasItsKeyAndPlace) {
               made(CFSTR("DNS"), [&](MoreSCDigest& digest) {
                   digest.dns = {1, servers, 1, domains};
               }));
+    EXPECT_EQ("-50", made(CFSTR("DNS"), [](MoreSCDigest& digest) { digest.dns = {1, nullptr, 0, nullptr}; }));
     EXPECT_EQ("{ConfigMethod = Manual; DHCPClientID = c; Addresses = (192.0.0.1); Router = 255.255.255.255}",
               made(CFSTR("IPv4"), [&](MoreSCDigest& digest) {
                   digest.ipv4 = {CFSTR("Manual"), servers[0], {}, servers[1], CFSTR("c")};

@@ -30,6 +30,12 @@ constexpr const char* lostService =
     "/NetworkServices/4}"
     "}; Global = {IPv4 = {ServiceOrder = (5, 4)}}}}}; NetworkServices = {5 = {}}; CurrentSet = /Sets/1}";
 
+// Nobody can tell what location 2 lists.
+constexpr const char* unknownOrder =
+    "{Sets = {1 = {Network = {Service = {5 = {__LINK__ = /NetworkServices/5}}; Global = {IPv4 = "
+    "{ServiceOrder = "
+    "(5)}}}}; 2 = {}; 3 = {}}; NetworkServices = {5 = {}; 7 = {}}; CurrentSet = /Sets/1}";
+
 // The text with "old -> new" edits made, one after the other, between which stands " | ".
 std::string edited(std::string text, std::string_view edits) {
     while (!edits.empty()) {
@@ -105,6 +111,9 @@ TEST_F(OperationsTest, ChangeTheTreeAndMarkTheSession) {
          SWEPT " | ; 4 = {__LINK__ = /NetworkServices/4} -> "},
         {oneSet, CHANGES(MoreSCDeleteService(nullptr, nullptr)), -50, unmarked, ""},
         {noOrder, CHANGES(MoreSCDeleteService(nullptr, s5)), -4960, unmarked, ""},
+        // The removal of services fails behind the rest.
+        {unknownOrder, CHANGES(MoreSCDeleteService(nullptr, s5)), 1004, marked, "5 = {__LINK__ = /NetworkServices/5} ->  | (5) -> ()"},
+        {unknownOrder, CHANGES(MoreSCDeleteSet(Str("3"))), 1004, unmarked, "; 3 = {} -> "},
         {oneSet, CHANGES(MoreSCRenameService(nullptr, s5, CFSTR("New"))), 0, marked, "Wired -> New"},
         {oneSet, CHANGES(MoreSCSetEntitiesDict(s1, nullptr, ab)), 0, marked, "{IPv4 = {ServiceOrder = (5)}} -> {a = b}"},
         {oneSet, CHANGES(MoreSCSetEntity(s1, s5, CFSTR("New"), ab)), 0, marked, "DNS = {} -> DNS = {}; New = {a = b}"},
