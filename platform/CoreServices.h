@@ -16,7 +16,7 @@ inline constexpr OSErr coreFoundationUnknownErr = -4960;
 inline constexpr OSType gestaltSystemVersion = 0x73797376;  // 'sysv'
 inline constexpr OSErr gestaltUndefSelectorErr = -5551;     // no such question, or no answer to it
 // For gestaltSystemVersion a BCD number: 0x1020 is 10.2.0. The response is untouched on failure.
-OSErr Gestalt(OSType selector, SInt32* response);
+OSErr Gestalt(OSType selector, SInt32* response) noexcept;
 
 // --- Folders ---
 
@@ -42,7 +42,7 @@ inline constexpr OSType kModemScriptsFolderType = 0xC46D6F64;
 // The folder of that kind in a domain. createFolder must be false. fnfErr when it does not exist, permErr
 // when it may not be seen, paramErr for an unknown kind or domain; the reference is then untouched. The user
 // is the one who runs the process, and the home is that of the password database.
-OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder);
+OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder) noexcept;
 
 struct OpaqueFSIterator;
 using FSIterator = OpaqueFSIterator*;
@@ -51,7 +51,7 @@ inline constexpr UInt32 kFSCatInfoNone = 0;
 inline constexpr OSErr errFSNoMoreItems = -1417;
 
 // An iterator over the items directly in a folder, ended with FSCloseIterator; null on failure.
-OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator);
+OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) noexcept;
 // Up to maximumItems references and names, in no order. errFSNoMoreItems marks the last batch, which may hold
 // items; what actualItems tells was delivered even when the status is another failure. A name that is not
 // printable UTF-8 of at most 64 bytes is passed over: it could not be named in a location. More than 4096
@@ -59,8 +59,8 @@ OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator);
 // names may be.
 OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems,
                            Boolean* containerChanged, UInt32 whichInfo, void* catalogInfos, FSRef* refs,
-                           void* specs, HFSUniStr255* names);
-OSErr FSCloseIterator(FSIterator iterator);
+                           void* specs, HFSUniStr255* names) noexcept;
+OSErr FSCloseIterator(FSIterator iterator) noexcept;
 
 struct LSItemInfoRecord {
     UInt32 flags;
@@ -73,7 +73,7 @@ inline constexpr UInt32 kLSItemInfoIsInvisible = 0x40;
 // since it was listed, and a link that leads nowhere, are neither a plain file nor a container, and no
 // failure: neither of them may spoil the listing of the folder. permErr and ioErr when the item is there and
 // cannot be looked at.
-OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInfoRecord* info);
+OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInfoRecord* info) noexcept;
 
 // --- Download ---
 
@@ -81,10 +81,10 @@ struct HandleBlock;
 // A growable buffer.
 using Handle = HandleBlock*;
 // A buffer of that many zero bytes; null without memory. It lives until the process ends or DisposeHandle.
-Handle NewHandle(long size);
-void DisposeHandle(Handle handle);
-long GetHandleSize(Handle handle);
-const char* GetHandleData(Handle handle);
+Handle NewHandle(long size) noexcept;
+void DisposeHandle(Handle handle) noexcept;
+long GetHandleSize(Handle handle) noexcept;
+const char* GetHandleData(Handle handle) noexcept;
 
 inline constexpr OSStatus kURLInvalidURLError = -30773;  // or a host that is not a numeric address
 inline constexpr OSStatus kURLUnsupportedSchemeError = -30774;
@@ -100,16 +100,16 @@ inline constexpr OSStatus kURLClientError = -30795;  // the HTTP client library 
 // or a 2xx did not arrive whole, with the reason in the log. Only a 2xx fills the buffer. destination,
 // eventProc and context are null, flags is 0.
 OSStatus URLSimpleDownload(const char* url, const void* destination, Handle buffer, UInt32 flags,
-                           const void* eventProc, void* context);
+                           const void* eventProc, void* context) noexcept;
 
 // --- Opening a URL ---
 
 // Opens the URL in the browser of the user who sits at the computer, as that user, and returns without
 // waiting for it. Nothing happens when nobody does (fnfErr). openedURL must be null.
-OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL);
+OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL) noexcept;
 
 // --- System log ---
 
 // Writes one line to the system log, as a warning of this system, without waiting: where nobody reads the log
 // it is lost.
-void SystemLog(const char* line);
+void SystemLog(const char* line) noexcept;

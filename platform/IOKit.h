@@ -48,26 +48,26 @@ inline constexpr kern_return_t kIOReturnNoDevice = static_cast<kern_return_t>(0x
 inline constexpr const char* kIOServicePlane = "IOService";
 
 // The handle through which the registry is asked, to be released with IOObjectRelease.
-kern_return_t IOMasterPort(mach_port_t bootstrapPort, mach_port_t* masterPort);
+kern_return_t IOMasterPort(mach_port_t bootstrapPort, mach_port_t* masterPort) noexcept;
 // A dictionary that matches every entry of a class ("IOProviderClass"); null without memory.
-CFMutableDictionaryRef IOServiceMatching(const char* className);
+CFMutableDictionaryRef IOServiceMatching(const char* className) noexcept;
 // Consumes one reference of the matching dictionary, on failure too. Matches the entries of the class under
 // "IOProviderClass" whose properties equal whatever else the dictionary holds; nothing when there is no such
 // class. They come in the order of the kernel's names, numbers in them by value. Hardware that cannot be
 // listed whole, or of more than 4096 devices, is kIOReturnError. The output is untouched on failure.
 kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryRef matching,
-                                           io_iterator_t* iterator);
+                                           io_iterator_t* iterator) noexcept;
 // The next entry, which the caller releases, or 0 at the end.
-io_object_t IOIteratorNext(io_iterator_t iterator);
+io_object_t IOIteratorNext(io_iterator_t iterator) noexcept;
 // One property as a value of the caller's, or null.
 CFTypeRef IORegistryEntryCreateCFProperty(io_registry_entry_t entry, CFStringRef key,
-                                          CFAllocatorRef allocator, IOOptionBits options);
+                                          CFAllocatorRef allocator, IOOptionBits options) noexcept;
 // All properties as a dictionary of the caller's; null on failure.
 kern_return_t IORegistryEntryCreateCFProperties(io_registry_entry_t entry, CFMutableDictionaryRef* properties,
-                                                CFAllocatorRef allocator, IOOptionBits options);
+                                                CFAllocatorRef allocator, IOOptionBits options) noexcept;
 // The parent, which the caller releases. plane is kIOServicePlane. The output is 0 on failure.
 kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const char* plane,
-                                            io_registry_entry_t* parent);
+                                            io_registry_entry_t* parent) noexcept;
 // Whether the entry is of the class; no parent is of any.
-Boolean IOObjectConformsTo(io_object_t object, const char* className);
-kern_return_t IOObjectRelease(io_object_t object);
+Boolean IOObjectConformsTo(io_object_t object, const char* className) noexcept;
+kern_return_t IOObjectRelease(io_object_t object) noexcept;

@@ -90,6 +90,6 @@ LogCapture::~LogCapture() {
 
 }  // namespace platform
 
-void SystemLog(const char* line) {
+void SystemLog(const char* line) noexcept {
     platform::logLine(platform::LogLevel::warning, line);
 }

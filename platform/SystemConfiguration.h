@@ -75,12 +75,12 @@ Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path)
 // changes then.
 Boolean SCPreferencesCommitChanges(SCPreferencesRef session) noexcept;
 // Makes the current location, as it is committed now, the active configuration, and returns when nothing more
-// can be expected of its interfaces or after a bounded wait. A commit of this session that left the location's
-// settings as they were changes nothing; one that changed nothing at all asks for just that: every interface is
-// looked at. Without a commit in this session only what an earlier apply left undone is finished. False: 1001
-// when this machine refused, with the reason in the system log; 1003. What a network, a cable or a key does is
-// a line in the log, and a success.
-Boolean SCPreferencesApplyChanges(SCPreferencesRef session);
+// can be expected of its interfaces or after a bounded wait. A commit of this session that left the
+// location's settings as they were changes nothing; one that changed nothing at all asks for just that: every
+// interface is looked at. Without a commit in this session only what an earlier apply left undone is
+// finished. False: 1001 when this machine refused, with the reason in the system log; 1003. What a network, a
+// cable or a key does is a line in the log, and a success.
+Boolean SCPreferencesApplyChanges(SCPreferencesRef session) noexcept;
 
 // --- Dynamic store: the live network state ---
 
@@ -106,31 +106,33 @@ extern const CFStringRef kSCEntNetIPv4;               // "IPv4"
 // switched on in the current location, "Setup:/Network/Global/<entity>" and
 // "Setup:/Network/Service/<serviceID>/<entity>".
 SCDynamicStoreRef SCDynamicStoreCreate(CFAllocatorRef allocator, CFStringRef name,
-                                       SCDynamicStoreCallBack callBack, SCDynamicStoreContext* context);
+                                       SCDynamicStoreCallBack callBack,
+                                       SCDynamicStoreContext* context) noexcept;
 // "<domain>/Network/Global/<entity>".
 CFStringRef SCDynamicStoreKeyCreateNetworkGlobalEntity(CFAllocatorRef allocator, CFStringRef domain,
-                                                       CFStringRef entity);
+                                                       CFStringRef entity) noexcept;
 // "<domain>/Network/Service/<serviceID>/<entity>"; without an entity the last piece is left out.
 CFStringRef SCDynamicStoreKeyCreateNetworkServiceEntity(CFAllocatorRef allocator, CFStringRef domain,
-                                                        CFStringRef serviceID, CFStringRef entity);
+                                                        CFStringRef serviceID, CFStringRef entity) noexcept;
 // The keys that match the whole of a POSIX extended regular expression, sorted by their text; an empty array
 // when none does. Null: 1002 for a malformed expression, 1001 or 1003 when the state cannot be read.
-CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef pattern);
+CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef pattern) noexcept;
 // The value at a key; null with 1004 when there is none, 1001 or 1003 when it cannot be read.
 //
 // "State:/Network/Global/IPv4" is there while there is a default route: "PrimaryInterface", the interface's
 // name; "Router", a dotted quad, when the route has one; "PrimaryService", the ID of the first service of the
 // current location that names the interface, if one does.
-CFPropertyListRef SCDynamicStoreCopyValue(SCDynamicStoreRef store, CFStringRef key);
+CFPropertyListRef SCDynamicStoreCopyValue(SCDynamicStoreRef store, CFStringRef key) noexcept;
 // Replaces the keys and the key patterns whose changes are reported, from now on; either may be null. False:
 // 1002 when something in them is no string or a pattern is malformed, 1001 or 1003 when the state cannot be
 // read; nothing is replaced then.
-Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef keys, CFArrayRef patterns);
+Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef keys,
+                                          CFArrayRef patterns) noexcept;
 // A source that calls the session's callback with the keys whose values changed. Changes that come within a
 // few hundredths of a second are reported at once, and a value that is again what it was is not reported.
 // The source retains the session. order is 0. Null on failure.
 CFRunLoopSourceRef SCDynamicStoreCreateRunLoopSource(CFAllocatorRef allocator, SCDynamicStoreRef store,
-                                                     CFIndex order);
+                                                     CFIndex order) noexcept;
 
 // --- Reachability ---
 
@@ -146,6 +148,6 @@ inline constexpr SCNetworkConnectionFlags kSCNetworkFlagsIsDirect = 1U << 17U;
 //
 // A name that is not an address in figures is looked up first, as every program does, which may well send
 // something and take its time; one that has no address is not reachable.
-Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnectionFlags* flags);
+Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnectionFlags* flags) noexcept;
 Boolean SCNetworkCheckReachabilityByAddress(const sockaddr* address, int addressLength,
-                                            SCNetworkConnectionFlags* flags);
+                                            SCNetworkConnectionFlags* flags) noexcept;

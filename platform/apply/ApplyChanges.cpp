@@ -12,7 +12,7 @@ constexpr int mostApplies = 5;
 
 }  // namespace
 
-Boolean SCPreferencesApplyChanges(SCPreferencesRef session) {
+Boolean SCPreferencesApplyChanges(SCPreferencesRef session) noexcept {
     using platform::Outcome;
     using platform::preferences::setStatus;
     using platform::values::Owned;

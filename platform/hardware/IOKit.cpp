@@ -106,7 +106,7 @@ kern_return_t guarded(Operation operation) noexcept {
 using namespace platform::hardware;
 using platform::values::Owned;
 
-kern_return_t IOMasterPort(mach_port_t /*bootstrapPort*/, mach_port_t* masterPort) {
+kern_return_t IOMasterPort(mach_port_t /*bootstrapPort*/, mach_port_t* masterPort) noexcept {
     if (masterPort == nullptr) {
         return kIOReturnBadArgument;
     }
@@ -116,7 +116,7 @@ kern_return_t IOMasterPort(mach_port_t /*bootstrapPort*/, mach_port_t* masterPor
     });
 }
 
-CFMutableDictionaryRef IOServiceMatching(const char* className) {
+CFMutableDictionaryRef IOServiceMatching(const char* className) noexcept {
     if (className == nullptr) {
         return nullptr;
     }
@@ -132,7 +132,7 @@ CFMutableDictionaryRef IOServiceMatching(const char* className) {
 }
 
 kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryRef matching,
-                                           io_iterator_t* iterator) {
+                                           io_iterator_t* iterator) noexcept {
     const auto consumed = Owned<CFDictionaryRef>::adopt(matching);
     if (matching == nullptr || iterator == nullptr || find<Master>(masterPort) == nullptr) {
         return kIOReturnBadArgument;
@@ -147,7 +147,7 @@ kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryR
     });
 }
 
-io_object_t IOIteratorNext(io_iterator_t iterator) {
+io_object_t IOIteratorNext(io_iterator_t iterator) noexcept {
     Iterator* position = find<Iterator>(iterator);
     if (position == nullptr || position->next == position->entries.size()) {
         return IO_OBJECT_NULL;
@@ -162,7 +162,7 @@ io_object_t IOIteratorNext(io_iterator_t iterator) {
 }
 
 CFTypeRef IORegistryEntryCreateCFProperty(io_registry_entry_t entry, CFStringRef key,
-                                          CFAllocatorRef /*allocator*/, IOOptionBits /*options*/) {
+                                          CFAllocatorRef /*allocator*/, IOOptionBits /*options*/) noexcept {
     const Entry* found = findEntry(entry);
     if (found == nullptr || key == nullptr) {
         return nullptr;
@@ -171,7 +171,7 @@ CFTypeRef IORegistryEntryCreateCFProperty(io_registry_entry_t entry, CFStringRef
 }
 
 kern_return_t IORegistryEntryCreateCFProperties(io_registry_entry_t entry, CFMutableDictionaryRef* properties,
-                                                CFAllocatorRef allocator, IOOptionBits /*options*/) {
+                                                CFAllocatorRef allocator, IOOptionBits /*options*/) noexcept {
     if (properties == nullptr) {
         return kIOReturnBadArgument;
     }
@@ -185,7 +185,7 @@ kern_return_t IORegistryEntryCreateCFProperties(io_registry_entry_t entry, CFMut
 }
 
 kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const char* plane,
-                                            io_registry_entry_t* parent) {
+                                            io_registry_entry_t* parent) noexcept {
     if (parent == nullptr) {
         return kIOReturnBadArgument;
     }
@@ -203,12 +203,12 @@ kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const cha
     });
 }
 
-Boolean IOObjectConformsTo(io_object_t object, const char* className) {
+Boolean IOObjectConformsTo(io_object_t object, const char* className) noexcept {
     const Entry* found = findEntry(object);
     return found != nullptr && className != nullptr && !found->className.empty() &&
            found->className == className;
 }
 
-kern_return_t IOObjectRelease(io_object_t object) {
+kern_return_t IOObjectRelease(io_object_t object) noexcept {
     return handles().erase(object) != 0 ? KERN_SUCCESS : kIOReturnBadArgument;
 }

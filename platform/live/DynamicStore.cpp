@@ -252,7 +252,8 @@ CFStringRef createKey(CFStringRef domain, std::string_view middle, CFStringRef i
 }  // namespace
 
 SCDynamicStoreRef SCDynamicStoreCreate(CFAllocatorRef /*allocator*/, CFStringRef name,
-                                       SCDynamicStoreCallBack callBack, SCDynamicStoreContext* context) {
+                                       SCDynamicStoreCallBack callBack,
+                                       SCDynamicStoreContext* context) noexcept {
     std::string client(as<CFStringRef>(name) != nullptr ? textOf(name) : "live state");
     DynamicStore* const store = new DynamicStore(std::move(client), callBack, context);
     setStatus(kSCStatusOK);
@@ -260,16 +261,16 @@ SCDynamicStoreRef SCDynamicStoreCreate(CFAllocatorRef /*allocator*/, CFStringRef
 }
 
 CFStringRef SCDynamicStoreKeyCreateNetworkGlobalEntity(CFAllocatorRef /*allocator*/, CFStringRef domain,
-                                                       CFStringRef entity) {
+                                                       CFStringRef entity) noexcept {
     return createKey(domain, "/Network/Global", nullptr, entity);
 }
 
 CFStringRef SCDynamicStoreKeyCreateNetworkServiceEntity(CFAllocatorRef /*allocator*/, CFStringRef domain,
-                                                        CFStringRef serviceID, CFStringRef entity) {
+                                                        CFStringRef serviceID, CFStringRef entity) noexcept {
     return createKey(domain, "/Network/Service", serviceID, entity);
 }
 
-CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef pattern) {
+CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef pattern) noexcept {
     const DynamicStore* const self = DynamicStore::from(store);
     if (self == nullptr || as<CFStringRef>(pattern) == nullptr) {
         setStatus(self == nullptr ? kSCStatusNoStoreSession : kSCStatusInvalidArgument);
@@ -288,7 +289,7 @@ CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef patter
     return arrayOf(keys).take();
 }
 
-CFPropertyListRef SCDynamicStoreCopyValue(SCDynamicStoreRef store, CFStringRef key) {
+CFPropertyListRef SCDynamicStoreCopyValue(SCDynamicStoreRef store, CFStringRef key) noexcept {
     const DynamicStore* const self = DynamicStore::from(store);
     if (self == nullptr || as<CFStringRef>(key) == nullptr) {
         setStatus(self == nullptr ? kSCStatusNoStoreSession : kSCStatusInvalidArgument);
@@ -301,7 +302,8 @@ CFPropertyListRef SCDynamicStoreCopyValue(SCDynamicStoreRef store, CFStringRef k
     return value.take();
 }
 
-Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef keys, CFArrayRef patterns) {
+Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef keys,
+                                          CFArrayRef patterns) noexcept {
     DynamicStore* const self = DynamicStore::from(store);
     if (self == nullptr) {
         return static_cast<Boolean>(setStatus(kSCStatusNoStoreSession));
@@ -323,7 +325,7 @@ Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef ke
 }
 
 CFRunLoopSourceRef SCDynamicStoreCreateRunLoopSource(CFAllocatorRef /*allocator*/, SCDynamicStoreRef store,
-                                                     CFIndex /*order*/) {
+                                                     CFIndex /*order*/) noexcept {
     DynamicStore* const self = DynamicStore::from(store);
     if (self == nullptr) {
         setStatus(kSCStatusNoStoreSession);

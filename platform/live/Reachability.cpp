@@ -79,7 +79,7 @@ Outcome askForAny(const AddressList& list, Route& route) {
 }  // namespace
 
 Boolean SCNetworkCheckReachabilityByAddress(const sockaddr* address, int addressLength,
-                                            SCNetworkConnectionFlags* flags) {
+                                            SCNetworkConnectionFlags* flags) noexcept {
     const auto length = static_cast<std::size_t>(addressLength < 0 ? 0 : addressLength);
     const std::optional<Destination> destination = destinationOf(address, length);
     if (!destination || flags == nullptr) {
@@ -93,7 +93,7 @@ Boolean SCNetworkCheckReachabilityByAddress(const sockaddr* address, int address
     return static_cast<Boolean>(done);
 }
 
-Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnectionFlags* flags) {
+Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnectionFlags* flags) noexcept {
     if (nodename == nullptr || *nodename == '\0' || flags == nullptr) {
         return static_cast<Boolean>(setStatus(kSCStatusInvalidArgument));
     }

@@ -20,7 +20,7 @@ std::map<Handle, std::unique_ptr<HandleBlock>>& buffers() {
 
 }  // namespace
 
-Handle NewHandle(long size) {
+Handle NewHandle(long size) noexcept {
     if (size < 0) {
         return nullptr;
     }
@@ -35,20 +35,20 @@ Handle NewHandle(long size) {
     }
 }
 
-void DisposeHandle(Handle handle) {
+void DisposeHandle(Handle handle) noexcept {
     buffers().erase(handle);
 }
 
-long GetHandleSize(Handle handle) {
+long GetHandleSize(Handle handle) noexcept {
     return static_cast<long>(handle->content.size());
 }
 
-const char* GetHandleData(Handle handle) {
+const char* GetHandleData(Handle handle) noexcept {
     return handle->content.data();
 }
 
 OSStatus URLSimpleDownload(const char* url, const void* destination, Handle buffer, UInt32 flags,
-                           const void* eventProc, void* context) {
+                           const void* eventProc, void* context) noexcept {
     if (url == nullptr || buffers().count(buffer) == 0 || destination != nullptr || flags != 0 ||
         eventProc != nullptr || context != nullptr) {
         return paramErr;

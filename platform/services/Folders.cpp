@@ -182,7 +182,7 @@ OSErr nextItem(OpaqueFSIterator& iterator, std::string& name, HFSUniStr255& unic
 
 using namespace platform::services;
 
-OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder) {
+OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder) noexcept {
     if (folderType != kModemScriptsFolderType || createFolder != 0 || folder == nullptr) {
         return paramErr;
     }
@@ -203,7 +203,7 @@ OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef
     });
 }
 
-OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) {
+OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) noexcept {
     if (iterator == nullptr) {
         return paramErr;
     }
@@ -228,7 +228,7 @@ OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) {
 
 OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems,
                            Boolean* containerChanged, UInt32 whichInfo, void* catalogInfos, FSRef* refs,
-                           void* specs, HFSUniStr255* names) {
+                           void* specs, HFSUniStr255* names) noexcept {
     if (actualItems == nullptr) {
         return paramErr;
     }
@@ -256,11 +256,11 @@ OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* act
     });
 }
 
-OSErr FSCloseIterator(FSIterator iterator) {
+OSErr FSCloseIterator(FSIterator iterator) noexcept {
     return iterators().erase(iterator) != 0 ? noErr : paramErr;
 }
 
-OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInfoRecord* info) {
+OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInfoRecord* info) noexcept {
     const std::string* path = item == nullptr ? nullptr : paths().pathOf(*item);
     if (path == nullptr || requestedInfo != kLSRequestBasicFlagsOnly || info == nullptr) {
         return paramErr;

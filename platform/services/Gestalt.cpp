@@ -1,7 +1,7 @@
 #include "platform/CoreServices.h"
 #include "platform/Host.h"
 
-OSErr Gestalt(OSType selector, SInt32* response) {
+OSErr Gestalt(OSType selector, SInt32* response) noexcept {
     if (response == nullptr) {
         return paramErr;
     }

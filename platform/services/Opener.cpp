@@ -9,7 +9,7 @@
 #include "platform/Host.h"
 #include "platform/values/Values.h"
 
-OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL) {
+OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL) noexcept {
     if (url == nullptr || openedURL != nullptr) {
         return paramErr;
     }

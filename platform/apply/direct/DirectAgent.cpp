@@ -91,8 +91,11 @@ class Progress {
         carrierDeadline_ = std::min(deadline_, Clock::now() + carrierBound);
         if (task_->refusal.ok() && state != WirelessJoin::State::joined) {
             giveUp(reason.empty() ? "the network was not joined in time" : reason);
-        } else if (waitsForLease_) {
-            hurryDhcpClient(name_);
+        } else if (task_->refusal.ok()) {
+            interface_.noteJoined();
+            if (waitsForLease_) {
+                hurryDhcpClient(name_);
+            }
         }
         isSettled_ = isSettled_ || !task_->refusal.ok();
         return true;

@@ -178,7 +178,12 @@ Outcome DirectInterface::switchOn(const InterfacePlan& plan, std::string& troubl
     RETURN_IF_FAILED(setIPv6Disabled(true));
     RETURN_IF_FAILED(setUp(true));
     RETURN_IF_FAILED(kernel_.makeAddresses(*link_, addresses));
-    RETURN_IF_FAILED(kernel_.makeRoutes(*link_, routes, true));
+    if (!kernel_.makeRoutes(*link_, routes, true).ok()) {
+        // Somebody took the way to the addresses' own networks away: it comes with the addresses.
+        RETURN_IF_FAILED(kernel_.makeAddresses(*link_, {}));
+        RETURN_IF_FAILED(kernel_.makeAddresses(*link_, addresses));
+        RETURN_IF_FAILED(kernel_.makeRoutes(*link_, routes, true));
+    }
     if (plan.method != IPv4Method::dhcp) {
         return setInterfaceNameServers(interface_, plan.rank, {plan.nameServers, plan.searchDomains},
                                        trouble);
@@ -230,6 +235,12 @@ Outcome DirectInterface::startClient(const InterfacePlan& plan, std::string& tro
         RETURN_IF_FAILED(setInterfaceNameServers(interface_, plan.rank, own, trouble));
     }
     return running ? Outcome() : startDhcpClient(dhcpSettings(plan));
+}
+
+void DirectInterface::noteJoined() {
+    if (refresh().ok() && link_) {
+        (void)kernel_.forgetSilentNeighbours(*link_).ok();
+    }
 }
 
 Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join,

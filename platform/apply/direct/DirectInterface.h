@@ -36,6 +36,9 @@ class DirectInterface {
     // Makes it as it was, and compares. The same for `join` and trouble.
     Outcome giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join, std::string& trouble);
 
+    // The card has got onto its network: who was asked for in vain before can answer now.
+    void noteJoined();
+
   private:
     Outcome switchOff(std::string& trouble);
     Outcome switchOn(const InterfacePlan& plan, std::string& trouble);

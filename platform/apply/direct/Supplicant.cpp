@@ -12,6 +12,8 @@ namespace {
 
 using std::chrono::steady_clock;
 
+// Between two scans for a network that was not heard: the supplicant itself takes its time.
+constexpr std::chrono::seconds scanAgain{2};
 // Between two looks at the state when no notice tells of a change.
 constexpr std::chrono::milliseconds lookAgain{250};
 
@@ -98,6 +100,12 @@ class SupplicantJoin final : public WirelessJoin {
         if (state_ == State::waiting && steady_clock::now() >= nextLook_) {
             nextLook_ = steady_clock::now() + lookAgain;
             RETURN_IF_FAILED(look());
+        }
+        if (state_ == State::waiting && !choice_.isHeard && steady_clock::now() >= nextScan_) {
+            nextScan_ = steady_clock::now() + scanAgain;
+            // By its name, as the network says. One that is under way goes on.
+            std::string answer;
+            RETURN_IF_FAILED(socket_.ask("SCAN", "look around", answer));
         }
         state = state_;
         reason = reason_;
@@ -205,6 +213,7 @@ class SupplicantJoin final : public WirelessJoin {
     State state_ = State::waiting;
     std::string reason_;
     steady_clock::time_point nextLook_;
+    steady_clock::time_point nextScan_ = steady_clock::now() + scanAgain;
 };
 
 // The card goes back to one of its own networks by itself.

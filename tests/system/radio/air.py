@@ -98,7 +98,9 @@ def heard():
     for block in re.split(r"^BSS ", at("ear", "iw dev wlan3 scan flush"), flags=re.M)[1:]:
         name = re.search(r"^\tSSID: ?(.*)$", block, re.M)
         kind = "ad-hoc" if "IBSS" in re.search(r"capability: (.*)", block).group(1) else "access point"
-        found.add((name.group(1) if name else "", block[:17], kind))
+        # One that hides its name is of no row but its own, and its last beacon is heard for a while.
+        if name and name.group(1):
+            found.add((name.group(1), block[:17], kind))
     return found
 
 

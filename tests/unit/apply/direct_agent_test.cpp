@@ -426,7 +426,7 @@ TEST_F(DirectAgentTest, RenewsALeaseWithOtherValues) {
 
 TEST_F(DirectAgentTest, LooksAtTheMachineWhenALocationIsMadeCurrentAgain) {
     for (const char* const trouble :
-         {"ip addr flush dev card0", "ip link set card0 down", "ip route flush dev card0 table all",
+         {"ip addr flush dev card0", "ip link set card0 down", "ip route flush dev card0",
           "ip addr add 10.9.9.9/8 dev card0", "ip link set card1 up; ip addr add 10.8.8.8/8 dev card1"}) {
         SCOPED_TRACE(trouble);
         run([trouble] {

@@ -51,17 +51,18 @@ Registry gRegistry;
 
 }  // namespace
 
-kern_return_t IOMasterPort(mach_port_t, mach_port_t* master) {
+kern_return_t IOMasterPort(mach_port_t, mach_port_t* master) noexcept {
     *master = gRegistry.handOut(kMaster);
     return KERN_SUCCESS;
 }
 
-CFMutableDictionaryRef IOServiceMatching(const char* className) {
+CFMutableDictionaryRef IOServiceMatching(const char* className) noexcept {
     const Value matching = read("{IOProviderClass = " + std::string(className) + "}");
     return CFDictionaryCreateMutableCopy(nullptr, 0, static_cast<CFDictionaryRef>(matching.get()));
 }
 
-kern_return_t IOServiceGetMatchingServices(mach_port_t, CFDictionaryRef matching, io_iterator_t* iterator) {
+kern_return_t IOServiceGetMatchingServices(mach_port_t, CFDictionaryRef matching,
+                                           io_iterator_t* iterator) noexcept {
     std::vector<io_object_t> found;
     const std::string type = show(CFDictionaryGetValue(matching, CFSTR("IOProviderClass")));
     CFTypeRef stream = CFDictionaryGetValue(matching, CFSTR("IOSerialBSDClientType"));
@@ -83,7 +84,7 @@ kern_return_t IOServiceGetMatchingServices(mach_port_t, CFDictionaryRef matching
     return KERN_SUCCESS;
 }
 
-io_object_t IOIteratorNext(io_iterator_t iterator) {
+io_object_t IOIteratorNext(io_iterator_t iterator) noexcept {
     auto& rest = gRegistry.iterators.at(iterator);
     const io_object_t next = rest.empty() ? 0 : rest.back();
     if (next != 0) {
@@ -93,29 +94,29 @@ io_object_t IOIteratorNext(io_iterator_t iterator) {
 }
 
 CFTypeRef IORegistryEntryCreateCFProperty(io_registry_entry_t entry, CFStringRef key, CFAllocatorRef,
-                                          IOOptionBits) {
+                                          IOOptionBits) noexcept {
     return gRegistry.copyProperty(entry, key);
 }
 
 kern_return_t IORegistryEntryCreateCFProperties(io_registry_entry_t entry, CFMutableDictionaryRef* properties,
-                                                CFAllocatorRef, IOOptionBits) {
+                                                CFAllocatorRef, IOOptionBits) noexcept {
     CFTypeRef all = gRegistry.entries.at(entry).properties.get();
     *properties = CFDictionaryCreateMutableCopy(nullptr, 0, static_cast<CFDictionaryRef>(all));
     return KERN_SUCCESS;
 }
 
 kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const char*,
-                                            io_registry_entry_t* parent) {
+                                            io_registry_entry_t* parent) noexcept {
     const io_object_t found = gRegistry.entries.at(entry).parent;
     *parent = found != 0 ? gRegistry.handOut(found) : 0;
     return found != 0 ? KERN_SUCCESS : kIOReturnNoDevice;
 }
 
-Boolean IOObjectConformsTo(io_object_t object, const char* className) {
+Boolean IOObjectConformsTo(io_object_t object, const char* className) noexcept {
     return gRegistry.entries.at(object).type == className;
 }
 
-kern_return_t IOObjectRelease(io_object_t object) {
+kern_return_t IOObjectRelease(io_object_t object) noexcept {
     const auto held = gRegistry.handles.find(object);
     EXPECT_NE(gRegistry.handles.end(), held) << "given back twice";
     if (held != gRegistry.handles.end()) {
