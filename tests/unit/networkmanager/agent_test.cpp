@@ -299,6 +299,7 @@ TEST_F(NetworkManager, cardWithoutCarrier) {
     EXPECT_EQ(giveBack(before).trouble, "no profile can be active on it now");
     EXPECT_EQ(changes(), Changes{"Delete location-assistant wlan0"});
 
+    agent_ = makeNetworkManagerAgent();
     standIn_.cards[0].type = 1;
     standIn_.cards[0].state = 20;
     InterfacePlan wired = plan({});
