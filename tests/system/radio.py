@@ -40,7 +40,7 @@ MODULES = ("virtio_pci", "9pnet_virtio", "9p", "overlay")
 LOWER = {"host": "/lab/root:/lab/machine:/host", "debian": "/lab/machine:/lab/debian"}
 
 PROGRAMS = ("NetworkManager", "nmcli", "wpa_supplicant", "wpa_cli", "iwd", "hostapd", "dnsmasq", "dbus-daemon",
-            "busybox", "iw", "ip", "ss", "nsenter", "sh", "rm", "mkdir", "id", "python3", "wpa_action")
+            "busybox", "dhclient", "iw", "ip", "ss", "nsenter", "sh", "rm", "mkdir", "id", "python3", "wpa_action")
 
 READ = ("/bin", "/sbin", "/lib", "/lib64", "/etc/ld.so.cache", "/etc/nsswitch.conf", "/etc/passwd", "/etc/group", "/etc/hosts",
         "/etc/host.conf", "/etc/gai.conf", "/etc/services", "/etc/protocols", "/etc/localtime", "/etc/ssl/openssl.cnf",
@@ -61,6 +61,7 @@ mount -t tmpfs -o size=60%,mode=755 tmpfs /over
 mkdir /over/upper /over/work
 mount -t overlay -o lowerdir={lower},upperdir=/over/upper,workdir=/over/work overlay /new
 mkdir -p /new/host /new/report
+{extra}
 mount --move /host /new/host
 mount -t 9p -o $options report /new/report
 umount /proc
@@ -68,12 +69,33 @@ exec switch_root /new {init}
 """
 
 
-def missing():
+# A booted distribution plays the command in a unit of its own; nobody logs in on its console.
+UNIT = """
+cat >/new/etc/systemd/system/laboratory.service <<'END'
+[Unit]
+After=multi-user.target
+[Service]
+Type=oneshot
+ExecStart=/bin/sh /host{here}/radio/prepare
+StandardOutput=tty
+StandardError=tty
+TTYPath=/dev/ttyS0
+TimeoutStartSec=infinity
+END
+mkdir -p /new/etc/systemd/system/graphical.target.wants
+ln -s ../laboratory.service /new/etc/systemd/system/graphical.target.wants
+ln -sf /dev/null /new/etc/systemd/system/serial-getty@ttyS0.service
+"""
+
+
+def missing(distribution="host"):
     """What the machine needs and is not here, or nothing."""
     if not shutil.which("qemu-system-x86_64"):
         return "no qemu-system-x86_64"
     if not KERNEL.exists():
         return f"no {KERNEL}"
+    if distribution == "debian" and not (LAB / "debian/sbin/init").exists():
+        return f"no {LAB}/debian"
     return None
 
 
@@ -93,7 +115,8 @@ def initial_root(folder, distribution, init):
             if path.name not in order:
                 order.append(path.name)
                 shutil.copy(path, root / "modules")
-    (root / "init").write_text(INIT.format(modules=" ".join(order), lower=LOWER[distribution], init=init))
+    (root / "init").write_text(INIT.format(modules=" ".join(order), lower=LOWER[distribution], init=init,
+                                           extra=UNIT.format(here=HERE) if distribution == "debian" else ""))
     (root / "init").chmod(0o755)
     names = subprocess.run(["find", "."], cwd=root, check=True, capture_output=True).stdout
     archive = subprocess.run(["cpio", "-o", "-H", "newc", "-R", "0:0", "--quiet"], cwd=root, check=True, input=names,
@@ -104,11 +127,10 @@ def initial_root(folder, distribution, init):
     return path
 
 
-def needed():
+def needed(unpacked):
     """The files that the machine's programs consist of, as it sees them; it copies them before anything is timed. Every
     file that is opened here asks this computer, and meanwhile the idle machine's clock runs on, by as much as this
     computer is slow."""
-    unpacked = LAB / "root"
     environment = {"LD_LIBRARY_PATH": f"{unpacked}/usr/lib/x86_64-linux-gnu", "PATH": "/usr/sbin:/usr/bin:/sbin:/bin"}
     programs = [BINARY, *(unpacked / "usr/lib/x86_64-linux-gnu/NetworkManager").glob("*/*.so")]
     for name in PROGRAMS:
@@ -131,7 +153,7 @@ def boot(words, report, distribution="host", kernel_words="", memory=1500, limit
         f"export LA_BINARY=/build/app/{BINARY.name} PYTHONPATH=/host{shlex.quote(str(HERE / 'radio'))}\n"
         + "".join(f"export {key}={shlex.quote(value)}\n" for key, value in os.environ.items() if "SAN_OPTIONS" in key)
         + f"exec {shlex.join(map(str, words))}\n")
-    (report / "needed").write_text("\n".join(needed()) + "\n")
+    (report / "needed").write_text("\n".join(needed(LAB / ("debian" if distribution == "debian" else "root"))) + "\n")
     (report / "build").write_text(str(BINARY.parents[1]))
     (report / "status").unlink(missing_ok=True)
     init = f"/bin/sh /host{shlex.quote(str(HERE / 'radio/init'))}" if distribution == "host" else "/sbin/init"
@@ -141,7 +163,7 @@ def boot(words, report, distribution="host", kernel_words="", memory=1500, limit
             "qemu-system-x86_64", "-nodefaults", "-no-user-config", "-display", "none", "-no-reboot",
             "-accel", "tcg,thread=single", "-icount", "shift=1,sleep=off", "-rtc", "clock=vm", "-smp", "1",
             "-m", str(memory), "-kernel", KERNEL, "-initrd", initial_root(Path(folder), distribution, init),
-            "-append", f"console=ttyS0 panic=-1 loglevel=3 mitigations=off cryptomgr.notests net.ifnames=0 {kernel_words}", "-serial", "stdio",
+            "-append", f"console=ttyS0 panic=-1 loglevel=3 mitigations=off cryptomgr.notests systemd.show_status=0 net.ifnames=0 {kernel_words}", "-serial", "stdio",
             "-virtfs", "local,path=/,mount_tag=files,security_model=none,readonly=on,multidevs=remap",
             "-virtfs", f"local,path={LAB},mount_tag=lab,security_model=none,readonly=on",
             "-virtfs", f"local,path={report},mount_tag=report,security_model=none",

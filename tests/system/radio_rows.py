@@ -13,6 +13,7 @@ from pathlib import Path
 import radio
 
 sys.path.insert(0, str(radio.HERE / "radio"))
+import distribution  # noqa: E402
 import rows  # noqa: E402
 
 BUILD = Path(os.environ.get("LA_BUILD", radio.BINARY.parents[1])).resolve()
@@ -31,10 +32,15 @@ def play(host, *chosen):
     folder = results(host)
     shutil.rmtree(folder, ignore_errors=True)
     folder.mkdir(parents=True)
-    if reason := radio.missing():
+    booted = host == "debian"
+    if reason := radio.missing("debian" if booted else "host"):
         (folder / "skipped").write_text(reason)
         skip(reason)
-    status = radio.boot(["python3", f"/host{radio.HERE}/radio/rows.py", host, *chosen], folder)
+    script = f"/host{radio.HERE}/radio/"
+    if booted:
+        status = radio.boot(["python3", script + "distribution.py", *chosen], folder, "debian", memory=2000, limit=1100)
+    else:
+        status = radio.boot(["python3", script + "rows.py", host, *chosen], folder, limit=1100)
     sys.exit(0 if status == 0 else 1)
 
 
@@ -54,6 +60,7 @@ def main():
         case ["list"]:
             for host in rows.hosts.HOSTS:
                 print(host, *rows.rows_of(host))
+            print("debian", *distribution.HOSTS)
         case ["play", host, *chosen]:
             play(host, *chosen)
         case ["judge", host, name]:

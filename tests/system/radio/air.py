@@ -64,6 +64,8 @@ def log_of(name):
 
 def make():
     """Brings the radios and what answers at their places; no network is on the air yet."""
+    if LOGS.exists():
+        return
     LOGS.mkdir()
     sh(f"""
         modprobe mac80211_hwsim radios=4
@@ -106,9 +108,9 @@ def heard():
 
 class Network:
     """One network on the air, from the making on until stop(); with dhcp, addresses are to be had there. kind is
-    open, wep, wpa2 or wpa3; place is who offers it."""
+    open, wep, wpa2 or wpa3; place is who offers it; dhcp is how long an address is had."""
 
-    def __init__(self, name, kind="open", key="", adhoc=False, hidden=False, dhcp=False, place="printer"):
+    def __init__(self, name, kind="open", key="", adhoc=False, hidden=False, dhcp=None, place="printer"):
         self.name, self.kind, self.key, self.adhoc, self.hidden, self.place = name, kind, key, adhoc, hidden, place
         self.device = PLACES[place]
         self.processes = []
@@ -125,7 +127,7 @@ class Network:
             net = ADDRESS[self.place].rsplit(".", 1)[0]
             self.processes.append(spawn(
                 "dnsmasq", "--no-daemon", "--conf-file=/dev/null", "--port=0", f"--interface={self.device}",
-                "--bind-interfaces", f"--dhcp-range={net}.50,{net}.99,255.255.255.0,1h", "--no-ping",
+                "--bind-interfaces", f"--dhcp-range={net}.50,{net}.99,255.255.255.0,{self.dhcp}", "--no-ping",
                 f"--dhcp-option=3,{ADDRESS[self.place]}", f"--dhcp-option=6,{ADDRESS[self.place]}", "--user=root",
                 "--dhcp-authoritative", "--pid-file=", f"--dhcp-leasefile={LOGS}/{self.place}.leases",
                 place=self.place, log="dhcp"))
@@ -163,5 +165,5 @@ class Network:
         return address in at(self.place, f"iw dev {self.device} station dump")
 
 
-def home():
-    return Network(HOME, "wpa2", HOME_KEY, dhcp=True, place="home")
+def home(lease="1h"):
+    return Network(HOME, "wpa2", HOME_KEY, dhcp=lease, place="home")

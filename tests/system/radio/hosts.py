@@ -64,15 +64,19 @@ class Host:
 
     def __init__(self):
         self.syslog = []
-        listener = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
-        listener.bind("/dev/log")
-        threading.Thread(target=self._listen, args=(listener,), daemon=True).start()
+        self.listen()
         air.make()
         self.home = air.home() if self.has_home else None
         self.daemons = []
         self.begin()
         self.pristine = self.state()
         self.untouched = True  # the state is still that, by the last look at it
+
+    def listen(self):
+        """Keeps the tool's log lines in `syslog`."""
+        listener = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
+        listener.bind("/dev/log")
+        threading.Thread(target=self._listen, args=(listener,), daemon=True).start()
 
     def _listen(self, listener):
         while True:
@@ -131,13 +135,15 @@ class Host:
             if link["ifname"].startswith(("wlan", "eth")):
                 state[link["ifname"]] = {
                     "up": "UP" in link["flags"], "hardware": link["address"],
-                    "addresses": sorted(
-                        " ".join(f"{key}={value}" for key, value in address.items()
-                                 if key not in ("valid_life_time", "preferred_life_time", "tentative"))
-                        for address in link["addr_info"])}
+                    "addresses": sorted(" ".join(f"{key}={self._timeless(key, value)}" for key, value in address.items()
+                                                 if key != "tentative") for address in link["addr_info"])}
         state["routes"] = sorted(json.dumps(route) for family in "46"
                                  for route in json.loads(sh(f"ip -{family} -j route show table all")))
         return state
+
+    @staticmethod
+    def _timeless(key, value):
+        return ("for ever" if value > 1 << 31 else "for a while") if key.endswith("life_time") else value
 
     @staticmethod
     def joined():
