@@ -9,7 +9,7 @@
 #include "platform/apply/direct/DhcpClient.h"
 #include "platform/apply/direct/KernelWireless.h"
 #include "platform/apply/direct/NameServers.h"
-#include "platform/apply/direct/Radio.h"
+#include "platform/apply/Radio.h"
 #include "platform/apply/direct/Supplicant.h"
 
 namespace platform::apply {

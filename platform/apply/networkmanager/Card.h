@@ -18,6 +18,8 @@ namespace platform::apply {
 struct EarlierCard {
     ProfileNote note;
     bool wasUp = false;  // the profile was complete, with its addresses
+    // The card's own switch, which the daemon sees only where there is a device manager; nothing without one.
+    std::optional<bool> radioOff = {};
 
     template <class Self, class Fields>
     static void listFields(Self& self, Fields& fields) {
@@ -25,6 +27,7 @@ struct EarlierCard {
         fields("Autoconnect", self.note.autoconnect);
         fields("Radio", self.note.radio);
         fields("WasUp", self.wasUp);
+        fields("RadioOff", self.radioOff);
     }
 };
 

@@ -2,6 +2,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "platform/apply/Radio.h"
 #include "platform/apply/networkmanager/Card.h"
 
 namespace platform::apply {
@@ -69,16 +70,22 @@ class GoingCard final : public Card {
         }
         readyDeadline_ = Clock::now() + readyBound;
         if (isWireless()) {
-            RETURN_IF_FAILED(switchRadio());
+            RETURN_IF_FAILED(switchRadioOn());
         }
         stage_ = Stage::becomeReady;
         return {};
     }
 
-    Outcome switchRadio() {
+    Outcome switchRadioOn() {
         const bool isWanted = plan_.wireless && plan_.wireless->powerEnabled.value_or(false);
         if (!isWanted) {
             return {};
+        }
+        std::optional<Radio> radio;
+        RETURN_IF_FAILED(readRadio(interface_, radio));
+        if (radio && radio->isOff) {
+            RETURN_IF_FAILED(platform::apply::switchRadio(interface_, true));
+            readyDeadline_ = Clock::now() + radioBound;
         }
         if (!daemon_.isRadioOn()) {
             RETURN_IF_FAILED(daemon_.setRadio(true));

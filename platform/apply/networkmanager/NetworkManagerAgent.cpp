@@ -10,6 +10,7 @@
 #include <utility>
 
 #include "platform/apply/Agents.h"
+#include "platform/apply/Radio.h"
 #include "platform/apply/networkmanager/Card.h"
 
 namespace platform::apply {
@@ -52,13 +53,19 @@ Outcome NetworkManagerAgent::captureCard(const Device& device, const std::string
              : isVolatile ? "it is left as it is: its profile would be lost with its connection"
                           : "";
     earlier = {{active ? active->uuid : "", device.autoconnect, daemon_.isRadioOn()},
-               active && active->complete};
+               active && active->complete,
+               {}};
+    std::optional<Radio> radio;
+    RETURN_IF_FAILED(readRadio(interface, radio));
+    if (radio) {
+        earlier.radioOff = radio->isOff;
+    }
     if (earlier.note.earlier == profileUUID(interface)) {
         // The record of how it was is lost, but not the profile.
         std::optional<Profile> profile;
         RETURN_IF_FAILED(daemon_.findProfile(profileUUID(interface), profile));
         const bool isKnown = profile && isOurs(profile->sections);
-        earlier = {isKnown ? noteOf(profile->sections) : ProfileNote(), true};
+        earlier = {isKnown ? noteOf(profile->sections) : ProfileNote(), true, {}};
     }
     return {};
 }

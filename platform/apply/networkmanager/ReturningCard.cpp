@@ -2,6 +2,7 @@
 #include <utility>
 
 #include "platform/Log.h"
+#include "platform/apply/Radio.h"
 #include "platform/apply/networkmanager/Card.h"
 
 namespace platform::apply {
@@ -169,6 +170,9 @@ class ReturningCard final : public Card {
         }
         if (!note().radio && daemon_.isRadioOn()) {
             RETURN_IF_FAILED(daemon_.setRadio(false));
+        }
+        if (earlier_.radioOff.value_or(false)) {
+            RETURN_IF_FAILED(switchRadio(interface_, false));
         }
         settle();
         return task_.trouble.empty() ? compare() : Outcome();

@@ -1,4 +1,4 @@
-#include "platform/apply/direct/Radio.h"
+#include "platform/apply/Radio.h"
 
 #include <fcntl.h>
 #include <linux/rfkill.h>
