@@ -137,8 +137,10 @@ class Host:
                     "up": "UP" in link["flags"], "hardware": link["address"],
                     "addresses": sorted(" ".join(f"{key}={self._timeless(key, value)}" for key, value in address.items()
                                                  if key != "tentative") for address in link["addr_info"])}
+        # The way to a card's own link-local address comes a second after the address, when no neighbour has objected.
         state["routes"] = sorted(json.dumps(route) for family in "46"
-                                 for route in json.loads(sh(f"ip -{family} -j route show table all")))
+                                 for route in json.loads(sh(f"ip -{family} -j route show table all"))
+                                 if not (route.get("type") == "local" and route["dst"].startswith("fe80:")))
         return state
 
     @staticmethod
