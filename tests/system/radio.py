@@ -9,22 +9,23 @@ its own root is the same file system with everything that it writes lost at the 
 there, joined to a network "home" when SCRIPT begins:
 
     bare          nobody, nothing prepared: `modprobe mac80211_hwsim radios=N` is SCRIPT's own affair (the default)
-    nobody        wlan0 is down and on no network; air.py in folder radio is at hand (`import air`)
+    nobody        wlan0 is down and on no network
     supplicant    a bare wpa_supplicant on wlan0
     networkmanager, networkmanager-iwd
 
-The machine's clock counts instructions and idle time is skipped: it keeps time however busy this computer is.
-Environment: LA_BINARY, the tool; RADIO_LIMIT, after how many seconds the machine is ended (600).
+On all but the first a Python SCRIPT finds the host as `host` (radio/hosts.py) and networks to put on the air in `air`
+(radio/air.py). The machine's clock counts instructions and idle time is skipped: it keeps time however busy this computer is.
+Environment: LA_BINARY, the tool; RADIO_LIMIT, after how many seconds of this computer's the machine is ended (600).
 """
 import glob
 import gzip
 import os
+import re
 import shlex
 import shutil
 import subprocess
 import sys
 import tempfile
-import time
 from pathlib import Path
 
 HERE = Path(__file__).resolve().parent
@@ -39,6 +40,9 @@ MODULES = ("virtio_pci", "9pnet_virtio", "9p", "overlay")
 # The lower folders of the root come first to last: what is unpacked for the laboratory, then this computer's own.
 LOWER = {"host": "/lab/root:/lab/machine:/host", "debian": "/lab/machine:/lab/debian"}
 
+WORDS = "console=ttyS0 panic=-1 loglevel=3 mitigations=off cryptomgr.notests net.ifnames=0 systemd.show_status=0"
+END_WITH_PARENT = "setpriv", "--pdeathsig", "KILL"
+
 PROGRAMS = ("NetworkManager", "nmcli", "wpa_supplicant", "wpa_cli", "iwd", "hostapd", "dnsmasq", "dbus-daemon",
             "busybox", "dhclient", "iw", "ip", "ss", "nsenter", "sh", "rm", "mkdir", "id", "python3", "wpa_action")
 
@@ -47,8 +51,8 @@ READ = ("/bin", "/sbin", "/lib", "/lib64", "/etc/ld.so.cache", "/etc/nsswitch.co
         "/etc/iproute2/*", "/usr/lib/locale/C.utf8/*", "/usr/lib/locale/C.utf8/*/*", "/usr/lib/x86_64-linux-gnu/libnss_*",
         "/usr/lib/x86_64-linux-gnu/gconv/gconv-modules.cache", "/usr/lib/x86_64-linux-gnu/ossl-modules/*")
 
-# Said of every hub that ends inside the machine, which is what ours is for.
-HUB_WARNING = b"qemu-system-x86_64: warning: hub 0 is not connected to host network\n"
+# What the emulator says of every hub that ends inside the machine, which is what ours is for, and the kernel's last words.
+NOISE = re.compile(r"hub 0 is not connected to host network$|\] sysrq: Power Off$|\] reboot: Power down$")
 
 INIT = """#!/bin/busybox sh
 /bin/busybox --install -s /bin
@@ -145,11 +149,13 @@ def needed(unpacked):
                   if not file.is_relative_to(BINARY.parent))
 
 
-def boot(words, report, distribution="host", kernel_words="", memory=1500, limit=None, output=sys.stdout):
+def boot(words, report, distribution="host", memory=1500, limit=None, output=sys.stdout):
     """Runs the command `words` in a machine of its own. It finds the folder `report` at /report, and may write there.
     Returns its exit status, or None when the machine ended without one."""
+    limit = limit or os.environ.get("RADIO_LIMIT", "600")
     (report / "command").write_text(
-        "export PATH=/usr/sbin:/usr/bin:/sbin:/bin LC_ALL=C PYTHONUTF8=1 PYTHONCOERCECLOCALE=0 PYTHONDONTWRITEBYTECODE=1 PYTHONUNBUFFERED=1\n"
+        "export PATH=/usr/sbin:/usr/bin:/sbin:/bin LC_ALL=C PYTHONUTF8=1 PYTHONCOERCECLOCALE=0\n"
+        "export PYTHONDONTWRITEBYTECODE=1 PYTHONUNBUFFERED=1\n"
         f"export LA_BINARY=/build/app/{BINARY.name} PYTHONPATH=/host{shlex.quote(str(HERE / 'radio'))}\n"
         + "".join(f"export {key}={shlex.quote(value)}\n" for key, value in os.environ.items() if "SAN_OPTIONS" in key)
         + f"exec {shlex.join(map(str, words))}\n")
@@ -159,11 +165,11 @@ def boot(words, report, distribution="host", kernel_words="", memory=1500, limit
     init = f"/bin/sh /host{shlex.quote(str(HERE / 'radio/init'))}" if distribution == "host" else "/sbin/init"
     with tempfile.TemporaryDirectory() as folder:
         machine = subprocess.Popen([
-            "setpriv", "--pdeathsig", "KILL",
+            *END_WITH_PARENT, "timeout", "--foreground", "--signal=KILL", str(limit), *END_WITH_PARENT,
             "qemu-system-x86_64", "-nodefaults", "-no-user-config", "-display", "none", "-no-reboot",
             "-accel", "tcg,thread=single", "-icount", "shift=1,sleep=off", "-rtc", "clock=vm", "-smp", "1",
             "-m", str(memory), "-kernel", KERNEL, "-initrd", initial_root(Path(folder), distribution, init),
-            "-append", f"console=ttyS0 panic=-1 loglevel=3 mitigations=off cryptomgr.notests systemd.show_status=0 net.ifnames=0 {kernel_words}", "-serial", "stdio",
+            "-append", WORDS, "-serial", "stdio",
             "-virtfs", "local,path=/,mount_tag=files,security_model=none,readonly=on,multidevs=remap",
             "-virtfs", f"local,path={LAB},mount_tag=lab,security_model=none,readonly=on",
             "-virtfs", f"local,path={report},mount_tag=report,security_model=none",
@@ -172,27 +178,13 @@ def boot(words, report, distribution="host", kernel_words="", memory=1500, limit
             "-netdev", "hubport,id=far,hubid=0", "-device", "e1000,netdev=far",
         ], stdin=subprocess.DEVNULL, stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
         try:
-            watch = subprocess.Popen(["timeout", str(limit or os.environ.get("RADIO_LIMIT", 600)),
-                                      "tail", f"--pid={machine.pid}", "-f", "/dev/null"])
-            os.set_blocking(machine.stdout.fileno(), False)
-            while True:
-                data = machine.stdout.read()
-                if data:
-                    data = data.replace(HUB_WARNING, b"")
-                    output.write(data.decode("utf-8", "replace").replace("\r", ""))
-                    output.flush()
-                elif data == b"" or machine.poll() is not None:
-                    break
-                elif watch.poll() is not None:
-                    output.write("\nThe machine took too long and was ended.\n")
-                    break
-                else:
-                    time.sleep(0.05)
+            for line in machine.stdout:
+                line = line.decode("utf-8", "replace").rstrip("\r\n")
+                if not NOISE.search(line):
+                    print(line, file=output, flush=True)
         finally:
             machine.kill()
             machine.wait()
-            watch.kill()
-            watch.wait()
     status = report / "status"
     return int(status.read_text()) if status.exists() and status.read_text().strip() else None
 

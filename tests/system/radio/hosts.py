@@ -292,7 +292,6 @@ def main():
     """usage: hosts.py HOST SCRIPT [ARGUMENT ...]: plays SCRIPT on that host, at home; a Python script finds the host
     as `host`."""
     host = HOSTS[sys.argv[1]]()
-    print("ready", Path("/proc/uptime").read_text(), flush=True)
     sys.argv = sys.argv[2:]
     if sys.argv[0] == "python3":
         sys.argv.pop(0)
