@@ -123,6 +123,9 @@ OSStatus WaitForUserToBeDone() {
         std::printf("Done yet? <y/n>");
         std::fflush(stdout);
         const int answer = std::getchar();
+        if (answer == EOF && std::ferror(stdout) != 0) {
+            break;  // nobody answers, and nobody reads the question
+        }
         if (answer == '\r' || answer == '\n') {
             continue;
         }

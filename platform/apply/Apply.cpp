@@ -159,6 +159,9 @@ class Run {
         if (!isChanged) {
             return;
         }
+        if (!changing.empty()) {
+            failures_.note(writeRecord(record_));
+        }
         crew.run(deadline);
         std::vector<std::string> given;
         crew.forEach([this, &given](const Task& task) {
@@ -214,7 +217,8 @@ class Run {
         for (const InterfacePlan& plan : plan_) {
             RecordEntry* const entry = record_.find(plan.name);
             std::optional<InterfacePlan> recorded = withoutKey(plan, record_.salt);
-            if (entry != nullptr && (!entry->completed || entry->plan != recorded)) {
+            if (entry != nullptr) {
+                // All of them are looked at now: a run that is ended before the end of it leaves them marked.
                 entry->plan = std::move(recorded);
                 entry->completed = entry->isLeftAlone();
             }

@@ -20,12 +20,14 @@ std::filesystem::path findSwitch(const std::string& interface, std::uint32_t& nu
     const std::string prefix = "rfkill";
     const std::filesystem::path card = currentHost().sysfsRoot + "/class/net/" + interface + "/phy80211";
     std::error_code error;
-    for (const auto& entry : std::filesystem::directory_iterator(card, error)) {
-        const std::string name = entry.path().filename();
+    // A card may be pulled out in the middle of this, and nothing here throws.
+    for (std::filesystem::directory_iterator entry(card, error), end; !error && entry != end;
+         entry.increment(error)) {
+        const std::string name = entry->path().filename();
         if (name.starts_with(prefix) &&
             std::from_chars(name.data() + prefix.size(), name.data() + name.size(), number).ec ==
                 std::errc()) {
-            return entry.path();
+            return entry->path();
         }
     }
     return {};
@@ -48,9 +50,9 @@ Outcome readRadio(const std::string& interface, std::optional<Radio>& radio) {
         return {};
     }
     Radio found;
-    RETURN_IF_FAILED(readFlag(folder / "soft", found.isOff));
-    RETURN_IF_FAILED(readFlag(folder / "hard", found.isBlocked));
-    radio = found;
+    if (readFlag(folder / "soft", found.isOff).ok() && readFlag(folder / "hard", found.isBlocked).ok()) {
+        radio = found;
+    }
     return {};
 }
 

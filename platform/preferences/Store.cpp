@@ -58,6 +58,7 @@ Outcome load(const StoreFile& file, Snapshot& snapshot) {
         done = parse(file.path(), content, snapshot.tree);
     }
     if (done.ok()) {
+        file.keepPrivate(known);
         snapshot.file = std::move(known);
         remember(file, snapshot);
     }

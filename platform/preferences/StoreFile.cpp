@@ -171,6 +171,16 @@ Outcome StoreFile::makeDirectories() {
     return checkDirectory();
 }
 
+void StoreFile::keepPrivate(KnownFile& known) const {
+    struct stat status {};
+    const int file = known.pin->get();
+    if (::fstat(file, &status) == 0 && (status.st_mode & (S_IRWXG | S_IRWXO)) != 0 &&
+        status.st_uid == ::geteuid() && ::fchmod(file, S_IRUSR | S_IWUSR) == 0 &&
+        ::fstat(file, &status) == 0) {
+        known.identity = identityOf(status);
+    }
+}
+
 Outcome StoreFile::lock(std::chrono::milliseconds wait, FileDescriptor& lock) {
     Outcome made = makeDirectories();
     if (!made.ok()) {

@@ -53,6 +53,9 @@ class StoreFile {
     Outcome look(std::optional<FileIdentity>& identity) const;
     // All of the file, and what it was when it was read. Fails beyond largestPreferencesFile.
     Outcome read(std::string& content, KnownFile& known) const;
+    // Takes the rights of group and others away from a file of this user's own, which holds passwords and may
+    // come from a copy or an editor. known becomes what the file then is.
+    void keepPrivate(KnownFile& known) const;
     // Takes the lock, which goes with the descriptor. Makes the directory (0700) and its parents when they
     // are missing, on the disk before anything is put into them. 3002 when another process keeps it for the
     // whole wait.

@@ -226,6 +226,15 @@ Outcome startHeld(const DhcpSettings& settings, const std::string& hook, Process
     return {};
 }
 
+void signalClient(const std::string& interface, int signal) {
+    std::optional<ClientState> state;
+    if (readState(settingsPath(interface), state).ok() && state) {
+        if (const FileDescriptor handle = handleOf(state->client); handle.isOpen()) {
+            (void)::syscall(SYS_pidfd_send_signal, handle.get(), signal, nullptr, 0);
+        }
+    }
+}
+
 }  // namespace
 
 Outcome readDhcpSettings(const std::string& interface, std::optional<DhcpSettings>& settings) {
@@ -272,12 +281,11 @@ Outcome startDhcpClient(const DhcpSettings& settings) {
 }
 
 void hurryDhcpClient(const std::string& interface) {
-    std::optional<ClientState> state;
-    if (readState(settingsPath(interface), state).ok() && state) {
-        if (const FileDescriptor handle = handleOf(state->client); handle.isOpen()) {
-            (void)::syscall(SYS_pidfd_send_signal, handle.get(), SIGUSR1, nullptr, 0);
-        }
-    }
+    signalClient(interface, SIGUSR1);
+}
+
+void askDhcpClientToEnd(const std::string& interface) {
+    signalClient(interface, SIGTERM);
 }
 
 Outcome stopDhcpClient(const std::string& interface) {

@@ -34,6 +34,8 @@ Outcome startDhcpClient(const DhcpSettings& settings);
 // Has a client without a lease ask for one right now: its card has just come onto a network. A client that
 // has ended is let be.
 void hurryDhcpClient(const std::string& interface);
+// Begins what stopDhcpClient then waits for.
+void askDhcpClientToEnd(const std::string& interface);
 // Lets the client give its lease back to the server and end, and undoes what is left of the lease. Success
 // when there is no client.
 Outcome stopDhcpClient(const std::string& interface);

@@ -56,7 +56,7 @@ class Progress {
             return {kSCStatusFailed, "what the record says of the time before cannot be understood"};
         }
         RETURN_IF_FAILED(interface_.open());
-        return interface_.giveBack(*before, join_, task_->trouble);
+        return interface_.giveBack(*before, join_);
     }
 
     [[nodiscard]] std::optional<Snapshot> snapshot() const {
@@ -179,6 +179,11 @@ class DirectAgent final : public Agent {
 
     void start(std::span<Task> tasks, Clock::time_point deadline) override {
         progress_.clear();
+        for (const Task& task : tasks) {
+            if (task.plan == nullptr) {
+                askDhcpClientToEnd(task.before->interface);  // all of them, before any is waited for
+            }
+        }
         for (Task& task : tasks) {
             progress_.push_back(std::make_unique<Progress>(task, deadline));
             progress_.back()->start();

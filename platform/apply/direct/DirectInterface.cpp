@@ -6,10 +6,10 @@
 #include <ctime>
 
 #include "platform/Log.h"
+#include "platform/apply/Radio.h"
 #include "platform/apply/direct/DhcpClient.h"
 #include "platform/apply/direct/KernelWireless.h"
 #include "platform/apply/direct/NameServers.h"
-#include "platform/apply/Radio.h"
 #include "platform/apply/direct/Supplicant.h"
 
 namespace platform::apply {
@@ -156,7 +156,7 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Sn
 }
 
 Outcome DirectInterface::switchOff(std::string& trouble) {
-    RETURN_IF_FAILED(setInterfaceNameServers(interface_, 0, {}, trouble));
+    RETURN_IF_FAILED(setNameServers(0, {}, trouble));
     RETURN_IF_FAILED(kernel_.makeRoutes(*link_, {}, false));
     RETURN_IF_FAILED(kernel_.makeAddresses(*link_, {}));
     return setUp(false);
@@ -168,7 +168,7 @@ Outcome DirectInterface::switchOn(const InterfacePlan& plan, std::string& troubl
     if (plan.method == IPv4Method::dhcp) {
         LeaseState held;
         RETURN_IF_FAILED(readLease(interface_, held));
-        if (held.isTaken && held.lease) {
+        if (held.lease) {
             addresses = {addressOf(interface_, *held.lease)};
             routes = routesOf(*held.lease, plan.rank);
         }
@@ -185,8 +185,7 @@ Outcome DirectInterface::switchOn(const InterfacePlan& plan, std::string& troubl
         RETURN_IF_FAILED(kernel_.makeRoutes(*link_, routes, true));
     }
     if (plan.method != IPv4Method::dhcp) {
-        return setInterfaceNameServers(interface_, plan.rank, {plan.nameServers, plan.searchDomains},
-                                       trouble);
+        return setNameServers(plan.rank, {plan.nameServers, plan.searchDomains}, trouble);
     }
     return {};
 }
@@ -232,9 +231,20 @@ Outcome DirectInterface::startClient(const InterfacePlan& plan, std::string& tro
     }
     const NameService own{plan.nameServers, plan.searchDomains};
     if (!running || !own.servers.empty()) {
-        RETURN_IF_FAILED(setInterfaceNameServers(interface_, plan.rank, own, trouble));
+        RETURN_IF_FAILED(setNameServers(plan.rank, own, trouble));
     }
-    return running ? Outcome() : startDhcpClient(dhcpSettings(plan));
+    // What an earlier server offered in vain says nothing about the next one.
+    return running ? forgetRefusal(interface_) : startDhcpClient(dhcpSettings(plan));
+}
+
+// Keeps the trouble that was told first.
+Outcome DirectInterface::setNameServers(unsigned rank, const NameService& service, std::string& trouble) {
+    std::string met;
+    RETURN_IF_FAILED(setInterfaceNameServers(interface_, rank, service, met));
+    if (trouble.empty()) {
+        trouble = std::move(met);
+    }
+    return {};
 }
 
 void DirectInterface::noteJoined() {
@@ -243,8 +253,7 @@ void DirectInterface::noteJoined() {
     }
 }
 
-Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join,
-                                  std::string& trouble) {
+Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join) {
     std::optional<Notes> notes;
     RETURN_IF_FAILED(readNotes(interface_, notes));
     if (!notes) {
@@ -252,7 +261,10 @@ Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<Wirele
     }
     Steps steps;
     steps.take(stopDhcpClient(interface_));
-    steps.take(setInterfaceNameServers(interface_, 0, {}, trouble));
+    // The file of before is kept nowhere else: until it is back, this interface is not given back.
+    std::string notBack;
+    steps.take(setInterfaceNameServers(interface_, 0, {}, notBack));
+    steps.take(notBack.empty() ? Outcome() : Outcome(kSCStatusFailed, notBack));
     if (notes->joined) {
         steps.take(leaveNetwork(before, join));
     }

@@ -10,6 +10,7 @@
 #include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/Kernel.h"
+#include "platform/apply/direct/NameServers.h"
 #include "platform/apply/direct/Snapshot.h"
 #include "platform/apply/direct/WirelessJoin.h"
 
@@ -33,8 +34,8 @@ class DirectInterface {
     // to wait for. trouble is told when settings stand that help nothing.
     Outcome apply(const InterfacePlan& plan, const std::optional<Snapshot>& before,
                   std::unique_ptr<WirelessJoin>& join, std::string& trouble);
-    // Makes it as it was, and compares. The same for `join` and trouble.
-    Outcome giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join, std::string& trouble);
+    // Makes it as it was, and compares. The same for `join`.
+    Outcome giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join);
 
     // The card has got onto its network: who was asked for in vain before can answer now.
     void noteJoined();
@@ -43,6 +44,7 @@ class DirectInterface {
     Outcome switchOff(std::string& trouble);
     Outcome switchOn(const InterfacePlan& plan, std::string& trouble);
     Outcome switchRadioOn(const InterfacePlan& plan, bool& isUsable);
+    Outcome setNameServers(unsigned rank, const NameService& service, std::string& trouble);
     Outcome startClient(const InterfacePlan& plan, std::string& trouble);
     Outcome startJoin(const InterfacePlan& plan, bool mayStay, std::unique_ptr<WirelessJoin>& join,
                       std::string& trouble);

@@ -158,7 +158,9 @@ Outcome takeLease(const DhcpSettings& settings, const Lease& lease) {
     if (earlier.lease && !(earlier.lease->address == lease.address)) {
         RETURN_IF_FAILED(dropLease(settings));
     }
-    RETURN_IF_FAILED(writeLease(settings.interface, {false, lease, ""}));
+    // A lease that is only renewed stays taken meanwhile.
+    const bool isRenewed = earlier.isTaken && earlier.lease && earlier.lease->address == lease.address;
+    RETURN_IF_FAILED(writeLease(settings.interface, {isRenewed, lease, ""}));
     RETURN_IF_FAILED(kernel.addAddress(*link, addressOf(settings.interface, lease)));
     if (earlier.lease && earlier.lease->router != lease.router) {
         for (const Route& route : routesOf(*earlier.lease, settings.rank)) {
@@ -182,6 +184,16 @@ Outcome refuseLease(const std::string& interface, const std::string& reason) {
     LeaseState state;
     RETURN_IF_FAILED(readLease(interface, state));
     state.refusal = reason;
+    return writeLease(interface, state);
+}
+
+Outcome forgetRefusal(const std::string& interface) {
+    LeaseState state;
+    RETURN_IF_FAILED(readLease(interface, state));
+    if (state.refusal.empty()) {
+        return {};
+    }
+    state.refusal.clear();
     return writeLease(interface, state);
 }
 

@@ -64,6 +64,9 @@ Outcome dropLease(const DhcpSettings& settings);
 // Keeps the reason why a lease could not be taken, for the run that waits for it.
 Outcome refuseLease(const std::string& interface, const std::string& reason);
 
+// Forgets the reason why the last offer was refused.
+Outcome forgetRefusal(const std::string& interface);
+
 // What the interface's lease has come to.
 struct LeaseState {
     bool isTaken = false;

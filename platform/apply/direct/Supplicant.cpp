@@ -303,16 +303,19 @@ Outcome leaveBySupplicant(const std::string& interface, const std::optional<Know
             ours.push_back(network);
         }
     }
-    // With another network chosen since, ours is off, and what is on or off is somebody else's choice.
-    const bool isOursChosen =
-        std::ranges::any_of(ours, [](const ConfiguredNetwork& network) { return !network.isDisabled; });
+    // With another network chosen since, that one is on, and what is on or off is somebody else's choice.
+    const bool isOursChosen = std::ranges::all_of(networks, [&ours](const ConfiguredNetwork& network) {
+        const bool isOurs = std::ranges::any_of(
+            ours, [&network](const ConfiguredNetwork& one) { return one.number == network.number; });
+        return isOurs || network.isDisabled;
+    });
     for (const ConfiguredNetwork& network : networks) {
         if (before && isOursChosen && network.isDisabled && contains(before->enabled, network.number)) {
             RETURN_IF_FAILED(
                 supplicant.order("ENABLE_NETWORK " + std::to_string(network.number), "switch on a network"));
         }
     }
-    // Last, because their being there is what says that something is to be undone.
+    // Last: a run that is ended before finds them again.
     for (const ConfiguredNetwork& network : ours) {
         RETURN_IF_FAILED(supplicant.removeNetwork(network.number));
     }

@@ -20,6 +20,7 @@ using std::chrono::steady_clock;
 
 constexpr milliseconds answerTime{2000};
 constexpr std::size_t largestAnswer = std::size_t{64} << 10U;
+constexpr std::size_t mostEntries = 1000;
 // The value of a network's "id_str", which is a note for whoever configures it.
 constexpr std::string_view ourTag = "\"location-assistant\"";
 
@@ -170,16 +171,26 @@ Outcome SupplicantSocket::order(const std::string& request, const char* what) {
 
 Outcome SupplicantSocket::listNetworks(std::vector<ConfiguredNetwork>& networks) {
     networks.clear();
-    std::string answer;
-    RETURN_IF_FAILED(ask("LIST_NETWORKS", "list its networks", answer));
-    for (const std::string_view line : split(answer, '\n')) {
-        // number, name, bssid, flags
-        const std::vector<std::string_view> fields = split(line, '\t');
-        const auto number = fields.size() >= 3 ? parseNumber(fields[0]) : std::nullopt;
-        if (number) {
+    // One answer holds a few dozen at most; the next ones come behind the last of it.
+    for (std::size_t before = 1; networks.size() != before && networks.size() < mostEntries;) {
+        before = networks.size();
+        const std::string behind =
+            networks.empty() ? "" : " LAST_ID=" + std::to_string(networks.back().number);
+        std::string answer;
+        RETURN_IF_FAILED(ask("LIST_NETWORKS" + behind, "list its networks", answer));
+        for (const std::string_view line : split(answer, '\n')) {
+            // number, name, bssid, flags
+            const std::vector<std::string_view> fields = split(line, '\t');
+            const auto number = fields.size() >= 3 ? parseNumber(fields[0]) : std::nullopt;
+            if (!number || (!networks.empty() && *number <= networks.back().number)) {
+                continue;
+            }
             const bool isDisabled =
                 fields.size() > 3 && fields[3].find("[DISABLED]") != std::string_view::npos;
             networks.push_back({*number, isDisabled, fields[1].empty()});
+        }
+        if (behind.empty() && networks.empty()) {
+            break;
         }
     }
     return {};
@@ -235,24 +246,29 @@ Outcome SupplicantSocket::readStatus(std::map<std::string, std::string, std::les
 
 Outcome SupplicantSocket::readHeard(const std::string& name, std::vector<HeardNetwork>& heard) {
     heard.clear();
-    std::string answer;
-    RETURN_IF_FAILED(ask("SCAN_RESULTS", "list what it hears", answer));
-    for (const std::string_view line : split(answer, '\n')) {
-        // bssid, frequency, signal level, flags, name
-        const std::vector<std::string_view> fields = split(line, '\t');
-        if (fields.size() != 5 || unescape(fields[4]) != name) {
+    // One by one, since one answer would not hold them all. The mask asks for what is read here.
+    std::string which = "FIRST";
+    for (std::size_t i = 0; i < mostEntries; ++i) {
+        std::string answer;
+        RETURN_IF_FAILED(ask("BSS " + which + " MASK=0x1a87", "list what it hears", answer));
+        const std::string_view id = lineOf(answer, "id");
+        if (id.empty()) {
+            break;
+        }
+        which = "NEXT-" + std::string(id);
+        if (unescape(lineOf(answer, "ssid")) != name) {
             continue;
         }
+        const std::string_view level = lineOf(answer, "level");
+        const std::string_view flags = lineOf(answer, "flags");
         HeardNetwork network;
-        network.bssid = fields[0];
-        network.frequency = parseNumber(fields[1]).value_or(0);
+        network.bssid = lineOf(answer, "bssid");
+        network.frequency = parseNumber(lineOf(answer, "freq")).value_or(0);
         // In dBm, below zero.
-        std::from_chars(fields[2].data(), fields[2].data() + fields[2].size(), network.strength);
-        network.security = securityOf(fields[3]);
-        network.isAdHoc = fields[3].find("[IBSS]") != std::string_view::npos;
-        std::string details;
-        RETURN_IF_FAILED(ask("BSS " + network.bssid, "tell about a network", details));
-        network.age = std::chrono::seconds(parseNumber(lineOf(details, "age")).value_or(0));
+        std::from_chars(level.data(), level.data() + level.size(), network.strength);
+        network.security = securityOf(flags);
+        network.isAdHoc = flags.find("[IBSS]") != std::string_view::npos;
+        network.age = std::chrono::seconds(parseNumber(lineOf(answer, "age")).value_or(0));
         heard.push_back(std::move(network));
     }
     return {};

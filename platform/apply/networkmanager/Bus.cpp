@@ -53,6 +53,11 @@ Outcome fromBus(const std::string& what, int result) {
 
 int noteOwner(sd_bus_message* message, void* left, sd_bus_error* /*error*/) {
     const char* before = nullptr;
+    const char* const sender = sd_bus_message_get_sender(message);
+    // Only the bus itself tells who owns a name; anybody can send such a message to this process alone.
+    if (sender == nullptr || std::strcmp(sender, "org.freedesktop.DBus") != 0) {
+        return 0;
+    }
     if (sd_bus_message_read(message, "sss", nullptr, &before, nullptr) >= 0 && *before != '\0') {
         *static_cast<bool*>(left) = true;
     }

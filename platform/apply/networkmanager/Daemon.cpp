@@ -342,7 +342,11 @@ Outcome Daemon::disconnect(const Device& device) {
     Message reply;
     std::string error;
     Outcome outcome = call(device.path, deviceInterface, "Disconnect", {}, reply, &error);
-    return error == "org.freedesktop.NetworkManager.Device.NotActive" || isGone(error) ? Outcome() : outcome;
+    if (isGone(error)) {
+        devices_[device.path] = 0;
+        return {};
+    }
+    return error == "org.freedesktop.NetworkManager.Device.NotActive" ? Outcome() : outcome;
 }
 
 Outcome Daemon::setManaged(const Device& device, bool managed) {

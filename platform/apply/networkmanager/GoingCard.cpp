@@ -62,8 +62,7 @@ class GoingCard final : public Card {
             return daemon_.disconnect(device_);
         }
         if (!isWireless() && network()) {
-            settle("a network to join is named, and the card is not a wireless one");
-            return {};
+            task_.trouble = "a network to join is named, and the card is not a wireless one";
         }
         if (!device_.managed) {
             RETURN_IF_FAILED(daemon_.setManaged(device_, true));

@@ -29,7 +29,7 @@ class StandInSupplicant {
     };
     // The networks and the air are written before the first command and read after the last.
     std::map<int, Network> networks;
-    std::string scanResults = "bssid / frequency / signal level / flags / ssid\n";
+    std::string scanResults = "bssid / frequency / signal level / flags / ssid\n";  // a line each
     std::string heardLater;  // once a network is looked for
     int age = 0;             // of everything heard, in seconds
     // What joining comes to: a notice, and whether the card then is on the network.
@@ -141,10 +141,24 @@ class StandInSupplicant {
                         (network.isDisabled ? "[DISABLED]" : "") + "\n";
             }
             return list;
-        } else if (name == "SCAN_RESULTS") {
-            return scanResults;
         } else if (name == "BSS") {
-            return "id=1\nage=" + std::to_string(age) + "\n";
+            // FIRST, or NEXT- and a number: the lines of the air, counted from 1.
+            const std::size_t dash = command.find('-');
+            int wanted = dash == std::string::npos ? 1 : std::stoi(command.substr(dash + 1)) + 1;
+            std::istringstream lines(scanResults);
+            std::string line;
+            while (wanted-- >= 0 && std::getline(lines, line)) {
+            }
+            std::istringstream fields(line);
+            std::string bssid, frequency, level, flags, ssid;
+            if (!lines || !(fields >> bssid >> frequency >> level >> flags)) {
+                return "";
+            }
+            std::getline(fields >> std::ws, ssid);
+            return "id=" +
+                   std::to_string(dash == std::string::npos ? 1 : std::stoi(command.substr(dash + 1)) + 1) +
+                   "\nbssid=" + bssid + "\nfreq=" + frequency + "\nlevel=" + level +
+                   "\nage=" + std::to_string(age) + "\nflags=" + flags + "\nssid=" + ssid + "\n";
         } else if (name == "STATUS") {
             return current_ < 0 ? "wpa_state=SCANNING\n"
                                 : "bssid=02:00:00:00:00:01\nid=" + std::to_string(current_) +

@@ -174,6 +174,16 @@ TEST_F(SupplicantTest, ComesBackToWhatItFound) {
     EXPECT_EQ(Lines{"REMOVE_NETWORK 2"}, supplicant->changes());
     EXPECT_FALSE(supplicant->networks[1].isDisabled);
 
+    // A key that fits nothing ends the looking; what was on before is switched on all the same.
+    supplicant->networks[0].isDisabled = false;
+    supplicant->networks[1].isDisabled = true;
+    EXPECT_EQ("", join(settings));
+    EXPECT_NE("", join({{}, "printer", "four"}));
+    EXPECT_TRUE(supplicant->networks[0].isDisabled);
+    EXPECT_TRUE(leaveBySupplicant("wlan0", before, back).ok());
+    EXPECT_FALSE(supplicant->networks[0].isDisabled);
+    supplicant->changes();
+
     // A run that ended right after adding one left it without a name or a mark.
     supplicant->networks[7];
     EXPECT_TRUE(leaveBySupplicant("wlan0", before, back).ok());

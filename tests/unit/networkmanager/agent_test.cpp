@@ -286,7 +286,9 @@ TEST_F(NetworkManager, aWiredCardJoinsNoNetwork) {
     standIn_.cards[0].type = 1;
     EXPECT_EQ(takeOver(printer_, capture()).trouble,
               "a network to join is named, and the card is not a wireless one");
-    EXPECT_EQ(changes(), Changes());
+    EXPECT_EQ(changes(), (Changes{"AddConnection2 location-assistant wlan0",
+                                  "ActivateConnection location-assistant wlan0 on wlan0"}))
+        << "the other settings stand";
 }
 
 TEST_F(NetworkManager, cardWithoutCarrier) {
