@@ -34,7 +34,6 @@ constexpr std::uint32_t inMemory = 0x2;
 constexpr std::uint32_t blockAutoconnect = 0x20;
 
 constexpr std::uint32_t reasonNone = 0;
-constexpr std::uint32_t reasonNewActivation = 60;
 
 constexpr std::uint32_t modeAdHoc = 1;
 constexpr std::uint32_t accessPrivacy = 0x1;
@@ -84,46 +83,6 @@ Outcome readPath(const char* what, const Message& reply, std::string& path) {
 }
 
 }  // namespace
-
-std::string describeFailure(std::uint32_t reason) {
-    switch (reason) {
-        case 4:
-            return "the card could not be configured";
-        case 5:
-        case 6:
-        case 15:
-        case 16:
-        case 17:
-            return "no DHCP server answered";
-        case 7:
-            return "the network's key is wrong or missing";
-        case 8:
-        case 9:
-        case 10:
-        case 11:
-            return "the network broke off the joining";
-        case 35:
-            return "the card's firmware is missing";
-        case 36:
-            return "the card was taken out";
-        case 37:
-            return "the computer went to sleep";
-        case 38:
-            return "the profile was deleted meanwhile";
-        case 39:
-            return "somebody disconnected the card meanwhile";
-        case 40:
-            return "the cable is out, or the network went away";
-        case 53:
-            return "the network was not found";
-        case reasonNewActivation:
-            return "somebody else took over the card";
-        case 64:
-            return "somebody else uses the address";
-        default:
-            return "NetworkManager gives the reason " + std::to_string(reason);
-    }
-}
 
 Outcome Daemon::call(const std::string& path, const char* interface, const char* member, Arguments arguments,
                      Message& reply, std::string* error, std::string_view secret) {
@@ -421,6 +380,29 @@ Outcome Daemon::readHeard(const Device& device, const std::string& network,
                          std::chrono::seconds(std::max<std::int64_t>(now.tv_sec - lastHeard, 0))});
     }
     return {};
+}
+
+Outcome Daemon::scanFor(const Device& device, const std::string& network) {
+    Message reply;
+    std::string error;
+    Outcome outcome = call(
+        device.path, wirelessInterface, "RequestScan",
+        [&network](sd_bus_message* m) {
+            int result = sd_bus_message_open_container(m, 'a', "{sv}");
+            result = result < 0 ? result : sd_bus_message_open_container(m, 'e', "sv");
+            result = result < 0 ? result : sd_bus_message_append(m, "s", "ssids");
+            result = result < 0 ? result : sd_bus_message_open_container(m, 'v', "aay");
+            result = result < 0 ? result : sd_bus_message_open_container(m, 'a', "ay");
+            result =
+                result < 0 ? result : sd_bus_message_append_array(m, 'y', network.data(), network.size());
+            for (int depth = 0; depth < 4; ++depth) {
+                result = result < 0 ? result : sd_bus_message_close_container(m);
+            }
+            return result;
+        },
+        reply, &error);
+    // It has just looked, or is busy with joining, for which it looks by itself.
+    return error.empty() ? outcome : Outcome();
 }
 
 Outcome Daemon::listen() {

@@ -99,6 +99,10 @@ class Daemon {
     Outcome setRadio(bool on);
     // The networks of this name that the card hears, with their ages.
     Outcome readHeard(const Device& device, const std::string& network, std::vector<HeardNetwork>& heard);
+    // Has the card look for the network by its name, which one that does not announce itself answers to.
+    // Success when the daemon does not look now.
+    Outcome scanFor(const Device& device, const std::string& network);
+
     // From here on the signals of cards and profiles are taken in.
     Outcome listen();
     // Waits for a signal at most until the time; fails when the daemon left the bus.

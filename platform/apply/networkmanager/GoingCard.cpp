@@ -10,6 +10,7 @@ namespace {
 
 // Between two looks at what is on the air when nothing tells of a change.
 constexpr std::chrono::seconds lookAgain{2};
+constexpr std::chrono::seconds scanAgain{3};
 
 class GoingCard final : public Card {
   public:
@@ -17,7 +18,17 @@ class GoingCard final : public Card {
         : Card(daemon, task, deadline), plan_(*task.plan), earlier_(std::move(earlier)) {}
 
   private:
-    enum class Stage { begin, comeToRest, becomeReady, chooseLink, leaveOther, store, comeUp, tellFailure };
+    enum class Stage {
+        begin,
+        comeToRest,
+        becomeReady,
+        chooseLink,
+        leaveOther,
+        store,
+        comeUp,
+        search,
+        tellFailure
+    };
 
     Outcome advance() override {
         switch (stage_) {
@@ -35,6 +46,8 @@ class GoingCard final : public Card {
                 return store();
             case Stage::comeUp:
                 return comeUp();
+            case Stage::search:
+                return search();
             case Stage::tellFailure:
                 return tellFailure();
         }
@@ -166,12 +179,14 @@ class GoingCard final : public Card {
             reason_ = "the network was not found";
         }
         // What is not heard now may be heard again: the daemon keeps what it was told.
-        const bool isNew = !link_ || !link_->choice ||
-                           (decision.choice->isHeard && !decision.choice->isSameJoin(*link_->choice));
+        const bool isNew =
+            !link_ || !link_->choice ||
+            (decision.choice->isHeard && (isSearching_ || !decision.choice->isSameJoin(*link_->choice)));
         if (!isNew) {
-            stage_ = Stage::comeUp;
+            stage_ = isSearching_ ? Stage::search : Stage::comeUp;
             return {};
         }
+        isSearching_ = false;
         if (!link_) {
             link_.emplace();
         }
@@ -298,7 +313,30 @@ class GoingCard final : public Card {
         return daemon_.setAutoconnect(device_, true);
     }
 
+    // There are daemons that try only what they have heard: then it is looked for first.
+    Outcome search() {
+        if (isLate()) {
+            return giveUp();
+        }
+        if (Clock::now() >= scanAgainAt_) {
+            scanAgainAt_ = Clock::now() + scanAgain;
+            RETURN_IF_FAILED(daemon_.scanFor(device_, network().value_or("")));
+        }
+        if (changesOnAir_ == daemon_.changesOnAir() && Clock::now() < lookAgainAt_) {
+            waitUntil(std::min(lookAgainAt_, scanAgainAt_));
+        } else {
+            stage_ = Stage::chooseLink;
+        }
+        return {};
+    }
+
     Outcome tellFailure() {
+        if (link_ && link_->choice && !link_->choice->isHeard) {
+            isSearching_ = true;
+            active_.reset();
+            stage_ = Stage::search;
+            return {};
+        }
         const std::uint32_t reason = daemon_.failureOf(device_.path);
         if (reason == 0 && Clock::now() < reasonDeadline_) {
             waitUntil(reasonDeadline_);
@@ -322,7 +360,9 @@ class GoingCard final : public Card {
     Clock::time_point readyDeadline_;
     Clock::time_point reasonDeadline_;
     Clock::time_point lookAgainAt_;
+    Clock::time_point scanAgainAt_;
     unsigned changesOnAir_ = 0;
+    bool isSearching_ = false;
     std::optional<Active> active_;
     std::optional<WirelessLink> link_;  // of a wireless card
     std::string reason_;                // why the card is not on its network so far
