@@ -43,7 +43,7 @@ LOWER = {"host": "/lab/root:/lab/machine:/host", "debian": "/lab/machine:/lab/de
 WORDS = "console=ttyS0 panic=-1 loglevel=3 mitigations=off cryptomgr.notests net.ifnames=0 systemd.show_status=0"
 END_WITH_PARENT = "setpriv", "--pdeathsig", "KILL"
 
-PROGRAMS = ("NetworkManager", "nmcli", "wpa_supplicant", "wpa_cli", "iwd", "hostapd", "dnsmasq", "dbus-daemon",
+PROGRAMS = ("NetworkManager", "nmcli", "wpa_supplicant", "wpa_cli", "iwd", "hostapd", "dnsmasq", "dbus-daemon", "udevadm",
             "busybox", "dhclient", "iw", "ip", "ss", "nsenter", "sh", "rm", "mkdir", "id", "python3", "wpa_action")
 
 READ = ("/bin", "/sbin", "/lib", "/lib64", "/etc/ld.so.cache", "/etc/nsswitch.conf", "/etc/passwd", "/etc/group", "/etc/hosts",

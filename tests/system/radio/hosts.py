@@ -215,8 +215,11 @@ class NetworkManager(Host):
         (folder / "home.nmconnection").write_text(HOME_PROFILE)
         (folder / "home.nmconnection").chmod(0o600)
         Path("/run/air/bus.conf").write_text(BUS)
-        # Without udev NetworkManager takes devices for ready only where sysfs is read-only.
-        sh("mount -o remount,bind,ro /sys")
+        # udev tells NetworkManager of devices and switches.
+        self.daemons.append(spawn("/usr/lib/systemd/systemd-udevd", log="udev"))
+        wait_until(Path("/run/udev/control").exists, 20, "udev")
+        sh("udevadm trigger --action=add --subsystem-match=net --subsystem-match=rfkill --subsystem-match=ieee80211; "
+           "udevadm settle")
         self.daemons.append(spawn("dbus-daemon", "--config-file=/run/air/bus.conf", "--nofork", "--nopidfile"))
         wait_until(Path("/run/dbus/system_bus_socket").exists, 10, "the bus")
         self.start_supplicant()
