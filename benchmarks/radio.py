@@ -3,8 +3,8 @@
 machine with NetworkManager: from the start to the printer's page, and from the start to the home network's address.
 
 The seconds are the machine's own, whose clock does not depend on how busy this computer is. nmcli's profile is made
-before it is timed. A network that was not heard before has been on the air for a moment only; nmcli is then told to look
-for it first. Medians of several runs, taken in turn. Needs LA_BINARY.
+before it is timed. A network that was not heard before has been on the air for a moment only; nmcli is then told to
+look for it first. Medians of several runs, taken in turn. Needs LA_BINARY.
 """
 import os
 import statistics
@@ -16,14 +16,14 @@ from pathlib import Path
 
 RUNS = 3
 LIMIT = 60
-PROFILE = ("connection add type wifi ifname wlan0 con-name printer ssid '{}' wifi.mode {} autoconnect no ipv4.method manual "
-           "ipv4.addresses 192.0.0.199/24 ipv4.gateway 192.0.0.192 ipv6.method disabled")
+PROFILE = ("connection add type wifi ifname wlan0 con-name printer ssid '{}' wifi.mode {} autoconnect no "
+           "ipv4.method manual ipv4.addresses 192.0.0.199/24 ipv4.gateway 192.0.0.192 ipv6.method disabled")
 
 
 def seconds_until(reached, command):
     """Runs a command and returns the seconds from its start until the condition holds, by when it may still run."""
     start = time.monotonic()
-    with subprocess.Popen(command, stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL, shell=isinstance(command, str)):
+    with subprocess.Popen(["sh", "-c", command], stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL):
         while not reached():
             if time.monotonic() > start + LIMIT:
                 return None
@@ -50,8 +50,8 @@ def measure(host, air):
         elif heard(name):
             print(f"{name} was heard already", flush=True)
         if ours:
-            there = seconds_until(page, [os.environ["LA_BINARY"], "create", "from_intro", name])
-            back = seconds_until(host.at_home, [os.environ["LA_BINARY"], "remove"])
+            there = seconds_until(page, f"$LA_BINARY create from_intro '{name}'")
+            back = seconds_until(host.at_home, "$LA_BINARY remove")
         else:
             host.nmcli(PROFILE.format(name, "adhoc" if adhoc else "infrastructure"))
             up = "nmcli connection up printer"
@@ -77,10 +77,11 @@ def measure(host, air):
             for index, way in enumerate(("page", "home")):
                 times = [[run[index] for run in results[ours]] for ours in (True, False)]
                 failed = [sum(each is None for each in column) for column in times]
-                mine, theirs = (statistics.median(LIMIT if each is None else each for each in column) for column in times)
+                mine, theirs = (statistics.median(LIMIT if each is None else each for each in column)
+                                for column in times)
+                remark = f"   did not succeed: {failed[0]} and {failed[1]} of {RUNS}" if any(failed) else ""
                 print(f"{'ad-hoc' if adhoc else 'access point':<16} {'yes' if before else 'no':<13} {way:<6} "
-                      f"{mine:6.2f}s {theirs:6.2f}s {mine / theirs:6.2f}"
-                      + (f"   did not succeed: {failed[0]} and {failed[1]} of {RUNS}" if any(failed) else ""), flush=True)
+                      f"{mine:6.2f}s {theirs:6.2f}s {mine / theirs:6.2f}{remark}", flush=True)
 
 
 def main():

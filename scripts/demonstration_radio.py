@@ -1,5 +1,6 @@
 #!/usr/bin/env python3
-"""The main job over the air, in an emulated machine with simulated radios. Exits 1 when the way back did not lead back."""
+"""The main job over the air, in an emulated machine with simulated radios. Exits 1 when the way back did not lead
+back."""
 import difflib
 import pprint
 import subprocess

@@ -14,7 +14,8 @@ there, joined to a network "home" when SCRIPT begins:
     networkmanager, networkmanager-iwd
 
 On all but the first a Python SCRIPT finds the host as `host` (radio/hosts.py) and networks to put on the air in `air`
-(radio/air.py). The machine's clock counts instructions and idle time is skipped: it keeps time however busy this computer is.
+(radio/air.py). The machine's clock counts instructions and idle time is skipped: it keeps time however busy this
+computer is.
 Environment: LA_BINARY, the tool; RADIO_LIMIT, after how many seconds of this computer's the machine is ended (600).
 """
 import glob
@@ -43,15 +44,17 @@ LOWER = {"host": "/lab/root:/lab/machine:/host", "debian": "/lab/machine:/lab/de
 WORDS = "console=ttyS0 panic=-1 loglevel=3 mitigations=off cryptomgr.notests net.ifnames=0 systemd.show_status=0"
 END_WITH_PARENT = "setpriv", "--pdeathsig", "KILL"
 
-PROGRAMS = ("NetworkManager", "nmcli", "wpa_supplicant", "wpa_cli", "iwd", "hostapd", "dnsmasq", "dbus-daemon", "udevadm",
+PROGRAMS = ("NetworkManager", "nmcli", "wpa_supplicant", "wpa_cli", "iwd", "hostapd", "dnsmasq", "dbus-daemon",
+            "udevadm",
             "busybox", "dhclient", "iw", "ip", "ss", "nsenter", "sh", "rm", "mkdir", "id", "python3", "wpa_action")
 
-READ = ("/bin", "/sbin", "/lib", "/lib64", "/etc/ld.so.cache", "/etc/nsswitch.conf", "/etc/passwd", "/etc/group", "/etc/hosts",
-        "/etc/host.conf", "/etc/gai.conf", "/etc/services", "/etc/protocols", "/etc/localtime", "/etc/ssl/openssl.cnf",
-        "/etc/iproute2/*", "/usr/lib/locale/C.utf8/*", "/usr/lib/locale/C.utf8/*/*", "/usr/lib/x86_64-linux-gnu/libnss_*",
+READ = ("/bin", "/sbin", "/lib", "/lib64", "/etc/ld.so.cache", "/etc/nsswitch.conf", "/etc/passwd", "/etc/group",
+        "/etc/hosts", "/etc/host.conf", "/etc/gai.conf", "/etc/services", "/etc/protocols", "/etc/localtime",
+        "/etc/ssl/openssl.cnf",
+        "/etc/iproute2/*", "/usr/lib/x86_64-linux-gnu/libnss_*",
         "/usr/lib/x86_64-linux-gnu/gconv/gconv-modules.cache", "/usr/lib/x86_64-linux-gnu/ossl-modules/*")
 
-# What the emulator says of every hub that ends inside the machine, which is what ours is for, and the kernel's last words.
+# What the emulator says of every hub that ends inside the machine, as ours shall, and the kernel's last words.
 NOISE = re.compile(r"hub 0 is not connected to host network$|\] sysrq: Power Off$|\] reboot: Power down$")
 
 INIT = """#!/bin/busybox sh
@@ -143,7 +146,7 @@ def needed(unpacked):
     files = {Path(each) for pattern in READ for each in glob.glob(pattern)}
     for program in filter(None, programs):
         listed = subprocess.run(["ldd", program], env=environment, capture_output=True, text=True, check=False).stdout
-        files |= {Path(program), *(Path(word) for line in listed.splitlines() for word in line.split() if word[0] == "/")}
+        files |= {Path(program), *(Path(word) for word in listed.split() if word[0] == "/")}
     files |= {file.resolve() for file in files}
     return sorted(f"/{file.relative_to(unpacked)}" if file.is_relative_to(unpacked) else str(file) for file in files
                   if not file.is_relative_to(BINARY.parent))

@@ -98,7 +98,8 @@ class Host:
         pass
 
     def at_home(self):
-        return self.joined() == (air.HOME, "access point") and any(a.startswith("192.168.50.") for a in self.addresses())
+        return self.joined() == (air.HOME, "access point") and any(
+            each.startswith("192.168.50.") for each in self.addresses())
 
     def begin_again(self):
         """Makes the machine what it was at its start, whatever was left behind."""

@@ -259,8 +259,8 @@ def home_is_gone(visit):
 @row("nobody")
 def home_joined_by_the_kernel(visit):
     visit.offer(name="Open home", place="home")
-    visit.disturb(air.sh, "ip link set wlan0 up; iw dev wlan0 connect 'Open home'; ip addr add 192.168.50.20/24 brd + dev wlan0; "
-                         "ip route add default via 192.168.50.1 dev wlan0")
+    visit.disturb(air.sh, "ip link set wlan0 up; iw dev wlan0 connect 'Open home'; "
+                  "ip addr add 192.168.50.20/24 brd + dev wlan0; ip route add default via 192.168.50.1 dev wlan0")
     wait_until(lambda: visit.host.joined() == ("Open home", "access point"), 10, "at home")
     time.sleep(2)
     visit.offer()
@@ -271,8 +271,8 @@ def home_joined_by_the_kernel(visit):
 def assisted_run(visit):
     visit.offer()
     nmcli = visit.host.nmcli
-    visit.disturb(nmcli, f"connection add type wifi ifname wlan0 con-name printer ssid '{visit.name}' ipv4.method manual "
-          "ipv4.addresses 192.0.0.7/24 ipv6.method disabled connection.autoconnect no")
+    visit.disturb(nmcli, f"connection add type wifi ifname wlan0 con-name printer ssid '{visit.name}' "
+                  "ipv4.method manual ipv4.addresses 192.0.0.7/24 ipv6.method disabled connection.autoconnect no")
     wait_until(lambda: "activated" in nmcli("-w 30 connection up printer"), 60, "the printer's network joined by hand")
     try:
         visit.remember()
