@@ -102,7 +102,7 @@ def missing(distribution="host"):
     if not KERNEL.exists():
         return f"no {KERNEL}"
     if distribution == "debian" and not (LAB / "debian/sbin/init").exists():
-        return f"no {LAB}/debian"
+        return f"no {LAB}/debian: scripts/install-dependencies debian makes it"
     return None
 
 
