@@ -383,24 +383,26 @@ Outcome Daemon::readHeard(const Device& device, const std::string& network,
 }
 
 Outcome Daemon::scanFor(const Device& device, const std::string& network) {
+    const auto byName = [&network](sd_bus_message* m) {
+        int result = sd_bus_message_open_container(m, 'a', "{sv}");
+        result = result < 0 ? result : sd_bus_message_open_container(m, 'e', "sv");
+        result = result < 0 ? result : sd_bus_message_append(m, "s", "ssids");
+        result = result < 0 ? result : sd_bus_message_open_container(m, 'v', "aay");
+        result = result < 0 ? result : sd_bus_message_open_container(m, 'a', "ay");
+        result = result < 0 ? result : sd_bus_message_append_array(m, 'y', network.data(), network.size());
+        for (int depth = 0; depth < 4; ++depth) {
+            result = result < 0 ? result : sd_bus_message_close_container(m);
+        }
+        return result;
+    };
+    const auto byNoName = [](sd_bus_message* m) { return sd_bus_message_append(m, "a{sv}", 0); };
     Message reply;
     std::string error;
-    Outcome outcome = call(
-        device.path, wirelessInterface, "RequestScan",
-        [&network](sd_bus_message* m) {
-            int result = sd_bus_message_open_container(m, 'a', "{sv}");
-            result = result < 0 ? result : sd_bus_message_open_container(m, 'e', "sv");
-            result = result < 0 ? result : sd_bus_message_append(m, "s", "ssids");
-            result = result < 0 ? result : sd_bus_message_open_container(m, 'v', "aay");
-            result = result < 0 ? result : sd_bus_message_open_container(m, 'a', "ay");
-            result =
-                result < 0 ? result : sd_bus_message_append_array(m, 'y', network.data(), network.size());
-            for (int depth = 0; depth < 4; ++depth) {
-                result = result < 0 ? result : sd_bus_message_close_container(m);
-            }
-            return result;
-        },
-        reply, &error);
+    Outcome outcome = call(device.path, wirelessInterface, "RequestScan", byName, reply, &error);
+    if (!error.empty()) {
+        // Not every daemon below it can call out for a name.
+        outcome = call(device.path, wirelessInterface, "RequestScan", byNoName, reply, &error);
+    }
     // It has just looked, or is busy with joining, for which it looks by itself.
     return error.empty() ? outcome : Outcome();
 }

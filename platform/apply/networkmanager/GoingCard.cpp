@@ -95,11 +95,11 @@ class GoingCard final : public Card {
         }
         std::optional<Radio> radio;
         RETURN_IF_FAILED(readRadio(interface_, radio));
+        // The card's own switch, when it has one: the daemon switches all cards, and follows this one.
         if (radio && radio->isOff) {
-            RETURN_IF_FAILED(platform::apply::switchRadio(interface_, true));
+            RETURN_IF_FAILED(switchRadio(interface_, true));
             readyDeadline_ = Clock::now() + radioBound;
-        }
-        if (!daemon_.isRadioOn()) {
+        } else if (!daemon_.isRadioOn()) {
             RETURN_IF_FAILED(daemon_.setRadio(true));
             readyDeadline_ = Clock::now() + radioBound;
         }

@@ -168,11 +168,10 @@ class ReturningCard final : public Card {
         if (device && device->autoconnect != note().autoconnect) {
             RETURN_IF_FAILED(daemon_.setAutoconnect(*device, note().autoconnect));
         }
-        if (!note().radio && daemon_.isRadioOn()) {
-            RETURN_IF_FAILED(daemon_.setRadio(false));
-        }
         if (earlier_.radioOff.value_or(false)) {
             RETURN_IF_FAILED(switchRadio(interface_, false));
+        } else if (!earlier_.radioOff && !note().radio && daemon_.isRadioOn()) {
+            RETURN_IF_FAILED(daemon_.setRadio(false));
         }
         settle();
         return task_.trouble.empty() ? compare() : Outcome();

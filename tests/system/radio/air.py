@@ -4,6 +4,7 @@ Each of the three lives in a network namespace of its own. Networks of one boot 
 remembers for minutes what was heard.
 """
 import re
+import struct
 import subprocess
 import time
 from pathlib import Path
@@ -95,6 +96,12 @@ def wired_card(present):
 
 def heard():
     """Every network on the air as (name, address, kind), from a scan of this moment; the ear is nobody's card."""
+    # A daemon that switches radios off switches off all there are, wherever they are.
+    card = {folder.name for folder in Path("/sys/class/ieee80211/phy0").glob("rfkill*")}
+    with open("/dev/rfkill", "wb", buffering=0) as device:
+        for folder in Path("/sys/class/rfkill").glob("rfkill*"):
+            if folder.name not in card:
+                device.write(struct.pack("=IBBBB", int(folder.name[6:]), 0, 2, 0, 0))
     sh("ip -n ear link set wlan3 up")
     found = set()
     for block in re.split(r"^BSS ", at("ear", "iw dev wlan3 scan flush"), flags=re.M)[1:]:

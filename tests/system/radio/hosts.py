@@ -35,6 +35,7 @@ plugins=keyfile
 auth-polkit=false
 [device]
 wifi.backend={}
+wifi.scan-rand-mac-address=no
 """
 HOME_PROFILE = f"""[connection]
 id={air.HOME}
