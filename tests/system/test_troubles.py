@@ -87,9 +87,20 @@ class Troubles(lab.LabTest):
         self.timed("create", "auto")
         return "eth1: "
 
+    def ctrl_c_twice(self):
+        for seconds in 0.3, 3:
+            for words in ("create", "auto"), ("remove",):
+                run = self.lab.start(*words, start_new_session=True, stdout=subprocess.DEVNULL)
+                time.sleep(seconds if words[0] == "create" else 0.05)
+                os.killpg(run.pid, signal.SIGINT)  # as a terminal does, to all that belongs to the run
+                run.communicate(timeout=5)
+        # First it ends what was begun, with one wait for the server that is not there.
+        self.assertLess(self.timed("remove"), 25)
+        return ""
+
     def test_every_trouble(self):
         for row in ("no_server_twice", "no_server_on_the_air", "unknown_network", "unusable_key", "mistyped_key",
-                    "location_that_is_gone", "other_users_file", "card_pulled_out"):
+                    "location_that_is_gone", "other_users_file", "card_pulled_out", "ctrl_c_twice"):
             with self.subTest(row):
                 self.machine(cards=("eth0", "wlan0", "eth1")[:3 if row == "card_pulled_out" else 2])
                 try:

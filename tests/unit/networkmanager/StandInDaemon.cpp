@@ -486,4 +486,13 @@ int StandInDaemon::setProperty(sd_bus_message* call, const std::string& path) {
     return reply(call);
 }
 
+Task run(Agent& agent, const Captured& before, const InterfacePlan* plan, std::chrono::milliseconds bound) {
+    std::vector<Task> tasks{{&before, plan, {}, {}}};
+    const Clock::time_point deadline = Clock::now() + bound;
+    agent.start(tasks, deadline);
+    while (!agent.settle(deadline)) {
+    }
+    return tasks[0];
+}
+
 }  // namespace testing_support

@@ -6,6 +6,7 @@
 #include <systemd/sd-bus.h>
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <map>
@@ -14,6 +15,7 @@
 #include <thread>
 #include <vector>
 
+#include "platform/apply/Agents.h"
 #include "platform/apply/networkmanager/Value.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
@@ -126,5 +128,10 @@ class StandInDaemon {
     std::atomic<bool> stop_ = false;
     std::thread thread_;
 };
+
+// Gives the agent one task and waits for its end, or for as long as it may take.
+platform::apply::Task run(platform::apply::Agent& agent, const platform::apply::Captured& before,
+                          const platform::apply::InterfacePlan* plan,
+                          std::chrono::milliseconds bound = std::chrono::seconds(10));
 
 }  // namespace testing_support

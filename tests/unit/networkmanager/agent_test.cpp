@@ -19,6 +19,7 @@ namespace platform::apply {
 namespace {
 
 using testing_support::PrivateBus;
+using testing_support::run;
 using testing_support::StandInDaemon;
 using testing_support::TemporaryDirectory;
 
@@ -78,18 +79,8 @@ class NetworkManager : public ::testing::Test {
         EXPECT_TRUE(outcome.ok()) << outcome.reason();
         return captured.empty() ? Captured() : captured[0];
     }
-    // One task at a time, to its end or for as long as it may take.
-    Task run(const Captured& before, const InterfacePlan* plan,
-             std::chrono::milliseconds bound = std::chrono::seconds(10)) {
-        std::vector<Task> tasks{{&before, plan, {}, {}}};
-        const Clock::time_point deadline = Clock::now() + bound;
-        agent_->start(tasks, deadline);
-        while (!agent_->settle(deadline)) {
-        }
-        return tasks[0];
-    }
-    Task takeOver(const InterfacePlan& plan, const Captured& before) { return run(before, &plan); }
-    Task giveBack(const Captured& before) { return run(before, nullptr); }
+    Task takeOver(const InterfacePlan& plan, const Captured& before) { return run(*agent_, before, &plan); }
+    Task giveBack(const Captured& before) { return run(*agent_, before, nullptr); }
     // Nothing was refused and nothing stood against it.
     static std::string wrong(const Task& task) { return task.refusal.reason() + task.trouble; }
     using Changes = std::vector<std::string>;
@@ -154,7 +145,7 @@ TEST_F(NetworkManager, joinsWhatIsOnTheAir) {
 TEST_F(NetworkManager, turnsToACellOnceItIsHeard) {
     standIn_.cards[0].hangs = true;
     standIn_.cards[0].points = {{"Printer", true, false, 0, false}};
-    EXPECT_NE(run(capture(), &printer_, std::chrono::seconds(3)).trouble, "");
+    EXPECT_NE(run(*agent_, capture(), &printer_, std::chrono::seconds(3)).trouble, "");
     EXPECT_EQ(valueOf<std::string>(ours()["802-11-wireless"], "mode"), "adhoc");
     EXPECT_EQ(changes(), (Changes{"AddConnection2 location-assistant wlan0",
                                   "ActivateConnection location-assistant wlan0 on wlan0",
@@ -223,7 +214,7 @@ TEST_F(NetworkManager, failures) {
         EXPECT_TRUE(ours().empty());
     }
     standIn_.cards[0].hangs = true;
-    EXPECT_EQ(run(before, &office, std::chrono::milliseconds(300)).trouble,
+    EXPECT_EQ(run(*agent_, before, &office, std::chrono::milliseconds(300)).trouble,
               "no DHCP server answered; NetworkManager goes on asking");
     standIn_.cards[0].hangs = false;
 
@@ -265,7 +256,7 @@ TEST_F(NetworkManager, believesNoSignalFromSomebodyElse) {
     standIn_.cards[0].hangs = true;
     StandInDaemon::Forger forger(bus_.socket());
     const Captured before = capture();
-    EXPECT_EQ(run(before, &printer_, std::chrono::seconds(1)).trouble,
+    EXPECT_EQ(run(*agent_, before, &printer_, std::chrono::seconds(1)).trouble,
               "no DHCP server answered; NetworkManager goes on asking");
 }
 

@@ -16,6 +16,7 @@ namespace platform::apply {
 namespace {
 
 using testing_support::PrivateBus;
+using testing_support::run;
 using testing_support::StandInDaemon;
 
 const std::string desk = "11111111-2222-4333-8444-555555555555";
@@ -125,23 +126,13 @@ class Contract : public ::testing::Test {
         EXPECT_TRUE(leftAlone.empty());
         return captured;
     }
-    // One task at a time, to its end or for as long as it may take.
-    Task run(const Captured& before, const InterfacePlan* plan,
-             std::chrono::milliseconds bound = std::chrono::seconds(10)) {
-        std::vector<Task> tasks{{&before, plan, {}, {}}};
-        const Clock::time_point deadline = Clock::now() + bound;
-        agent_->start(tasks, deadline);
-        while (!agent_->settle(deadline)) {
-        }
-        return tasks[0];
-    }
     void takeOver(const InterfacePlan& plan, const Captured& before) {
-        const Task task = run(before, &plan);
+        const Task task = run(*agent_, before, &plan);
         EXPECT_TRUE(task.refusal.ok()) << task.refusal.reason();
         EXPECT_EQ(task.trouble, "");
     }
     std::string giveBack(const Captured& before) {
-        const Task task = run(before, nullptr);
+        const Task task = run(*agent_, before, nullptr);
         EXPECT_TRUE(task.refusal.ok()) << task.refusal.reason();
         return task.trouble;
     }
@@ -217,7 +208,7 @@ TEST_F(Contract, offAndOnAndBack) {
     const Captured missing{"nosuch0", captured.state};
     takeOver(off("nosuch0"), missing);
     const InterfacePlan plan = on("nosuch0");
-    EXPECT_EQ(run(missing, &plan).trouble, "there is no such interface");
+    EXPECT_EQ(run(*agent_, missing, &plan).trouble, "there is no such interface");
 }
 
 TEST_F(Contract, idleCards) {
@@ -264,7 +255,7 @@ TEST_F(Contract, anothersProfileUnderOurUUID) {
     const Captured captured = capture({"eth0"}).at(0);
     add(profileUUID("eth0"), "eth0", "10.20.30.5");
     const InterfacePlan plan = on("eth0");
-    EXPECT_EQ(run(captured, &plan).refusal.status(), kSCStatusFailed);
+    EXPECT_EQ(run(*agent_, captured, &plan).refusal.status(), kSCStatusFailed);
     giveBack(captured);
     EXPECT_TRUE(exists(profileUUID("eth0")));
 }
