@@ -1,11 +1,14 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <csignal>
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <iterator>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -80,6 +83,23 @@ TEST(SetIDFile, ReplacesTheWholeContentAndKeepsNewFilesPrivate) {
     struct stat status = {};
     ASSERT_EQ(stat(fresh.c_str(), &status), 0);
     EXPECT_EQ(status.st_mode & 07777U, 0600U);
+}
+
+TEST(SetIDFile, AFullDiskLeavesTheOldContent) {
+    const TemporaryDirectory folder;
+    const std::string path = folder.at("set.orig");
+    WriteSetIDFile(path.c_str(), "4");
+    // The second byte does not fit.
+    rlimit whole{};
+    getrlimit(RLIMIT_FSIZE, &whole);
+    const rlimit small{1, whole.rlim_max};
+    const auto before = std::signal(SIGXFSZ, SIG_IGN);
+    setrlimit(RLIMIT_FSIZE, &small);
+    WriteSetIDFile(path.c_str(), "12");
+    setrlimit(RLIMIT_FSIZE, &whole);
+    std::signal(SIGXFSZ, before);
+    EXPECT_EQ("4", read(path));
+    EXPECT_EQ(1, std::distance(std::filesystem::directory_iterator(folder.path()), {}));
 }
 
 TEST(SetIDFile, WhatIsNotAPlainFileOfOursIsNotReadAndIsReplaced) {

@@ -171,10 +171,13 @@ TEST_F(EngineTest, ChoosesAnAgentForEachInterface) {
     const auto daemon = std::make_shared<RecordingAgent>("daemon");
     install({daemon, agent_});
     daemon->machine = {{"wlan0", "D"}};
+    agent_->slow = 1;
     EXPECT_TRUE(apply(there_).ok());
-    EXPECT_EQ((Lines{"capture eth0 wlan0", "takeOver wlan0", "settle", "wlan0: D -> ours: manual 0"}),
-              taken(daemon.get()));
-    EXPECT_EQ((Lines{"capture eth0", "takeOver eth0", "settle", "eth0: E -> ours: off"}), taken());
+    EXPECT_EQ(
+        (Lines{"capture eth0 wlan0", "takeOver wlan0", "settle", "settle", "wlan0: D -> ours: manual 0"}),
+        taken(daemon.get()))
+        << "each is asked until all have settled";
+    EXPECT_EQ((Lines{"capture eth0", "takeOver eth0", "settle", "settle", "eth0: E -> ours: off"}), taken());
 
     // The daemon has begun to lead eth0 too.
     daemon->machine["eth0"] = "D";

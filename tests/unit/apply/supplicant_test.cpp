@@ -92,6 +92,7 @@ TEST_F(SupplicantTest, JoinsByWhatIsOnTheAir) {
          {{}, "printer", "abcdefghijklm"},
          {"key_mgmt WPA-PSK", "psk \"abcdefghijklm\""}},
         {"", {{}, "printer", "four"}, {"the network's key has no form that a key can have"}},
+        {"", {{}, "printer", std::string(64, 'x')}, {"the network's key has no form that a key can have"}},
         {"x\t2412\t-50\t[WPA2-PSK-CCMP][ESS]\tprinter\n",
          open,
          {"the network asks for a key and the location holds none"}},

@@ -289,6 +289,9 @@ int StandInDaemon::profileCall(sd_bus_message* call, const std::string& member, 
         profile.sections = std::move(sections);
         return reply(call, [](sd_bus_message* m) { return sd_bus_message_append(m, "a{sv}", 0); });
     }
+    if (forbidsChanges) {
+        return fail(call, prefix + ".Settings.PermissionDenied", "Insufficient privileges");
+    }
     const std::string path = sd_bus_message_get_path(call);
     for (std::size_t i = 0; i < cards.size(); ++i) {
         if (!cards[i].active.empty() && actives_[cards[i].active].profile == path) {

@@ -228,6 +228,11 @@ TEST_F(NetworkManager, failures) {
     standIn_.forbidsChanges = true;
     EXPECT_EQ(takeOver(office, before).refusal.status(), kSCStatusAccessError);
     standIn_.forbidsChanges = false;
+    EXPECT_EQ(wrong(takeOver(office, before)), "");
+    standIn_.forbidsChanges = true;
+    EXPECT_EQ(giveBack(before).refusal.status(), kSCStatusAccessError)
+        << "a profile that stays is tried again";
+    standIn_.forbidsChanges = false;
 
     standIn_.leavesAtActivation = true;
     EXPECT_EQ(takeOver(office, before).refusal.reason(),
