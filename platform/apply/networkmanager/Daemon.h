@@ -10,11 +10,22 @@
 
 #include "platform/Outcome.h"
 #include "platform/apply/WirelessChoice.h"
-#include "platform/apply/networkmanager/Bus.h"
 #include "platform/apply/networkmanager/Profile.h"
-#include "platform/apply/networkmanager/Value.h"
+#include "platform/bus/Bus.h"
+#include "platform/bus/Value.h"
 
 namespace platform::apply {
+
+using bus::Arguments;
+using bus::Bus;
+using bus::Clock;
+using bus::Dictionary;
+using bus::Message;
+using bus::readTexts;
+using bus::Sections;
+using bus::Texts;
+using bus::Value;
+using bus::valueOf;
 
 // Of NetworkManager's states of a card: unmanaged 10, unavailable 20, disconnected 30, then activating,
 // activated 100, deactivating 110, failed 120.

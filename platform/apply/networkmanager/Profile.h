@@ -8,9 +8,17 @@
 
 #include "platform/apply/Plan.h"
 #include "platform/apply/WirelessChoice.h"
-#include "platform/apply/networkmanager/Value.h"
+#include "platform/bus/Value.h"
 
 namespace platform::apply {
+
+using bus::Bytes;
+using bus::Dictionary;
+using bus::Sections;
+using bus::TextMap;
+using bus::Texts;
+using bus::Value;
+using bus::valueOf;
 
 // What was there before the profile, kept in the profile itself too: whoever finds the profile finds the way
 // back.

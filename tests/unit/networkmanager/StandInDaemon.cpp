@@ -19,6 +19,7 @@ namespace testing_support {
 namespace {
 
 using namespace platform::apply;
+using namespace platform::bus;
 
 const std::string root = "/org/freedesktop/NetworkManager";
 const std::string prefix = "org.freedesktop.NetworkManager";

@@ -16,7 +16,7 @@
 #include <vector>
 
 #include "platform/apply/Agents.h"
-#include "platform/apply/networkmanager/Value.h"
+#include "platform/bus/Value.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
 namespace testing_support {
@@ -89,12 +89,12 @@ class StandInDaemon {
     // Every request that changes something, in order, as "Member what".
     std::vector<std::string> changes;
     // By UUID, with secrets.
-    [[nodiscard]] platform::apply::Sections profile(const std::string& uuid) const;
+    [[nodiscard]] platform::bus::Sections profile(const std::string& uuid) const;
 
   private:
     struct Profile {
         std::string uuid;
-        platform::apply::Sections sections;
+        platform::bus::Sections sections;
     };
     struct Active {
         std::size_t card = 0;
@@ -117,7 +117,7 @@ class StandInDaemon {
     void signalCard(std::size_t card, std::uint32_t state, std::uint32_t reason);
     void signalActive(const std::string& path, std::uint32_t state);
     static int reply(sd_bus_message* call, const Answer& append = {});
-    [[nodiscard]] platform::apply::Dictionary describe(const std::string& path, const std::string& interface);
+    [[nodiscard]] platform::bus::Dictionary describe(const std::string& path, const std::string& interface);
 
     mutable std::mutex mutex_;
     sd_bus* bus_ = nullptr;

@@ -13,7 +13,7 @@
 namespace testing_support {
 namespace {
 
-using namespace platform::apply;
+using namespace platform::bus;
 
 GVariant* toVariant(const Dictionary& dictionary);
 

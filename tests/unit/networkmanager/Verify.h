@@ -3,11 +3,11 @@
 
 #include <string>
 
-#include "platform/apply/networkmanager/Value.h"
+#include "platform/bus/Value.h"
 
 namespace testing_support {
 
 // What is wrong with the profile or its secrets; empty when nothing is.
-[[nodiscard]] std::string verifyProfile(const platform::apply::Sections& profile);
+[[nodiscard]] std::string verifyProfile(const platform::bus::Sections& profile);
 
 }  // namespace testing_support

@@ -12,9 +12,9 @@
 #include <vector>
 
 #include "platform/Outcome.h"
-#include "platform/apply/networkmanager/Value.h"
+#include "platform/bus/Value.h"
 
-namespace platform::apply {
+namespace platform::bus {
 
 using Clock = std::chrono::steady_clock;
 
@@ -99,4 +99,4 @@ class Bus {
 [[nodiscard]] Outcome fromBus(const std::string& what, int result, const sd_bus_error& error,
                               std::string_view secret);
 
-}  // namespace platform::apply
+}  // namespace platform::bus

@@ -1,9 +1,9 @@
-#include "platform/apply/networkmanager/Value.h"
+#include "platform/bus/Value.h"
 
 #include <cerrno>
 #include <string_view>
 
-namespace platform::apply {
+namespace platform::bus {
 namespace {
 
 constexpr std::size_t mostElements = 100'000;
@@ -287,4 +287,4 @@ int readTexts(sd_bus_message* message, Texts& texts) {
     });
 }
 
-}  // namespace platform::apply
+}  // namespace platform::bus

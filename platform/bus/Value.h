@@ -12,7 +12,7 @@
 #include <variant>
 #include <vector>
 
-namespace platform::apply {
+namespace platform::bus {
 
 struct Value;
 using Dictionary = std::map<std::string, Value, std::less<>>;
@@ -57,4 +57,4 @@ int readDictionary(sd_bus_message* message, Dictionary& dictionary);
 int readSections(sd_bus_message* message, Sections& sections);
 int readTexts(sd_bus_message* message, Texts& texts);  // as or ao
 
-}  // namespace platform::apply
+}  // namespace platform::bus

@@ -1,4 +1,4 @@
-#include "platform/apply/networkmanager/Bus.h"
+#include "platform/bus/Bus.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -8,7 +8,7 @@
 
 #include "platform/Host.h"
 
-namespace platform::apply {
+namespace platform::bus {
 namespace {
 
 constexpr const char* propertiesInterface = "org.freedesktop.DBus.Properties";
@@ -48,7 +48,7 @@ class Error {
 };
 
 Outcome fromBus(const std::string& what, int result) {
-    return platform::apply::fromBus(what, result, sd_bus_error{}, {});
+    return platform::bus::fromBus(what, result, sd_bus_error{}, {});
 }
 
 int noteOwner(sd_bus_message* message, void* left, sd_bus_error* /*error*/) {
@@ -257,4 +257,4 @@ Outcome Bus::handleSignals(Clock::time_point until) {
     return result < 0 ? fromBus("the system bus", result) : Outcome();
 }
 
-}  // namespace platform::apply
+}  // namespace platform::bus
