@@ -19,8 +19,8 @@
 #include <thread>
 #include <vector>
 
-#include "platform/Host.h"
 #include "platform/SystemConfiguration.h"
+#include "platform/base/Host.h"
 #include "platform/values/Values.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 

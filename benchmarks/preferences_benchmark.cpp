@@ -13,8 +13,8 @@
 #include <iterator>
 #include <string>
 
-#include "platform/Host.h"
 #include "platform/SystemConfiguration.h"
+#include "platform/base/Host.h"
 #include "platform/preferences/Store.h"
 #include "platform/values/Values.h"
 #include "tests/unit/support/TemporaryDirectory.h"

@@ -8,8 +8,8 @@
 #include <vector>
 
 #include "platform/CoreFoundation.h"
-#include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
+#include "platform/base/Outcome.h"
 #include "platform/values/Object.h"
 
 namespace platform::apply {

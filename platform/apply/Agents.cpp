@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 
 namespace platform::apply {
 

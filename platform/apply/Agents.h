@@ -5,8 +5,8 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Agent.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

@@ -4,12 +4,12 @@
 #include <memory>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/apply/Agents.h"
 #include "platform/apply/Plan.h"
 #include "platform/apply/Properties.h"
 #include "platform/apply/Record.h"
 #include "platform/apply/StateFile.h"
+#include "platform/base/Log.h"
 
 namespace platform::apply {
 namespace {

@@ -2,7 +2,7 @@
 #pragma once
 
 #include "platform/CoreFoundation.h"
-#include "platform/Outcome.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

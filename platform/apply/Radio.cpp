@@ -8,9 +8,9 @@
 #include <filesystem>
 #include <system_error>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Host.h"
 #include "platform/apply/StateFile.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Host.h"
 
 namespace platform::apply {
 namespace {

@@ -4,7 +4,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Outcome.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

@@ -10,8 +10,8 @@
 #include <optional>
 #include <thread>
 
-#include "platform/Host.h"
 #include "platform/apply/Properties.h"
+#include "platform/base/Host.h"
 #include "platform/values/PropertyListXML.h"
 
 namespace platform::apply {

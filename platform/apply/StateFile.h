@@ -7,8 +7,8 @@
 #include <string_view>
 
 #include "platform/CoreFoundation.h"
-#include "platform/FileDescriptor.h"
-#include "platform/Outcome.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Outcome.h"
 #include "platform/values/Fields.h"
 
 namespace platform::apply {

@@ -7,7 +7,7 @@
 #include <span>
 #include <string>
 
-#include "platform/Outcome.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

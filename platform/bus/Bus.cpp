@@ -6,7 +6,7 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 
 namespace platform::bus {
 namespace {

@@ -11,7 +11,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Outcome.h"
+#include "platform/base/Outcome.h"
 #include "platform/bus/Value.h"
 
 namespace platform::bus {

@@ -7,7 +7,7 @@
 #include <tuple>
 #include <utility>
 
-#include "platform/DeviceText.h"
+#include "platform/base/DeviceText.h"
 #include "platform/hardware/Entry.h"
 #include "platform/hardware/Properties.h"
 #include "platform/hardware/Sysfs.h"

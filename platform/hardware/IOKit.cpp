@@ -6,7 +6,7 @@
 #include <utility>
 #include <variant>
 
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 #include "platform/hardware/Entry.h"
 #include "platform/values/Values.h"
 

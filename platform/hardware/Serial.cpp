@@ -1,7 +1,7 @@
 #include <algorithm>
 #include <sstream>
 
-#include "platform/DeviceText.h"
+#include "platform/base/DeviceText.h"
 #include "platform/hardware/Entry.h"
 #include "platform/hardware/Properties.h"
 #include "platform/hardware/Sysfs.h"

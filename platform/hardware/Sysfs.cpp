@@ -13,8 +13,8 @@
 #include <memory>
 #include <utility>
 
-#include "platform/DeviceText.h"
-#include "platform/FileDescriptor.h"
+#include "platform/base/DeviceText.h"
+#include "platform/base/FileDescriptor.h"
 
 namespace platform::hardware {
 namespace {

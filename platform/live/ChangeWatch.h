@@ -6,8 +6,8 @@
 #include <memory>
 #include <string>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Outcome.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Outcome.h"
 #include "platform/live/NetworkState.h"
 
 namespace platform::live {

@@ -10,8 +10,8 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Host.h"
 #include "platform/SystemConfiguration.h"
+#include "platform/base/Host.h"
 #include "platform/live/ChangeWatch.h"
 #include "platform/live/LiveView.h"
 #include "platform/live/NetworkState.h"

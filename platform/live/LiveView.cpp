@@ -6,7 +6,7 @@
 #include <optional>
 #include <utility>
 
-#include "platform/DeviceText.h"
+#include "platform/base/DeviceText.h"
 #include "platform/preferences/Store.h"
 #include "platform/values/Values.h"
 

@@ -18,7 +18,7 @@
 #include <vector>
 
 #include "platform/CoreFoundation.h"
-#include "platform/Outcome.h"
+#include "platform/base/Outcome.h"
 #include "platform/live/NetworkState.h"
 #include "platform/preferences/Tree.h"
 #include "platform/values/Object.h"

@@ -1,6 +1,6 @@
 #include "platform/live/NetworkState.h"
 
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 #include "platform/live/KernelNetworkState.h"
 
 namespace platform::live {

@@ -8,7 +8,7 @@
 #include <memory>
 #include <vector>
 
-#include "platform/Outcome.h"
+#include "platform/base/Outcome.h"
 #include "platform/netlink/Message.h"
 
 struct mnl_socket;

@@ -2,8 +2,8 @@
 #include <string>
 #include <utility>
 
-#include "platform/Host.h"
 #include "platform/SystemConfiguration.h"
+#include "platform/base/Host.h"
 #include "platform/preferences/Session.h"
 #include "platform/preferences/Status.h"
 #include "platform/values/Values.h"

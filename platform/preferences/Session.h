@@ -5,9 +5,9 @@
 #include <string>
 #include <utility>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Outcome.h"
 #include "platform/SystemConfiguration.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Outcome.h"
 #include "platform/preferences/Store.h"
 #include "platform/preferences/StoreFile.h"
 #include "platform/preferences/Tree.h"

@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "platform/Log.h"
+#include "platform/base/Log.h"
 
 namespace platform::preferences {
 namespace {

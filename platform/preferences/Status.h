@@ -3,7 +3,7 @@
 
 #include <string_view>
 
-#include "platform/Outcome.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::preferences {
 

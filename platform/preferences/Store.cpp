@@ -3,7 +3,7 @@
 #include <string>
 #include <utility>
 
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 #include "platform/preferences/FirstRunTree.h"
 #include "platform/values/PropertyListXML.h"
 #include "platform/values/Values.h"

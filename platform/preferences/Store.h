@@ -4,7 +4,7 @@
 #include <optional>
 
 #include "platform/CoreFoundation.h"
-#include "platform/Outcome.h"
+#include "platform/base/Outcome.h"
 #include "platform/preferences/StoreFile.h"
 #include "platform/values/Object.h"
 

@@ -11,8 +11,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Outcome.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Outcome.h"
 #include "platform/preferences/FileOperations.h"
 
 namespace platform::preferences {

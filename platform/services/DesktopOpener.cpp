@@ -17,8 +17,8 @@
 #include <utility>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Log.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Log.h"
 #include "platform/services/DesktopSession.h"
 #include "platform/services/Opener.h"
 

@@ -4,7 +4,7 @@
 #include <utility>
 
 #include "platform/CoreServices.h"
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 
 struct HandleBlock {
     std::string content;

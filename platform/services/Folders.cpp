@@ -17,8 +17,8 @@
 #include <vector>
 
 #include "platform/CoreServices.h"
-#include "platform/DeviceText.h"
-#include "platform/Host.h"
+#include "platform/base/DeviceText.h"
+#include "platform/base/Host.h"
 #include "platform/values/Values.h"
 
 // A folder being read.

@@ -1,5 +1,5 @@
 #include "platform/CoreServices.h"
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 
 OSErr Gestalt(OSType selector, SInt32* response) noexcept {
     if (response == nullptr) {

@@ -12,7 +12,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Log.h"
+#include "platform/base/Log.h"
 #include "platform/services/Download.h"
 
 namespace platform::services {

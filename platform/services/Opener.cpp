@@ -6,7 +6,7 @@
 #include <string>
 
 #include "platform/CoreServices.h"
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 #include "platform/values/Values.h"
 
 OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL) noexcept {

@@ -13,7 +13,7 @@
 #include <optional>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 #include "platform/values/Scalars.h"
 
 using namespace platform::values;

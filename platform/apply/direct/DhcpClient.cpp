@@ -13,10 +13,10 @@
 #include <csignal>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Host.h"
-#include "platform/Log.h"
 #include "platform/apply/StateFile.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 
 namespace platform::apply {
 namespace {

@@ -9,8 +9,8 @@
 #include <optional>
 #include <string>
 
-#include "platform/Outcome.h"
 #include "platform/apply/direct/Lease.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

@@ -6,10 +6,10 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Host.h"
-#include "platform/Log.h"
 #include "platform/apply/direct/DhcpClient.h"
 #include "platform/apply/direct/Lease.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 
 namespace {
 

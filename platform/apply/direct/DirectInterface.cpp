@@ -5,12 +5,12 @@
 #include <algorithm>
 #include <ctime>
 
-#include "platform/Log.h"
 #include "platform/apply/Radio.h"
 #include "platform/apply/direct/DhcpClient.h"
 #include "platform/apply/direct/KernelWireless.h"
 #include "platform/apply/direct/NameServers.h"
 #include "platform/apply/direct/Supplicant.h"
+#include "platform/base/Log.h"
 
 namespace platform::apply {
 namespace {

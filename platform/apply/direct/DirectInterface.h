@@ -7,12 +7,12 @@
 #include <string>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/Kernel.h"
 #include "platform/apply/direct/NameServers.h"
 #include "platform/apply/direct/Snapshot.h"
 #include "platform/apply/direct/WirelessJoin.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

@@ -21,8 +21,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
+#include "platform/base/Outcome.h"
 #include "platform/netlink/Link.h"
 #include "platform/netlink/Message.h"
 #include "platform/netlink/Socket.h"

@@ -9,11 +9,11 @@
 #include <span>
 #include <string>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/WirelessCard.h"
 #include "platform/apply/direct/WirelessJoin.h"
 #include "platform/apply/direct/WirelessMessages.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

@@ -8,8 +8,8 @@
 #include <optional>
 #include <string_view>
 
-#include "platform/Log.h"
 #include "platform/apply/StateFile.h"
+#include "platform/base/Log.h"
 
 namespace platform::apply {
 namespace {

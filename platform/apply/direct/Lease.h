@@ -7,10 +7,10 @@
 #include <string>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/Kernel.h"
 #include "platform/apply/direct/NameServers.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

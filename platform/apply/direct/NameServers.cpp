@@ -11,9 +11,9 @@
 #include <optional>
 #include <tuple>
 
-#include "platform/Host.h"
-#include "platform/Log.h"
 #include "platform/apply/StateFile.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 
 namespace platform::apply {
 namespace {

@@ -9,8 +9,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

@@ -4,9 +4,9 @@
 #include <sys/random.h>
 #include <unistd.h>
 
-#include "platform/FileDescriptor.h"
 #include "platform/apply/Digest.h"
 #include "platform/apply/StateFile.h"
+#include "platform/base/FileDescriptor.h"
 
 namespace platform::apply {
 namespace {

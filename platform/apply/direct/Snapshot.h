@@ -7,11 +7,11 @@
 #include <string>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/Kernel.h"
 #include "platform/apply/direct/Supplicant.h"
 #include "platform/apply/direct/WirelessCard.h"
+#include "platform/base/Outcome.h"
 #include "platform/values/Fields.h"
 
 namespace platform::apply {

@@ -10,9 +10,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/WirelessJoin.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

@@ -10,7 +10,7 @@
 #include <cstring>
 #include <utility>
 
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 
 namespace platform::apply {
 namespace {

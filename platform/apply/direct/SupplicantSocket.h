@@ -9,9 +9,9 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Outcome.h"
 #include "platform/apply/WirelessChoice.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

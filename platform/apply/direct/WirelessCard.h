@@ -8,9 +8,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/direct/Kernel.h"
 #include "platform/apply/direct/WirelessMessages.h"
+#include "platform/base/Outcome.h"
 #include "platform/netlink/Generic.h"
 #include "platform/netlink/Socket.h"
 

@@ -3,7 +3,7 @@
 
 #include <string>
 
-#include "platform/Outcome.h"
+#include "platform/base/Outcome.h"
 
 namespace platform::apply {
 

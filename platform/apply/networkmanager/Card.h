@@ -6,10 +6,10 @@
 #include <optional>
 #include <string>
 
-#include "platform/Outcome.h"
 #include "platform/apply/Agent.h"
 #include "platform/apply/networkmanager/Daemon.h"
 #include "platform/apply/networkmanager/Profile.h"
+#include "platform/base/Outcome.h"
 #include "platform/values/Fields.h"
 
 namespace platform::apply {

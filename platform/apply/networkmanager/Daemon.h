@@ -8,9 +8,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/Outcome.h"
 #include "platform/apply/WirelessChoice.h"
 #include "platform/apply/networkmanager/Profile.h"
+#include "platform/base/Outcome.h"
 #include "platform/bus/Bus.h"
 #include "platform/bus/Value.h"
 

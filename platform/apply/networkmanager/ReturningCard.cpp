@@ -1,9 +1,9 @@
 // A card on its way back to how it was.
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/apply/Radio.h"
 #include "platform/apply/networkmanager/Card.h"
+#include "platform/base/Log.h"
 
 namespace platform::apply {
 namespace {

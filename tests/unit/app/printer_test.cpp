@@ -8,7 +8,7 @@
 #include "app/ArvAssistant.h"
 #include "app/Reachability.h"
 #include "app/Trace.h"
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 #include "platform/live/NetworkState.h"
 #include "platform/services/Download.h"
 #include "platform/services/Opener.h"

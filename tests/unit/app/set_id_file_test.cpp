@@ -14,7 +14,7 @@
 #include <vector>
 
 #include "app/SetIDFile.h"
-#include "platform/Log.h"
+#include "platform/base/Log.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
 namespace {

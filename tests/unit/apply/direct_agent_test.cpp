@@ -10,14 +10,14 @@
 #include <string>
 #include <vector>
 
-#include "platform/Host.h"
-#include "platform/Log.h"
 #include "platform/apply/Agents.h"
 #include "platform/apply/Apply.h"
 #include "platform/apply/StateFile.h"
 #include "platform/apply/direct/Lease.h"
 #include "platform/apply/direct/NameServers.h"
 #include "platform/apply/direct/Supplicant.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "tests/unit/apply/StandInSupplicant.h"
 #include "tests/unit/apply/Trees.h"
 #include "tests/unit/support/Interrupted.h"

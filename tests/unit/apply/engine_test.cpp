@@ -5,10 +5,10 @@
 #include <string>
 #include <vector>
 
-#include "platform/Host.h"
-#include "platform/Log.h"
 #include "platform/apply/Apply.h"
 #include "platform/apply/StateFile.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "tests/unit/apply/Trees.h"
 #include "tests/unit/support/RecordingAgent.h"
 #include "tests/unit/support/TemporaryDirectory.h"

@@ -7,9 +7,9 @@
 #include <memory>
 #include <string>
 
-#include "platform/Host.h"
-#include "platform/Log.h"
 #include "platform/apply/StateFile.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
 namespace platform::apply {

@@ -7,7 +7,7 @@
 #include <thread>
 #include <vector>
 
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 #include "tests/unit/apply/StandInSupplicant.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 

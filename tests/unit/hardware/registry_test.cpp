@@ -7,8 +7,8 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Host.h"
 #include "platform/IOKit.h"
+#include "platform/base/Host.h"
 #include "platform/values/Values.h"
 #include "tests/unit/support/SysfsTree.h"
 

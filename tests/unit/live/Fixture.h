@@ -14,10 +14,10 @@
 #include <utility>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Host.h"
-#include "platform/Log.h"
 #include "platform/SystemConfiguration.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "platform/live/NetworkState.h"
 #include "platform/values/Values.h"
 #include "tests/unit/support/TemporaryDirectory.h"

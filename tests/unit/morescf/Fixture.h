@@ -17,8 +17,8 @@
 
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
-#include "platform/Host.h"
-#include "platform/Log.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "platform/values/PropertyListXML.h"
 #include "tests/unit/support/Notation.h"
 #include "tests/unit/support/RecordingAgent.h"

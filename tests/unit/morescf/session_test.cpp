@@ -4,7 +4,7 @@
 #include <chrono>
 #include <thread>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 #include "tests/unit/morescf/Fixture.h"
 
 namespace morescf_test {

@@ -12,7 +12,7 @@
 #include <stdexcept>
 #include <utility>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 #include "tests/unit/networkmanager/Verify.h"
 
 namespace testing_support {

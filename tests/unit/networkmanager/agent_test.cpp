@@ -8,11 +8,11 @@
 #include <memory>
 #include <utility>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Host.h"
-#include "platform/Log.h"
 #include "platform/apply/Agents.h"
 #include "platform/apply/networkmanager/Daemon.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "tests/unit/networkmanager/StandInDaemon.h"
 
 namespace platform::apply {

@@ -10,9 +10,9 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Host.h"
-#include "platform/Log.h"
 #include "platform/SystemConfiguration.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "platform/values/PropertyListXML.h"
 #include "platform/values/Values.h"
 #include "tests/unit/support/TemporaryDirectory.h"

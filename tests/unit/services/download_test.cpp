@@ -9,9 +9,9 @@
 #include <thread>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Host.h"
-#include "platform/Log.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "platform/services/Download.h"
 
 namespace {

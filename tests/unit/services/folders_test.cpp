@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "platform/CoreServices.h"
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
 namespace {

@@ -14,9 +14,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Host.h"
-#include "platform/Log.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "platform/services/Opener.h"
 #include "platform/values/Values.h"
 #include "tests/unit/services/StandInDesktop.h"

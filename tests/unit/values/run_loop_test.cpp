@@ -8,7 +8,7 @@
 #include <chrono>
 #include <thread>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 #include "platform/values/RunLoop.h"
 #include "tests/unit/values/Values.h"
 

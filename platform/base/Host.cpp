@@ -1,4 +1,4 @@
-#include "platform/Host.h"
+#include "platform/base/Host.h"
 
 #include <utility>
 

@@ -1,4 +1,4 @@
-#include "platform/Log.h"
+#include "platform/base/Log.h"
 
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -11,7 +11,7 @@
 #include <utility>
 
 #include "platform/CoreServices.h"
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 
 namespace platform {
 namespace {

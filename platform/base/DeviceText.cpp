@@ -1,4 +1,4 @@
-#include "platform/DeviceText.h"
+#include "platform/base/DeviceText.h"
 
 #include <unicode/uchar.h>
 #include <unicode/utf8.h>
