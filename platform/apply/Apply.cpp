@@ -18,6 +18,9 @@ namespace {
 constexpr std::chrono::seconds lockBound{60};
 constexpr std::chrono::seconds goingBound{20};
 constexpr std::chrono::seconds returningBound{15};
+// What an earlier run left half-way is set going again; whoever comes to do something else does not wait long
+// for it.
+constexpr std::chrono::seconds finishingBound{3};
 // With agents at work side by side each gets its turn this often.
 constexpr std::chrono::milliseconds slice{50};
 // How often one process tries to finish the same unfinished plan: each try may take a deadline's time.
@@ -87,8 +90,8 @@ class Crew {
 // One run under the lock.
 class Run {
   public:
-    Run(const Plan& plan, Record& record, Failures& failures)
-        : plan_(plan), record_(record), failures_(failures) {}
+    Run(const Plan& plan, Record& record, Failures& failures, bool activates)
+        : plan_(plan), record_(record), failures_(failures), activates_(activates) {}
 
     void make() {
         const Clock::time_point begin = Clock::now();
@@ -99,7 +102,7 @@ class Run {
         known_ = agents_;
         giveBack(begin + returningBound, isShorter);
         if (hasAgents && !plan_.empty() && capture()) {
-            takeOver(begin + goingBound);
+            takeOver(begin + (activates_ ? goingBound : finishingBound));
         }
     }
 
@@ -261,8 +264,9 @@ class Run {
     const Plan& plan_;
     Record& record_;
     Failures& failures_;
-    Agents agents_;  // that may lead interfaces now
-    Agents known_;   // and those of the record
+    bool activates_;  // false: it finishes what was activated before
+    Agents agents_;   // that may lead interfaces now
+    Agents known_;    // and those of the record
 };
 
 // Whether this process may try once more to make this location so.
@@ -316,7 +320,7 @@ Outcome applyTree(CFDictionaryRef root, CFDictionaryRef replaced) {
     if (failures.note(makeRuntimeDirectory()) &&
         failures.note(lock.acquire(runtimePath("applied.lock"), lockBound)) &&
         failures.note(readRecord(record)) && (activates || !record.isOf(plan))) {
-        Run(plan, record, failures).make();
+        Run(plan, record, failures, activates).make();
     }
     return outcome();
 }
