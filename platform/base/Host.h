@@ -37,6 +37,9 @@ struct Host {
     std::string systemBusSocket = "/run/dbus/system_bus_socket";
     // Holds one control socket of the wireless supplicant for each interface.
     std::string supplicantDirectory = "/run/wpa_supplicant";
+    // Of systemd-networkd: what it knows of each link, and the configuration that lives as long as one boot.
+    std::string networkdStateDirectory = "/run/systemd/netif/links";
+    std::string networkdDirectory = "/run/systemd/network";
 
     // The DHCP client, and the program that it runs when a lease comes and goes.
     std::string dhcpClient = "/usr/bin/busybox";

@@ -3,17 +3,16 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
 #include <cerrno>
-#include <charconv>
 #include <csignal>
 #include <vector>
 
 #include "platform/apply/StateFile.h"
+#include "platform/apply/direct/Process.h"
 #include "platform/base/FileDescriptor.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
@@ -28,18 +27,6 @@ std::string settingsPath(const std::string& interface) {
     return runtimePath("dhcp-" + interface + ".plist");
 }
 
-// A process, told from a later one with the same number by when it started.
-struct Process {
-    pid_t number = 0;
-    std::int64_t started = 0;  // in clock ticks since the machine's start
-
-    template <class Self, class Fields>
-    static void listFields(Self& self, Fields& fields) {
-        fields("Number", self.number);
-        fields("Started", self.started);
-    }
-};
-
 // What is kept of a client.
 struct ClientState {
     HookSettings settings;
@@ -52,43 +39,6 @@ struct ClientState {
         fields("Client", self.client);
     }
 };
-
-// 0 when there is no such process, or it has ended and waits for its parent to notice.
-std::int64_t startTimeOf(pid_t number) {
-    std::string text;
-    if (!readWholeFile("/proc/" + std::to_string(number) + "/stat", text).ok()) {
-        return 0;
-    }
-    // The program's name, in parentheses, may hold anything; the fields are counted behind it.
-    std::size_t position = text.rfind(')');
-    constexpr int stateField = 3;
-    constexpr int startField = 22;
-    for (int field = stateField; position != std::string::npos && field <= startField; ++field) {
-        position = text.find(' ', position + 1);
-        if (field == stateField && position != std::string::npos && text[position + 1] == 'Z') {
-            return 0;
-        }
-    }
-    std::int64_t started = 0;
-    if (position == std::string::npos) {
-        return 0;
-    }
-    std::from_chars(text.data() + position + 1, text.data() + text.size(), started);
-    return started;
-}
-
-bool isAlive(const Process& process) {
-    return process.number > 1 && process.started != 0 && startTimeOf(process.number) == process.started;
-}
-
-// A handle that stays with the process even when its number is used again; closed when it is not alive.
-FileDescriptor handleOf(const Process& process) {
-    FileDescriptor handle(static_cast<int>(::syscall(SYS_pidfd_open, process.number, 0)));
-    if (handle.isOpen() && !isAlive(process)) {
-        handle.reset();
-    }
-    return handle;
-}
 
 bool hasEnded(const FileDescriptor& handle, std::chrono::milliseconds wait) {
     pollfd ended{handle.get(), POLLIN, 0};
@@ -221,7 +171,7 @@ Outcome startHeld(const DhcpSettings& settings, const std::string& hook, Process
     if (!reported) {
         return {kSCStatusFailed, "cannot start the DHCP client"};
     }
-    client = {number, startTimeOf(number)};
+    client = processOf(number);
     opener = std::move(gateIn);
     return {};
 }
@@ -229,9 +179,7 @@ Outcome startHeld(const DhcpSettings& settings, const std::string& hook, Process
 void signalClient(const std::string& interface, int signal) {
     std::optional<ClientState> state;
     if (readState(settingsPath(interface), state).ok() && state) {
-        if (const FileDescriptor handle = handleOf(state->client); handle.isOpen()) {
-            (void)::syscall(SYS_pidfd_send_signal, handle.get(), signal, nullptr, 0);
-        }
+        sendSignal(state->client, signal);
     }
 }
 
@@ -296,7 +244,7 @@ Outcome stopDhcpClient(const std::string& interface) {
     }
     const FileDescriptor handle = handleOf(state->client);
     if (handle.isOpen()) {
-        (void)::syscall(SYS_pidfd_send_signal, handle.get(), SIGTERM, nullptr, 0);
+        sendSignal(state->client, SIGTERM);
         if (!hasEnded(handle, stopTime)) {
             logLine(LogLevel::warning, interface + ": the DHCP client does not end by itself and is ended");
             // With the program that it may be waiting for: it leads a process group of its own.

@@ -56,7 +56,10 @@ class Progress {
             return {kSCStatusFailed, "what the record says of the time before cannot be understood"};
         }
         RETURN_IF_FAILED(interface_.open());
-        return interface_.giveBack(*before, join_);
+        RETURN_IF_FAILED(interface_.giveBack(*before, join_));
+        waitsForNetworkd_ = waitsForCarrier_ =
+            interface_.link() && before->others.networkd && !before->state.addresses.empty();
+        return {};
     }
 
     [[nodiscard]] std::optional<Snapshot> snapshot() const {
@@ -75,6 +78,9 @@ class Progress {
         }
         if (waitsForLease_) {
             return advanceLease();
+        }
+        if (waitsForNetworkd_ && !isLate() && !isNetworkdSettled(interface_.link()->index)) {
+            return false;
         }
         isSettled_ = true;
         return true;
@@ -154,6 +160,7 @@ class Progress {
     std::unique_ptr<WirelessJoin> join_;
     bool waitsForCarrier_ = false;
     bool waitsForLease_ = false;
+    bool waitsForNetworkd_ = false;  // which configures the interface anew
     bool isSettled_ = false;
 };
 

@@ -92,6 +92,7 @@ Outcome DirectInterface::takeSnapshot(Snapshot& snapshot) {
     snapshot.up = link_->up;
     snapshot.ipv6Disabled = isIPv6Disabled(interface_);
     snapshot.takenAt = secondsSinceStart();
+    snapshot.others = findOtherDaemons(interface_, link_->index);
     RETURN_IF_FAILED(kernel_.read(*link_, snapshot.state));
     std::optional<Radio> radio;
     RETURN_IF_FAILED(readRadio(interface_, radio));
@@ -126,6 +127,9 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Sn
         }
     }
     RETURN_IF_FAILED(writeNotes(interface_, applying));
+    if (before) {
+        suspendOtherDaemons(interface_, link_->index, before->others);
+    }
     std::optional<DhcpSettings> client;
     RETURN_IF_FAILED(readDhcpSettings(interface_, client));
     const bool wantsClient = !isOff(plan) && plan.method == IPv4Method::dhcp;
@@ -290,6 +294,8 @@ Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<Wirele
             }
         }
     }
+    // Also when something failed: they bring what they can.
+    steps.take(resumeOtherDaemons(interface_, before.others));
     return steps.ok() ? removeNotes(interface_) : steps.first();
 }
 

@@ -9,6 +9,7 @@
 
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/Kernel.h"
+#include "platform/apply/direct/OtherDaemons.h"
 #include "platform/apply/direct/Supplicant.h"
 #include "platform/apply/direct/WirelessCard.h"
 #include "platform/base/Outcome.h"
@@ -23,7 +24,8 @@ struct Snapshot {
     std::optional<KnownNetworks> networks;  // nothing when no wireless supplicant ran
     std::optional<WirelessState> wireless;  // of a wireless card without one
     std::optional<bool> radioOff;           // nothing when it has no radio that can be switched
-    std::int64_t takenAt = 0;               // seconds since the machine's start, sleep included
+    OtherDaemons others;
+    std::int64_t takenAt = 0;  // seconds since the machine's start, sleep included
 
     template <class Self, class Fields>
     static void listFields(Self& self, Fields& fields) {
@@ -34,6 +36,7 @@ struct Snapshot {
         fields("Networks", self.networks);
         fields("Wireless", self.wireless);
         fields("RadioOff", self.radioOff);
+        fields("Others", self.others);
         fields("TakenAt", self.takenAt);
     }
 };

@@ -99,6 +99,7 @@ class DirectAgentTest : public PrivateNetworkTest {
             const TemporaryDirectory folder;
             Host host;
             host.runtimeDirectory = folder.at("run");
+            host.networkdStateDirectory = folder.at("links");
             host.dhcpHook = LA_DHCP_HOOK;
             const HostOverride override(host);
             const LogCapture log(
