@@ -23,7 +23,6 @@ namespace {
 
 using platform::preferences::Snapshot;
 using platform::preferences::StoreFile;
-using platform::preferences::systemFileOperations;
 using platform::values::makeString;
 using platform::values::Owned;
 
@@ -168,7 +167,7 @@ void openUnchanged(benchmark::State& state) {
 
 void readFile(benchmark::State& state) {
     const BenchmarkStore store(locations(state));
-    const StoreFile file(store.directory(), systemFileOperations());
+    const StoreFile file(store.directory());
     const UserTime user(state);
     for (auto _ : state) {
         platform::preferences::remember(file, {});

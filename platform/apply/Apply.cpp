@@ -9,6 +9,7 @@
 #include "platform/apply/Properties.h"
 #include "platform/apply/Record.h"
 #include "platform/apply/StateFile.h"
+#include "platform/base/FileLock.h"
 #include "platform/base/Log.h"
 
 namespace platform::apply {
@@ -316,9 +317,9 @@ Outcome applyTree(CFDictionaryRef root, CFDictionaryRef replaced) {
     if (!activates && !mayRetry(textIn(root, CFSTR("CurrentSet")))) {
         return {};
     }
-    StateLock lock;
+    FileDescriptor lock;
     if (failures.note(makeRuntimeDirectory()) &&
-        failures.note(lock.acquire(runtimePath("applied.lock"), lockBound)) &&
+        failures.note(takeFileLock(runtimePath("applied.lock"), lockBound, lock)) &&
         failures.note(readRecord(record)) && (activates || !record.isOf(plan))) {
         Run(plan, record, failures, activates).make();
     }

@@ -55,7 +55,7 @@ Outcome readRecord(Record& record) {
 }
 
 Outcome writeRecord(const Record& record) {
-    return record.entries.empty() ? removeStateFile(recordPath()) : writeState(recordPath(), record);
+    return record.entries.empty() ? removeFile(recordPath()) : writeState(recordPath(), record);
 }
 
 }  // namespace platform::apply

@@ -14,6 +14,7 @@
 
 namespace platform {
 
+class FileOperations;
 namespace apply {
 class Agent;
 }
@@ -46,7 +47,7 @@ struct Host {
     // Empty: beside this program's file, or where the program was installed.
     std::string dhcpHook;
 
-    // The modem-script folders of the four domains. An empty user folder stands for
+    // The modem-script folders of the four domains. An empty user folder means
     // <home from the password database>/.local/share/modem-scripts.
     std::string userModemScripts;
     std::string networkModemScripts = "/net/share/modem-scripts";
@@ -59,6 +60,7 @@ struct Host {
     // In the order in which they are asked who leads an interface; none: the platform's own.
     std::vector<std::shared_ptr<apply::Agent>> agents;
     // Null: the platform's own, chosen at the call.
+    std::shared_ptr<FileOperations> files;
     std::shared_ptr<services::Downloader> downloader;
     std::shared_ptr<services::Opener> opener;
     std::shared_ptr<live::NetworkState> networkState;

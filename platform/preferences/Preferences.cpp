@@ -3,7 +3,6 @@
 #include <utility>
 
 #include "platform/SystemConfiguration.h"
-#include "platform/base/Host.h"
 #include "platform/preferences/Session.h"
 #include "platform/preferences/Status.h"
 #include "platform/values/Values.h"
@@ -56,9 +55,7 @@ SCPreferencesRef SCPreferencesCreate(CFAllocatorRef /*allocator*/, CFStringRef n
     }
     const std::string client(textOf(name));
     Owned<SCPreferencesRef> session;
-    setStatus(Session::open(client, platform::currentHost().preferencesDirectory,
-                            platform::preferences::systemFileOperations(), session),
-              client);
+    setStatus(Session::open(client, session), client);
     return session.take();
 }
 

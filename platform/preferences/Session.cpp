@@ -3,6 +3,7 @@
 #include <optional>
 #include <utility>
 
+#include "platform/base/Host.h"
 #include "platform/values/PropertyListXML.h"
 
 namespace platform::preferences {
@@ -14,17 +15,14 @@ Session::Session(std::string name, StoreFile file, Snapshot read)
       onDisk_(std::move(read)),
       tree_(onDisk_.tree) {}
 
-Outcome Session::open(std::string name, const std::string& directory, FileOperations& operations,
-                      values::Owned<SCPreferencesRef>& session) {
-    StoreFile file(directory, operations);
+Outcome Session::open(std::string name, values::Owned<SCPreferencesRef>& session) {
+    StoreFile file(currentHost().preferencesDirectory);
     Snapshot snapshot;
-    Outcome done = load(file, snapshot);
-    if (done.ok()) {
-        Object* const object = new Session(std::move(name), std::move(file), std::move(snapshot));
-        session =
-            values::Owned<SCPreferencesRef>::adopt(static_cast<SCPreferencesRef>(static_cast<void*>(object)));
-    }
-    return done;
+    RETURN_IF_FAILED(load(file, snapshot));
+    Object* const object = new Session(std::move(name), std::move(file), std::move(snapshot));
+    session =
+        values::Owned<SCPreferencesRef>::adopt(static_cast<SCPreferencesRef>(static_cast<void*>(object)));
+    return {};
 }
 
 Session* Session::from(SCPreferencesRef reference) noexcept {
@@ -51,14 +49,10 @@ Outcome Session::lock(std::chrono::milliseconds wait) {
         return {};
     }
     FileDescriptor lock;
-    Outcome done = file_.lock(wait, lock);
-    if (done.ok()) {
-        done = checkFresh();
-    }
-    if (done.ok()) {
-        lock_ = std::move(lock);
-    }
-    return done;
+    RETURN_IF_FAILED(file_.lock(wait, lock));
+    RETURN_IF_FAILED(checkFresh());
+    lock_ = std::move(lock);
+    return {};
 }
 
 Outcome Session::unlock() {
@@ -91,11 +85,9 @@ Outcome Session::write() {
 
 Outcome Session::commit(std::chrono::milliseconds wait) {
     values::Owned<CFDictionaryRef> replaced = replaced_ ? replaced_ : onDisk_.tree;
-    Outcome done = makeDurable(wait);
-    if (done.ok()) {
-        replaced_ = std::move(replaced);
-    }
-    return done;
+    RETURN_IF_FAILED(makeDurable(wait));
+    replaced_ = std::move(replaced);
+    return {};
 }
 
 Outcome Session::makeDurable(std::chrono::milliseconds wait) {

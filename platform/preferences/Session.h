@@ -22,9 +22,8 @@ inline constexpr std::chrono::seconds lockWait{30};
 
 class Session final : public values::Object {
   public:
-    // The store of a directory as it is now. The operations must outlive the session.
-    static Outcome open(std::string name, const std::string& directory, FileOperations& operations,
-                        values::Owned<SCPreferencesRef>& session);
+    // The host's store as it is now.
+    static Outcome open(std::string name, values::Owned<SCPreferencesRef>& session);
     // Null when the reference is null or no session.
     [[nodiscard]] static Session* from(SCPreferencesRef reference) noexcept;
 

@@ -6,7 +6,6 @@
 #include "platform/base/Host.h"
 #include "platform/preferences/FirstRunTree.h"
 #include "platform/values/PropertyListXML.h"
-#include "platform/values/Values.h"
 
 namespace platform::preferences {
 namespace {
@@ -22,26 +21,12 @@ Remembered& remembered() {
     return last;
 }
 
-Outcome parse(const std::string& path, const std::string& content, values::Owned<CFDictionaryRef>& tree) {
-    values::ParseError error;
-    values::Owned<CFPropertyListRef> value = values::parsePropertyListXML(content, error);
-    if (!value) {
-        return {kSCStatusFailed, path + ", line " + std::to_string(error.line) + ", column " +
-                                     std::to_string(error.column) + ": " + error.reason};
-    }
-    tree = values::Owned<CFDictionaryRef>::retained(values::as<CFDictionaryRef>(value.get()));
-    return tree ? Outcome() : Outcome(kSCStatusFailed, path + " holds no dictionary");
-}
-
 }  // namespace
 
 Outcome load(const StoreFile& file, Snapshot& snapshot) {
     snapshot = {};
     std::optional<FileIdentity> now;
-    Outcome done = file.look(now);
-    if (!done.ok()) {
-        return done;
-    }
+    RETURN_IF_FAILED(file.look(now));
     if (!now) {
         snapshot.tree = makeFirstRunTree();
         return {};
@@ -53,16 +38,12 @@ Outcome load(const StoreFile& file, Snapshot& snapshot) {
     }
     std::string content;
     KnownFile known;
-    done = file.read(content, known);
-    if (done.ok()) {
-        done = parse(file.path(), content, snapshot.tree);
-    }
-    if (done.ok()) {
-        file.keepPrivate(known);
-        snapshot.file = std::move(known);
-        remember(file, snapshot);
-    }
-    return done;
+    RETURN_IF_FAILED(file.read(content, known));
+    RETURN_IF_FAILED(values::parseDictionaryFile(file.path(), content, snapshot.tree));
+    file.keepPrivate(known);
+    snapshot.file = std::move(known);
+    remember(file, snapshot);
+    return {};
 }
 
 void remember(const StoreFile& file, const Snapshot& snapshot) {
@@ -71,7 +52,7 @@ void remember(const StoreFile& file, const Snapshot& snapshot) {
 
 Outcome loadCommittedTree(values::Owned<CFDictionaryRef>& tree) {
     Snapshot snapshot;
-    Outcome done = load(StoreFile(currentHost().preferencesDirectory, systemFileOperations()), snapshot);
+    Outcome done = load(StoreFile(currentHost().preferencesDirectory), snapshot);
     tree = std::move(snapshot.tree);
     return done;
 }

@@ -1,7 +1,7 @@
 // The preferences file and its lock, as bytes: looked at, read, replaced.
 #pragma once
 
-#include <sys/types.h>
+#include <sys/stat.h>
 
 #include <chrono>
 #include <cstddef>
@@ -13,7 +13,6 @@
 
 #include "platform/base/FileDescriptor.h"
 #include "platform/base/Outcome.h"
-#include "platform/preferences/FileOperations.h"
 
 namespace platform::preferences {
 
@@ -37,14 +36,14 @@ struct KnownFile {
     std::shared_ptr<const FileDescriptor> pin;
 };
 
-// "preferences.plist" in one directory, "preferences.lock" beside it, and "preferences.plist.new" while a
+// "preferences.plist" in one directory, "preferences.lock" beside it, and a new file of its name while a
 // commit writes. A symbolic link in the place of any of them is refused, wherever it leads: the store of a
 // tool that runs as root has no business elsewhere. So is everything else that is no regular file, and none
 // of it is ever waited for. The directory and the lock must belong to this process's user or to root, and
 // nobody else may write to them: whoever could would choose the network that root configures.
 class StoreFile {
   public:
-    StoreFile(std::string directory, FileOperations& operations);
+    explicit StoreFile(std::string directory);
 
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
 
@@ -59,26 +58,21 @@ class StoreFile {
     // Takes the lock, which goes with the descriptor. Makes the directory (0700) and its parents when they
     // are missing, on the disk before anything is put into them. 3002 when another process keeps it for the
     // whole wait.
-    Outcome lock(std::chrono::milliseconds wait, FileDescriptor& lock);
+    Outcome lock(std::chrono::milliseconds wait, FileDescriptor& lock) const;
     // Puts the content in the file's place, all of it or nothing, on the disk when the call returns. The file
     // then has mode 0600, whatever it had before: it holds passwords. The lock must be held. known is what
     // the file then is: set as soon as the new content has its place, even when the call fails after that,
     // and nothing, on success too, when somebody else touched the file at that very moment.
-    Outcome replace(std::string_view content, std::optional<KnownFile>& known);
+    Outcome replace(std::string_view content, std::optional<KnownFile>& known) const;
 
   private:
     // That the directory is one, and nobody else can change what is in it.
     [[nodiscard]] Outcome checkDirectory() const;
-    Outcome makeDirectories();
-    Outcome writeTemporary(std::string_view content, std::optional<FileIdentity>& identity);
-    Outcome fill(int descriptor, std::string_view content);
-    Outcome syncDirectory(const std::string& path);
-    [[nodiscard]] std::optional<KnownFile> recognize(FileIdentity written) const;
+    [[nodiscard]] Outcome makeDirectories() const;
+    [[nodiscard]] std::optional<KnownFile> recognize(const struct stat& written) const;
 
     std::string directory_;
     std::string path_;
-    std::string temporaryPath_;
-    FileOperations* operations_;
 };
 
 }  // namespace platform::preferences

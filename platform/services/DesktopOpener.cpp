@@ -1,22 +1,20 @@
-#include <fcntl.h>
 #include <grp.h>
 #include <poll.h>
 #include <pwd.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
 #include <cerrno>
 #include <chrono>
-#include <csignal>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <utility>
 #include <vector>
 
+#include "platform/base/ChildProcess.h"
 #include "platform/base/FileDescriptor.h"
 #include "platform/base/Log.h"
 #include "platform/services/DesktopSession.h"
@@ -102,16 +100,6 @@ std::vector<std::string> environmentFor(const User& user, const DesktopSession& 
     return environment;
 }
 
-std::vector<char*> pointersTo(std::vector<std::string>& strings) {
-    std::vector<char*> pointers;
-    pointers.reserve(strings.size() + 1);
-    for (std::string& string : strings) {
-        pointers.push_back(string.data());
-    }
-    pointers.push_back(nullptr);
-    return pointers;
-}
-
 // Becomes the user for good.
 bool become(const User& user) {
     if (geteuid() == 0 &&
@@ -126,45 +114,21 @@ bool become(const User& user) {
            saved == user.id && setuid(0) != 0;
 }
 
-// Standard input and output lead nowhere, the report is descriptor 3, and there are no others.
-bool arrangeDescriptors(int report) {
-    constexpr int place = 3;
-    // Out of the way first: in a process without standard streams it may be one of 0 to 2.
-    const int aside = fcntl(report, F_DUPFD_CLOEXEC, place + 1);
-    const int nowhere = open("/dev/null", O_RDWR);
-    if (aside < 0 || nowhere < 0 || dup2(nowhere, 0) < 0 || dup2(nowhere, 1) < 0 || dup2(nowhere, 2) < 0 ||
-        dup3(aside, place, O_CLOEXEC) < 0) {
-        return false;
-    }
-    return close_range(place + 1, ~0U, 0) == 0;
-}
-
-void restoreSignals() {
-    for (int signal = 1; signal < NSIG; ++signal) {
-        // Those that cannot be changed, or belong to the C library, refuse, which is as well.
-        static_cast<void>(std::signal(signal, SIG_DFL));
-    }
-    sigset_t none;
-    sigemptyset(&none);
-    sigprocmask(SIG_SETMASK, &none, nullptr);
-}
-
-// Each status on the way to the program: noErr right before it, so that an end without a word is a failure.
-void report(OSStatus status) {
-    static_cast<void>(!write(3, &status, sizeof status));
-}
-
-// In the child; returns only when no program could be run.
-OSStatus runProgram(const Desktop& desktop, const User& user, const DesktopSession& session,
-                    const std::string& url) {
-    restoreSignals();
+// In the child; tells each status on the way to the program: noErr right before it, so that an end without a
+// word is a failure.
+void runProgram(const Desktop& desktop, const User& user, const DesktopSession& session,
+                const std::string& url, int channel) {
+    const auto report = [channel](OSStatus status) {
+        static_cast<void>(!write(channel, &status, sizeof status));
+    };
     alarm(lifetimeBeforeProgram);
     if (!become(user)) {
-        return permErr;
+        report(permErr);
+        return;
     }
-    std::vector<std::string> environment = environmentFor(user, session, desktop.runtimeRoot);
+    const std::vector<std::string> environment = environmentFor(user, session, desktop.runtimeRoot);
     if (chdir(user.home.c_str()) != 0 && chdir("/") != 0) {
-        return ioErr;
+        return;
     }
     umask(022);
     alarm(0);
@@ -172,10 +136,10 @@ OSStatus runProgram(const Desktop& desktop, const User& user, const DesktopSessi
     int error = ENOENT;
     for (std::vector<std::string> arguments : desktop.programs) {
         arguments.push_back(url);
-        execve(arguments.front().c_str(), pointersTo(arguments).data(), pointersTo(environment).data());
-        error = error == ENOENT ? errno : error;
+        const int failure = becomeProgram(arguments.front(), arguments, environment);
+        error = error == ENOENT ? failure : error;
     }
-    return error == ENOENT ? fnfErr : error == EACCES ? permErr : ioErr;
+    report(error == ENOENT ? fnfErr : error == EACCES ? permErr : ioErr);
 }
 
 // What the child said last before it became the program, or ended.
@@ -203,37 +167,10 @@ OSStatus lastReport(int reports) {
 
 OSStatus handOver(const Desktop& desktop, const User& user, const DesktopSession& session,
                   const std::string& url) {
-    std::array<int, 2> ends{-1, -1};
-    if (pipe2(ends.data(), O_CLOEXEC) != 0) {
-        return ioErr;
-    }
-    const FileDescriptor reports(ends[0]);
-    FileDescriptor reporter(ends[1]);
-    const pid_t child = fork();
-    if (child < 0) {
-        return ioErr;
-    }
-    if (child == 0) {
-        // The program is the child of a child that ends at once, so that nobody has to wait for it.
-        setsid();
-        if (fork() != 0) {
-            _exit(0);
-        }
-        OSStatus status = ioErr;
-        try {
-            if (arrangeDescriptors(reporter.get())) {
-                status = runProgram(desktop, user, session, url);
-                report(status);
-            }
-        } catch (...) {
-            // The silence tells.
-        }
-        _exit(127);
-    }
-    reporter.reset();
-    while (waitpid(child, nullptr, 0) < 0 && errno == EINTR) {
-    }
-    return lastReport(reports.get());
+    FileDescriptor channel;
+    const Outcome started =
+        startDetached([&](int reports) { runProgram(desktop, user, session, url, reports); }, channel);
+    return started.ok() ? lastReport(channel.get()) : ioErr;
 }
 
 OSStatus failed(OSStatus status, const std::string& reason) {

@@ -7,6 +7,7 @@
 #include <string_view>
 
 #include "platform/CoreFoundation.h"
+#include "platform/base/Outcome.h"
 #include "platform/values/Object.h"
 
 namespace platform::values {
@@ -25,6 +26,9 @@ struct ParseError {
 // integers that fit 64 bits, dates in UTC, data in base 64; entities other than the five of XML and character
 // references are refused.
 [[nodiscard]] Owned<CFPropertyListRef> parsePropertyListXML(std::string_view text, ParseError& error);
+// The dictionary that a file with this text holds. Fails, with the place in the reason, for anything else.
+Outcome parseDictionaryFile(const std::string& path, std::string_view text,
+                            Owned<CFDictionaryRef>& dictionary);
 
 // The document for a value, in UTF-8, indented with tabs, entries in their own order, ending in a line break;
 // it reads back as an equal value. Nothing when the value holds something that XML cannot carry (a string

@@ -11,6 +11,7 @@
 #include "platform/values/PropertyListBuilder.h"
 #include "platform/values/PropertyListXML.h"
 #include "platform/values/PropertyListXMLForms.h"
+#include "platform/values/Values.h"
 
 namespace platform::values {
 
@@ -153,6 +154,18 @@ Owned<CFPropertyListRef> parseAnyPropertyListXML(std::string_view text, ParseErr
 Owned<CFPropertyListRef> parsePropertyListXML(std::string_view text, ParseError& error) {
     Owned<CFPropertyListRef> value = parsePlainPropertyListXML(text);
     return value ? value : parseAnyPropertyListXML(text, error);
+}
+
+Outcome parseDictionaryFile(const std::string& path, std::string_view text,
+                            Owned<CFDictionaryRef>& dictionary) {
+    ParseError error;
+    const Owned<CFPropertyListRef> value = parsePropertyListXML(text, error);
+    if (!value) {
+        return {kSCStatusFailed, path + ", line " + std::to_string(error.line) + ", column " +
+                                     std::to_string(error.column) + ": " + error.reason};
+    }
+    dictionary = Owned<CFDictionaryRef>::retained(as<CFDictionaryRef>(value.get()));
+    return dictionary ? Outcome() : Outcome(kSCStatusFailed, path + " holds no dictionary");
 }
 
 }  // namespace platform::values

@@ -1,18 +1,15 @@
 #include "platform/apply/direct/DhcpClient.h"
 
-#include <fcntl.h>
 #include <poll.h>
-#include <sys/stat.h>
-#include <sys/wait.h>
+#include <sys/socket.h>
 #include <unistd.h>
 
-#include <array>
-#include <cerrno>
 #include <csignal>
 #include <vector>
 
 #include "platform/apply/StateFile.h"
 #include "platform/apply/direct/Process.h"
+#include "platform/base/ChildProcess.h"
 #include "platform/base/FileDescriptor.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
@@ -93,86 +90,25 @@ std::vector<std::string> argumentsFor(const DhcpSettings& settings, const std::s
     return arguments;
 }
 
-std::vector<char*> pointersTo(std::vector<std::string>& texts) {
-    std::vector<char*> pointers;
-    pointers.reserve(texts.size() + 1);
-    for (std::string& text : texts) {
-        pointers.push_back(text.data());
-    }
-    pointers.push_back(nullptr);
-    return pointers;
-}
-
-// In the child, between fork and exec: only what is safe there.
-[[noreturn]] void becomeClient(int gate, const char* program, char* const* arguments,
-                               char* const* environment) {
-    ::setsid();
-    sigset_t none;
-    sigemptyset(&none);
-    ::sigprocmask(SIG_SETMASK, &none, nullptr);
-    for (int signal = 1; signal < NSIG; ++signal) {
-        ::signal(signal, SIG_DFL);
-    }
-    char go = 0;
-    if (::read(gate, &go, 1) != 1 || ::chdir("/") != 0) {
-        ::_exit(126);
-    }
-    const int nowhere = ::open("/dev/null", O_RDWR | O_CLOEXEC);
-    if (nowhere < 0 || ::dup2(nowhere, 0) < 0 || ::dup2(nowhere, 1) < 0 || ::dup2(nowhere, 2) < 0) {
-        ::_exit(126);
-    }
-    ::close_range(3, ~0U, 0);
-    ::execve(program, arguments, environment);
-    ::_exit(127);
-}
-
-// Starts the client as a child of nobody in particular, held at the gate until a byte comes through it; if
-// this process ends before, so does the client.
+// Starts the client held at the gate: it waits for a byte, and ends when this process ends before.
 Outcome startHeld(const DhcpSettings& settings, const std::string& hook, Process& client,
-                  FileDescriptor& opener) {
-    std::vector<std::string> arguments = argumentsFor(settings, hook);
-    std::vector<std::string> environment{
-        "PATH=/usr/sbin:/usr/bin:/sbin:/bin",
-        std::string(dhcpSettingsVariable) + "=" + settingsPath(settings.interface)};
-    const std::vector<char*> argumentPointers = pointersTo(arguments);
-    const std::vector<char*> environmentPointers = pointersTo(environment);
-    const char* const program = currentHost().dhcpClient.c_str();
-
-    std::array<int, 2> gate{};
-    std::array<int, 2> report{};
-    if (::pipe2(gate.data(), O_CLOEXEC) != 0) {
-        return Outcome::fromErrno("cannot make a pipe");
-    }
-    FileDescriptor gateOut(gate[0]);
-    FileDescriptor gateIn(gate[1]);
-    if (::pipe2(report.data(), O_CLOEXEC) != 0) {
-        return Outcome::fromErrno("cannot make a pipe");
-    }
-    FileDescriptor reportOut(report[0]);
-    FileDescriptor reportIn(report[1]);
-    const pid_t between = ::fork();
-    if (between < 0) {
-        return Outcome::fromErrno("cannot start the DHCP client");
-    }
-    if (between == 0) {
-        ::close(gateIn.get());
-        const pid_t number = ::fork();
-        if (number == 0) {
-            ::close(reportIn.get());
-            becomeClient(gateOut.get(), program, argumentPointers.data(), environmentPointers.data());
+                  FileDescriptor& gate) {
+    const auto run = [&](int channel) {
+        const pid_t number = getpid();
+        char go = 0;
+        if (::write(channel, &number, sizeof number) == sizeof number && ::read(channel, &go, 1) == 1 &&
+            ::chdir("/") == 0) {
+            (void)becomeProgram(currentHost().dhcpClient, argumentsFor(settings, hook),
+                                {"PATH=/usr/sbin:/usr/bin:/sbin:/bin",
+                                 std::string(dhcpSettingsVariable) + "=" + settingsPath(settings.interface)});
         }
-        (void)!::write(reportIn.get(), &number, sizeof number);
-        ::_exit(0);
-    }
-    reportIn.reset();
-    pid_t number = -1;
-    const bool reported = ::read(reportOut.get(), &number, sizeof number) == sizeof number && number > 1;
-    (void)::waitpid(between, nullptr, 0);
-    if (!reported) {
+    };
+    RETURN_IF_FAILED(startDetached(run, gate));
+    pid_t number = 0;
+    if (::read(gate.get(), &number, sizeof number) != sizeof number) {
         return {kSCStatusFailed, "cannot start the DHCP client"};
     }
     client = processOf(number);
-    opener = std::move(gateIn);
     return {};
 }
 
@@ -219,13 +155,13 @@ Outcome startDhcpClient(const DhcpSettings& settings) {
         return Outcome::fromErrno("cannot run the DHCP client " + currentHost().dhcpClient);
     }
     Process client;
-    FileDescriptor opener;
-    RETURN_IF_FAILED(startHeld(settings, hook, client, opener));
+    FileDescriptor gate;
+    RETURN_IF_FAILED(startHeld(settings, hook, client, gate));
     // Only a client that the next run can find again is let go.
     RETURN_IF_FAILED(writeState(settingsPath(settings.interface),
                                 ClientState{{settings, currentHost().resolverFile}, client}));
-    return ::write(opener.get(), "g", 1) == 1 ? Outcome()
-                                              : Outcome::fromErrno("cannot start the DHCP client");
+    return ::send(gate.get(), "g", 1, MSG_NOSIGNAL) == 1 ? Outcome()
+                                                         : Outcome::fromErrno("cannot start the DHCP client");
 }
 
 void hurryDhcpClient(const std::string& interface) {
@@ -253,7 +189,7 @@ Outcome stopDhcpClient(const std::string& interface) {
         }
     }
     RETURN_IF_FAILED(dropLease(state->settings.dhcp));
-    return removeStateFile(settingsPath(interface));
+    return removeFile(settingsPath(interface));
 }
 
 }  // namespace platform::apply

@@ -215,7 +215,7 @@ Outcome dropLease(const DhcpSettings& settings) {
             RETURN_IF_FAILED(setServers(settings, {}));
         }
     }
-    return removeStateFile(leasePath(settings.interface));
+    return removeFile(leasePath(settings.interface));
 }
 
 }  // namespace platform::apply

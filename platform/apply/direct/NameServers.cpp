@@ -12,6 +12,7 @@
 #include <tuple>
 
 #include "platform/apply/StateFile.h"
+#include "platform/base/FileLock.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
 
@@ -102,9 +103,9 @@ Outcome readFileState(const std::string& path, FileState& state) {
 Outcome makeFileState(const std::string& path, const FileState& state) {
     switch (state.kind) {
         case FileState::Kind::absent:
-            return removeStateFile(path);
+            return removeFile(path);
         case FileState::Kind::file:
-            return replaceFile(path, state.content, state.ownership);
+            return replaceFileOrMount(path, state.content, state.ownership);
         case FileState::Kind::link:
             break;
     }
@@ -115,7 +116,7 @@ Outcome makeFileState(const std::string& path, const FileState& state) {
         ::rename(temporary.c_str(), path.c_str()) != 0) {
         return Outcome::fromErrno("cannot make the link " + path);
     }
-    return syncDirectoryOf(path);
+    return syncDirectory(parentOf(path));
 }
 
 std::string statePath() {
@@ -170,7 +171,7 @@ Outcome giveFileBack(const std::string& path, const FileState& now, State& state
             return {};
         }
     }
-    return removeStateFile(statePath());
+    return removeFile(statePath());
 }
 
 }  // namespace
@@ -178,8 +179,8 @@ Outcome giveFileBack(const std::string& path, const FileState& now, State& state
 Outcome setInterfaceNameServers(const std::string& interface, unsigned rank, const NameService& service,
                                 std::string& trouble) {
     trouble.clear();
-    StateLock lock;
-    RETURN_IF_FAILED(lock.acquire(runtimePath("name-servers.lock"), lockBound));
+    FileDescriptor lock;
+    RETURN_IF_FAILED(takeFileLock(runtimePath("name-servers.lock"), lockBound, lock));
     std::optional<State> known;
     RETURN_IF_FAILED(readState(statePath(), known));
     if (!known && service.empty()) {
@@ -218,7 +219,7 @@ Outcome setInterfaceNameServers(const std::string& interface, unsigned rank, con
     std::erase_if(state.written, [&now](const std::string& old) { return !old.starts_with(now.content); });
     state.written.push_back(content);
     RETURN_IF_FAILED(writeState(statePath(), state));
-    if (const Outcome replaced = replaceFile(path, content, {0644, ::geteuid(), ::getegid()});
+    if (const Outcome replaced = replaceFileOrMount(path, content, {0644, ::geteuid(), ::getegid()});
         !replaced.ok()) {
         trouble = replaced.reason();
     }

@@ -64,7 +64,7 @@ Outcome writeNotes(const std::string& interface, const Notes& notes) {
 }
 
 Outcome removeNotes(const std::string& interface) {
-    return removeStateFile(notesPath(interface));
+    return removeFile(notesPath(interface));
 }
 
 }  // namespace platform::apply

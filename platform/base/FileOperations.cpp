@@ -1,4 +1,4 @@
-#include "platform/preferences/FileOperations.h"
+#include "platform/base/FileOperations.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -6,7 +6,9 @@
 
 #include <cstdio>
 
-namespace platform::preferences {
+#include "platform/base/Host.h"
+
+namespace platform {
 
 int FileOperations::makeDirectory(const std::string& path, mode_t mode) {
     return ::mkdir(path.c_str(), mode);
@@ -36,9 +38,9 @@ int FileOperations::remove(const std::string& path) {
     return ::unlink(path.c_str());
 }
 
-FileOperations& systemFileOperations() {
-    static FileOperations operations;
-    return operations;
+FileOperations& fileOperations() {
+    static FileOperations system;
+    return currentHost().files ? *currentHost().files : system;
 }
 
-}  // namespace platform::preferences
+}  // namespace platform

@@ -1,5 +1,4 @@
-// The steps by which the preferences file changes on disk, one function each, so that a test can make any of
-// them fail.
+// The steps by which a file changes on disk, one function each, so that a test can make any of them fail.
 #pragma once
 
 #include <sys/types.h>
@@ -7,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-namespace platform::preferences {
+namespace platform {
 
 // Every function is the system call that its name suggests: -1 and errno on failure.
 class FileOperations {
@@ -28,7 +27,7 @@ class FileOperations {
     virtual int remove(const std::string& path);
 };
 
-// The system's own.
-[[nodiscard]] FileOperations& systemFileOperations();
+// Those of the host in force.
+[[nodiscard]] FileOperations& fileOperations();
 
-}  // namespace platform::preferences
+}  // namespace platform

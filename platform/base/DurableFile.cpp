@@ -1,0 +1,170 @@
+#include "platform/base/DurableFile.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/FileOperations.h"
+
+namespace platform {
+namespace {
+
+Outcome writeAll(int descriptor, std::string_view content, const std::string& path) {
+    while (!content.empty()) {
+        const ssize_t written = fileOperations().write(descriptor, content);
+        if (written < 0 && errno == EINTR) {
+            continue;
+        }
+        if (written <= 0) {
+            return Outcome::fromErrno("cannot write " + path, written < 0 ? errno : EIO);
+        }
+        content.remove_prefix(static_cast<std::size_t>(written));
+    }
+    return {};
+}
+
+Outcome overwrite(const std::string& path, std::string_view content) {
+    const FileDescriptor file(fileOperations().open(path, O_WRONLY | O_TRUNC, 0));
+    if (!file.isOpen()) {
+        return Outcome::fromErrno("cannot open " + path);
+    }
+    RETURN_IF_FAILED(writeAll(file.get(), content, path));
+    return fileOperations().sync(file.get()) == 0 ? Outcome()
+                                                  : Outcome::fromErrno("cannot put " + path + " on the disk");
+}
+
+Outcome fill(int descriptor, std::string_view content, const FileOwnership& ownership,
+             const std::string& path) {
+    RETURN_IF_FAILED(writeAll(descriptor, content, path));
+    if (::fchown(descriptor, ownership.user, ownership.group) != 0 ||
+        ::fchmod(descriptor, ownership.mode) != 0) {
+        return Outcome::fromErrno("cannot give " + path + " its owner and mode");
+    }
+    return fileOperations().sync(descriptor) == 0 ? Outcome()
+                                                  : Outcome::fromErrno("cannot put " + path + " on the disk");
+}
+
+Outcome writeTemporary(const std::string& path, std::string_view content, const FileOwnership& ownership,
+                       struct stat* written) {
+    // Nobody but the lock's holder makes this file, so one that is there was left behind by a crash.
+    if (fileOperations().remove(path) != 0 && errno != ENOENT) {
+        return Outcome::fromErrno("cannot remove " + path);
+    }
+    FileDescriptor file(fileOperations().open(path, O_WRONLY | O_CREAT | O_EXCL, 0600));
+    if (!file.isOpen()) {
+        return Outcome::fromErrno("cannot make " + path);
+    }
+    Outcome done = fill(file.get(), content, ownership, path);
+    if (done.ok() && written != nullptr && ::fstat(file.get(), written) != 0) {
+        done = Outcome::fromErrno("cannot look at " + path);
+    }
+    if (fileOperations().close(file.release()) != 0 && done.ok()) {
+        done = Outcome::fromErrno("cannot close " + path);
+    }
+    return done;
+}
+
+Outcome replace(const std::string& path, std::string_view content, const FileOwnership& ownership,
+                struct stat* written, bool& isMount) {
+    const std::string temporary = temporaryFor(path);
+    Outcome done = writeTemporary(temporary, content, ownership, written);
+    if (done.ok() && fileOperations().rename(temporary, path) != 0) {
+        isMount = errno == EBUSY;
+        done = Outcome::fromErrno("cannot replace " + path);
+    }
+    if (!done.ok()) {
+        (void)fileOperations().remove(temporary);
+        return done;
+    }
+    return syncDirectory(parentOf(path));
+}
+
+}  // namespace
+
+std::string parentOf(const std::string& path) {
+    const std::size_t slash = path.find_last_of('/');
+    return slash == std::string::npos ? "." : slash == 0 ? "/" : path.substr(0, slash);
+}
+
+Outcome checkRegular(const struct stat& status, const std::string& path) {
+    if (S_ISLNK(status.st_mode)) {
+        return {kSCStatusFailed, path + " is a symbolic link"};
+    }
+    return S_ISREG(status.st_mode) ? Outcome() : Outcome(kSCStatusFailed, path + " is not a regular file");
+}
+
+Outcome checkTrusted(const struct stat& status, const std::string& path) {
+    if ((status.st_uid != ::geteuid() && status.st_uid != 0) || (status.st_mode & (S_IWGRP | S_IWOTH)) != 0) {
+        return {kSCStatusFailed, path + " belongs to somebody else, or others may write to it"};
+    }
+    return {};
+}
+
+Outcome readDescriptor(int descriptor, const std::string& path, std::size_t largest, std::string& content) {
+    struct stat status {};
+    if (::fstat(descriptor, &status) != 0) {
+        return Outcome::fromErrno("cannot look at " + path);
+    }
+    RETURN_IF_FAILED(checkRegular(status, path));
+    std::size_t filled = 0;
+    const auto size = static_cast<std::size_t>(status.st_size);
+    // One byte more than the file has, to see its end; those that the kernel makes up have size 0.
+    content.resize(std::max<std::size_t>(std::min(size, largest) + 1, 4096));
+    while (size <= largest && filled <= largest) {
+        const ssize_t got = ::read(descriptor, content.data() + filled, content.size() - filled);
+        if (got < 0 && errno != EINTR) {
+            return Outcome::fromErrno("cannot read " + path);
+        }
+        if (got == 0) {
+            content.resize(filled);
+            return {};
+        }
+        filled += static_cast<std::size_t>(std::max<ssize_t>(got, 0));
+        content.resize(filled == content.size() ? filled * 2 : content.size());
+    }
+    return {kSCStatusFailed, path + " is larger than " + std::to_string(largest) + " bytes"};
+}
+
+Outcome readWholeFile(const std::string& path, std::string& content, std::size_t largest) {
+    const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
+    return file.isOpen() ? readDescriptor(file.get(), path, largest, content)
+                         : Outcome::fromErrno("cannot open " + path);
+}
+
+std::string temporaryFor(const std::string& path) {
+    return path + ".la-new";
+}
+
+Outcome replaceFile(const std::string& path, std::string_view content, const FileOwnership& ownership,
+                    struct stat* written) {
+    bool isMount = false;
+    return replace(path, content, ownership, written, isMount);
+}
+
+Outcome replaceFileOrMount(const std::string& path, std::string_view content,
+                           const FileOwnership& ownership) {
+    bool isMount = false;
+    Outcome done = replace(path, content, ownership, nullptr, isMount);
+    return isMount ? overwrite(path, content) : done;
+}
+
+Outcome removeFile(const std::string& path) {
+    (void)fileOperations().remove(temporaryFor(path));
+    if (fileOperations().remove(path) != 0) {
+        return errno == ENOENT ? Outcome() : Outcome::fromErrno("cannot remove " + path);
+    }
+    return syncDirectory(parentOf(path));
+}
+
+Outcome syncDirectory(const std::string& path) {
+    const FileDescriptor directory(fileOperations().open(path + "/.", O_RDONLY | O_DIRECTORY, 0));
+    if (!directory.isOpen() || fileOperations().sync(directory.get()) != 0) {
+        return Outcome::fromErrno("cannot put " + path + " on the disk");
+    }
+    return {};
+}
+
+}  // namespace platform
