@@ -13,7 +13,7 @@ namespace {
 
 OSStatus CreateStringWithASCII(const char* text, CFStringRef* result) {
     CFStringRef string = CFStringCreateWithCString(kCFAllocatorDefault, text, kCFStringEncodingASCII);
-    const OSStatus err = string != nullptr ? 0 : coreFoundationUnknownErr;
+    const OSStatus err = ErrorIfMissing(string);
     HandOverOrNull(err, string, result);
     return err;
 }
@@ -31,12 +31,9 @@ OSStatus MoreSCFCreateStringWithMacAddress(const UInt8 macAddr[6], CFStringRef* 
 }
 
 OSStatus MoreSCFStringToMacAddress(CFStringRef str, UInt8 macAddr[6]) {
-    OSStatus err = 0;
     char text[18];
     unsigned int bytes[6];
-    if (str == nullptr) {
-        err = paramErr;
-    }
+    OSStatus err = ErrorIfNotGiven(str);
     if (err == 0 && !CFStringGetCString(str, text, sizeof(text), kCFStringEncodingASCII)) {
         err = coreFoundationUnknownErr;
     }
@@ -58,10 +55,7 @@ OSStatus MoreSCFCreateStringWithInetAddress(in_addr addr, CFStringRef* result) {
 
 OSStatus MoreSCFCreateArrayWithInetAddresses(CFIndex count, const in_addr* addresses, CFArrayRef* result) {
     CFMutableArrayRef array = nullptr;
-    OSStatus err = 0;
-    if (count != 0 && addresses == nullptr) {
-        err = paramErr;
-    }
+    OSStatus err = count != 0 ? ErrorIfNotGiven(addresses) : 0;
     if (err == 0) {
         err = CFQArrayCreateMutable(&array);
     }
@@ -78,21 +72,13 @@ OSStatus MoreSCFCreateArrayWithInetAddresses(CFIndex count, const in_addr* addre
 }
 
 OSStatus MoreSCFCopyEncodedPPPPassword(CFStringRef password, CFDataRef* encodedPassword) {
-    OSStatus err = 0;
     UniChar* units = nullptr;
     CFDataRef encoded = nullptr;
-    CFIndex count = 0;
-    if (password == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        count = CFStringGetLength(password);
-        if (count > 0) {
-            units = static_cast<UniChar*>(std::malloc(static_cast<std::size_t>(count) * sizeof(UniChar)));
-            if (units == nullptr) {
-                err = memFullErr;
-            }
-        }
+    const CFIndex count = password != nullptr ? CFStringGetLength(password) : 0;
+    OSStatus err = ErrorIfNotGiven(password);
+    if (err == 0 && count > 0) {
+        units = static_cast<UniChar*>(std::malloc(static_cast<std::size_t>(count) * sizeof(UniChar)));
+        err = units != nullptr ? 0 : memFullErr;
     }
     if (err == 0) {
         CFStringGetCharacters(password, CFRangeMake(0, count), units);
@@ -101,9 +87,7 @@ OSStatus MoreSCFCopyEncodedPPPPassword(CFStringRef password, CFDataRef* encodedP
         }
         encoded = CFDataCreate(kCFAllocatorDefault, reinterpret_cast<const UInt8*>(units),
                                count * static_cast<CFIndex>(sizeof(UniChar)));
-        if (encoded == nullptr) {
-            err = coreFoundationUnknownErr;
-        }
+        err = ErrorIfMissing(encoded);
     }
     std::free(units);
     HandOverOrNull(err, encoded, encodedPassword);

@@ -5,53 +5,33 @@
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
-const MoreSCPPPOptions kMoreSCPPPOptionsDefaultTenOne = {
-    .dialOnDemand = false,
-    .idleReminder = false,
-    .idleReminderTimer = 1800,
-    .disconnectOnIdle = true,
-    .disconnectOnIdleTimer = 900,
-    .disconnectOnLogout = true,
-    .commRedialEnabled = true,
-    .commRedialCount = 1,
-    .commRedialInterval = 30,
-    .lcpEchoEnabled = true,
-    .ipcpCompressionVJ = true,
-    .commDisplayTerminalWindow = false,
-    .verboseLogging = false,
-};
+namespace {
 
-const MoreSCPPPOptions kMoreSCPPPOptionsDefaultTenTwoAndLater = {
-    .dialOnDemand = false,
-    .idleReminder = false,
-    .idleReminderTimer = 1800,
-    .disconnectOnIdle = true,
-    .disconnectOnIdleTimer = 600,
-    .disconnectOnLogout = true,
-    .commRedialEnabled = true,
-    .commRedialCount = 1,
-    .commRedialInterval = 5,
-    .lcpEchoEnabled = true,
-    .ipcpCompressionVJ = true,
-    .commDisplayTerminalWindow = false,
-    .verboseLogging = false,
-};
+// The tables differ in three values, and agree in the rest.
+constexpr MoreSCPPPOptions PPPOptions(Boolean disconnectOnIdle, SInt32 disconnectOnIdleTimer,
+                                      SInt32 commRedialInterval) {
+    return {
+        .dialOnDemand = false,
+        .idleReminder = false,
+        .idleReminderTimer = 1800,
+        .disconnectOnIdle = disconnectOnIdle,
+        .disconnectOnIdleTimer = disconnectOnIdleTimer,
+        .disconnectOnLogout = true,
+        .commRedialEnabled = true,
+        .commRedialCount = 1,
+        .commRedialInterval = commRedialInterval,
+        .lcpEchoEnabled = true,
+        .ipcpCompressionVJ = true,
+        .commDisplayTerminalWindow = false,
+        .verboseLogging = false,
+    };
+}
 
-const MoreSCPPPOptions kMoreSCPPPoEOptionsDefaultTenTwoAndLater = {
-    .dialOnDemand = false,
-    .idleReminder = false,
-    .idleReminderTimer = 1800,
-    .disconnectOnIdle = false,
-    .disconnectOnIdleTimer = 1800,
-    .disconnectOnLogout = true,
-    .commRedialEnabled = true,
-    .commRedialCount = 1,
-    .commRedialInterval = 5,
-    .lcpEchoEnabled = true,
-    .ipcpCompressionVJ = true,
-    .commDisplayTerminalWindow = false,
-    .verboseLogging = false,
-};
+}  // namespace
+
+const MoreSCPPPOptions kMoreSCPPPOptionsDefaultTenOne = PPPOptions(true, 900, 30);
+const MoreSCPPPOptions kMoreSCPPPOptionsDefaultTenTwoAndLater = PPPOptions(true, 600, 5);
+const MoreSCPPPOptions kMoreSCPPPoEOptionsDefaultTenTwoAndLater = PPPOptions(false, 1800, 5);
 
 const MoreSCModemDigest kMoreSCModemDigestDefault = {
     .connectionScript = nullptr,
@@ -67,75 +47,87 @@ constexpr OSStatus kUnknownProtocolErr = -1;
 
 Boolean gTenTwoOrLater = false;
 
-// One key of a record each. After an error none is written any more.
+// An entity that is being built. After an error no key is written any more.
+struct Record {
+    CFMutableDictionaryRef dict;
+    OSStatus err;
+};
 
-void SetNumber(OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, SInt32 value) {
-    if (*err == 0) {
-        *err = CFQDictionarySetNumber(dict, key, value);
+void SetNumber(Record* record, CFStringRef key, SInt32 value) {
+    if (record->err == 0) {
+        record->err = CFQDictionarySetNumber(record->dict, key, value);
     }
 }
 
-void SetValue(const OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, CFTypeRef value) {
-    if (*err == 0) {
-        CFDictionarySetValue(dict, key, value);
+void SetValue(Record* record, CFStringRef key, CFTypeRef value) {
+    if (record->err == 0) {
+        CFDictionarySetValue(record->dict, key, value);
     }
 }
 
 // Null leaves the key out.
-void SetOptional(const OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, CFTypeRef value) {
+void SetOptional(Record* record, CFStringRef key, CFTypeRef value) {
     if (value != nullptr) {
-        SetValue(err, dict, key, value);
+        SetValue(record, key, value);
     }
 }
 
 // Null is -50.
-void SetRequired(OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, CFTypeRef value) {
-    if (*err == 0 && value == nullptr) {
-        *err = paramErr;
+void SetRequired(Record* record, CFStringRef key, CFTypeRef value) {
+    if (record->err == 0) {
+        record->err = ErrorIfNotGiven(value);
     }
-    SetValue(err, dict, key, value);
+    SetValue(record, key, value);
 }
 
-void SetInactive(OSStatus* err, CFMutableDictionaryRef dict) {
-    SetNumber(err, dict, kInactiveKey, 1);
+// A value that is made for the record; it comes with the status of making it, and is consumed.
+void SetMade(Record* record, CFStringRef key, OSStatus err, CFTypeRef value) {
+    if (record->err == 0) {
+        record->err = err;
+    }
+    SetValue(record, key, value);
+    CFQRelease(value);
 }
 
-void SetMacAddress(OSStatus* err, CFMutableDictionaryRef dict, const UInt8 macAddr[6]) {
+void SetActive(Record* record, Boolean active) {
+    if (!active) {
+        SetNumber(record, kInactiveKey, 1);
+    }
+}
+
+void SetMacAddress(Record* record, const UInt8 macAddr[6]) {
     CFStringRef text = nullptr;
-    if (*err == 0) {
-        *err = MoreSCFCreateStringWithMacAddress(macAddr, &text);
-    }
-    SetValue(err, dict, kMACAddressKey, text);
-    CFQRelease(text);
+    const OSStatus err = MoreSCFCreateStringWithMacAddress(macAddr, &text);
+    SetMade(record, kMACAddressKey, err, text);
 }
 
-// An address as an array of one; 0 is absent.
-void SetInetAddressArray(OSStatus* err, CFMutableDictionaryRef dict, CFStringRef key, in_addr address) {
-    CFArrayRef addresses = nullptr;
-    if (*err == 0 && address.s_addr != 0) {
-        *err = MoreSCFCreateArrayWithInetAddresses(1, &address, &addresses);
-        SetValue(err, dict, key, addresses);
+// Nothing for no addresses.
+void SetInetAddresses(Record* record, CFStringRef key, UInt32 count, const in_addr* addresses) {
+    if (count != 0) {
+        CFArrayRef array = nullptr;
+        const OSStatus err =
+            MoreSCFCreateArrayWithInetAddresses(static_cast<CFIndex>(count), addresses, &array);
+        SetMade(record, key, err, array);
     }
-    CFQRelease(addresses);
 }
 
 OSStatus AddProxy(CFMutableDictionaryRef dict, CFStringRef enableKey, CFStringRef proxyKey,
                   CFStringRef portKey, Boolean enableValue, CFStringRef proxyValue, UInt16 portValue) {
-    OSStatus err = CFQDictionarySetNumber(dict, enableKey, enableValue);
-    SetOptional(&err, dict, proxyKey, proxyValue);
+    Record record = {dict, 0};
+    SetNumber(&record, enableKey, enableValue);
+    SetOptional(&record, proxyKey, proxyValue);
     if (portValue != 0) {
-        SetNumber(&err, dict, portKey, portValue);
+        SetNumber(&record, portKey, portValue);
     }
-    return err;
+    return record.err;
 }
 
 OSStatus CreateArrayWithStrings(UInt32 count, const CFStringRef* strings, CFMutableArrayRef* result) {
     CFMutableArrayRef array = nullptr;
     OSStatus err = strings != nullptr ? CFQArrayCreateMutable(&array) : static_cast<OSStatus>(paramErr);
     for (UInt32 i = 0; err == 0 && i < count; ++i) {
-        if (strings[i] == nullptr) {
-            err = paramErr;
-        } else {
+        err = ErrorIfNotGiven(strings[i]);
+        if (err == 0) {
             CFArrayAppendValue(array, strings[i]);
         }
     }
@@ -143,285 +135,244 @@ OSStatus CreateArrayWithStrings(UInt32 count, const CFStringRef* strings, CFMuta
     return err;
 }
 
-// The member of a union of digests; none of no union.
-template <class Union, class Digest>
-const Digest* Member(const Union* digests, Digest Union::*member) {
-    return digests != nullptr ? &(digests->*member) : nullptr;
+// What every builder does around the keys of its own: a new dictionary, which the keys are put into, and
+// which the caller gets, or null. err is that of looking at the digest.
+template <class Fill>
+OSStatus CreateRecord(OSStatus err, CFMutableDictionaryRef* entity, Fill fill) {
+    Record record = {nullptr, err};
+    if (record.err == 0) {
+        record.err = CFQDictionaryCreateMutable(&record.dict);
+    }
+    if (record.err == 0) {
+        fill(&record);
+    }
+    HandOverOrNull(record.err, record.dict, entity);
+    return record.err;
 }
 
-// An empty record for a builder to fill; -50 without a digest.
-OSStatus BeginRecord(const void* digest, CFMutableDictionaryRef* record) {
-    return digest != nullptr ? CFQDictionaryCreateMutable(record) : static_cast<OSStatus>(paramErr);
+// A protocol's builder, as a dispatcher calls it.
+template <class Union>
+struct Builder {
+    CFStringRef protocol;
+    OSStatus (*create)(const Union* digest, CFMutableDictionaryRef* entity);
+};
+
+// Builds from the protocol's member of a union of digests; from no digest without a union.
+template <auto create, auto member, class Union>
+OSStatus CreateFromMember(const Union* digests, CFMutableDictionaryRef* entity) {
+    return create(digests != nullptr ? &(digests->*member) : nullptr, entity);
+}
+
+template <class Union, std::size_t count>
+OSStatus Dispatch(const Builder<Union> (&builders)[count], CFStringRef protocol, const Union* digest,
+                  CFMutableDictionaryRef* entity) {
+    OSStatus err = kUnknownProtocolErr;
+    bool isFound = protocol == nullptr;
+    if (isFound) {
+        err = paramErr;
+        HandOverOrNull<CFMutableDictionaryRef>(err, nullptr, entity);
+    }
+    for (std::size_t i = 0; !isFound && i < count; ++i) {
+        isFound = CFEqual(protocol, builders[i].protocol);
+        if (isFound) {
+            err = builders[i].create(digest, entity);
+        }
+    }
+    return err;
 }
 
 }  // namespace
 
 OSStatus MoreSCCreateInterfaceEntity(const MoreSCInterfaceDigest* digest, CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    OSStatus err = BeginRecord(digest, &record);
-    if (err == 0) {
-        SetRequired(&err, record, kDeviceNameKey, digest->deviceName);
-        SetRequired(&err, record, kUserDefinedNameKey, digest->userDefinedName);
-        SetRequired(&err, record, kHardwareKey, digest->hardware);
-        SetRequired(&err, record, kTypeKey, digest->type);
-        SetOptional(&err, record, kSubTypeKey, digest->subType);
-        SetOptional(&err, record, kHardwareVariantKey, digest->variant);
-    }
-    HandOverOrNull(err, record, entity);
-    return err;
+    return CreateRecord(ErrorIfNotGiven(digest), entity, [digest](Record* record) {
+        SetRequired(record, kDeviceNameKey, digest->deviceName);
+        SetRequired(record, kUserDefinedNameKey, digest->userDefinedName);
+        SetRequired(record, kHardwareKey, digest->hardware);
+        SetRequired(record, kTypeKey, digest->type);
+        SetOptional(record, kSubTypeKey, digest->subType);
+        SetOptional(record, kHardwareVariantKey, digest->variant);
+    });
 }
 
 OSStatus MoreSCCreateProxiesEntity(const MoreSCProxiesDigest* digest, CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    OSStatus err = BeginRecord(digest, &record);
-    if (err == 0) {
-        SetOptional(&err, record, CFSTR("ExceptionsList"), digest->exceptionsList);
-        SetNumber(&err, record, CFSTR("FTPPassive"), digest->ftpPassive);
-    }
-    if (err == 0) {
-        err = AddProxy(record, CFSTR("FTPEnable"), CFSTR("FTPProxy"), CFSTR("FTPPort"), digest->ftpEnable,
-                       digest->ftpProxy, digest->ftpPort);
-    }
-    if (err == 0) {
-        err = AddProxy(record, CFSTR("GopherEnable"), CFSTR("GopherProxy"), CFSTR("GopherPort"),
-                       digest->gopherEnable, digest->gopherProxy, digest->gopherPort);
-    }
-    if (err == 0) {
-        err = AddProxy(record, CFSTR("HTTPEnable"), CFSTR("HTTPProxy"), CFSTR("HTTPPort"), digest->httpEnable,
-                       digest->httpProxy, digest->httpPort);
-    }
-    if (err == 0) {
-        err = AddProxy(record, CFSTR("HTTPSEnable"), CFSTR("HTTPSProxy"), CFSTR("HTTPSPort"),
-                       digest->httpsEnable, digest->httpsProxy, digest->httpsPort);
-    }
-    if (err == 0) {
-        err = AddProxy(record, CFSTR("RTSPEnable"), CFSTR("RTSPProxy"), CFSTR("RTSPPort"), digest->rtspEnable,
-                       digest->rtspProxy, digest->rtspPort);
-    }
-    if (err == 0) {
-        err = AddProxy(record, CFSTR("SOCKSEnable"), CFSTR("SOCKSProxy"), CFSTR("SOCKSPort"),
-                       digest->socksEnable, digest->socksProxy, digest->socksPort);
-    }
-    HandOverOrNull(err, record, entity);
-    return err;
+    return CreateRecord(ErrorIfNotGiven(digest), entity, [digest](Record* record) {
+        const struct {
+            CFStringRef enableKey, proxyKey, portKey;
+            Boolean enable;
+            CFStringRef proxy;
+            UInt16 port;
+        } proxies[] = {
+            {CFSTR("FTPEnable"), CFSTR("FTPProxy"), CFSTR("FTPPort"), digest->ftpEnable, digest->ftpProxy,
+             digest->ftpPort},
+            {CFSTR("GopherEnable"), CFSTR("GopherProxy"), CFSTR("GopherPort"), digest->gopherEnable,
+             digest->gopherProxy, digest->gopherPort},
+            {CFSTR("HTTPEnable"), CFSTR("HTTPProxy"), CFSTR("HTTPPort"), digest->httpEnable,
+             digest->httpProxy, digest->httpPort},
+            {CFSTR("HTTPSEnable"), CFSTR("HTTPSProxy"), CFSTR("HTTPSPort"), digest->httpsEnable,
+             digest->httpsProxy, digest->httpsPort},
+            {CFSTR("RTSPEnable"), CFSTR("RTSPProxy"), CFSTR("RTSPPort"), digest->rtspEnable,
+             digest->rtspProxy, digest->rtspPort},
+            {CFSTR("SOCKSEnable"), CFSTR("SOCKSProxy"), CFSTR("SOCKSPort"), digest->socksEnable,
+             digest->socksProxy, digest->socksPort},
+        };
+        SetOptional(record, CFSTR("ExceptionsList"), digest->exceptionsList);
+        SetNumber(record, CFSTR("FTPPassive"), digest->ftpPassive);
+        for (const auto& each : proxies) {
+            if (record->err == 0) {
+                record->err = AddProxy(record->dict, each.enableKey, each.proxyKey, each.portKey, each.enable,
+                                       each.proxy, each.port);
+            }
+        }
+    });
 }
 
 OSStatus MoreSCCreateAppleTalkEntity(const MoreSCAppleTalkDigest* digest, CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    OSStatus err = BeginRecord(digest, &record);
-    if (err == 0) {
-        SetRequired(&err, record, kConfigMethodKey, digest->configMethod);
-        SetOptional(&err, record, CFSTR("DefaultZone"), digest->defaultZone);
+    return CreateRecord(ErrorIfNotGiven(digest), entity, [digest](Record* record) {
+        SetRequired(record, kConfigMethodKey, digest->configMethod);
+        SetOptional(record, CFSTR("DefaultZone"), digest->defaultZone);
         if (digest->manual) {
-            SetNumber(&err, record, CFSTR("NetworkID"), digest->networkID);
-            SetNumber(&err, record, CFSTR("NodeID"), digest->nodeID);
+            SetNumber(record, CFSTR("NetworkID"), digest->networkID);
+            SetNumber(record, CFSTR("NodeID"), digest->nodeID);
         }
-        if (!digest->active) {
-            SetInactive(&err, record);
-        }
-    }
-    HandOverOrNull(err, record, entity);
-    return err;
+        SetActive(record, digest->active);
+    });
 }
 
 OSStatus MoreSCCreateDNSEntity(const MoreSCDNSDigest* digest, CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    CFArrayRef servers = nullptr;
-    CFMutableArrayRef domains = nullptr;
-    OSStatus err = BeginRecord(digest, &record);
-    if (err == 0 && digest->serverAddressesCount != 0) {
-        err = MoreSCFCreateArrayWithInetAddresses(static_cast<CFIndex>(digest->serverAddressesCount),
-                                                  digest->serverAddresses, &servers);
-        SetValue(&err, record, CFSTR("ServerAddresses"), servers);
-    }
-    if (err == 0 && digest->searchDomainsCount != 0) {
-        err = CreateArrayWithStrings(digest->searchDomainsCount, digest->searchDomains, &domains);
-        SetValue(&err, record, CFSTR("SearchDomains"), domains);
-    }
-    CFQRelease(servers);
-    CFQRelease(domains);
-    HandOverOrNull(err, record, entity);
-    return err;
+    return CreateRecord(ErrorIfNotGiven(digest), entity, [digest](Record* record) {
+        SetInetAddresses(record, CFSTR("ServerAddresses"), digest->serverAddressesCount,
+                         digest->serverAddresses);
+        if (digest->searchDomainsCount != 0) {
+            CFMutableArrayRef domains = nullptr;
+            const OSStatus err =
+                CreateArrayWithStrings(digest->searchDomainsCount, digest->searchDomains, &domains);
+            SetMade(record, CFSTR("SearchDomains"), err, domains);
+        }
+    });
 }
 
 OSStatus MoreSCCreateIPv4Entity(const MoreSCIPv4Digest* digest, CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    CFStringRef router = nullptr;
-    OSStatus err = BeginRecord(digest, &record);
-    if (err == 0) {
-        SetRequired(&err, record, kConfigMethodKey, digest->configMethod);
-        SetOptional(&err, record, CFSTR("DHCPClientID"), digest->clientID);
-        SetInetAddressArray(&err, record, CFSTR("Addresses"), digest->address);
-        SetInetAddressArray(&err, record, CFSTR("SubnetMasks"), digest->subnetMask);
-    }
-    // Unlike the other two, the router stands alone, not in an array.
-    if (err == 0 && digest->router.s_addr != 0) {
-        err = MoreSCFCreateStringWithInetAddress(digest->router, &router);
-        SetValue(&err, record, CFSTR("Router"), router);
-    }
-    CFQRelease(router);
-    HandOverOrNull(err, record, entity);
-    return err;
+    return CreateRecord(ErrorIfNotGiven(digest), entity, [digest](Record* record) {
+        SetRequired(record, kConfigMethodKey, digest->configMethod);
+        SetOptional(record, CFSTR("DHCPClientID"), digest->clientID);
+        // One address each, or none.
+        SetInetAddresses(record, CFSTR("Addresses"), digest->address.s_addr != 0, &digest->address);
+        SetInetAddresses(record, CFSTR("SubnetMasks"), digest->subnetMask.s_addr != 0, &digest->subnetMask);
+        // Unlike the other two, the router stands alone, not in an array.
+        if (digest->router.s_addr != 0) {
+            CFStringRef router = nullptr;
+            const OSStatus err = MoreSCFCreateStringWithInetAddress(digest->router, &router);
+            SetMade(record, CFSTR("Router"), err, router);
+        }
+    });
 }
 
 OSStatus MoreSCCreatePPPEntity(const MoreSCPPPDigest* digest, CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    CFDataRef password = nullptr;
     // Asked for in any case: this also tells the version of the system, which decides on some keys below.
-    const MoreSCPPPOptions* options = MoreSCGetDefaultPPPOptions(false);
-    OSStatus err = BeginRecord(digest, &record);
-    if (err == 0 && digest->options != nullptr) {
-        options = digest->options;
-    }
-    if (err == 0) {
-        SetOptional(&err, record, kUserDefinedNameKey, digest->userDefinedName);
-        if (!digest->active) {
-            SetInactive(&err, record);
+    const MoreSCPPPOptions* defaults = MoreSCGetDefaultPPPOptions(false);
+    return CreateRecord(ErrorIfNotGiven(digest), entity, [digest, defaults](Record* record) {
+        const MoreSCPPPOptions* options = digest->options != nullptr ? digest->options : defaults;
+        SetOptional(record, kUserDefinedNameKey, digest->userDefinedName);
+        SetActive(record, digest->active);
+        SetNumber(record, CFSTR("DialOnDemand"), options->dialOnDemand);
+        SetNumber(record, CFSTR("DisconnectOnIdle"), options->disconnectOnIdle);
+        SetNumber(record, CFSTR("DisconnectOnIdleTimer"), options->disconnectOnIdleTimer);
+        SetNumber(record, CFSTR("DisconnectOnLogout"), options->disconnectOnLogout);
+        SetNumber(record, CFSTR("IdleReminder"), options->idleReminder);
+        SetNumber(record, CFSTR("IdleReminderTimer"), options->idleReminderTimer);
+        SetValue(record, CFSTR("Logfile"), CFSTR("/tmp/ppp.log"));
+        SetNumber(record, CFSTR("VerboseLogging"), options->verboseLogging);
+        SetOptional(record, CFSTR("AuthName"), digest->authName);
+        if (digest->authPassword != nullptr) {
+            CFDataRef password = nullptr;
+            const OSStatus err = MoreSCFCopyEncodedPPPPassword(digest->authPassword, &password);
+            SetMade(record, CFSTR("AuthPassword"), err, password);
         }
-        SetNumber(&err, record, CFSTR("DialOnDemand"), options->dialOnDemand);
-        SetNumber(&err, record, CFSTR("DisconnectOnIdle"), options->disconnectOnIdle);
-        SetNumber(&err, record, CFSTR("DisconnectOnIdleTimer"), options->disconnectOnIdleTimer);
-        SetNumber(&err, record, CFSTR("DisconnectOnLogout"), options->disconnectOnLogout);
-        SetNumber(&err, record, CFSTR("IdleReminder"), options->idleReminder);
-        SetNumber(&err, record, CFSTR("IdleReminderTimer"), options->idleReminderTimer);
-        SetValue(&err, record, CFSTR("Logfile"), CFSTR("/tmp/ppp.log"));
-        SetNumber(&err, record, CFSTR("VerboseLogging"), options->verboseLogging);
-        SetOptional(&err, record, CFSTR("AuthName"), digest->authName);
-    }
-    if (err == 0 && digest->authPassword != nullptr) {
-        err = MoreSCFCopyEncodedPPPPassword(digest->authPassword, &password);
-        SetValue(&err, record, CFSTR("AuthPassword"), password);
-    }
-    if (err == 0) {
-        SetOptional(&err, record, CFSTR("CommAlternateRemoteAddress"), digest->commAlternateRemoteAddress);
-        SetNumber(&err, record, CFSTR("CommDisplayTerminalWindow"), options->commDisplayTerminalWindow);
-        SetNumber(&err, record, CFSTR("CommRedialCount"), options->commRedialCount);
-        SetNumber(&err, record, CFSTR("CommRedialEnabled"), options->commRedialEnabled);
-        SetNumber(&err, record, CFSTR("CommRedialInterval"), options->commRedialInterval);
-        SetOptional(&err, record, CFSTR("CommRemoteAddress"), digest->commRemoteAddress);
+        SetOptional(record, CFSTR("CommAlternateRemoteAddress"), digest->commAlternateRemoteAddress);
+        SetNumber(record, CFSTR("CommDisplayTerminalWindow"), options->commDisplayTerminalWindow);
+        SetNumber(record, CFSTR("CommRedialCount"), options->commRedialCount);
+        SetNumber(record, CFSTR("CommRedialEnabled"), options->commRedialEnabled);
+        SetNumber(record, CFSTR("CommRedialInterval"), options->commRedialInterval);
+        SetOptional(record, CFSTR("CommRemoteAddress"), digest->commRemoteAddress);
+        // Systems before 10.2 do not know the key, and give a dead line up one echo earlier.
         if (gTenTwoOrLater) {
-            SetNumber(&err, record, CFSTR("CommUseTerminalScript"), 0);
+            SetNumber(record, CFSTR("CommUseTerminalScript"), 0);
         }
-        SetNumber(&err, record, CFSTR("IPCPCompressionVJ"), options->ipcpCompressionVJ);
-        SetNumber(&err, record, CFSTR("LCPEchoEnabled"), options->lcpEchoEnabled);
-        SetNumber(&err, record, CFSTR("LCPEchoFailure"), gTenTwoOrLater ? 4 : 3);
-        SetNumber(&err, record, CFSTR("LCPEchoInterval"), 10);
-    }
-    CFQRelease(password);
-    HandOverOrNull(err, record, entity);
-    return err;
+        SetNumber(record, CFSTR("IPCPCompressionVJ"), options->ipcpCompressionVJ);
+        SetNumber(record, CFSTR("LCPEchoEnabled"), options->lcpEchoEnabled);
+        SetNumber(record, CFSTR("LCPEchoFailure"), gTenTwoOrLater ? 4 : 3);
+        SetNumber(record, CFSTR("LCPEchoInterval"), 10);
+    });
 }
 
 OSStatus MoreSCCreateAirPortEntity(const MoreSCAirPortDigest* digest, CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    OSStatus err = BeginRecord(digest, &record);
-    if (err == 0) {
-        SetMacAddress(&err, record, digest->macAddress);
-        SetOptional(&err, record, CFSTR("PreferredNetwork"), digest->preferredNetwork);
-    }
-    HandOverOrNull(err, record, entity);
-    return err;
+    return CreateRecord(ErrorIfNotGiven(digest), entity, [digest](Record* record) {
+        SetMacAddress(record, digest->macAddress);
+        SetOptional(record, CFSTR("PreferredNetwork"), digest->preferredNetwork);
+    });
 }
 
 OSStatus MoreSCCreateEthernetEntity(const MoreSCEthernetDigest* digest, CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    OSStatus err = BeginRecord(digest, &record);
-    if (err == 0) {
-        SetMacAddress(&err, record, digest->macAddress);
-    }
-    HandOverOrNull(err, record, entity);
-    return err;
+    return CreateRecord(ErrorIfNotGiven(digest), entity,
+                        [digest](Record* record) { SetMacAddress(record, digest->macAddress); });
 }
 
 OSStatus MoreSCCreateModemEntity(const MoreSCModemDigest* digest, CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    OSStatus err = BeginRecord(digest, &record);
-    if (err == 0) {
-        SetRequired(&err, record, CFSTR("ConnectionScript"), digest->connectionScript);
-        SetNumber(&err, record, CFSTR("DataCompression"), digest->dataCompressionErrorCorrection);
-        SetValue(&err, record, CFSTR("DialMode"),
+    return CreateRecord(ErrorIfNotGiven(digest), entity, [digest](Record* record) {
+        SetRequired(record, CFSTR("ConnectionScript"), digest->connectionScript);
+        SetNumber(record, CFSTR("DataCompression"), digest->dataCompressionErrorCorrection);
+        SetValue(record, CFSTR("DialMode"),
                  digest->waitForDialTone ? CFSTR("WaitForDialTone") : CFSTR("IgnoreDialTone"));
-        SetNumber(&err, record, CFSTR("ErrorCorrection"), digest->dataCompressionErrorCorrection);
-        SetNumber(&err, record, CFSTR("PulseDial"), digest->pulseDial);
-        SetNumber(&err, record, CFSTR("Speaker"), digest->speaker);
-    }
-    HandOverOrNull(err, record, entity);
-    return err;
+        SetNumber(record, CFSTR("ErrorCorrection"), digest->dataCompressionErrorCorrection);
+        SetNumber(record, CFSTR("PulseDial"), digest->pulseDial);
+        SetNumber(record, CFSTR("Speaker"), digest->speaker);
+    });
 }
+
+// The two global builders read nothing of their digests, which may be null.
 
 OSStatus MoreSCCreateIPv4GlobalEntity(const MoreSCIPv4GlobalDigest* /*digest*/,
                                       CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    CFMutableArrayRef order = nullptr;
-    OSStatus err = CFQDictionaryCreateMutable(&record);
-    SetNumber(&err, record, CFSTR("PPPOverridePrimary"), 0);
-    if (err == 0) {
-        err = CFQArrayCreateMutable(&order);
-    }
-    SetValue(&err, record, kServiceOrderKey, order);
-    CFQRelease(order);
-    HandOverOrNull(err, record, entity);
-    return err;
+    return CreateRecord(0, entity, [](Record* record) {
+        CFMutableArrayRef order = nullptr;
+        SetNumber(record, CFSTR("PPPOverridePrimary"), 0);
+        const OSStatus err = CFQArrayCreateMutable(&order);
+        SetMade(record, kServiceOrderKey, err, order);
+    });
 }
 
 OSStatus MoreSCCreateNetInfoGlobalEntity(const MoreSCNetInfoGlobalDigest* /*digest*/,
                                          CFMutableDictionaryRef* entity) {
-    CFMutableDictionaryRef record = nullptr;
-    const OSStatus err = CFQDictionaryCreateMutable(&record);
-    HandOverOrNull(err, record, entity);
-    return err;
+    return CreateRecord(0, entity, [](Record*) {});
 }
 
 OSStatus MoreSCCreateEntity(CFStringRef protocol, const MoreSCDigest* digest,
                             CFMutableDictionaryRef* entity) {
-    OSStatus err = 0;
-    if (protocol == nullptr) {
-        err = paramErr;
-        HandOverOrNull<CFMutableDictionaryRef>(err, nullptr, entity);
-    } else if (CFEqual(protocol, kInterfaceProtocol)) {
-        err = MoreSCCreateInterfaceEntity(Member(digest, &MoreSCDigest::interface), entity);
-    } else if (CFEqual(protocol, kProxiesProtocol)) {
-        err = MoreSCCreateProxiesEntity(Member(digest, &MoreSCDigest::proxies), entity);
-    } else if (CFEqual(protocol, kAppleTalkProtocol)) {
-        err = MoreSCCreateAppleTalkEntity(Member(digest, &MoreSCDigest::appleTalk), entity);
-    } else if (CFEqual(protocol, kDNSProtocol)) {
-        err = MoreSCCreateDNSEntity(Member(digest, &MoreSCDigest::dns), entity);
-    } else if (CFEqual(protocol, kIPv4Protocol)) {
-        err = MoreSCCreateIPv4Entity(Member(digest, &MoreSCDigest::ipv4), entity);
-    } else if (CFEqual(protocol, kPPPProtocol)) {
-        err = MoreSCCreatePPPEntity(Member(digest, &MoreSCDigest::ppp), entity);
-    } else if (CFEqual(protocol, kAirPortProtocol)) {
-        err = MoreSCCreateAirPortEntity(Member(digest, &MoreSCDigest::airPort), entity);
-    } else if (CFEqual(protocol, kEthernetProtocol)) {
-        err = MoreSCCreateEthernetEntity(Member(digest, &MoreSCDigest::ethernet), entity);
-    } else if (CFEqual(protocol, kModemProtocol)) {
-        err = MoreSCCreateModemEntity(Member(digest, &MoreSCDigest::modem), entity);
-    } else {
-        err = kUnknownProtocolErr;
-    }
-    return err;
+    static const Builder<MoreSCDigest> builders[] = {
+        {kInterfaceProtocol, CreateFromMember<MoreSCCreateInterfaceEntity, &MoreSCDigest::interface>},
+        {kProxiesProtocol, CreateFromMember<MoreSCCreateProxiesEntity, &MoreSCDigest::proxies>},
+        {kAppleTalkProtocol, CreateFromMember<MoreSCCreateAppleTalkEntity, &MoreSCDigest::appleTalk>},
+        {kDNSProtocol, CreateFromMember<MoreSCCreateDNSEntity, &MoreSCDigest::dns>},
+        {kIPv4Protocol, CreateFromMember<MoreSCCreateIPv4Entity, &MoreSCDigest::ipv4>},
+        {kPPPProtocol, CreateFromMember<MoreSCCreatePPPEntity, &MoreSCDigest::ppp>},
+        {kAirPortProtocol, CreateFromMember<MoreSCCreateAirPortEntity, &MoreSCDigest::airPort>},
+        {kEthernetProtocol, CreateFromMember<MoreSCCreateEthernetEntity, &MoreSCDigest::ethernet>},
+        {kModemProtocol, CreateFromMember<MoreSCCreateModemEntity, &MoreSCDigest::modem>},
+    };
+    return Dispatch(builders, protocol, digest, entity);
 }
 
 OSStatus MoreSCCreateGlobalEntity(CFStringRef protocol, const MoreSCGlobalDigest* digest,
                                   CFMutableDictionaryRef* entity) {
-    OSStatus err = 0;
-    if (protocol == nullptr) {
-        err = paramErr;
-        HandOverOrNull<CFMutableDictionaryRef>(err, nullptr, entity);
-    } else if (CFEqual(protocol, kIPv4Protocol)) {
-        err = MoreSCCreateIPv4GlobalEntity(Member(digest, &MoreSCGlobalDigest::ipv4), entity);
-    } else if (CFEqual(protocol, kNetInfoProtocol)) {
-        err = MoreSCCreateNetInfoGlobalEntity(Member(digest, &MoreSCGlobalDigest::netInfo), entity);
-    } else {
-        err = kUnknownProtocolErr;
-    }
-    return err;
+    static const Builder<MoreSCGlobalDigest> builders[] = {
+        {kIPv4Protocol, CreateFromMember<MoreSCCreateIPv4GlobalEntity, &MoreSCGlobalDigest::ipv4>},
+        {kNetInfoProtocol, CreateFromMember<MoreSCCreateNetInfoGlobalEntity, &MoreSCGlobalDigest::netInfo>},
+    };
+    return Dispatch(builders, protocol, digest, entity);
 }
 
 const MoreSCPPPOptions* MoreSCGetDefaultPPPOptions(Boolean isPPPoE) {
-    SInt32 version = 0;
-    gTenTwoOrLater =
-        Gestalt(gestaltSystemVersion, &version) == noErr && static_cast<UInt32>(version) > 0x101F;
+    gTenTwoOrLater = GetSystemVersion() >= kVersionTenTwo;
     const MoreSCPPPOptions* options = &kMoreSCPPPOptionsDefaultTenOne;
     if (gTenTwoOrLater) {
         options =

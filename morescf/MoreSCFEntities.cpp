@@ -1,171 +1,77 @@
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
-#include "morescf/MoreSCFTree.h"
+#include "morescf/MoreSCFNode.h"
+#include "morescf/MoreSCFSteps.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
 namespace {
 
-OSStatus CopyDictionaryAtPath(CFStringRef path, CFDictionaryRef* dict) {
-    CFDictionaryRef found = SCPreferencesPathGetValue(MoreSCGetSCPreferencesRef(), path);
-    const OSStatus err = MoreSCError(found);
-    if (err == 0) {
-        *dict = static_cast<CFDictionaryRef>(CFQRetain(found));
+// Takes the step for the protocol and the dictionary of each entity. What is no dictionary is a property of
+// the service itself. The step may change the service.
+template <class Step>
+OSStatus ForEachEntity(CFDictionaryRef service, Step step) {
+    CFArrayRef keys = nullptr;
+    CFArrayRef values = nullptr;
+    const OSStatus err = InTurn([&] { return CFQArrayCreateWithDictionaryKeys(service, &keys); },
+                                [&] { return CFQArrayCreateWithDictionaryValues(service, &values); });
+    const CFIndex count = err == 0 ? CFArrayGetCount(keys) : 0;
+    for (CFIndex i = 0; i < count; ++i) {
+        if (IsDictionary(CFArrayGetValueAtIndex(values, i))) {
+            step(CFArrayGetValueAtIndex(keys, i), CFArrayGetValueAtIndex(values, i));
+        }
     }
+    CFQRelease(keys);
+    CFQRelease(values);
     return err;
-}
-
-OSStatus CreateMutableCopy(CFDictionaryRef dict, CFMutableDictionaryRef* copy) {
-    *copy = CFDictionaryCreateMutableCopy(kCFAllocatorDefault, 0, dict);
-    return *copy != nullptr ? 0 : coreFoundationUnknownErr;
 }
 
 }  // namespace
 
 OSStatus MoreSCCopyEntitiesDict(CFStringRef setID, CFStringRef serviceID, CFDictionaryRef* entitiesDict) {
-    CFStringRef path = nullptr;
-    CFDictionaryRef dict = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = CopyResolvedServicePath(setID, serviceID, &path);
-    }
-    if (err == 0) {
-        err = CopyDictionaryAtPath(path, &dict);
-    }
-    CFQRelease(path);
-    MoreSCClose(&err, false);
-    HandOverOrNull(err, dict, entitiesDict);
-    return err;
+    return CopyNode(ServiceNode(setID, serviceID), entitiesDict);
 }
 
 OSStatus MoreSCCopyEntitiesDictMutable(CFStringRef setID, CFStringRef serviceID,
                                        CFMutableDictionaryRef* entitiesDict) {
-    CFDictionaryRef dict = nullptr;
-    CFMutableDictionaryRef copy = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCCopyEntitiesDict(setID, serviceID, &dict);
-    }
-    if (err == 0) {
-        err = CreateMutableCopy(dict, &copy);
-    }
-    CFQRelease(dict);
-    MoreSCClose(&err, false);
-    HandOver(err, copy, entitiesDict);
-    return err;
+    return CopyNodeMutable(ServiceNode(setID, serviceID), entitiesDict);
 }
 
 OSStatus MoreSCSetEntitiesDict(CFStringRef setID, CFStringRef serviceID, CFDictionaryRef entitiesDict) {
-    CFStringRef path = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && entitiesDict == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = CopyResolvedServicePath(setID, serviceID, &path);
-    }
-    if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesPathSetValue(MoreSCGetSCPreferencesRef(), path, entitiesDict));
-    }
-    CFQRelease(path);
-    MoreSCClose(&err, true);
-    return err;
+    return StoreNode(ServiceNode(setID, serviceID), entitiesDict);
 }
 
 OSStatus MoreSCCopyEntity(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                           CFDictionaryRef* entity) {
-    CFStringRef path = nullptr;
-    CFDictionaryRef dict = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = CopyEntityPath(setID, serviceID, protocol, &path);
-    }
-    if (err == 0) {
-        err = CopyDictionaryAtPath(path, &dict);
-    }
-    CFQRelease(path);
-    MoreSCClose(&err, false);
-    HandOverOrNull(err, dict, entity);
-    return err;
+    return CopyNode(EntityNode(setID, serviceID, protocol), entity);
 }
 
 OSStatus MoreSCCopyEntityMutable(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                                  CFMutableDictionaryRef* entity) {
-    CFDictionaryRef dict = nullptr;
-    CFMutableDictionaryRef copy = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCCopyEntity(setID, serviceID, protocol, &dict);
-    }
-    if (err == 0) {
-        err = CreateMutableCopy(dict, &copy);
-    }
-    CFQRelease(dict);
-    MoreSCClose(&err, false);
-    HandOver(err, copy, entity);
-    return err;
+    return CopyNodeMutable(EntityNode(setID, serviceID, protocol), entity);
 }
 
 OSStatus MoreSCSetEntity(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                          CFDictionaryRef entity) {
-    CFStringRef path = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && entity == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = CopyEntityPath(setID, serviceID, protocol, &path);
-    }
-    if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesPathSetValue(MoreSCGetSCPreferencesRef(), path, entity));
-    }
-    CFQRelease(path);
-    MoreSCClose(&err, true);
-    return err;
+    return StoreNode(EntityNode(setID, serviceID, protocol), entity);
 }
 
 OSStatus MoreSCCopyEntities(CFStringRef setID, CFStringRef serviceID, CFArrayRef* entityProtocols,
                             CFArrayRef* entityValues) {
-    CFDictionaryRef dict = nullptr;
-    CFArrayRef keys = nullptr;
-    CFArrayRef values = nullptr;
+    CFDictionaryRef service = nullptr;
     CFMutableArrayRef protocols = nullptr;
     CFMutableArrayRef entities = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && entityProtocols == nullptr && entityValues != nullptr) {
-        err = paramErr;
-    }
+    OSStatus err = InTurn([&] { return entityValues != nullptr ? ErrorIfNotGiven(entityProtocols) : 0; },
+                          [&] { return CopyNode(ServiceNode(setID, serviceID), &service); },
+                          [&] { return CFQArrayCreateMutable(&protocols); },
+                          [&] { return CFQArrayCreateMutable(&entities); });
     if (err == 0) {
-        err = MoreSCCopyEntitiesDict(setID, serviceID, &dict);
+        err = ForEachEntity(service, [&](CFTypeRef protocol, CFTypeRef entity) {
+            CFArrayAppendValue(protocols, protocol);
+            CFArrayAppendValue(entities, entity);
+        });
     }
-    if (entityProtocols != nullptr) {
-        if (err == 0) {
-            err = CFQArrayCreateMutable(&protocols);
-        }
-        if (err == 0) {
-            err = CFQArrayCreateMutable(&entities);
-        }
-        if (err == 0) {
-            err = CFQArrayCreateWithDictionaryKeys(dict, &keys);
-        }
-        if (err == 0) {
-            err = CFQArrayCreateWithDictionaryValues(dict, &values);
-        }
-        if (err == 0) {
-            const CFIndex count = CFArrayGetCount(keys);
-            for (CFIndex i = 0; i < count; ++i) {
-                CFTypeRef value = CFArrayGetValueAtIndex(values, i);
-                if (IsDictionary(value)) {
-                    CFArrayAppendValue(protocols, CFArrayGetValueAtIndex(keys, i));
-                    CFArrayAppendValue(entities, value);
-                }
-            }
-        }
-    }
-    CFQRelease(dict);
-    CFQRelease(keys);
-    CFQRelease(values);
-    MoreSCClose(&err, false);
+    CFQRelease(service);
     HandOver<CFArrayRef>(err, protocols, entityProtocols);
     HandOver<CFArrayRef>(err, entities, entityValues);
     return err;
@@ -173,118 +79,50 @@ OSStatus MoreSCCopyEntities(CFStringRef setID, CFStringRef serviceID, CFArrayRef
 
 OSStatus MoreSCSetEntities(CFStringRef setID, CFStringRef serviceID, CFArrayRef entityProtocols,
                            CFArrayRef entityValues) {
-    CFMutableDictionaryRef dict = nullptr;
-    CFArrayRef keys = nullptr;
-    CFArrayRef values = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && (entityProtocols == nullptr || entityValues == nullptr ||
-                     CFArrayGetCount(entityProtocols) != CFArrayGetCount(entityValues))) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = MoreSCCopyEntitiesDictMutable(setID, serviceID, &dict);
-    }
-    if (err == 0) {
-        err = CFQArrayCreateWithDictionaryKeys(dict, &keys);
-    }
-    if (err == 0) {
-        err = CFQArrayCreateWithDictionaryValues(dict, &values);
-    }
-    if (err == 0) {
-        const CFIndex oldCount = CFArrayGetCount(keys);
-        for (CFIndex i = 0; i < oldCount; ++i) {
-            if (IsDictionary(CFArrayGetValueAtIndex(values, i))) {
-                CFDictionaryRemoveValue(dict, CFArrayGetValueAtIndex(keys, i));
-            }
-        }
-        const CFIndex newCount = CFArrayGetCount(entityProtocols);
-        for (CFIndex i = 0; i < newCount; ++i) {
-            CFDictionaryAddValue(dict, CFArrayGetValueAtIndex(entityProtocols, i),
+    const bool isValid = entityProtocols != nullptr && entityValues != nullptr &&
+                         CFArrayGetCount(entityProtocols) == CFArrayGetCount(entityValues);
+    return ChangeNode(ServiceNode(setID, serviceID), isValid, [=](CFMutableDictionaryRef service) {
+        const OSStatus err = ForEachEntity(
+            service, [=](CFTypeRef protocol, CFTypeRef) { CFDictionaryRemoveValue(service, protocol); });
+        const CFIndex count = err == 0 ? CFArrayGetCount(entityProtocols) : 0;
+        for (CFIndex i = 0; i < count; ++i) {
+            // Against a property of the service, and against an earlier entity of its protocol, it does not
+            // count.
+            CFDictionaryAddValue(service, CFArrayGetValueAtIndex(entityProtocols, i),
                                  CFArrayGetValueAtIndex(entityValues, i));
         }
-        err = MoreSCSetEntitiesDict(setID, serviceID, dict);
-    }
-    CFQRelease(dict);
-    CFQRelease(keys);
-    CFQRelease(values);
-    MoreSCClose(&err, true);
-    return err;
+        return err;
+    });
 }
 
 OSStatus MoreSCNewEntity(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                          CFDictionaryRef entity) {
-    CFMutableDictionaryRef dict = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && (protocol == nullptr || entity == nullptr)) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = MoreSCCopyEntitiesDictMutable(setID, serviceID, &dict);
-    }
-    if (err == 0 && CFDictionaryContainsKey(dict, protocol)) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        CFDictionaryAddValue(dict, protocol, entity);
-        err = MoreSCSetEntitiesDict(setID, serviceID, dict);
-    }
-    CFQRelease(dict);
-    MoreSCClose(&err, true);
-    return err;
+    return ChangeNode(ServiceNode(setID, serviceID), protocol != nullptr && entity != nullptr,
+                      [=](CFMutableDictionaryRef service) {
+                          OSStatus err = 0;
+                          if (CFDictionaryContainsKey(service, protocol)) {
+                              err = paramErr;
+                          } else {
+                              CFDictionaryAddValue(service, protocol, entity);
+                          }
+                          return err;
+                      });
 }
 
 OSStatus MoreSCDeleteEntity(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol) {
-    CFMutableDictionaryRef dict = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && protocol == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = MoreSCCopyEntitiesDictMutable(setID, serviceID, &dict);
-    }
-    if (err == 0) {
-        CFDictionaryRemoveValue(dict, protocol);
-        err = MoreSCSetEntitiesDict(setID, serviceID, dict);
-    }
-    CFQRelease(dict);
-    MoreSCClose(&err, true);
-    return err;
+    return ChangeNode(ServiceNode(setID, serviceID), protocol != nullptr,
+                      [=](CFMutableDictionaryRef service) {
+                          CFDictionaryRemoveValue(service, protocol);
+                          return OSStatus{0};
+                      });
 }
 
 OSStatus MoreSCIsEntityActive(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                               Boolean* active) {
-    CFDictionaryRef entity = nullptr;
-    Boolean isActive = false;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCCopyEntity(setID, serviceID, protocol, &entity);
-    }
-    if (err == 0) {
-        isActive = IsDictionaryActive(entity);
-    }
-    CFQRelease(entity);
-    MoreSCClose(&err, false);
-    if (err == 0) {
-        *active = isActive;
-    }
-    return err;
+    return IsNodeActive(EntityNode(setID, serviceID, protocol), active);
 }
 
 OSStatus MoreSCSetEntityActive(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                                Boolean active) {
-    CFMutableDictionaryRef entity = nullptr;
-    Boolean changed = false;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCCopyEntityMutable(setID, serviceID, protocol, &entity);
-    }
-    if (err == 0) {
-        err = SetDictionaryActive(entity, active, &changed);
-    }
-    if (err == 0 && changed) {
-        err = MoreSCSetEntity(setID, serviceID, protocol, entity);
-    }
-    CFQRelease(entity);
-    MoreSCClose(&err, changed);
-    return err;
+    return SetNodeActive(EntityNode(setID, serviceID, protocol), active);
 }

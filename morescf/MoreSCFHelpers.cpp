@@ -6,6 +6,7 @@
 #include "morescf/MoreSCF.h"
 #include "morescf/MoreSCFKeys.h"
 #include "morescf/MoreSCFPortScanner.h"
+#include "morescf/MoreSCFSteps.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
@@ -13,6 +14,16 @@ namespace {
 
 // A live record that does not tell how it was configured.
 constexpr OSStatus kNoConfigMethodErr = -2;
+
+// Takes the step for each service that the location lists, until one fails: the status of that one.
+template <class Step>
+OSStatus ForEachService(CFStringRef setID, Step step) {
+    CFArrayRef serviceIDs = nullptr;
+    const OSStatus err = InTurn([&] { return MoreSCCopyServiceIDs(setID, &serviceIDs, nullptr); },
+                                [&] { return ForEach<CFStringRef>(serviceIDs, step); });
+    CFQRelease(serviceIDs);
+    return err;
+}
 
 OSStatus IsSetupConfiguredToUseDHCP(SCDynamicStoreRef store, CFStringRef key, Boolean* usesDHCP) {
     CFPropertyListRef value = SCDynamicStoreCopyValue(store, key);
@@ -32,48 +43,48 @@ OSStatus IsSetupConfiguredToUseDHCP(SCDynamicStoreRef store, CFStringRef key, Bo
     return err;
 }
 
-OSStatus AppendServiceIDForEachDHCPDynamicStoreKey(SCDynamicStoreRef store, CFArrayRef keys,
-                                                   CFMutableArrayRef serviceIDs) {
-    OSStatus err = 0;
-    const CFIndex count = CFArrayGetCount(keys);
-    for (CFIndex i = 0; err == 0 && i < count; ++i) {
-        CFTypeRef key = CFArrayGetValueAtIndex(keys, i);
-        Boolean usesDHCP = false;
-        if (!IsString(key)) {
-            err = coreFoundationUnknownErr;
-        }
-        if (err == 0) {
-            err = IsSetupConfiguredToUseDHCP(store, static_cast<CFStringRef>(key), &usesDHCP);
-        }
-        if (err == 0 && usesDHCP) {
-            // "Setup:" / "Network" / "Service" / ID / "IPv4"
-            CFArrayRef components = CFStringCreateArrayBySeparatingStrings(
-                kCFAllocatorDefault, static_cast<CFStringRef>(key), CFSTR("/"));
-            if (components != nullptr && CFArrayGetCount(components) > 3) {
-                CFArrayAppendValue(serviceIDs, CFArrayGetValueAtIndex(components, 3));
-            } else {
-                err = coreFoundationUnknownErr;
-            }
-            CFQRelease(components);
-        }
+// The ID in "Setup:/Network/Service/<service ID>/IPv4".
+OSStatus AppendServiceIDOfKey(CFStringRef key, CFMutableArrayRef serviceIDs) {
+    CFArrayRef components = CFStringCreateArrayBySeparatingStrings(kCFAllocatorDefault, key, CFSTR("/"));
+    const bool hasID = components != nullptr && CFArrayGetCount(components) > 3;
+    if (hasID) {
+        CFArrayAppendValue(serviceIDs, CFArrayGetValueAtIndex(components, 3));
     }
-    return err;
+    CFQRelease(components);
+    return hasID ? 0 : coreFoundationUnknownErr;
 }
 
-// The output stays as it is when there is no modem.
+OSStatus AppendServiceIDForEachDHCPDynamicStoreKey(SCDynamicStoreRef store, CFArrayRef keys,
+                                                   CFMutableArrayRef serviceIDs) {
+    return ForEach<CFTypeRef>(keys, [store, serviceIDs](CFTypeRef entry) {
+        auto* key = IsString(entry) ? static_cast<CFStringRef>(entry) : nullptr;
+        Boolean usesDHCP = false;
+        OSStatus err = ErrorIfMissing(key);
+        if (err == 0) {
+            err = IsSetupConfiguredToUseDHCP(store, key, &usesDHCP);
+        }
+        if (err == 0 && usesDHCP) {
+            err = AppendServiceIDOfKey(key, serviceIDs);
+        }
+        return err;
+    });
+}
+
+// The output stays as it is when there is no modem. The ports are sorted, so the first one is the default.
 OSStatus CopyDefaultModemPortBSDName(CFStringRef* bsdName) {
     CFArrayRef ports = nullptr;
+    CFStringRef found = nullptr;
     OSStatus err = MoreSCCreatePortArray(&ports);
     if (err == 0) {
-        const CFIndex count = CFArrayGetCount(ports);
-        bool found = false;
-        for (CFIndex i = 0; !found && i < count; ++i) {
-            auto* port = static_cast<CFDictionaryRef>(CFArrayGetValueAtIndex(ports, i));
-            if (HasStringValue(port, kHardwareKey, kModemProtocol)) {
-                found = true;
-                *bsdName = static_cast<CFStringRef>(CFQRetain(GetStringValue(port, kDeviceNameKey)));
+        err = ForEach<CFDictionaryRef>(ports, [&found](CFDictionaryRef port) {
+            if (found == nullptr && HasStringValue(port, kHardwareKey, kModemProtocol)) {
+                found = Retained(GetStringValue(port, kDeviceNameKey));
             }
-        }
+            return OSStatus{0};
+        });
+    }
+    if (found != nullptr) {
+        HandOver(err, found, bsdName);
     }
     CFQRelease(ports);
     return err;
@@ -89,10 +100,8 @@ OSStatus SetupEntity(CFStringRef setID, CFStringRef serviceID, CFStringRef proto
     if (given != nullptr) {
         digest.*member = *given;
     }
-    OSStatus err = MoreSCCreateEntity(protocol, &digest, &entity);
-    if (err == 0) {
-        err = MoreSCSetEntity(setID, serviceID, protocol, entity);
-    }
+    const OSStatus err = InTurn([&] { return MoreSCCreateEntity(protocol, &digest, &entity); },
+                                [&] { return MoreSCSetEntity(setID, serviceID, protocol, entity); });
     CFQRelease(entity);
     return err;
 }
@@ -114,10 +123,8 @@ OSStatus SetupModemService(CFStringRef setID, CFStringRef serviceID, const MoreS
 }
 
 OSStatus SetIPv4Active(CFStringRef serviceID, Boolean active) {
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCSetEntityActive(nullptr, serviceID, kIPv4Protocol, active);
-    }
+    OSStatus err =
+        InTurn(OpenSession, [&] { return MoreSCSetEntityActive(nullptr, serviceID, kIPv4Protocol, active); });
     MoreSCClose(&err, true);
     return err;
 }
@@ -125,55 +132,41 @@ OSStatus SetIPv4Active(CFStringRef serviceID, Boolean active) {
 }  // namespace
 
 OSStatus MoreSCIsAppleTalkActive(CFStringRef setID, Boolean* active) {
-    CFArrayRef serviceIDs = nullptr;
     *active = false;
-    OSStatus err = MoreSCOpen(false, false);
+    OSStatus err = OpenSession();
     if (err == 0) {
-        err = MoreSCCopyServiceIDs(setID, &serviceIDs, nullptr);
-    }
-    if (err == 0) {
-        const CFIndex count = CFArrayGetCount(serviceIDs);
-        for (CFIndex i = 0; err == 0 && !*active && i < count; ++i) {
-            auto* serviceID = static_cast<CFStringRef>(CFArrayGetValueAtIndex(serviceIDs, i));
+        err = ForEachService(setID, [setID, active](CFStringRef serviceID) {
             Boolean isServiceActive = false;
             Boolean isEntityActive = false;
-            err = MoreSCIsServiceActive(setID, serviceID, &isServiceActive);
-            if (err == 0 && isServiceActive) {
-                err = MoreSCIsEntityActive(setID, serviceID, kAppleTalkProtocol, &isEntityActive);
+            // The first service that answers the question decides: those behind it are not asked.
+            OSStatus stepErr = *active ? 0 : MoreSCIsServiceActive(setID, serviceID, &isServiceActive);
+            if (stepErr == 0 && isServiceActive) {
+                stepErr = MoreSCIsEntityActive(setID, serviceID, kAppleTalkProtocol, &isEntityActive);
             }
-            if (err == 0 && isEntityActive) {
-                *active = true;
-            }
-        }
+            *active = *active || isEntityActive;
+            return stepErr;
+        });
     }
-    CFQRelease(serviceIDs);
     MoreSCClose(&err, false);
     return err;
 }
 
 OSStatus MoreSCSetAppleTalkActive(CFStringRef setID, Boolean active) {
-    CFArrayRef serviceIDs = nullptr;
     bool madeChanges = false;
-    OSStatus err = MoreSCOpen(false, false);
+    OSStatus err = OpenSession();
     if (err == 0) {
-        err = MoreSCCopyServiceIDs(setID, &serviceIDs, nullptr);
-    }
-    if (err == 0) {
-        const CFIndex count = CFArrayGetCount(serviceIDs);
-        for (CFIndex i = 0; err == 0 && i < count; ++i) {
-            auto* serviceID = static_cast<CFStringRef>(CFArrayGetValueAtIndex(serviceIDs, i));
+        err = ForEachService(setID, [setID, active, &madeChanges](CFStringRef serviceID) {
+            OSStatus stepErr = 0;
             Boolean isActive = false;
             // A service without AppleTalk is skipped.
             if (MoreSCIsEntityActive(setID, serviceID, kAppleTalkProtocol, &isActive) == 0 &&
                 (isActive != 0) != (active != 0)) {
-                err = MoreSCSetEntityActive(setID, serviceID, kAppleTalkProtocol, active);
-                if (err == 0) {
-                    madeChanges = true;
-                }
+                stepErr = MoreSCSetEntityActive(setID, serviceID, kAppleTalkProtocol, active);
+                madeChanges = madeChanges || stepErr == 0;
             }
-        }
+            return stepErr;
+        });
     }
-    CFQRelease(serviceIDs);
     MoreSCClose(&err, madeChanges);
     return err;
 }
@@ -194,10 +187,7 @@ OSStatus MoreSCCreateActiveDHCPServicesArray(CFArrayRef* activeDHCP) {
         err = MoreSCError(keys);
     }
     if (err == 0) {
-        serviceIDs = CFArrayCreateMutable(kCFAllocatorDefault, CFArrayGetCount(keys), &kCFTypeArrayCallBacks);
-        if (serviceIDs == nullptr) {
-            err = coreFoundationUnknownErr;
-        }
+        err = CFQArrayCreateMutable(&serviceIDs);
     }
     if (err == 0) {
         err = AppendServiceIDForEachDHCPDynamicStoreKey(store, keys, serviceIDs);
@@ -210,41 +200,29 @@ OSStatus MoreSCCreateActiveDHCPServicesArray(CFArrayRef* activeDHCP) {
 }
 
 OSStatus MoreSCDHCPRelease(CFStringRef serviceID) {
-    OSStatus err = 0;
-    if (serviceID == nullptr) {
-        err = paramErr;
-    }
     // Two sessions, since the system gives the lease up only when it sees the entity off.
-    if (err == 0) {
-        err = SetIPv4Active(serviceID, false);
-    }
-    if (err == 0) {
-        err = SetIPv4Active(serviceID, true);
-    }
-    return err;
+    return InTurn([&] { return ErrorIfNotGiven(serviceID); }, [&] { return SetIPv4Active(serviceID, false); },
+                  [&] { return SetIPv4Active(serviceID, true); });
 }
 
 OSStatus MoreSCFindSetByUserVisibleNameAndCopyID(CFStringRef userVisibleName, CFStringRef* setID) {
     CFArrayRef setIDs = nullptr;
     CFStringRef foundID = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && userVisibleName == nullptr) {
-        err = paramErr;
-    }
+    OSStatus err = InTurn(
+        OpenSession, [&] { return ErrorIfNotGiven(userVisibleName); },
+        [&] { return MoreSCCopySetIDs(&setIDs, nullptr); });
     if (err == 0) {
-        err = MoreSCCopySetIDs(&setIDs, nullptr);
-    }
-    if (err == 0) {
-        const CFIndex count = CFArrayGetCount(setIDs);
-        for (CFIndex i = 0; err == 0 && foundID == nullptr && i < count; ++i) {
-            auto* thisID = static_cast<CFStringRef>(CFArrayGetValueAtIndex(setIDs, i));
+        err = ForEach<CFStringRef>(setIDs, [userVisibleName, &foundID](CFStringRef thisID) {
             CFStringRef thisName = nullptr;
-            err = MoreSCCopyUserVisibleNameOfSet(thisID, &thisName);
-            if (err == 0 && CFEqual(thisName, userVisibleName)) {
-                foundID = static_cast<CFStringRef>(CFQRetain(thisID));
+            // A nameless location fails the search, but not behind the one that was found.
+            const OSStatus stepErr =
+                foundID == nullptr ? MoreSCCopyUserVisibleNameOfSet(thisID, &thisName) : OSStatus{0};
+            if (thisName != nullptr && CFEqual(thisName, userVisibleName)) {
+                foundID = Retained(thisID);
             }
             CFQRelease(thisName);
-        }
+            return stepErr;
+        });
     }
     CFQRelease(setIDs);
     MoreSCClose(&err, false);
@@ -258,46 +236,32 @@ OSStatus MoreSCMakeNewDialupSet(CFStringRef modemBSDName, CFStringRef userVisibl
                                 const MoreSCModemDigest* modemDigest, const MoreSCPPPDigest* pppDigest,
                                 const MoreSCIPv4Digest* ipv4Digest, const MoreSCDNSDigest* dnsDigest,
                                 CFStringRef* newSetID) {
-    CFStringRef portName = nullptr;
+    CFStringRef portName = Retained(modemBSDName);
     CFStringRef setID = nullptr;
-    CFArrayRef serviceIDs = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        if (modemBSDName != nullptr) {
-            portName = static_cast<CFStringRef>(CFQRetain(modemBSDName));
-        } else {
-            err = CopyDefaultModemPortBSDName(&portName);
-        }
+    OSStatus err = OpenSession();
+    if (err == 0 && portName == nullptr) {
+        err = CopyDefaultModemPortBSDName(&portName);
     }
     if (err == 0) {
         err = MoreSCNewSet(userVisibleName, &setID);
     }
     if (err == 0) {
-        err = MoreSCCopyServiceIDs(setID, &serviceIDs, nullptr);
-    }
-    if (err == 0) {
-        const CFIndex count = CFArrayGetCount(serviceIDs);
-        for (CFIndex i = 0; err == 0 && i < count; ++i) {
-            auto* serviceID = static_cast<CFStringRef>(CFArrayGetValueAtIndex(serviceIDs, i));
+        err = ForEachService(setID, [&](CFStringRef serviceID) {
             CFStringRef bsdName = nullptr;
-            err = MoreSCCopyBSDNameOfService(setID, serviceID, &bsdName);
-            if (err == 0) {
-                if (portName != nullptr && CFEqual(bsdName, portName)) {
-                    err = SetupModemService(setID, serviceID, modemDigest, pppDigest, ipv4Digest, dnsDigest);
-                } else {
-                    err = MoreSCSetServiceActive(setID, serviceID, false);
-                }
+            OSStatus stepErr = MoreSCCopyBSDNameOfService(setID, serviceID, &bsdName);
+            if (stepErr == 0 && portName != nullptr && CFEqual(bsdName, portName)) {
+                stepErr = SetupModemService(setID, serviceID, modemDigest, pppDigest, ipv4Digest, dnsDigest);
+            } else if (stepErr == 0) {
+                stepErr = MoreSCSetServiceActive(setID, serviceID, false);
             }
             CFQRelease(bsdName);
-        }
+            return stepErr;
+        });
     }
     if (err != 0 && setID != nullptr) {
         MoreSCDeleteSet(setID);
-        CFQRelease(setID);
-        setID = nullptr;
     }
     CFQRelease(portName);
-    CFQRelease(serviceIDs);
     MoreSCClose(&err, true);
     HandOverOrNull(err, setID, newSetID);
     return err;

@@ -1,93 +1,87 @@
 // A service for a port: what it holds at first.
 #include <cstring>
+#include <initializer_list>
 
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
 #include "morescf/MoreSCFCCLScanner.h"
+#include "morescf/MoreSCFDigest.h"
 #include "morescf/MoreSCFKeys.h"
+#include "morescf/MoreSCFSteps.h"
 #include "morescf/MoreSCFTree.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
 namespace {
 
-struct SystemVersion {
-    bool tenOneThreeOrLater;
-    bool tenTwoOrLater;
+struct NewService {
+    CFStringRef setID;
+    CFStringRef serviceID;
+    CFDictionaryRef port;
+    bool isEthernetLike;  // the port has a hardware address
+    UInt32 systemVersion;
 };
-
-// A version that cannot be had counts as an old one.
-SystemVersion GetSystemVersion() {
-    SInt32 version = 0;
-    const bool known = Gestalt(gestaltSystemVersion, &version) == noErr;
-    return {.tenOneThreeOrLater = known && static_cast<UInt32>(version) > 0x1012,
-            .tenTwoOrLater = known && static_cast<UInt32>(version) > 0x101F};
-}
 
 OSStatus AddEntityToService(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                             const MoreSCDigest* digest) {
     CFMutableDictionaryRef entity = nullptr;
-    OSStatus err = MoreSCCreateEntity(protocol, digest, &entity);
-    if (err == 0) {
-        err = MoreSCNewEntity(setID, serviceID, protocol, entity);
-    }
+    const OSStatus err = InTurn([&] { return MoreSCCreateEntity(protocol, digest, &entity); },
+                                [&] { return MoreSCNewEntity(setID, serviceID, protocol, entity); });
     CFQRelease(entity);
     return err;
 }
 
-// The entities, a function each. Ethernet-like ports are those with a hardware address.
-
-bool IsEthernetLike(CFDictionaryRef portDict) {
-    return CFDictionaryContainsKey(portDict, kMACAddressKey);
-}
-
-MoreSCDigest ZeroedDigest() {
+// The same with what fill puts into a digest of zeros.
+template <class Fill>
+OSStatus AddEntity(const NewService& service, CFStringRef protocol, Fill fill) {
     MoreSCDigest digest;
+    // An initializer would zero the first member of the union alone.
     std::memset(&digest, 0, sizeof(digest));
-    return digest;
+    fill(&digest);
+    return AddEntityToService(service.setID, service.serviceID, protocol, &digest);
 }
 
-OSStatus AddInterfaceEntity(CFStringRef setID, CFStringRef serviceID, CFDictionaryRef portDict) {
-    MoreSCDigest digest = ZeroedDigest();
-    digest.interface.deviceName = GetStringValue(portDict, kDeviceNameKey);
-    digest.interface.userDefinedName = GetStringValue(portDict, kUserDefinedNameKey);
-    digest.interface.hardware = GetStringValue(portDict, kHardwareKey);
-    digest.interface.type = GetStringValue(portDict, kTypeKey);
-    if (!IsEthernetLike(portDict)) {
-        digest.interface.subType = GetStringValue(portDict, kSubTypeKey);
+// The entities, a function each.
+
+OSStatus AddInterfaceEntity(const NewService& service) {
+    return AddEntity(service, kInterfaceProtocol, [&service](MoreSCDigest* digest) {
+        digest->interface.deviceName = GetStringValue(service.port, kDeviceNameKey);
+        digest->interface.userDefinedName = GetStringValue(service.port, kUserDefinedNameKey);
+        digest->interface.hardware = GetStringValue(service.port, kHardwareKey);
+        digest->interface.type = GetStringValue(service.port, kTypeKey);
+        if (!service.isEthernetLike) {
+            digest->interface.subType = GetStringValue(service.port, kSubTypeKey);
+        }
+        digest->interface.variant = GetStringValue(service.port, kHardwareVariantKey);
+    });
+}
+
+OSStatus AddProxiesEntity(const NewService& service) {
+    return AddEntity(service, kProxiesProtocol, [&service](MoreSCDigest* digest) {
+        digest->proxies.ftpPassive = service.systemVersion >= kVersionTenTwo;
+    });
+}
+
+OSStatus AddAppleTalkEntity(const NewService& service) {
+    OSStatus err = 0;
+    // Runs over Ethernet and not over a line, and is there to be switched on.
+    if (service.isEthernetLike) {
+        err = AddEntity(service, kAppleTalkProtocol,
+                        [](MoreSCDigest* digest) { digest->appleTalk.configMethod = CFSTR("Node"); });
     }
-    digest.interface.variant = GetStringValue(portDict, kHardwareVariantKey);
-    return AddEntityToService(setID, serviceID, kInterfaceProtocol, &digest);
+    return err;
 }
 
-OSStatus AddProxiesEntity(CFStringRef setID, CFStringRef serviceID, SystemVersion version) {
-    MoreSCDigest digest = ZeroedDigest();
-    digest.proxies.ftpPassive = version.tenTwoOrLater;
-    return AddEntityToService(setID, serviceID, kProxiesProtocol, &digest);
+OSStatus AddDNSEntity(const NewService& service) {
+    return AddEntity(service, kDNSProtocol, [](MoreSCDigest*) {});
 }
 
-OSStatus AddAppleTalkEntity(CFStringRef setID, CFStringRef serviceID) {
-    MoreSCDigest digest = ZeroedDigest();
-    digest.appleTalk.active = false;
-    digest.appleTalk.configMethod = CFSTR("Node");
-    return AddEntityToService(setID, serviceID, kAppleTalkProtocol, &digest);
-}
-
-OSStatus AddDNSEntity(CFStringRef setID, CFStringRef serviceID) {
-    const MoreSCDigest digest = ZeroedDigest();
-    return AddEntityToService(setID, serviceID, kDNSProtocol, &digest);
-}
-
-OSStatus AddIPv4Entity(CFStringRef setID, CFStringRef serviceID, bool isEthernetLike, SystemVersion version) {
-    MoreSCDigest digest = ZeroedDigest();
-    if (!isEthernetLike) {
-        digest.ipv4.configMethod = CFSTR("PPP");
-    } else if (version.tenOneThreeOrLater) {
-        digest.ipv4.configMethod = CFSTR("Manual");
-    } else {
-        digest.ipv4.configMethod = CFSTR("DHCP");
-    }
-    return AddEntityToService(setID, serviceID, kIPv4Protocol, &digest);
+// "Manual" without an address: a card does nothing with IPv4 before somebody configures it.
+OSStatus AddIPv4Entity(const NewService& service) {
+    return AddEntity(service, kIPv4Protocol, [&service](MoreSCDigest* digest) {
+        CFStringRef ofCard = service.systemVersion >= kVersionTenOneThree ? CFSTR("Manual") : CFSTR("DHCP");
+        digest->ipv4.configMethod = service.isEthernetLike ? ofCard : CFSTR("PPP");
+    });
 }
 
 OSStatus AddPPPEntityToService(CFStringRef setID, CFStringRef serviceID, Boolean isPPPoE) {
@@ -95,12 +89,14 @@ OSStatus AddPPPEntityToService(CFStringRef setID, CFStringRef serviceID, Boolean
     CFMutableDictionaryRef entity = nullptr;
     digest.active = !isPPPoE;
     digest.options = MoreSCGetDefaultPPPOptions(isPPPoE);
-    OSStatus err = MoreSCCreatePPPEntity(&digest, &entity);
-    if (err == 0) {
-        err = MoreSCNewEntity(setID, serviceID, kPPPProtocol, entity);
-    }
+    const OSStatus err = InTurn([&] { return MoreSCCreatePPPEntity(&digest, &entity); },
+                                [&] { return MoreSCNewEntity(setID, serviceID, kPPPProtocol, entity); });
     CFQRelease(entity);
     return err;
+}
+
+OSStatus AddPPPEntity(const NewService& service) {
+    return AddPPPEntityToService(service.setID, service.serviceID, service.isEthernetLike);
 }
 
 OSStatus FindDefaultModemScriptAndCopyName(CFStringRef* name) {
@@ -108,70 +104,54 @@ OSStatus FindDefaultModemScriptAndCopyName(CFStringRef* name) {
     CFIndex index = 0;
     OSStatus err = MoreSCCreateCCLArray(&scripts, &index);
     if (err == 0) {
-        if (CFArrayGetCount(scripts) > 0) {
-            *name = static_cast<CFStringRef>(CFQRetain(CFArrayGetValueAtIndex(scripts, index)));
-        } else {
-            *name = CFStringCreateWithCString(kCFAllocatorDefault, "", kCFStringEncodingASCII);
-        }
-        if (*name == nullptr) {
-            err = coreFoundationUnknownErr;
-        }
+        *name = CFArrayGetCount(scripts) > 0
+                    ? static_cast<CFStringRef>(Retained(CFArrayGetValueAtIndex(scripts, index)))
+                    : CFStringCreateWithCString(kCFAllocatorDefault, "", kCFStringEncodingASCII);
+        err = ErrorIfMissing(*name);
     }
     CFQRelease(scripts);
     return err;
 }
 
-OSStatus AddModemEntity(CFStringRef setID, CFStringRef serviceID) {
+OSStatus AddModemEntity(const NewService& service) {
     CFStringRef script = nullptr;
-    MoreSCDigest digest = ZeroedDigest();
     OSStatus err = FindDefaultModemScriptAndCopyName(&script);
     if (err == 0) {
-        digest.modem = kMoreSCModemDigestDefault;
-        digest.modem.dataCompressionErrorCorrection = true;
-        digest.modem.speaker = true;
-        digest.modem.waitForDialTone = true;
-        digest.modem.connectionScript = script;
-        err = AddEntityToService(setID, serviceID, kModemProtocol, &digest);
+        err = AddEntity(service, kModemProtocol, [script](MoreSCDigest* digest) {
+            digest->modem = kMoreSCModemDigestDefault;
+            digest->modem.connectionScript = script;
+        });
     }
     CFQRelease(script);
     return err;
 }
 
 // "AirPort" or "Ethernet".
-OSStatus AddCardEntity(CFStringRef setID, CFStringRef serviceID, CFDictionaryRef portDict) {
-    MoreSCDigest digest = ZeroedDigest();
-    const bool isAirPort = HasStringValue(portDict, kHardwareKey, kAirPortProtocol);
-    OSStatus err =
-        MoreSCFStringToMacAddress(GetStringValue(portDict, kMACAddressKey),
-                                  isAirPort ? digest.airPort.macAddress : digest.ethernet.macAddress);
+OSStatus AddCardEntity(const NewService& service) {
+    UInt8 macAddress[6];
+    const bool isAirPort = HasStringValue(service.port, kHardwareKey, kAirPortProtocol);
+    OSStatus err = MoreSCFStringToMacAddress(GetStringValue(service.port, kMACAddressKey), macAddress);
     if (err == 0) {
-        err = AddEntityToService(setID, serviceID, isAirPort ? kAirPortProtocol : kEthernetProtocol, &digest);
+        err = AddEntity(service, isAirPort ? kAirPortProtocol : kEthernetProtocol, [&](MoreSCDigest* digest) {
+            std::memcpy(isAirPort ? digest->airPort.macAddress : digest->ethernet.macAddress, macAddress,
+                        sizeof(macAddress));
+        });
     }
     return err;
 }
 
+OSStatus AddHardwareEntity(const NewService& service) {
+    return service.isEthernetLike ? AddCardEntity(service) : AddModemEntity(service);
+}
+
 // Everything that a new service holds, in this order.
-OSStatus AddEntitiesForPort(CFStringRef setID, CFStringRef serviceID, CFDictionaryRef portDict,
-                            SystemVersion version) {
-    const bool isEthernetLike = IsEthernetLike(portDict);
-    OSStatus err = AddInterfaceEntity(setID, serviceID, portDict);
-    if (err == 0) {
-        err = AddProxiesEntity(setID, serviceID, version);
-    }
-    if (err == 0 && isEthernetLike) {
-        err = AddAppleTalkEntity(setID, serviceID);
-    }
-    if (err == 0) {
-        err = AddDNSEntity(setID, serviceID);
-    }
-    if (err == 0) {
-        err = AddIPv4Entity(setID, serviceID, isEthernetLike, version);
-    }
-    if (err == 0) {
-        err = AddPPPEntityToService(setID, serviceID, isEthernetLike);
-    }
-    if (err == 0) {
-        err = isEthernetLike ? AddCardEntity(setID, serviceID, portDict) : AddModemEntity(setID, serviceID);
+OSStatus AddEntities(const NewService& service) {
+    OSStatus err = 0;
+    for (auto* add : {AddInterfaceEntity, AddProxiesEntity, AddAppleTalkEntity, AddDNSEntity, AddIPv4Entity,
+                      AddPPPEntity, AddHardwareEntity}) {
+        if (err == 0) {
+            err = add(service);
+        }
     }
     return err;
 }
@@ -181,22 +161,15 @@ OSStatus AddEntitiesForPort(CFStringRef setID, CFStringRef serviceID, CFDictiona
 OSStatus MoreSCNewService(CFStringRef setID, CFDictionaryRef portDict, CFStringRef* newServiceID) {
     CFStringRef serviceID = nullptr;
     CFStringRef servicePath = nullptr;
-    const SystemVersion version = GetSystemVersion();
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && portDict == nullptr) {
-        err = paramErr;
-    }
+    const UInt32 version = GetSystemVersion();
+    OSStatus err = InTurn(
+        OpenSession, [&] { return ErrorIfNotGiven(portDict); },
+        [&] { return MakeNewSeAndCopyIDAndPath(kNetworkServicesKey, &serviceID, &servicePath); },
+        [&] { return AddServiceToSet(setID, serviceID); },
+        [&] { return MoreSCRenameService(setID, serviceID, GetStringValue(portDict, kUserDefinedNameKey)); });
     if (err == 0) {
-        err = MakeNewSeAndCopyIDAndPath(kNetworkServicesKey, &serviceID, &servicePath);
-    }
-    if (err == 0) {
-        err = AddServiceToSet(setID, serviceID);
-    }
-    if (err == 0) {
-        err = MoreSCRenameService(setID, serviceID, GetStringValue(portDict, kUserDefinedNameKey));
-    }
-    if (err == 0) {
-        err = AddEntitiesForPort(setID, serviceID, portDict, version);
+        const bool isEthernetLike = CFDictionaryContainsKey(portDict, kMACAddressKey);
+        err = AddEntities({setID, serviceID, portDict, isEthernetLike, version});
     }
     if (err != 0 && serviceID != nullptr) {
         MoreSCDeleteService(setID, serviceID);

@@ -3,6 +3,7 @@
 #include "morescf/MoreSCFKeys.h"
 #include "morescf/MoreSCFPortScanner.h"
 #include "morescf/MoreSCFPorts.h"
+#include "morescf/MoreSCFSteps.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
@@ -14,7 +15,12 @@ const CFStringRef kSlotNameKey = CFSTR("AAPL,slot-name");
 const CFStringRef kChildIndexKey = CFSTR("IOChildIndex");
 const CFStringRef kUnknownText = CFSTR("unknown");
 
-// Registry data as text, without the zero bytes at its end.
+// Literally equal; null is equal to nothing.
+bool CFEqualString(CFStringRef a, CFStringRef b) {
+    return a != nullptr && b != nullptr && (a == b || CFStringCompare(a, b, 0) == kCFCompareEqualTo);
+}
+
+// Registry data as text, without the zero bytes at its end. Firmware writes it, in an encoding of its own.
 CFStringRef CreateStringFromData(CFDataRef data) {
     const UInt8* bytes = CFDataGetBytePtr(data);
     CFIndex length = CFDataGetLength(data);
@@ -32,56 +38,50 @@ CFStringRef CopyDataPropertyAsString(io_object_t entry, CFStringRef key) {
     return text;
 }
 
-// Records what a keyword of a name stands for.
+// Records the text, which is consumed, that a keyword of a name is replaced by.
 void RecordKeyword(CFMutableDictionaryRef portDict, CFStringRef key, CFStringRef text) {
     CFDictionarySetValue(portDict, key, text != nullptr ? text : kUnknownText);
+    CFQRelease(text);
+}
+
+// A name, and the place in the order that goes with it.
+OSStatus Propose(CFMutableDictionaryRef portDict, SInt32 sortOrder, CFStringRef name,
+                 CFStringRef* proposedName) {
+    *proposedName = Retained(name);
+    return CFQDictionarySetNumber(portDict, kSortOrderKey, sortOrder);
 }
 
 void RecordSlotName(io_object_t bus, CFMutableDictionaryRef portDict) {
     CFStringRef prefix = CFSTR("SLOT-");
     CFStringRef slot = CopyDataPropertyAsString(bus, kSlotNameKey);
+    CFStringRef rest = nullptr;
     if (slot != nullptr && CFStringHasPrefix(slot, prefix)) {
         const CFIndex start = CFStringGetLength(prefix);
-        CFStringRef rest = CFStringCreateWithSubstring(kCFAllocatorDefault, slot,
-                                                       CFRangeMake(start, CFStringGetLength(slot) - start));
-        if (rest != nullptr) {
-            CFQRelease(slot);
-            slot = rest;
-        }
+        rest = CFStringCreateWithSubstring(kCFAllocatorDefault, slot,
+                                           CFRangeMake(start, CFStringGetLength(slot) - start));
     }
-    RecordKeyword(portDict, kSlotNameKey, slot);
+    RecordKeyword(portDict, kSlotNameKey, Retained(rest != nullptr ? rest : slot));
     CFQRelease(slot);
+    CFQRelease(rest);
 }
 
 // The registry counts a card's ports from 0, its user from 1.
-void RecordPortNumber(io_object_t bus, CFMutableDictionaryRef portDict) {
-    SInt32 index = 0;
-    CFStringRef text = nullptr;
-    CFTypeRef number = CopyProperty(bus, kChildIndexKey, CFNumberGetTypeID());
-    if (ReadInteger(number, &index)) {
-        text = CFStringCreateWithFormat(kCFAllocatorDefault, nullptr, CFSTR("%ld"),
-                                        static_cast<long>(index) + 1);
-    }
-    RecordKeyword(portDict, kChildIndexKey, text);
-    CFQRelease(text);
-    CFQRelease(number);
+void RecordPortNumber(SInt32 index, CFMutableDictionaryRef portDict) {
+    RecordKeyword(
+        portDict, kChildIndexKey,
+        CFStringCreateWithFormat(kCFAllocatorDefault, nullptr, CFSTR("%ld"), static_cast<long>(index) + 1));
 }
 
 OSStatus CopyNameForPCIPort(io_object_t bus, CFDictionaryRef busProperties, CFMutableDictionaryRef portDict,
                             CFStringRef* proposedName) {
     SInt32 index = 0;
-    OSStatus err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortPCIEthernet);
-    if (err == 0) {
-        RecordSlotName(bus, portDict);
-        if (ReadInteger(CFDictionaryGetValue(busProperties, kChildIndexKey), &index)) {
-            RecordPortNumber(bus, portDict);
-            *proposedName = CFSTR("PCI Ethernet Slot %2$@, Port %3$@");
-        } else {
-            *proposedName = CFSTR("PCI Ethernet Slot %2$@");
-        }
-        CFQRetain(*proposedName);
+    CFStringRef name = CFSTR("PCI Ethernet Slot %2$@");
+    RecordSlotName(bus, portDict);
+    if (ReadInteger(CFDictionaryGetValue(busProperties, kChildIndexKey), &index)) {
+        RecordPortNumber(index, portDict);
+        name = CFSTR("PCI Ethernet Slot %2$@, Port %3$@");
     }
-    return err;
+    return Propose(portDict, kSortPCIEthernet, name, proposedName);
 }
 
 // The name of a card that is neither built in nor an AirPort.
@@ -89,32 +89,23 @@ OSStatus CopyNameByBus(io_object_t entry, CFDictionaryRef controllerProperties, 
                        CFMutableDictionaryRef portDict, CFStringRef* proposedName) {
     CFMutableDictionaryRef busProperties = nullptr;
     CFStringRef busName = nullptr;
-    CFStringRef bsdName = nullptr;
     OSStatus err = CopyProperties(bus, &busProperties);
     if (err == 0) {
-        CFTypeRef nameData = CFDictionaryGetValue(busProperties, CFSTR("name"));
-        if (nameData != nullptr && CFGetTypeID(nameData) == CFDataGetTypeID()) {
-            busName = CreateStringFromData(static_cast<CFDataRef>(nameData));
-        }
-        if (busName == nullptr) {
-            err = kCannotDescribePortErr;
-        }
+        busName = CopyDataPropertyAsString(bus, CFSTR("name"));
+        err = busName != nullptr ? 0 : kCannotDescribePortErr;
     }
     if (err == 0) {
         if (CFEqualString(busName, CFSTR("radio"))) {
-            err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortWireless);
-            *proposedName = static_cast<CFStringRef>(CFQRetain(CFSTR("Wireless Network Adaptor")));
+            err = Propose(portDict, kSortWireless, CFSTR("Wireless Network Adaptor"), proposedName);
         } else if (HasStringValue(controllerProperties, CFSTR("IOProviderClass"), CFSTR("IOPCIDevice"))) {
             err = CopyNameForPCIPort(bus, busProperties, portDict, proposedName);
         } else {
-            bsdName = CopyStringProperty(entry, kBSDNameKey);
-            RecordKeyword(portDict, kBSDNameKey, bsdName);
-            *proposedName = static_cast<CFStringRef>(CFQRetain(CFSTR("Ethernet Adaptor (%1$@)")));
+            RecordKeyword(portDict, kBSDNameKey, CopyStringProperty(entry, kBSDNameKey));
+            *proposedName = Retained(CFSTR("Ethernet Adaptor (%1$@)"));
         }
     }
     CFQRelease(busProperties);
     CFQRelease(busName);
-    CFQRelease(bsdName);
     return err;
 }
 
@@ -124,28 +115,17 @@ OSStatus CopyUserVisibleNameForEthernetPort(io_object_t entry, CFMutableDictiona
     io_object_t bus = IO_OBJECT_NULL;
     CFMutableDictionaryRef controllerProperties = nullptr;
     CFStringRef bsdName = nullptr;
-    OSStatus err = GetParent(entry, &controller);
-    if (err == 0) {
-        err = GetParent(controller, &bus);
-    }
-    if (err == 0) {
-        err = CopyProperties(controller, &controllerProperties);
-    }
-    if (err == 0) {
-        bsdName = CopyStringProperty(entry, kBSDNameKey);
-        if (bsdName == nullptr) {
-            err = kCannotDescribePortErr;
-        }
-    }
+    OSStatus err =
+        InTurn([&] { return GetParent(entry, &controller); }, [&] { return GetParent(controller, &bus); },
+               [&] { return CopyProperties(controller, &controllerProperties); },
+               [&] { return CopyRequiredString(entry, kBSDNameKey, &bsdName); });
     if (err == 0) {
         CFStringRef driverClass = GetStringValue(controllerProperties, CFSTR("IOClass"));
         if (CFEqualString(bsdName, CFSTR("en0"))) {
-            err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortBuiltInEthernet);
-            *proposedName = static_cast<CFStringRef>(CFQRetain(CFSTR("Built-in Ethernet")));
-        } else if (driverClass != nullptr && CFStringHasPrefix(driverClass, CFSTR("AirPort"))) {
+            err = Propose(portDict, kSortBuiltInEthernet, CFSTR("Built-in Ethernet"), proposedName);
+        } else if (driverClass != nullptr && CFStringHasPrefix(driverClass, kAirPortProtocol)) {
             CFDictionarySetValue(portDict, kHardwareKey, kAirPortProtocol);
-            err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortAirPort);
-            *proposedName = static_cast<CFStringRef>(CFQRetain(CFSTR("AirPort")));
+            err = Propose(portDict, kSortAirPort, CFSTR("AirPort"), proposedName);
         } else {
             err = CopyNameByBus(entry, controllerProperties, bus, portDict, proposedName);
         }
@@ -159,77 +139,60 @@ OSStatus CopyUserVisibleNameForEthernetPort(io_object_t entry, CFMutableDictiona
 
 OSStatus CopyNameForUSBModem(io_object_t entry, CFMutableDictionaryRef portDict, CFStringRef* proposedName) {
     io_object_t device = IO_OBJECT_NULL;
-    OSStatus err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortUSBModem);
+    CFStringRef product = nullptr;
+    OSStatus err = GetParent(entry, &device);
     if (err == 0) {
-        err = GetParent(entry, &device);
+        product = CopyStringProperty(device, CFSTR("Product Name"));
+        err =
+            Propose(portDict, kSortUSBModem, product != nullptr ? product : CFSTR("USB Modem"), proposedName);
     }
-    if (err == 0) {
-        *proposedName = CopyStringProperty(device, CFSTR("Product Name"));
-        if (*proposedName == nullptr) {
-            *proposedName = static_cast<CFStringRef>(CFQRetain(CFSTR("USB Modem")));
-        }
-    }
+    CFQRelease(product);
     ReleaseEntry(device);
     return err;
 }
 
-void RecordLowerCaseBaseName(io_object_t entry, CFMutableDictionaryRef portDict) {
-    CFMutableStringRef lowerCase = nullptr;
-    CFStringRef baseName = CopyStringProperty(entry, kBaseNameKey);
-    if (baseName != nullptr) {
-        lowerCase = CFStringCreateMutableCopy(kCFAllocatorDefault, 0, baseName);
-    }
+CFStringRef CreateLowerCase(CFStringRef text) {
+    CFMutableStringRef lowerCase = CFStringCreateMutableCopy(kCFAllocatorDefault, 0, text);
     if (lowerCase != nullptr) {
         CFStringLowercase(lowerCase, nullptr);
     }
-    RecordKeyword(portDict, kBaseNameKey, lowerCase);
-    CFQRelease(baseName);
-    CFQRelease(lowerCase);
+    return lowerCase;
 }
 
 OSStatus CopyUserVisibleNameForModemOrSerialPort(io_object_t entry, CFMutableDictionaryRef portDict,
                                                  CFStringRef* proposedName) {
-    OSStatus err = 0;
-    bool isModem = false;
-    CFStringRef fixedName = nullptr;
+    const struct {
+        CFStringRef baseName;
+        CFStringRef name;
+    } fixedNames[] = {{CFSTR("modem"), CFSTR("Modem Port")},
+                      {CFSTR("printer"), CFSTR("Printer Port")},
+                      {CFSTR("modem-printer"), CFSTR("Modem/Printer Port")},
+                      {kInfraredName, CFSTR("IrDA Modem Port")}};
     CFStringRef baseName = nullptr;
-    CFStringRef streamType = CopyStringProperty(entry, kStreamTypeKey);
-    if (streamType == nullptr) {
-        err = kCannotDescribePortErr;
+    CFStringRef streamType = nullptr;
+    OSStatus err = CopyRequiredString(entry, kStreamTypeKey, &streamType);
+    const bool isModem = CFEqualString(streamType, kModemStreamType);
+    if (err == 0 && isModem) {
+        err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortModem);
     }
     if (err == 0) {
-        isModem = CFEqualString(streamType, kModemStreamType);
-        if (isModem) {
-            err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortModem);
-        }
+        err = CopyRequiredString(entry, kBaseNameKey, &baseName);
     }
     if (err == 0) {
-        baseName = CopyStringProperty(entry, kBaseNameKey);
-        if (baseName == nullptr) {
-            err = kCannotDescribePortErr;
-        }
-    }
-    if (err == 0) {
-        if (CFEqualString(baseName, CFSTR("modem"))) {
-            if (isModem) {
-                err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortInternalModem);
+        for (const auto& fixed : fixedNames) {
+            if (CFEqualString(baseName, fixed.baseName)) {
+                *proposedName = Retained(fixed.name);
             }
-            fixedName = isModem ? CFSTR("Internal Modem") : CFSTR("Modem Port");
-        } else if (CFEqualString(baseName, CFSTR("printer"))) {
-            fixedName = CFSTR("Printer Port");
-        } else if (CFEqualString(baseName, CFSTR("modem-printer"))) {
-            fixedName = CFSTR("Modem/Printer Port");
+        }
+        if (isModem && CFEqualString(baseName, CFSTR("modem"))) {
+            CFQRelease(*proposedName);
+            err = Propose(portDict, kSortInternalModem, CFSTR("Internal Modem"), proposedName);
         } else if (CFEqualString(baseName, CFSTR("usbmodem"))) {
             err = CopyNameForUSBModem(entry, portDict, proposedName);
-        } else if (CFEqualString(baseName, kInfraredName)) {
-            fixedName = CFSTR("IrDA Modem Port");
-        } else {
-            RecordLowerCaseBaseName(entry, portDict);
-            fixedName = CFSTR("%4$@-port");
+        } else if (*proposedName == nullptr) {
+            RecordKeyword(portDict, kBaseNameKey, CreateLowerCase(baseName));
+            *proposedName = Retained(CFSTR("%4$@-port"));
         }
-    }
-    if (err == 0 && fixedName != nullptr) {
-        *proposedName = static_cast<CFStringRef>(CFQRetain(fixedName));
     }
     CFQRelease(streamType);
     CFQRelease(baseName);
@@ -245,14 +208,11 @@ OSStatus SubstituteKeywordsInUserVisibleName(io_object_t /*entry*/, CFDictionary
                     {CFSTR("%2$@"), kSlotNameKey},
                     {CFSTR("%3$@"), kChildIndexKey},
                     {CFSTR("%4$@"), kBaseNameKey}};
-    OSStatus err = 0;
     CFMutableStringRef text = nullptr;
     if (nameTemplate != nullptr) {
         text = CFStringCreateMutableCopy(kCFAllocatorDefault, 0, nameTemplate);
     }
-    if (text == nullptr) {
-        err = kCannotDescribePortErr;
-    }
+    const OSStatus err = text != nullptr ? 0 : kCannotDescribePortErr;
     if (err == 0) {
         for (const auto& each : keywords) {
             const CFRange place = CFStringFind(text, each.keyword, 0);
@@ -278,19 +238,14 @@ OSStatus CopyUserVisiblePortName(io_object_t entry, CFMutableDictionaryRef portD
     } else if (IOObjectConformsTo(entry, "IOSerialBSDClient")) {
         err = CopyUserVisibleNameForModemOrSerialPort(entry, portDict, &proposedName);
     } else {
-        proposedName = CopyStringProperty(entry, kBSDNameKey);
-        if (proposedName == nullptr) {
-            err = kCannotDescribePortErr;
-        }
+        err = CopyRequiredString(entry, kBSDNameKey, &proposedName);
     }
     if (gPortNameCallback != nullptr) {
         // Also after a failure: the hook may know a name where the rules have none.
         err = gPortNameCallback(entry, portDict, proposedName, &baseName);
     } else if (err == 0) {
         baseName = CFStringCreateCopy(kCFAllocatorDefault, proposedName);
-        if (baseName == nullptr) {
-            err = kCannotDescribePortErr;
-        }
+        err = baseName != nullptr ? 0 : kCannotDescribePortErr;
     }
     if (err == 0) {
         err = SubstituteKeywordsInUserVisibleName(entry, portDict, baseName, name);

@@ -1,8 +1,10 @@
 #include "morescf/MoreSCFPortScanner.h"
 
 #include "morecfq/MoreCFQ.h"
+#include "morescf/MoreSCFDigest.h"
 #include "morescf/MoreSCFKeys.h"
 #include "morescf/MoreSCFPorts.h"
+#include "morescf/MoreSCFSteps.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
@@ -15,76 +17,66 @@ using DeviceToDictProc = OSStatus (*)(void* context, io_object_t entry, CFMutabl
 CFStringRef CreateMACFromData(CFDataRef data) {
     CFStringRef text = nullptr;
     if (CFDataGetLength(data) == 6) {
-        const UInt8* bytes = CFDataGetBytePtr(data);
-        text = CFStringCreateWithFormat(kCFAllocatorDefault, nullptr, CFSTR("%02x:%02x:%02x:%02x:%02x:%02x"),
-                                        bytes[0], bytes[1], bytes[2], bytes[3], bytes[4], bytes[5]);
+        static_cast<void>(MoreSCFCreateStringWithMacAddress(CFDataGetBytePtr(data), &text));
     }
     return text;
 }
 
+// A controller without an address leaves the port without one.
+void SetMACAddress(io_object_t controller, CFMutableDictionaryRef portDict) {
+    auto* address =
+        static_cast<CFDataRef>(CopyProperty(controller, CFSTR("IOMACAddress"), CFDataGetTypeID()));
+    CFStringRef text = address != nullptr ? CreateMACFromData(address) : nullptr;
+    if (text != nullptr) {
+        CFDictionarySetValue(portDict, kMACAddressKey, text);
+    }
+    CFQRelease(address);
+    CFQRelease(text);
+}
+
 OSStatus EthernetDeviceToDictProc(void* /*context*/, io_object_t entry, CFMutableDictionaryRef portDict) {
     io_object_t controller = IO_OBJECT_NULL;
-    CFTypeRef address = nullptr;
-    CFStringRef addressText = nullptr;
     CFStringRef bsdName = nullptr;
-    OSStatus err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortEthernet);
+    OSStatus err = InTurn([&] { return CFQDictionarySetNumber(portDict, kSortOrderKey, kSortEthernet); },
+                          [&] { return CopyRequiredString(entry, kBSDNameKey, &bsdName); });
     if (err == 0) {
-        bsdName = CopyStringProperty(entry, kBSDNameKey);
-        if (bsdName != nullptr) {
-            CFDictionarySetValue(portDict, kDeviceNameKey, bsdName);
-        } else {
-            err = kCannotDescribePortErr;
-        }
-    }
-    CFDictionarySetValue(portDict, kHardwareKey, kEthernetProtocol);
-    CFDictionarySetValue(portDict, kTypeKey, kEthernetProtocol);
-    if (err == 0) {
+        CFDictionarySetValue(portDict, kDeviceNameKey, bsdName);
+        CFDictionarySetValue(portDict, kHardwareKey, kEthernetProtocol);
+        CFDictionarySetValue(portDict, kTypeKey, kEthernetProtocol);
         err = GetParent(entry, &controller);
     }
     if (err == 0) {
-        address = CopyProperty(controller, CFSTR("IOMACAddress"), CFDataGetTypeID());
-        if (address != nullptr) {
-            addressText = CreateMACFromData(static_cast<CFDataRef>(address));
-        }
-        if (addressText != nullptr) {
-            CFDictionarySetValue(portDict, kMACAddressKey, addressText);
-        }
+        SetMACAddress(controller, portDict);
     }
     CFQRelease(bsdName);
-    CFQRelease(address);
-    CFQRelease(addressText);
     ReleaseEntry(controller);
     return err;
 }
 
+// An entry without a base name, and the raw infrared device below the port of that name, are no ports.
 OSStatus ModemOrSerialDeviceToDictProc(void* /*context*/, io_object_t entry,
                                        CFMutableDictionaryRef portDict) {
     CFMutableDictionaryRef properties = nullptr;
-    CFStringRef baseName = nullptr;
+    CFStringRef deviceName = nullptr;
     OSStatus err = CopyProperties(entry, &properties);
-    if (err == 0) {
-        baseName = GetStringValue(properties, kBaseNameKey);
+    CFStringRef baseName = err == 0 ? GetStringValue(properties, kBaseNameKey) : nullptr;
+    const bool isPort = baseName != nullptr && !CFEqual(baseName, CFSTR("irda"));
+    const bool isInfrared = isPort && CFStringHasPrefix(baseName, kInfraredName);
+    if (isPort) {
+        err = CopyRequiredString(entry, CFSTR("IOTTYDevice"), &deviceName);
     }
-    if (err == 0 && baseName != nullptr && !CFEqualString(baseName, CFSTR("irda"))) {
-        CFStringRef deviceName = GetStringValue(properties, CFSTR("IOTTYDevice"));
-        if (deviceName == nullptr) {
-            err = kCannotDescribePortErr;
-        }
-        if (err == 0) {
-            err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortSerial);
-        }
-        if (err == 0) {
-            CFDictionarySetValue(portDict, kDeviceNameKey, deviceName);
-            CFDictionarySetValue(portDict, kHardwareKey, kModemProtocol);
-            CFDictionarySetValue(portDict, kTypeKey, kPPPProtocol);
-            CFDictionarySetValue(portDict, kSubTypeKey, CFSTR("PPPSerial"));
-        }
-        if (err == 0 && CFStringHasPrefix(baseName, kInfraredName)) {
-            err = CFQDictionarySetNumber(portDict, kSortOrderKey, kSortInfrared);
-            CFDictionarySetValue(portDict, kHardwareVariantKey, kInfraredName);
-        }
+    if (err == 0 && isPort) {
+        err = CFQDictionarySetNumber(portDict, kSortOrderKey, isInfrared ? kSortInfrared : kSortSerial);
+        CFDictionarySetValue(portDict, kDeviceNameKey, deviceName);
+        CFDictionarySetValue(portDict, kHardwareKey, kModemProtocol);
+        CFDictionarySetValue(portDict, kTypeKey, kPPPProtocol);
+        CFDictionarySetValue(portDict, kSubTypeKey, CFSTR("PPPSerial"));
+    }
+    if (err == 0 && isInfrared) {
+        CFDictionarySetValue(portDict, kHardwareVariantKey, kInfraredName);
     }
     CFQRelease(properties);
+    CFQRelease(deviceName);
     return err;
 }
 
@@ -92,10 +84,8 @@ OSStatus AddDeviceToArray(io_object_t entry, DeviceToDictProc fillProc, void* co
                           CFMutableArrayRef array) {
     CFMutableDictionaryRef portDict = nullptr;
     CFStringRef name = nullptr;
-    OSStatus err = CFQDictionaryCreateMutable(&portDict);
-    if (err == 0) {
-        err = fillProc(context, entry, portDict);
-    }
+    OSStatus err = InTurn([&] { return CFQDictionaryCreateMutable(&portDict); },
+                          [&] { return fillProc(context, entry, portDict); });
     if (err == 0 && CFDictionaryGetCount(portDict) != 0) {
         err = CopyUserVisiblePortName(entry, portDict, &name);
         if (err == 0) {
@@ -111,14 +101,9 @@ OSStatus AddDeviceToArray(io_object_t entry, DeviceToDictProc fillProc, void* co
 // Consumes a reference of matchingDict, which is null when it could not be made.
 OSStatus AddMatchingDevicesToArray(mach_port_t masterPort, CFDictionaryRef matchingDict,
                                    DeviceToDictProc fillProc, void* context, CFMutableArrayRef array) {
-    OSStatus err = 0;
     io_iterator_t iterator = IO_OBJECT_NULL;
-    if (matchingDict == nullptr) {
-        err = coreFoundationUnknownErr;
-    }
-    if (err == 0) {
-        err = IOServiceGetMatchingServices(masterPort, matchingDict, &iterator);
-    }
+    OSStatus err = InTurn([&] { return ErrorIfMissing(matchingDict); },
+                          [&] { return IOServiceGetMatchingServices(masterPort, matchingDict, &iterator); });
     while (err == 0) {
         io_object_t entry = IOIteratorNext(iterator);
         if (entry == IO_OBJECT_NULL) {
@@ -167,20 +152,15 @@ CFComparisonResult PortSorter(const void* lhs, const void* rhs, void* /*context*
 OSStatus MoreSCCreatePortArray(CFArrayRef* portArray) {
     mach_port_t masterPort = MACH_PORT_NULL;
     CFMutableArrayRef ports = nullptr;
-    OSStatus err = CFQArrayCreateMutable(&ports);
-    if (err == 0) {
-        err = IOMasterPort(MACH_PORT_NULL, &masterPort);
-    }
-    if (err == 0) {
-        err = AddMatchingDevicesToArray(masterPort, IOServiceMatching("IOEthernetInterface"),
-                                        EthernetDeviceToDictProc, nullptr, ports);
-    }
-    if (err == 0) {
-        err = AddSerialDevicesToArray(masterPort, kModemStreamType, ports);
-    }
-    if (err == 0) {
-        err = AddSerialDevicesToArray(masterPort, CFSTR("IORS232SerialStream"), ports);
-    }
+    OSStatus err =
+        InTurn([&] { return CFQArrayCreateMutable(&ports); },
+               [&] { return IOMasterPort(MACH_PORT_NULL, &masterPort); },
+               [&] {
+                   return AddMatchingDevicesToArray(masterPort, IOServiceMatching("IOEthernetInterface"),
+                                                    EthernetDeviceToDictProc, nullptr, ports);
+               },
+               [&] { return AddSerialDevicesToArray(masterPort, kModemStreamType, ports); },
+               [&] { return AddSerialDevicesToArray(masterPort, CFSTR("IORS232SerialStream"), ports); });
     if (err == 0) {
         CFArraySortValues(ports, CFRangeMake(0, CFArrayGetCount(ports)), PortSorter, nullptr);
     }

@@ -30,29 +30,27 @@ inline const CFStringRef kModemStreamType = CFSTR("IOModemSerialStream");
 inline const CFStringRef kInfraredName = CFSTR("IrDA-IrCOMM");
 
 // The name that the user sees, after the rules, the hook and the keywords; a new reference. It may change the
-// port's sort order and hardware, and records in its dictionary what the keywords stand for.
+// port's sort order and hardware, and records in its dictionary the text that each keyword is replaced by.
 OSStatus CopyUserVisiblePortName(io_object_t entry, CFMutableDictionaryRef portDict, CFStringRef* name);
-
-// Literally equal; null is equal to nothing.
-inline bool CFEqualString(CFStringRef a, CFStringRef b) {
-    if (a == nullptr || b == nullptr) {
-        return false;
-    }
-    return a == b || CFStringCompare(a, b, 0) == kCFCompareEqualTo;
-}
 
 // A property of that type, or null.
 inline CFTypeRef CopyProperty(io_object_t entry, CFStringRef key, CFTypeID type) {
     CFTypeRef value = IORegistryEntryCreateCFProperty(entry, key, kCFAllocatorDefault, 0);
-    if (value != nullptr && CFGetTypeID(value) != type) {
+    const bool isOfType = value != nullptr && CFGetTypeID(value) == type;
+    if (!isOfType) {
         CFQRelease(value);
-        value = nullptr;
     }
-    return value;
+    return isOfType ? value : nullptr;
 }
 
 inline CFStringRef CopyStringProperty(io_object_t entry, CFStringRef key) {
     return static_cast<CFStringRef>(CopyProperty(entry, key, CFStringGetTypeID()));
+}
+
+// -1 when it is not there.
+inline OSStatus CopyRequiredString(io_object_t entry, CFStringRef key, CFStringRef* value) {
+    *value = CopyStringProperty(entry, key);
+    return *value != nullptr ? 0 : kCannotDescribePortErr;
 }
 
 inline OSStatus GetParent(io_object_t entry, io_object_t* parent) {

@@ -1,41 +1,51 @@
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
 #include "morescf/MoreSCFKeys.h"
+#include "morescf/MoreSCFNode.h"
+#include "morescf/MoreSCFSteps.h"
 #include "morescf/MoreSCFTree.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
+namespace {
+
+// The entity of a location's globals that holds the service order.
+Node OrderNode(CFStringRef setID) {
+    return EntityNode(setID, nullptr, kIPv4Protocol);
+}
+
+OSStatus CopyServiceOrder(CFStringRef setID, CFArrayRef* order) {
+    CFDictionaryRef globalIPv4 = nullptr;
+    OSStatus err = CopyNode(OrderNode(setID), &globalIPv4);
+    if (err == 0) {
+        *order = Retained(GetArrayValue(globalIPv4, kServiceOrderKey));
+        err = ErrorIfMissing(*order);
+    }
+    CFQRelease(globalIPv4);
+    return err;
+}
+
+// The ID under which the service that the location links is kept for all of them.
+OSStatus CopyResolvedServiceID(CFStringRef setID, CFStringRef serviceID, CFStringRef* resolvedID) {
+    CFStringRef path = nullptr;
+    const OSStatus err = InTurn([&] { return CopyResolvedServicePath(setID, serviceID, &path); },
+                                [&] { return CopySeIDFromSePath(path, resolvedID); });
+    CFQRelease(path);
+    return err;
+}
+
+}  // namespace
+
 OSStatus MoreSCCopyServicesDict(CFStringRef setID, CFDictionaryRef* servicesDict, CFArrayRef* serviceOrder) {
-    SCPreferencesRef session = nullptr;
-    CFStringRef servicesPath = nullptr;
-    CFStringRef orderPath = nullptr;
     CFDictionaryRef services = nullptr;
     CFArrayRef order = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    session = MoreSCGetSCPreferencesRef();
+    OSStatus err = OpenSession();
     if (err == 0 && servicesDict != nullptr) {
-        err = CopySetServicesPath(setID, &servicesPath);
-        if (err == 0) {
-            services =
-                static_cast<CFDictionaryRef>(CFQRetain(SCPreferencesPathGetValue(session, servicesPath)));
-            err = MoreSCError(services);
-        }
+        err = CopyNode(LinksNode(setID), &services);
     }
     if (err == 0 && serviceOrder != nullptr) {
-        err = CopySetServiceOrderPath(setID, &orderPath);
-        if (err == 0) {
-            CFDictionaryRef globalIPv4 = SCPreferencesPathGetValue(session, orderPath);
-            err = MoreSCError(globalIPv4);
-            if (err == 0) {
-                order = static_cast<CFArrayRef>(CFQRetain(GetArrayValue(globalIPv4, kServiceOrderKey)));
-                if (order == nullptr) {
-                    err = coreFoundationUnknownErr;
-                }
-            }
-        }
+        err = CopyServiceOrder(setID, &order);
     }
-    CFQRelease(servicesPath);
-    CFQRelease(orderPath);
     MoreSCClose(&err, false);
     HandOverOrNull(err, services, servicesDict);
     HandOverOrNull(err, order, serviceOrder);
@@ -48,49 +58,30 @@ OSStatus MoreSCCopyServicesDictMutable(CFStringRef setID, CFMutableDictionaryRef
     CFArrayRef order = nullptr;
     CFMutableDictionaryRef servicesCopy = nullptr;
     CFMutableArrayRef orderCopy = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
+    OSStatus err = MoreSCCopyServicesDict(setID, &services, &order);
     if (err == 0) {
-        err = MoreSCCopyServicesDict(setID, &services, &order);
-    }
-    if (err == 0 && servicesDict != nullptr) {
         servicesCopy = CFDictionaryCreateMutableCopy(kCFAllocatorDefault, 0, services);
-        if (servicesCopy == nullptr) {
-            err = coreFoundationUnknownErr;
-        }
+        err = ErrorIfMissing(servicesCopy);
     }
-    if (err == 0 && serviceOrder != nullptr) {
+    if (err == 0) {
         orderCopy = CFArrayCreateMutableCopy(kCFAllocatorDefault, 0, order);
-        if (orderCopy == nullptr) {
-            err = coreFoundationUnknownErr;
-        }
+        err = ErrorIfMissing(orderCopy);
     }
     CFQRelease(services);
     CFQRelease(order);
-    MoreSCClose(&err, false);
     HandOver(err, servicesCopy, servicesDict);
     HandOver(err, orderCopy, serviceOrder);
     return err;
 }
 
 OSStatus MoreSCSetServicesDict(CFStringRef setID, CFDictionaryRef servicesDict, CFArrayRef serviceOrder) {
-    CFStringRef servicesPath = nullptr;
-    CFStringRef orderPath = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
+    OSStatus err = OpenSession();
     if (err == 0 && servicesDict != nullptr) {
-        err = CopySetServicesPath(setID, &servicesPath);
-        if (err == 0) {
-            err = MoreSCErrorBoolean(
-                SCPreferencesPathSetValue(MoreSCGetSCPreferencesRef(), servicesPath, servicesDict));
-        }
+        err = StoreNode(LinksNode(setID), servicesDict);
     }
     if (err == 0 && serviceOrder != nullptr) {
-        err = CopySetServiceOrderPath(setID, &orderPath);
-        if (err == 0) {
-            err = PreferencesPathSetProperty(orderPath, kServiceOrderKey, serviceOrder);
-        }
+        err = SetNodeProperty(OrderNode(setID), kServiceOrderKey, serviceOrder);
     }
-    CFQRelease(servicesPath);
-    CFQRelease(orderPath);
     MoreSCClose(&err, true);
     return err;
 }
@@ -100,40 +91,26 @@ OSStatus MoreSCCopyServiceIDs(CFStringRef setID, CFArrayRef* localServiceIDs,
     CFArrayRef order = nullptr;
     CFMutableArrayRef localIDs = nullptr;
     CFMutableArrayRef resolvedIDs = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
+    OSStatus err = InTurn(
+        OpenSession, [&] { return MoreSCCopyServicesDict(setID, nullptr, &order); },
+        [&] { return CFQArrayCreateMutable(&localIDs); },
+        [&] { return CFQArrayCreateMutable(&resolvedIDs); });
     if (err == 0) {
-        err = MoreSCCopyServicesDict(setID, nullptr, &order);
-    }
-    if (err == 0 && localServiceIDs != nullptr) {
-        err = CFQArrayCreateMutable(&localIDs);
-    }
-    if (err == 0 && resolvedServiceIDs != nullptr) {
-        err = CFQArrayCreateMutable(&resolvedIDs);
-    }
-    if (err == 0) {
-        const CFIndex count = CFArrayGetCount(order);
-        for (CFIndex i = 0; err == 0 && i < count; ++i) {
-            CFTypeRef entry = CFArrayGetValueAtIndex(order, i);
-            if (!IsString(entry)) {
-                err = coreFoundationUnknownErr;
-            }
-            if (err == 0 && localIDs != nullptr) {
+        err = ForEach<CFTypeRef>(order, [&](CFTypeRef entry) {
+            CFStringRef resolvedID = nullptr;
+            OSStatus entryErr = IsString(entry) ? 0 : coreFoundationUnknownErr;
+            if (entryErr == 0) {
                 CFArrayAppendValue(localIDs, entry);
             }
-            if (err == 0 && resolvedIDs != nullptr) {
-                CFStringRef path = nullptr;
-                CFStringRef resolvedID = nullptr;
-                err = CopyResolvedServicePath(setID, static_cast<CFStringRef>(entry), &path);
-                if (err == 0) {
-                    err = CopySeIDFromSePath(path, &resolvedID);
-                }
-                if (err == 0) {
-                    CFArrayAppendValue(resolvedIDs, resolvedID);
-                }
-                CFQRelease(path);
-                CFQRelease(resolvedID);
+            if (entryErr == 0 && resolvedServiceIDs != nullptr) {
+                entryErr = CopyResolvedServiceID(setID, static_cast<CFStringRef>(entry), &resolvedID);
             }
-        }
+            if (resolvedID != nullptr) {
+                CFArrayAppendValue(resolvedIDs, resolvedID);
+            }
+            CFQRelease(resolvedID);
+            return entryErr;
+        });
     }
     CFQRelease(order);
     MoreSCClose(&err, false);
@@ -144,86 +121,31 @@ OSStatus MoreSCCopyServiceIDs(CFStringRef setID, CFArrayRef* localServiceIDs,
 
 OSStatus MoreSCCopyUserVisibleNameOfService(CFStringRef setID, CFStringRef serviceID,
                                             CFStringRef* userVisibleName) {
-    CFDictionaryRef service = nullptr;
-    CFStringRef name = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCCopyEntitiesDict(setID, serviceID, &service);
-    }
-    if (err == 0) {
-        err = CopyStringValue(service, kUserDefinedNameKey, &name);
-    }
-    CFQRelease(service);
-    MoreSCClose(&err, false);
-    HandOver(err, name, userVisibleName);
-    return err;
+    return CopyNodeString(ServiceNode(setID, serviceID), kUserDefinedNameKey, userVisibleName);
 }
 
 OSStatus MoreSCIsServiceActive(CFStringRef setID, CFStringRef serviceID, Boolean* active) {
-    CFDictionaryRef service = nullptr;
-    Boolean isActive = false;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCCopyEntitiesDict(setID, serviceID, &service);
-    }
-    if (err == 0) {
-        isActive = IsDictionaryActive(service);
-    }
-    CFQRelease(service);
-    MoreSCClose(&err, false);
-    if (err == 0) {
-        *active = isActive;
-    }
-    return err;
+    return IsNodeActive(ServiceNode(setID, serviceID), active);
 }
 
 OSStatus MoreSCSetServiceActive(CFStringRef setID, CFStringRef serviceID, Boolean active) {
-    CFMutableDictionaryRef service = nullptr;
-    Boolean changed = false;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCCopyEntitiesDictMutable(setID, serviceID, &service);
-    }
-    if (err == 0) {
-        err = SetDictionaryActive(service, active, &changed);
-    }
-    if (err == 0 && changed) {
-        err = MoreSCSetEntitiesDict(setID, serviceID, service);
-    }
-    CFQRelease(service);
-    MoreSCClose(&err, changed);
-    return err;
+    return SetNodeActive(ServiceNode(setID, serviceID), active);
 }
 
 OSStatus MoreSCCopyBSDNameOfService(CFStringRef setID, CFStringRef serviceID, CFStringRef* bsdName) {
-    CFDictionaryRef interface = nullptr;
-    CFStringRef name = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCCopyEntity(setID, serviceID, kInterfaceProtocol, &interface);
-    }
-    if (err == 0) {
-        err = CopyStringValue(interface, kDeviceNameKey, &name);
-    }
-    CFQRelease(interface);
-    MoreSCClose(&err, false);
-    HandOver(err, name, bsdName);
-    return err;
+    return CopyNodeString(EntityNode(setID, serviceID, kInterfaceProtocol), kDeviceNameKey, bsdName);
+}
+
+OSStatus MoreSCRenameService(CFStringRef setID, CFStringRef serviceID, CFStringRef userVisibleName) {
+    return SetNodeProperty(ServiceNode(setID, serviceID), kUserDefinedNameKey, userVisibleName);
 }
 
 OSStatus MoreSCDuplicateService(CFStringRef setID, CFStringRef serviceID, CFStringRef userVisibleName,
                                 CFStringRef* newServiceID) {
     CFStringRef copyID = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && serviceID == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = DuplicateService(serviceID, &copyID);
-    }
-    if (err == 0) {
-        err = AddServiceToSet(setID, copyID);
-    }
+    OSStatus err = InTurn(
+        OpenSession, [&] { return DuplicateService(serviceID, &copyID); },
+        [&] { return AddServiceToSet(setID, copyID); });
     if (err == 0 && userVisibleName != nullptr) {
         err = MoreSCRenameService(setID, copyID, userVisibleName);
     }
@@ -238,13 +160,9 @@ OSStatus MoreSCDuplicateService(CFStringRef setID, CFStringRef serviceID, CFStri
 OSStatus MoreSCDeleteService(CFStringRef setID, CFStringRef serviceID) {
     CFMutableDictionaryRef services = nullptr;
     CFMutableArrayRef order = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && serviceID == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = MoreSCCopyServicesDictMutable(setID, &services, &order);
-    }
+    OSStatus err = InTurn(
+        OpenSession, [&] { return ErrorIfNotGiven(serviceID); },
+        [&] { return MoreSCCopyServicesDictMutable(setID, &services, &order); });
     if (err == 0) {
         CFDictionaryRemoveValue(services, serviceID);
         const CFIndex index =
@@ -256,10 +174,8 @@ OSStatus MoreSCDeleteService(CFStringRef setID, CFStringRef serviceID) {
         err = MoreSCSetServicesDict(setID, services, order);
     }
     if (serviceID != nullptr) {
-        const OSStatus err2 = DeleteUnreferencedServices();
-        if (err == 0) {
-            err = err2;
-        }
+        const OSStatus sweepErr = DeleteUnreferencedServices();
+        err = err != 0 ? err : sweepErr;
     }
     CFQRelease(services);
     CFQRelease(order);
@@ -267,31 +183,11 @@ OSStatus MoreSCDeleteService(CFStringRef setID, CFStringRef serviceID) {
     return err;
 }
 
-OSStatus MoreSCRenameService(CFStringRef setID, CFStringRef serviceID, CFStringRef userVisibleName) {
-    CFMutableDictionaryRef service = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && userVisibleName == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = MoreSCCopyEntitiesDictMutable(setID, serviceID, &service);
-    }
-    if (err == 0) {
-        CFDictionarySetValue(service, kUserDefinedNameKey, userVisibleName);
-        err = MoreSCSetEntitiesDict(setID, serviceID, service);
-    }
-    CFQRelease(service);
-    MoreSCClose(&err, true);
-    return err;
-}
-
 OSStatus AddServiceToSet(CFStringRef setID, CFStringRef serviceID) {
     CFMutableDictionaryRef services = nullptr;
     CFMutableArrayRef order = nullptr;
-    OSStatus err = MoreSCCopyServicesDictMutable(setID, &services, &order);
-    if (err == 0) {
-        err = AddServiceLinkToDict(serviceID, services);
-    }
+    OSStatus err = InTurn([&] { return MoreSCCopyServicesDictMutable(setID, &services, &order); },
+                          [&] { return AddServiceLinkToDict(serviceID, services); });
     if (err == 0) {
         CFArrayAppendValue(order, serviceID);
         err = MoreSCSetServicesDict(setID, services, order);
@@ -304,28 +200,15 @@ OSStatus AddServiceToSet(CFStringRef setID, CFStringRef serviceID) {
 OSStatus DuplicateService(CFStringRef serviceID, CFStringRef* newServiceID) {
     CFStringRef servicePath = nullptr;
     CFStringRef newPath = nullptr;
-    OSStatus err = CreateServicePathWithServiceID(serviceID, &servicePath);
-    if (err == 0) {
-        err = MakeNewSeAndCopyIDAndPath(kNetworkServicesKey, newServiceID, &newPath);
-    }
-    if (err == 0) {
-        err = PreferencesPathDuplicate(servicePath, newPath);
-    }
+    OSStatus err =
+        InTurn([&] { return CreateServicePathWithServiceID(serviceID, &servicePath); },
+               [&] { return MakeNewSeAndCopyIDAndPath(kNetworkServicesKey, newServiceID, &newPath); },
+               [&] { return PreferencesPathDuplicate(servicePath, newPath); });
     if (err != 0) {
         CFQRelease(*newServiceID);
         *newServiceID = nullptr;
     }
     CFQRelease(servicePath);
     CFQRelease(newPath);
-    return err;
-}
-
-OSStatus AddGlobalEntityToSet(CFStringRef setID, CFStringRef protocol, const MoreSCGlobalDigest* digest) {
-    CFMutableDictionaryRef entity = nullptr;
-    OSStatus err = MoreSCCreateGlobalEntity(protocol, digest, &entity);
-    if (err == 0) {
-        err = MoreSCNewEntity(setID, nullptr, protocol, entity);
-    }
-    CFQRelease(entity);
     return err;
 }

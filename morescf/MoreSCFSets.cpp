@@ -1,40 +1,31 @@
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
+#include "morescf/MoreSCFDigest.h"
 #include "morescf/MoreSCFKeys.h"
+#include "morescf/MoreSCFNode.h"
 #include "morescf/MoreSCFPortScanner.h"
+#include "morescf/MoreSCFSteps.h"
 #include "morescf/MoreSCFTree.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
 namespace {
 
-// The two dictionaries that a location's services and global entities are put into.
+// The two empty dictionaries that a location's services and global entities are put into.
 OSStatus MakeEmptySetContent(CFStringRef setID) {
-    SCPreferencesRef session = MoreSCGetSCPreferencesRef();
-    CFStringRef servicesPath = nullptr;
-    CFStringRef globalsPath = nullptr;
-    OSStatus err = 0;
-    CFDictionaryRef empty =
-        CFDictionaryCreate(kCFAllocatorDefault, nullptr, nullptr, 0, &kCFTypeDictionaryKeyCallBacks,
-                           &kCFTypeDictionaryValueCallBacks);
-    if (empty == nullptr) {
-        err = coreFoundationUnknownErr;
-    }
-    if (err == 0) {
-        err = CopySetServicesPath(setID, &servicesPath);
-    }
-    if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesPathSetValue(session, servicesPath, empty));
-    }
-    if (err == 0) {
-        err = CopySetGlobalsPath(setID, &globalsPath);
-    }
-    if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesPathSetValue(session, globalsPath, empty));
-    }
+    CFMutableDictionaryRef empty = nullptr;
+    const OSStatus err = InTurn([&] { return CFQDictionaryCreateMutable(&empty); },
+                                [&] { return StoreNode(LinksNode(setID), empty); },
+                                [&] { return StoreNode(ServiceNode(setID, nullptr), empty); });
     CFQRelease(empty);
-    CFQRelease(servicesPath);
-    CFQRelease(globalsPath);
+    return err;
+}
+
+OSStatus AddGlobalEntityToSet(CFStringRef setID, CFStringRef protocol, const MoreSCGlobalDigest* digest) {
+    CFMutableDictionaryRef entity = nullptr;
+    const OSStatus err = InTurn([&] { return MoreSCCreateGlobalEntity(protocol, digest, &entity); },
+                                [&] { return MoreSCNewEntity(setID, nullptr, protocol, entity); });
+    CFQRelease(entity);
     return err;
 }
 
@@ -42,84 +33,112 @@ OSStatus AddServiceForEachPort(CFStringRef setID) {
     CFArrayRef ports = nullptr;
     OSStatus err = MoreSCCreatePortArray(&ports);
     if (err == 0) {
-        const CFIndex count = CFArrayGetCount(ports);
-        for (CFIndex i = 0; err == 0 && i < count; ++i) {
-            err = MoreSCNewService(setID, static_cast<CFDictionaryRef>(CFArrayGetValueAtIndex(ports, i)),
-                                   nullptr);
-        }
+        err = ForEach<CFDictionaryRef>(
+            ports, [setID](CFDictionaryRef port) { return MoreSCNewService(setID, port, nullptr); });
     }
     CFQRelease(ports);
+    return err;
+}
+
+OSStatus SetTopLevelValue(CFStringRef key, CFPropertyListRef value) {
+    return MoreSCErrorBoolean(SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), key, value));
+}
+
+// A top-level value that is a dictionary.
+OSStatus CopyTopLevelDictionary(CFStringRef key, CFDictionaryRef* dict) {
+    CFTypeRef value = SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), key);
+    OSStatus err = MoreSCError(value);
+    if (err == 0 && !IsDictionary(value)) {
+        err = coreFoundationUnknownErr;
+    }
+    if (err == 0) {
+        *dict = static_cast<CFDictionaryRef>(CFQRetain(value));
+    }
     return err;
 }
 
 // Adds the resolved IDs of the location's services to the keys of the dictionary.
 OSStatus MarkServicesOfSet(CFStringRef setID, CFMutableDictionaryRef marks) {
     CFArrayRef serviceIDs = nullptr;
-    const OSStatus err = MoreSCCopyServiceIDs(setID, nullptr, &serviceIDs);
+    OSStatus err = MoreSCCopyServiceIDs(setID, nullptr, &serviceIDs);
     if (err == 0) {
-        const CFIndex count = CFArrayGetCount(serviceIDs);
-        for (CFIndex i = 0; i < count; ++i) {
-            CFDictionaryAddValue(marks, CFArrayGetValueAtIndex(serviceIDs, i), nullptr);
-        }
+        err = ForEach<CFTypeRef>(serviceIDs, [marks](CFTypeRef serviceID) {
+            CFDictionaryAddValue(marks, serviceID, nullptr);
+            return OSStatus{0};
+        });
     }
     CFQRelease(serviceIDs);
     return err;
 }
 
+OSStatus RemoveAtPath(CFStringRef path) {
+    return MoreSCErrorBoolean(SCPreferencesPathRemoveValue(MoreSCGetSCPreferencesRef(), path));
+}
+
+OSStatus RemoveService(CFStringRef serviceID) {
+    CFStringRef path = nullptr;
+    const OSStatus err = InTurn([&] { return CreateServicePathWithServiceID(serviceID, &path); },
+                                [&] { return RemoveAtPath(path); });
+    CFQRelease(path);
+    return err;
+}
+
 OSStatus RemoveUnmarkedServices(CFDictionaryRef marks) {
-    SCPreferencesRef session = MoreSCGetSCPreferencesRef();
+    CFDictionaryRef services = nullptr;
     CFArrayRef serviceIDs = nullptr;
-    CFTypeRef services = SCPreferencesGetValue(session, kNetworkServicesKey);
-    OSStatus err = MoreSCError(services);
-    if (err == 0 && !IsDictionary(services)) {
-        err = coreFoundationUnknownErr;
-    }
+    OSStatus err = InTurn([&] { return CopyTopLevelDictionary(kNetworkServicesKey, &services); },
+                          [&] { return CFQArrayCreateWithDictionaryKeys(services, &serviceIDs); });
     if (err == 0) {
-        err = CFQArrayCreateWithDictionaryKeys(static_cast<CFDictionaryRef>(services), &serviceIDs);
+        err = ForEach<CFStringRef>(serviceIDs, [marks](CFStringRef serviceID) {
+            return CFDictionaryContainsKey(marks, serviceID) ? OSStatus{0} : RemoveService(serviceID);
+        });
     }
-    if (err == 0) {
-        const CFIndex count = CFArrayGetCount(serviceIDs);
-        for (CFIndex i = 0; err == 0 && i < count; ++i) {
-            CFTypeRef serviceID = CFArrayGetValueAtIndex(serviceIDs, i);
-            if (!CFDictionaryContainsKey(marks, serviceID)) {
-                CFStringRef path = nullptr;
-                err = CreateServicePathWithServiceID(static_cast<CFStringRef>(serviceID), &path);
-                if (err == 0) {
-                    err = MoreSCErrorBoolean(SCPreferencesPathRemoveValue(session, path));
-                }
-                CFQRelease(path);
-            }
-        }
-    }
+    CFQRelease(services);
     CFQRelease(serviceIDs);
+    return err;
+}
+
+// The new location gets copies of its own of the services that the old one lists, in place of the links that
+// it took over.
+OSStatus DuplicateServicesReferencedBySet(CFStringRef setID, CFStringRef newSetID) {
+    CFArrayRef serviceIDs = nullptr;
+    CFMutableDictionaryRef services = nullptr;
+    CFMutableArrayRef order = nullptr;
+    const auto duplicate = [&](CFStringRef serviceID) {
+        CFStringRef copyID = nullptr;
+        const OSStatus err = InTurn([&] { return DuplicateService(serviceID, &copyID); },
+                                    [&] { return AddServiceLinkToDict(copyID, services); });
+        if (err == 0) {
+            CFArrayAppendValue(order, copyID);
+        }
+        CFQRelease(copyID);
+        return err;
+    };
+    const OSStatus err = InTurn([&] { return MoreSCCopyServiceIDs(setID, nullptr, &serviceIDs); },
+                                [&] { return CFQDictionaryCreateMutable(&services); },
+                                [&] { return CFQArrayCreateMutable(&order); },
+                                [&] { return ForEach<CFStringRef>(serviceIDs, duplicate); },
+                                [&] { return MoreSCSetServicesDict(newSetID, services, order); });
+    CFQRelease(serviceIDs);
+    CFQRelease(services);
+    CFQRelease(order);
     return err;
 }
 
 }  // namespace
 
 OSStatus MoreSCCopySetsDict(CFDictionaryRef* setsDict) {
-    CFTypeRef dict = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        dict = CFQRetain(SCPreferencesGetValue(MoreSCGetSCPreferencesRef(), kSetsKey));
-        err = MoreSCError(dict);
-    }
-    if (err == 0 && !IsDictionary(dict)) {
-        err = coreFoundationUnknownErr;
-    }
+    CFDictionaryRef dict = nullptr;
+    OSStatus err = InTurn(OpenSession, [&] { return CopyTopLevelDictionary(kSetsKey, &dict); });
     MoreSCClose(&err, false);
-    HandOver(err, static_cast<CFDictionaryRef>(dict), setsDict);
+    HandOver(err, dict, setsDict);
     return err;
 }
 
 OSStatus MoreSCSetSetsDict(CFDictionaryRef setsDict) {
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && setsDict == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), kSetsKey, setsDict));
-    }
+    OSStatus err = InTurn(
+        OpenSession, [&] { return ErrorIfNotGiven(setsDict); },
+        [&] { return SetTopLevelValue(kSetsKey, setsDict); });
     MoreSCClose(&err, true);
     return err;
 }
@@ -129,23 +148,15 @@ OSStatus MoreSCCopySetIDs(CFArrayRef* setIDs, CFIndex* indexOfCurrentSet) {
     CFArrayRef ids = nullptr;
     CFStringRef currentID = nullptr;
     CFIndex currentIndex = kCFNotFound;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = MoreSCCopySetsDict(&setsDict);
-    }
-    if (err == 0) {
-        err = CFQArrayCreateWithDictionaryKeys(setsDict, &ids);
-    }
+    OSStatus err = InTurn(
+        OpenSession, [&] { return MoreSCCopySetsDict(&setsDict); },
+        [&] { return CFQArrayCreateWithDictionaryKeys(setsDict, &ids); });
     if (err == 0 && indexOfCurrentSet != nullptr) {
         err = MoreSCCopyCurrentSet(&currentID);
-        if (err == 0) {
-            const CFIndex count = CFArrayGetCount(ids);
-            for (CFIndex i = 0; i < count; ++i) {
-                if (CFEqual(CFArrayGetValueAtIndex(ids, i), currentID)) {
-                    currentIndex = i;
-                }
-            }
-        }
+    }
+    if (err == 0 && currentID != nullptr) {
+        // The keys of a dictionary: there is one of them at most.
+        currentIndex = CFArrayGetFirstIndexOfValue(ids, CFRangeMake(0, CFArrayGetCount(ids)), currentID);
     }
     CFQRelease(setsDict);
     CFQRelease(currentID);
@@ -158,35 +169,15 @@ OSStatus MoreSCCopySetIDs(CFArrayRef* setIDs, CFIndex* indexOfCurrentSet) {
 }
 
 OSStatus MoreSCCopyUserVisibleNameOfSet(CFStringRef setID, CFStringRef* userVisibleName) {
-    CFStringRef setPath = nullptr;
-    CFStringRef name = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = CopySetPath(setID, &setPath);
-    }
-    if (err == 0) {
-        CFDictionaryRef dict = SCPreferencesPathGetValue(MoreSCGetSCPreferencesRef(), setPath);
-        err = MoreSCError(dict);
-        if (err == 0) {
-            err = CopyStringValue(dict, kUserDefinedNameKey, &name);
-        }
-    }
-    CFQRelease(setPath);
-    MoreSCClose(&err, false);
-    HandOver(err, name, userVisibleName);
-    return err;
+    return CopyNodeString(SetNode(setID), kUserDefinedNameKey, userVisibleName);
 }
 
 OSStatus MoreSCCopyCurrentSet(CFStringRef* setID) {
     CFStringRef currentPath = nullptr;
     CFStringRef currentID = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = CopySetPath(nullptr, &currentPath);
-    }
-    if (err == 0) {
-        err = CopySeIDFromSePath(currentPath, &currentID);
-    }
+    OSStatus err = InTurn(
+        OpenSession, [&] { return CopySetPath(nullptr, &currentPath); },
+        [&] { return CopySeIDFromSePath(currentPath, &currentID); });
     CFQRelease(currentPath);
     MoreSCClose(&err, false);
     HandOver(err, currentID, setID);
@@ -195,13 +186,9 @@ OSStatus MoreSCCopyCurrentSet(CFStringRef* setID) {
 
 OSStatus MoreSCSetCurrentSet(CFStringRef setID) {
     CFStringRef setPath = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = CreateSetPathWithSetID(setID, &setPath);
-    }
-    if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), kCurrentSetKey, setPath));
-    }
+    OSStatus err = InTurn(
+        OpenSession, [&] { return CreateSetPathWithSetID(setID, &setPath); },
+        [&] { return SetTopLevelValue(kCurrentSetKey, setPath); });
     CFQRelease(setPath);
     MoreSCClose(&err, true);
     return err;
@@ -210,29 +197,15 @@ OSStatus MoreSCSetCurrentSet(CFStringRef setID) {
 OSStatus MoreSCNewSet(CFStringRef userVisibleName, CFStringRef* newSetID) {
     CFStringRef setID = nullptr;
     CFStringRef setPath = nullptr;
-    MoreSCGlobalDigest digest = {};
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && userVisibleName == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = MakeNewSeAndCopyIDAndPath(kSetsKey, &setID, &setPath);
-    }
-    if (err == 0) {
-        err = MakeEmptySetContent(setID);
-    }
-    if (err == 0) {
-        err = AddGlobalEntityToSet(setID, kIPv4Protocol, &digest);
-    }
-    if (err == 0) {
-        err = AddGlobalEntityToSet(setID, kNetInfoProtocol, &digest);
-    }
-    if (err == 0) {
-        err = AddServiceForEachPort(setID);
-    }
-    if (err == 0) {
-        err = MoreSCRenameSet(setID, userVisibleName);
-    }
+    const MoreSCGlobalDigest digest = {};
+    OSStatus err = InTurn(
+        OpenSession, [&] { return ErrorIfNotGiven(userVisibleName); },
+        [&] { return MakeNewSeAndCopyIDAndPath(kSetsKey, &setID, &setPath); },
+        [&] { return MakeEmptySetContent(setID); },
+        [&] { return AddGlobalEntityToSet(setID, kIPv4Protocol, &digest); },
+        [&] { return AddGlobalEntityToSet(setID, kNetInfoProtocol, &digest); },
+        [&] { return AddServiceForEachPort(setID); },
+        [&] { return MoreSCRenameSet(setID, userVisibleName); });
     if (err != 0 && setID != nullptr) {
         MoreSCDeleteSet(setID);
     }
@@ -246,19 +219,11 @@ OSStatus MoreSCDuplicateSet(CFStringRef setID, CFStringRef newSetUserVisibleName
     CFStringRef oldPath = nullptr;
     CFStringRef newID = nullptr;
     CFStringRef newPath = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0) {
-        err = CopySetPath(setID, &oldPath);
-    }
-    if (err == 0) {
-        err = MakeNewSeAndCopyIDAndPath(kSetsKey, &newID, &newPath);
-    }
-    if (err == 0) {
-        err = PreferencesPathDuplicate(oldPath, newPath);
-    }
-    if (err == 0) {
-        err = DuplicateServicesReferencedBySet(setID, newID);
-    }
+    OSStatus err = InTurn(
+        OpenSession, [&] { return CopySetPath(setID, &oldPath); },
+        [&] { return MakeNewSeAndCopyIDAndPath(kSetsKey, &newID, &newPath); },
+        [&] { return PreferencesPathDuplicate(oldPath, newPath); },
+        [&] { return DuplicateServicesReferencedBySet(setID, newID); });
     if (err == 0 && newSetUserVisibleName != nullptr) {
         err = MoreSCRenameSet(newID, newSetUserVisibleName);
     }
@@ -275,27 +240,13 @@ OSStatus MoreSCDuplicateSet(CFStringRef setID, CFStringRef newSetUserVisibleName
 OSStatus MoreSCDeleteSet(CFStringRef setID) {
     CFStringRef currentID = nullptr;
     CFStringRef setPath = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && setID == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = MoreSCCopyCurrentSet(&currentID);
-    }
-    if (err == 0 && CFEqual(setID, currentID)) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = CreateSetPathWithSetID(setID, &setPath);
-    }
-    if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesPathRemoveValue(MoreSCGetSCPreferencesRef(), setPath));
-    }
+    OSStatus err = InTurn(
+        OpenSession, [&] { return ErrorIfNotGiven(setID); }, [&] { return MoreSCCopyCurrentSet(&currentID); },
+        [&] { return CFEqual(setID, currentID) ? OSStatus{paramErr} : OSStatus{0}; },
+        [&] { return CreateSetPathWithSetID(setID, &setPath); }, [&] { return RemoveAtPath(setPath); });
     if (setID != nullptr) {
-        const OSStatus err2 = DeleteUnreferencedServices();
-        if (err == 0) {
-            err = err2;
-        }
+        const OSStatus sweepErr = DeleteUnreferencedServices();
+        err = err != 0 ? err : sweepErr;
     }
     CFQRelease(currentID);
     CFQRelease(setPath);
@@ -304,77 +255,18 @@ OSStatus MoreSCDeleteSet(CFStringRef setID) {
 }
 
 OSStatus MoreSCRenameSet(CFStringRef setID, CFStringRef userVisibleName) {
-    CFStringRef setPath = nullptr;
-    OSStatus err = MoreSCOpen(false, false);
-    if (err == 0 && userVisibleName == nullptr) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = CopySetPath(setID, &setPath);
-    }
-    if (err == 0) {
-        err = PreferencesPathSetProperty(setPath, kUserDefinedNameKey, userVisibleName);
-    }
-    CFQRelease(setPath);
-    MoreSCClose(&err, true);
-    return err;
-}
-
-OSStatus DuplicateServicesReferencedBySet(CFStringRef setID, CFStringRef newSetID) {
-    CFArrayRef serviceIDs = nullptr;
-    CFMutableDictionaryRef services = nullptr;
-    CFMutableArrayRef order = nullptr;
-    OSStatus err = MoreSCCopyServiceIDs(setID, nullptr, &serviceIDs);
-    if (err == 0) {
-        err = CFQDictionaryCreateMutable(&services);
-    }
-    if (err == 0) {
-        err = CFQArrayCreateMutable(&order);
-    }
-    if (err == 0) {
-        const CFIndex count = CFArrayGetCount(serviceIDs);
-        for (CFIndex i = 0; err == 0 && i < count; ++i) {
-            CFStringRef copyID = nullptr;
-            err = DuplicateService(static_cast<CFStringRef>(CFArrayGetValueAtIndex(serviceIDs, i)), &copyID);
-            if (err == 0) {
-                err = AddServiceLinkToDict(copyID, services);
-            }
-            if (err == 0) {
-                CFArrayAppendValue(order, copyID);
-            }
-            CFQRelease(copyID);
-        }
-    }
-    if (err == 0) {
-        err = MoreSCSetServicesDict(newSetID, services, order);
-    }
-    CFQRelease(serviceIDs);
-    CFQRelease(services);
-    CFQRelease(order);
-    return err;
+    return SetNodeProperty(SetNode(setID), kUserDefinedNameKey, userVisibleName);
 }
 
 OSStatus DeleteUnreferencedServices() {
     CFArrayRef setIDs = nullptr;
-    OSStatus err = 0;
     // Only the keys count.
     CFMutableDictionaryRef marks =
         CFDictionaryCreateMutable(kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, nullptr);
-    if (marks == nullptr) {
-        err = coreFoundationUnknownErr;
-    }
-    if (err == 0) {
-        err = MoreSCCopySetIDs(&setIDs, nullptr);
-    }
-    if (err == 0) {
-        const CFIndex count = CFArrayGetCount(setIDs);
-        for (CFIndex i = 0; err == 0 && i < count; ++i) {
-            err = MarkServicesOfSet(static_cast<CFStringRef>(CFArrayGetValueAtIndex(setIDs, i)), marks);
-        }
-    }
-    if (err == 0) {
-        err = RemoveUnmarkedServices(marks);
-    }
+    const auto mark = [marks](CFStringRef setID) { return MarkServicesOfSet(setID, marks); };
+    const OSStatus err = InTurn(
+        [&] { return ErrorIfMissing(marks); }, [&] { return MoreSCCopySetIDs(&setIDs, nullptr); },
+        [&] { return ForEach<CFStringRef>(setIDs, mark); }, [&] { return RemoveUnmarkedServices(marks); });
     CFQRelease(setIDs);
     CFQRelease(marks);
     return err;

@@ -1,5 +1,6 @@
 #include "morescf/MoreSCFTree.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <cstdlib>
@@ -8,6 +9,7 @@
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
 #include "morescf/MoreSCFKeys.h"
+#include "morescf/MoreSCFSteps.h"
 #include "morescf/MoreSCFValues.h"
 #include "platform/CoreServices.h"
 
@@ -15,55 +17,51 @@ namespace {
 
 // "%@" would turn a null key into text, and a path to nowhere into one to "(null)".
 OSStatus CreatePath(CFStringRef format, CFStringRef first, CFStringRef second, CFStringRef* path) {
-    OSStatus err = 0;
-    if (first == nullptr || second == nullptr) {
-        err = paramErr;
-    }
+    OSStatus err = first != nullptr ? ErrorIfNotGiven(second) : static_cast<OSStatus>(paramErr);
     if (err == 0) {
         CFStringRef created = CFStringCreateWithFormat(kCFAllocatorDefault, nullptr, format, first, second);
-        if (created != nullptr) {
-            *path = created;
-        } else {
-            err = coreFoundationUnknownErr;
-        }
+        err = ErrorIfMissing(created);
+        HandOver(err, created, path);
     }
     return err;
 }
 
 OSStatus CopyPathInSet(CFStringRef setID, CFStringRef format, CFStringRef last, CFStringRef* path) {
     CFStringRef setPath = nullptr;
-    OSStatus err = CopySetPath(setID, &setPath);
-    if (err == 0) {
-        err = CreatePath(format, setPath, last, path);
-    }
+    const OSStatus err = InTurn([&] { return CopySetPath(setID, &setPath); },
+                                [&] { return CreatePath(format, setPath, last, path); });
     CFQRelease(setPath);
     return err;
 }
 
+// The number that a key is, when it counts (MoreSCFTree.h).
+bool ReadDecimalKey(CFTypeRef key, SInt32* number) {
+    char text[16];
+    if (!IsString(key) ||
+        !CFStringGetCString(static_cast<CFStringRef>(key), text, sizeof(text), kCFStringEncodingASCII) ||
+        text[0] < '0' || text[0] > '9') {
+        return false;
+    }
+    char* end = nullptr;
+    errno = 0;
+    const long value = std::strtol(text, &end, 10);
+    // What a 32-bit long cannot hold is an overflow, whatever this machine's long is.
+    if (errno != 0 || *end != '\0' || value > std::numeric_limits<SInt32>::max()) {
+        return false;
+    }
+    *number = static_cast<SInt32>(value);
+    return true;
+}
+
 SInt32 LargestNumericKey(CFArrayRef keys) {
     SInt32 largest = std::numeric_limits<SInt32>::min();
-    const CFIndex count = CFArrayGetCount(keys);
-    for (CFIndex i = 0; i < count; ++i) {
-        CFTypeRef key = CFArrayGetValueAtIndex(keys, i);
-        char text[16];
-        if (!IsString(key) ||
-            !CFStringGetCString(static_cast<CFStringRef>(key), text, sizeof(text), kCFStringEncodingASCII)) {
-            continue;
+    static_cast<void>(ForEach<CFTypeRef>(keys, [&largest](CFTypeRef key) {
+        SInt32 number = 0;
+        if (ReadDecimalKey(key, &number)) {
+            largest = std::max(largest, number);
         }
-        if (text[0] < '0' || text[0] > '9') {
-            continue;
-        }
-        char* end = nullptr;
-        errno = 0;
-        const long value = std::strtol(text, &end, 10);
-        // What a 32-bit long cannot hold is an overflow, whatever this machine's long is.
-        if (errno != 0 || *end != '\0' || value > std::numeric_limits<SInt32>::max()) {
-            continue;
-        }
-        if (value > largest) {
-            largest = static_cast<SInt32>(value);
-        }
-    }
+        return OSStatus{0};
+    }));
     return largest;
 }
 
@@ -85,7 +83,7 @@ OSStatus CopySeIDFromSePath(CFStringRef sePath, CFStringRef* seID) {
         err = coreFoundationUnknownErr;
     }
     if (err == 0) {
-        *seID = static_cast<CFStringRef>(CFQRetain(CFArrayGetValueAtIndex(components, 2)));
+        *seID = static_cast<CFStringRef>(Retained(CFArrayGetValueAtIndex(components, 2)));
     }
     CFQRelease(components);
     return err;
@@ -100,7 +98,7 @@ OSStatus CopySetPath(CFStringRef setID, CFStringRef* setPath) {
             err = coreFoundationUnknownErr;
         }
         if (err == 0) {
-            *setPath = static_cast<CFStringRef>(CFQRetain(current));
+            *setPath = static_cast<CFStringRef>(Retained(current));
         }
     } else {
         err = CreateSetPathWithSetID(setID, setPath);
@@ -116,10 +114,6 @@ OSStatus CopySetGlobalsPath(CFStringRef setID, CFStringRef* path) {
     return CopyPathInSet(setID, CFSTR("%@/Network/%@"), CFSTR("Global"), path);
 }
 
-OSStatus CopySetServiceOrderPath(CFStringRef setID, CFStringRef* path) {
-    return CopyPathInSet(setID, CFSTR("%@/Network/Global/%@"), kIPv4Protocol, path);
-}
-
 OSStatus CopyResolvedServicePath(CFStringRef setID, CFStringRef serviceID, CFStringRef* servicePath) {
     OSStatus err = 0;
     CFStringRef linkPath = nullptr;
@@ -127,13 +121,11 @@ OSStatus CopyResolvedServicePath(CFStringRef setID, CFStringRef serviceID, CFStr
         err = CopySetGlobalsPath(setID, servicePath);
     } else {
         err = CopyPathInSet(setID, CFSTR("%@/Network/Service/%@"), serviceID, &linkPath);
-        if (err == 0) {
-            CFStringRef target = SCPreferencesPathGetLink(MoreSCGetSCPreferencesRef(), linkPath);
-            err = MoreSCError(target);
-            if (err == 0) {
-                *servicePath = static_cast<CFStringRef>(CFQRetain(target));
-            }
-        }
+    }
+    if (linkPath != nullptr) {
+        CFStringRef target = Retained(SCPreferencesPathGetLink(MoreSCGetSCPreferencesRef(), linkPath));
+        err = MoreSCError(target);
+        HandOver(err, target, servicePath);
     }
     CFQRelease(linkPath);
     return err;
@@ -142,10 +134,9 @@ OSStatus CopyResolvedServicePath(CFStringRef setID, CFStringRef serviceID, CFStr
 OSStatus CopyEntityPath(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                         CFStringRef* entityPath) {
     CFStringRef servicePath = nullptr;
-    OSStatus err = CopyResolvedServicePath(setID, serviceID, &servicePath);
-    if (err == 0) {
-        err = CreatePath(CFSTR("%@/%@"), servicePath, protocol, entityPath);
-    }
+    const OSStatus err =
+        InTurn([&] { return CopyResolvedServicePath(setID, serviceID, &servicePath); },
+               [&] { return CreatePath(CFSTR("%@/%@"), servicePath, protocol, entityPath); });
     CFQRelease(servicePath);
     return err;
 }
@@ -157,9 +148,7 @@ OSStatus PreferencesPathSetProperty(CFStringRef path, CFStringRef key, CFPropert
     OSStatus err = MoreSCError(dict);
     if (err == 0) {
         copy = CFDictionaryCreateMutableCopy(kCFAllocatorDefault, 0, dict);
-        if (copy == nullptr) {
-            err = coreFoundationUnknownErr;
-        }
+        err = ErrorIfMissing(copy);
     }
     if (err == 0) {
         CFDictionarySetValue(copy, key, value);
@@ -171,74 +160,54 @@ OSStatus PreferencesPathSetProperty(CFStringRef path, CFStringRef key, CFPropert
 
 OSStatus PreferencesPathDuplicate(CFStringRef path, CFStringRef newPath) {
     SCPreferencesRef session = MoreSCGetSCPreferencesRef();
-    CFPropertyListRef copy = nullptr;
+    CFDictionaryRef copy = nullptr;
     CFDictionaryRef dict = SCPreferencesPathGetValue(session, path);
     OSStatus err = MoreSCError(dict);
     if (err == 0) {
-        copy = CFPropertyListCreateDeepCopy(kCFAllocatorDefault, dict,
-                                            kCFPropertyListMutableContainersAndLeaves);
-        if (copy == nullptr) {
-            err = coreFoundationUnknownErr;
-        }
+        copy = static_cast<CFDictionaryRef>(CFPropertyListCreateDeepCopy(
+            kCFAllocatorDefault, dict, kCFPropertyListMutableContainersAndLeaves));
+        err = ErrorIfMissing(copy);
     }
     if (err == 0) {
-        err = MoreSCErrorBoolean(
-            SCPreferencesPathSetValue(session, newPath, static_cast<CFDictionaryRef>(copy)));
+        err = MoreSCErrorBoolean(SCPreferencesPathSetValue(session, newPath, copy));
     }
     CFQRelease(copy);
     return err;
 }
 
 CFStringRef MySCPreferencesPathCreateUniqueChild(SCPreferencesRef session, CFStringRef prefix) {
-    CFMutableDictionaryRef none = nullptr;
+    CFMutableDictionaryRef empty = nullptr;
     CFArrayRef keys = nullptr;
-    CFMutableDictionaryRef child = nullptr;
     CFStringRef childPath = nullptr;
-    SInt32 largest = 0;
+    SInt32 largest = std::numeric_limits<SInt32>::max();  // no number is left
 
     CFDictionaryRef parent = SCPreferencesPathGetValue(session, prefix);
-    int scErr = SCError();
-    if (scErr == kSCStatusNoKey) {
-        scErr = CFQDictionaryCreateMutable(&none) == 0 ? kSCStatusOK : kSCStatusFailed;
-        parent = none;
+    const bool isAbsent = parent == nullptr && SCError() == kSCStatusNoKey;
+    if (CFQDictionaryCreateMutable(&empty) == 0 && isAbsent) {
+        parent = empty;
     }
-    if (scErr == kSCStatusOK && !IsDictionary(parent)) {
-        scErr = kSCStatusNoKey;
-    }
-    if (scErr == kSCStatusOK && CFDictionaryContainsKey(parent, kLinkKey)) {
-        scErr = kSCStatusFailed;
-    }
-    if (scErr == kSCStatusOK && CFQArrayCreateWithDictionaryKeys(parent, &keys) != 0) {
-        scErr = kSCStatusFailed;
-    }
-    if (scErr == kSCStatusOK) {
+    // A link gets no children: whoever follows it would not see them.
+    if (parent != nullptr && !CFDictionaryContainsKey(parent, kLinkKey) &&
+        CFQArrayCreateWithDictionaryKeys(parent, &keys) == 0) {
         largest = LargestNumericKey(keys);
-        if (largest == std::numeric_limits<SInt32>::max()) {
-            scErr = kSCStatusFailed;
-        }
     }
-    if (scErr == kSCStatusOK) {
+    if (empty != nullptr && largest != std::numeric_limits<SInt32>::max()) {
         childPath =
             CFStringCreateWithFormat(kCFAllocatorDefault, nullptr, CFSTR("%@/%i"), prefix, largest + 1);
-        if (childPath == nullptr || CFQDictionaryCreateMutable(&child) != 0 ||
-            !SCPreferencesPathSetValue(session, childPath, child)) {
-            CFQRelease(childPath);
-            childPath = nullptr;
-        }
+    }
+    if (childPath != nullptr && !SCPreferencesPathSetValue(session, childPath, empty)) {
+        CFQRelease(childPath);
+        childPath = nullptr;
     }
 
-    CFQRelease(none);
+    CFQRelease(empty);
     CFQRelease(keys);
-    CFQRelease(child);
     return childPath;
 }
 
 OSStatus MakeNewSeAndCopyIDAndPath(CFStringRef prefix, CFStringRef* newSeID, CFStringRef* newSePath) {
-    OSStatus err = 0;
     CFStringRef parentPath = CFStringCreateWithFormat(kCFAllocatorDefault, nullptr, CFSTR("/%@"), prefix);
-    if (parentPath == nullptr) {
-        err = coreFoundationUnknownErr;
-    }
+    OSStatus err = ErrorIfMissing(parentPath);
     if (err == 0) {
         *newSePath = MySCPreferencesPathCreateUniqueChild(MoreSCGetSCPreferencesRef(), parentPath);
         err = MoreSCError(*newSePath);
@@ -259,10 +228,8 @@ OSStatus MakeNewSeAndCopyIDAndPath(CFStringRef prefix, CFStringRef* newSeID, CFS
 OSStatus AddServiceLinkToDict(CFStringRef serviceID, CFMutableDictionaryRef servicesDict) {
     CFStringRef servicePath = nullptr;
     CFMutableDictionaryRef link = nullptr;
-    OSStatus err = CreateServicePathWithServiceID(serviceID, &servicePath);
-    if (err == 0) {
-        err = CFQDictionaryCreateMutable(&link);
-    }
+    const OSStatus err = InTurn([&] { return CreateServicePathWithServiceID(serviceID, &servicePath); },
+                                [&] { return CFQDictionaryCreateMutable(&link); });
     if (err == 0) {
         CFDictionarySetValue(link, kLinkKey, servicePath);
         CFDictionaryAddValue(servicesDict, serviceID, link);

@@ -4,7 +4,6 @@
 // references, written only on success unless said otherwise. Null IDs are -50 where null has no meaning.
 #pragma once
 
-#include "morescf/MoreSCFDigest.h"
 #include "platform/CoreFoundation.h"
 #include "platform/SystemConfiguration.h"
 
@@ -21,8 +20,6 @@ OSStatus CopySetPath(CFStringRef setID, CFStringRef* setPath);
 OSStatus CopySetServicesPath(CFStringRef setID, CFStringRef* path);
 // "<set path>/Network/Global"
 OSStatus CopySetGlobalsPath(CFStringRef setID, CFStringRef* path);
-// "<set path>/Network/Global/IPv4", which holds the service order
-OSStatus CopySetServiceOrderPath(CFStringRef setID, CFStringRef* path);
 // Where the service's link in the location leads; for a null service ID the location's globals.
 OSStatus CopyResolvedServicePath(CFStringRef setID, CFStringRef serviceID, CFStringRef* servicePath);
 // "<resolved service path>/<protocol>"
@@ -56,15 +53,11 @@ Boolean IsDictionaryActive(CFDictionaryRef dict);
 // is.
 OSStatus SetDictionaryActive(CFMutableDictionaryRef dict, Boolean active, Boolean* changed);
 
-// Of the locations:
-OSStatus DuplicateServicesReferencedBySet(CFStringRef setID, CFStringRef newSetID);
 // Removes every service that no location's order names.
 OSStatus DeleteUnreferencedServices();
 
-// Of the services:
 // Links the shared service in the location, last in its order.
 OSStatus AddServiceToSet(CFStringRef setID, CFStringRef serviceID);
 // A copy of the shared service under a new ID; no location knows it yet. The output must come in as null, and
 // is null on failure.
 OSStatus DuplicateService(CFStringRef serviceID, CFStringRef* newServiceID);
-OSStatus AddGlobalEntityToSet(CFStringRef setID, CFStringRef protocol, const MoreSCGlobalDigest* digest);

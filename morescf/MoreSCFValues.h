@@ -1,4 +1,4 @@
-// How this library reads values that others wrote, and hands over its own.
+// How this library reads values that others wrote, makes its own and hands them over.
 #pragma once
 
 #include "morecfq/MoreCFQ.h"
@@ -15,6 +15,22 @@ inline bool IsDictionary(CFTypeRef value) {
     return value != nullptr && CFGetTypeID(value) == CFDictionaryGetTypeID();
 }
 
+// 0 for a value; -4960 for one that could not be made, or that the tree lacks.
+inline OSStatus ErrorIfMissing(const void* value) {
+    return value != nullptr ? static_cast<OSStatus>(0) : static_cast<OSStatus>(coreFoundationUnknownErr);
+}
+// 0 for an argument that is there, else -50.
+inline OSStatus ErrorIfNotGiven(const void* argument) {
+    return argument != nullptr ? static_cast<OSStatus>(0) : static_cast<OSStatus>(paramErr);
+}
+
+// The value with one more reference, as the type that it came in; null stays null.
+template <class Ref>
+Ref Retained(Ref value) {
+    CFQRetain(value);
+    return value;
+}
+
 // The value under the key, borrowed; null when it is absent or of another type.
 inline CFStringRef GetStringValue(CFDictionaryRef dict, CFStringRef key) {
     CFTypeRef value = CFDictionaryGetValue(dict, key);
@@ -27,13 +43,21 @@ inline CFArrayRef GetArrayValue(CFDictionaryRef dict, CFStringRef key) {
 
 // The string under the key as a new reference; -4960 when there is none.
 inline OSStatus CopyStringValue(CFDictionaryRef dict, CFStringRef key, CFStringRef* value) {
-    *value = static_cast<CFStringRef>(CFQRetain(GetStringValue(dict, key)));
-    return *value != nullptr ? 0 : coreFoundationUnknownErr;
+    *value = Retained(GetStringValue(dict, key));
+    return ErrorIfMissing(*value);
 }
 // Whether that very string is under the key.
 inline bool HasStringValue(CFDictionaryRef dict, CFStringRef key, CFStringRef wanted) {
     CFStringRef value = GetStringValue(dict, key);
     return value != nullptr && CFEqual(value, wanted);
+}
+
+// The system's version as a BCD number (0x1020 is 10.2.0); one that cannot be had is 0, which is an old one.
+inline constexpr UInt32 kVersionTenOneThree = 0x1013;
+inline constexpr UInt32 kVersionTenTwo = 0x1020;
+inline UInt32 GetSystemVersion() {
+    SInt32 version = 0;
+    return Gestalt(gestaltSystemVersion, &version) == noErr ? static_cast<UInt32>(version) : 0;
 }
 
 // Hands a reference to the caller on success, when it is wanted; else gives it back.
