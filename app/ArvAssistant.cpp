@@ -1,19 +1,11 @@
 #include "app/ArvAssistant.h"
 
-#include "app/Reachability.h"
+#include "app/Printer.h"
 #include "app/SetIDFile.h"
 #include "app/Trace.h"
 #include "app/Turn.h"
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
-
-namespace {
-
-bool IsNamed(CFStringRef name, CFStringRef wanted) {
-    return CFEqual(name, wanted) != 0;
-}
-
-}  // namespace
 
 OSStatus ArvAssistant::Initialize() {
     return 0;
@@ -38,31 +30,20 @@ void ArvAssistant::WriteOriginalSetID(const char* path) {
 OSStatus ArvAssistant::SaveOriginalSet() {
     traceCurrentSet();
     const OSStatus err = RememberCurrentSet();
-
-    CFStringRef name = nullptr;
-    MoreSCCopyUserVisibleNameOfSet(originalSetID, &name);
-    if (name == nullptr) {
-        return 0;
-    }
-    const bool isTemporary = IsNamed(name, TemporarySetName());
-    CFQRelease(name);
-    if (!isTemporary) {
+    const SetName name = NameOfSet(originalSetID);
+    if (name == SetName::other || name == SetName::kept) {
         WriteOriginalSetID(kOriginalSetFile);
     }
-    return err;
+    return name == SetName::none ? 0 : err;
 }
 
 OSStatus ArvAssistant::SaveTemporarySet() {
     traceCurrentSet();
     const OSStatus err = RememberCurrentSet();
-
-    CFStringRef name = nullptr;
-    MoreSCCopyUserVisibleNameOfSet(originalSetID, &name);
-    if (name != nullptr && IsNamed(name, TemporarySetName())) {
+    if (NameOfSet(originalSetID) == SetName::temporary) {
         MoreSCRenameSet(originalSetID, KeptSetName());
         WriteOriginalSetID(kOriginalSetFile);
     }
-    CFQRelease(name);
     return err;
 }
 
@@ -76,26 +57,16 @@ OSStatus ArvAssistant::SaveZATSet() {
     return err;
 }
 
+// An object that remembers no location asks for the current one's name, and so whether this computer is on
+// the temporary location that an earlier process made.
 OSStatus ArvAssistant::RestoreOriginalSet() {
-    CFStringRef name = nullptr;
-    MoreSCCopyUserVisibleNameOfSet(originalSetID, &name);
-    if (name == nullptr) {
-        return 0;
-    }
-    const bool leadBack = IsNamed(name, TemporarySetName());
-    CFQRelease(name);
-    return leadBack ? RestoreSetFromFile(kOriginalSetFile) : 0;
+    return NameOfSet(originalSetID) == SetName::temporary ? RestoreSetFromFile(kOriginalSetFile) : 0;
 }
 
 OSStatus ArvAssistant::RestoreOriginalSet2() {
-    CFStringRef name = nullptr;
-    MoreSCCopyUserVisibleNameOfSet(originalSetID, &name);
-    if (name == nullptr) {
-        return 0;
-    }
-    const bool leadBack = IsNamed(name, TemporarySetName()) || IsNamed(name, KeptSetName());
-    CFQRelease(name);
-    return leadBack ? RestoreSetFromFile(kZATSetFile) : 0;
+    const SetName name = NameOfSet(originalSetID);
+    const bool leadsBack = name == SetName::temporary || name == SetName::kept;
+    return leadsBack ? RestoreSetFromFile(kZATSetFile) : 0;
 }
 
 // Both ways back name kOriginalSetFile in their trace, whichever file they read: printer-setup applications

@@ -16,11 +16,18 @@ inline CFStringRef KeptSetName() {
     return CFSTR("Current Configured Location");
 }
 
+// What the assistant makes of a location's name.
+enum class SetName { none, temporary, kept, other };
+// Of the location of that ID; of the current one for null. none: it has no name, or cannot be read.
+SetName NameOfSet(CFStringRef setID);
+
 inline constexpr const char* kOriginalSetFile = "/tmp/set.orig";
 inline constexpr const char* kZATSetFile = "/tmp/zat.orig";
 
 // There is no remembered location to go back to.
 inline constexpr OSStatus kNoOriginalSetErr = -1234;
+
+struct TemporaryMode;
 
 // Every operation returns 0 or a status of the network-configuration library, unless it says otherwise, and
 // traces its steps.
@@ -82,7 +89,7 @@ class ArvAssistant {
     OSStatus ActivateSet(CFStringRef setID);
     // Consumes the entity.
     OSStatus ConfigureTemporarySetProperties(CFStringRef setID, CFStringRef serviceID,
-                                             CFMutableDictionaryRef entity, const char* mode,
+                                             CFMutableDictionaryRef entity, const TemporaryMode& mode,
                                              const char* networkName, const char* password);
     // The current location's ID replaces the one remembered, null on failure.
     OSStatus RememberCurrentSet();

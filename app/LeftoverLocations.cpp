@@ -7,13 +7,12 @@
 
 namespace {
 
-bool IsString(CFTypeRef value) {
-    return value != nullptr && CFGetTypeID(value) == CFStringGetTypeID();
-}
+// Whether a location that has no name stands in the trace; it is never deleted.
+enum class Nameless { skipped, traced };
 
-// Deletes every location of that name but the current one. The walk runs backwards, so that
-// the status that comes back is that of the one with the lowest index.
-OSStatus DeleteSetsNamed(CFStringRef doomedName, const char* heading, bool onlyStrings) {
+// Deletes every location of that name but the current one, which the library refuses to delete. The walk
+// runs backwards, so that the status that comes back is that of the one with the lowest index.
+OSStatus DeleteSetsNamed(CFStringRef doomedName, const char* heading, Nameless nameless) {
     CFArrayRef ids = nullptr;
     CFIndex currentIndex = kCFNotFound;
     MoreSCCopySetIDs(&ids, &currentIndex);
@@ -35,7 +34,7 @@ OSStatus DeleteSetsNamed(CFStringRef doomedName, const char* heading, bool onlyS
         }
         CFStringRef name = nullptr;
         MoreSCCopyUserVisibleNameOfSet(id, &name);
-        if (!onlyStrings || (IsString(name) && IsString(id))) {
+        if (name != nullptr || nameless == Nameless::traced) {
             TRACE("i=%d, currentSetID=%s, currentSetName=\"%s\"\n", static_cast<int>(i),
                   SystemText(id).c_str(), SystemText(name).c_str());
             if (name != nullptr && CFEqual(name, doomedName) != 0) {
@@ -53,11 +52,25 @@ OSStatus DeleteSetsNamed(CFStringRef doomedName, const char* heading, bool onlyS
 }  // namespace
 
 OSStatus ArvAssistant::CleanupOldTemporarySets() {
-    return DeleteSetsNamed(TemporarySetName(), "In ArvAssistant::CleanupOldTemporarySets(),\n", true);
+    return DeleteSetsNamed(TemporarySetName(), "In ArvAssistant::CleanupOldTemporarySets(),\n",
+                           Nameless::skipped);
 }
 
 OSStatus ArvAssistant::CleanupOldUserSets() {
-    return DeleteSetsNamed(KeptSetName(), "In ArvAssistant::CleanupOldUserSets(),\n", false);
+    return DeleteSetsNamed(KeptSetName(), "In ArvAssistant::CleanupOldUserSets(),\n", Nameless::traced);
+}
+
+SetName NameOfSet(CFStringRef setID) {
+    SetName found = SetName::none;
+    CFStringRef name = nullptr;
+    MoreSCCopyUserVisibleNameOfSet(setID, &name);
+    if (name != nullptr) {
+        found = CFEqual(name, TemporarySetName()) != 0 ? SetName::temporary
+                : CFEqual(name, KeptSetName()) != 0    ? SetName::kept
+                                                       : SetName::other;
+    }
+    CFQRelease(name);
+    return found;
 }
 
 OSStatus ListLocations() {
@@ -116,12 +129,7 @@ int TempLocationExists() {
             TRACE("TempLocationExists(): NULL == currentSetID!!\n");
             continue;
         }
-        CFStringRef name = nullptr;
-        MoreSCCopyUserVisibleNameOfSet(id, &name);
-        if (name != nullptr && CFEqual(name, TemporarySetName()) != 0) {
-            exists = 1;
-        }
-        CFQRelease(name);
+        exists = NameOfSet(id) == SetName::temporary ? 1 : 0;
     }
     CFQRelease(ids);
     return exists;

@@ -8,7 +8,7 @@
 extern bool gIsNetworkReady;
 
 // Starts watching "State:/Network/Global/IPv4" on the calling thread's run loop, which the caller has to run.
-// A failure is told in two lines on standard error and leaves nothing that works. Called again it makes a
+// A failure is reported in two lines on standard error and leaves nothing that works. Called again it makes a
 // session of its own beside the one before, which is handed to the callback as its info.
 void watchForNetworkChanges();
 

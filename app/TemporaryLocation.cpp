@@ -4,22 +4,35 @@
 #include <cstring>
 
 #include "app/ArvAssistant.h"
+#include "app/Printer.h"
 #include "app/Trace.h"
 #include "morecfq/MoreCFQ.h"
 #include "morescf/MoreSCF.h"
 #include "morescf/MoreSCFDigest.h"
 #include "platform/CoreServices.h"
 
+// What a mode of "create" means: the kind of card that stays on, and how it gets its address.
+struct TemporaryMode {
+    CFStringRef hardware;  // the entity that the services of such cards have: "AirPort" or "Ethernet"
+    bool isWireless;
+    bool usesDHCP;
+};
+
 namespace {
 
 // The printer's own set-up network: a fixed address for this computer, and the printer as the router.
 constexpr const char* kOwnAddress = "192.0.0.199";
 constexpr const char* kSubnetMask = "255.255.255.0";
-constexpr const char* kPrinterAddress = "192.0.0.192";
+bool IsWord(const char* word, const char* wanted) {
+    return word != nullptr && std::strcmp(word, wanted) == 0;
+}
 
-// No mode is a mode other than every one that has a name.
-bool IsMode(const char* mode, const char* wanted) {
-    return mode != nullptr && std::strcmp(mode, wanted) == 0;
+// Any other word, and none, is what the printer itself needs: its wireless network, at a fixed address.
+TemporaryMode ModeOfWord(const char* word) {
+    if (IsWord(word, "auto")) {
+        return {CFSTR("Ethernet"), false, true};
+    }
+    return {CFSTR("AirPort"), true, IsWord(word, "wirelessAuto")};
 }
 
 OSStatus CopyArgument(const char* argument, CFStringRef* string) {
@@ -60,17 +73,14 @@ OSStatus SetAirPortKeys(CFMutableDictionaryRef entity, const char* networkName, 
     return err;
 }
 
-OSStatus CreateIPv4Settings(const char* mode, CFMutableDictionaryRef* entity) {
+OSStatus CreateIPv4Settings(const TemporaryMode& mode, CFMutableDictionaryRef* entity) {
     OSStatus err = 0;
     MoreSCIPv4Digest digest = {};
-    if (IsMode(mode, "auto") || IsMode(mode, "wirelessAuto")) {
-        digest.configMethod = CFSTR("DHCP");
-    } else {
-        digest.configMethod = CFSTR("Manual");
-        if (inet_aton(kOwnAddress, &digest.address) == 0 || inet_aton(kSubnetMask, &digest.subnetMask) == 0 ||
-            inet_aton(kPrinterAddress, &digest.router) == 0) {
-            err = paramErr;
-        }
+    digest.configMethod = mode.usesDHCP ? CFSTR("DHCP") : CFSTR("Manual");
+    if (!mode.usesDHCP &&
+        (inet_aton(kOwnAddress, &digest.address) == 0 || inet_aton(kSubnetMask, &digest.subnetMask) == 0 ||
+         inet_aton(kPrinterAddress, &digest.router) == 0)) {
+        err = paramErr;
     }
     if (err == 0) {
         err = MoreSCCreateIPv4Entity(&digest, entity);
@@ -82,6 +92,7 @@ OSStatus CreateIPv4Settings(const char* mode, CFMutableDictionaryRef* entity) {
 
 OSStatus ArvAssistant::CreateTemporarySet(char* mode, char* networkName, char* password) {
     TRACE("Creating the temporary set\n");
+    const TemporaryMode settings = ModeOfWord(mode);
     CFStringRef setID = nullptr;
     CFArrayRef serviceIDs = nullptr;
     bool foundAirPortCard = false;
@@ -103,14 +114,14 @@ OSStatus ArvAssistant::CreateTemporarySet(char* mode, char* networkName, char* p
     }
 
     if (err == 0) {
-        const CFStringRef type = IsMode(mode, "auto") ? CFSTR("Ethernet") : CFSTR("AirPort");
         const CFIndex count = CFArrayGetCount(serviceIDs);
+        // Every service is gone through, whatever comes of one: each is left on or off.
         for (CFIndex i = 0; i < count; ++i) {
             const auto serviceID = static_cast<CFStringRef>(CFArrayGetValueAtIndex(serviceIDs, i));
             CFStringRef serviceName = nullptr;
             CFMutableDictionaryRef entity = nullptr;
             MoreSCCopyUserVisibleNameOfService(setID, serviceID, &serviceName);
-            err = MoreSCCopyEntityMutable(setID, serviceID, type, &entity);
+            err = MoreSCCopyEntityMutable(setID, serviceID, settings.hardware, &entity);
             if (err != 0) {
                 err = MoreSCSetServiceActive(setID, serviceID, false);
                 TRACE("Disabling interface %s\n", SystemText(serviceName).c_str());
@@ -118,7 +129,8 @@ OSStatus ArvAssistant::CreateTemporarySet(char* mode, char* networkName, char* p
                 TRACE("Enabling interface %s\n", SystemText(serviceName).c_str());
                 err = MoreSCSetServiceActive(setID, serviceID, true);
                 foundAirPortCard = true;
-                err = ConfigureTemporarySetProperties(setID, serviceID, entity, mode, networkName, password);
+                err = ConfigureTemporarySetProperties(setID, serviceID, entity, settings, networkName,
+                                                      password);
             }
             CFQRelease(serviceName);
         }
@@ -149,16 +161,15 @@ OSStatus ArvAssistant::CreateTemporarySet(char* mode, char* networkName, char* p
 }
 
 OSStatus ArvAssistant::ConfigureTemporarySetProperties(CFStringRef setID, CFStringRef serviceID,
-                                                       CFMutableDictionaryRef entity, const char* mode,
-                                                       const char* networkName, const char* password) {
+                                                       CFMutableDictionaryRef entity,
+                                                       const TemporaryMode& mode, const char* networkName,
+                                                       const char* password) {
     OSStatus err = 0;
-    if (IsMode(mode, "auto")) {
-        err = MoreSCSetEntity(setID, serviceID, CFSTR("Ethernet"), entity);
-    } else {
+    if (mode.isWireless) {
         err = SetAirPortKeys(entity, networkName, password);
-        if (err == 0) {
-            err = MoreSCSetEntity(setID, serviceID, CFSTR("AirPort"), entity);
-        }
+    }
+    if (err == 0) {
+        err = MoreSCSetEntity(setID, serviceID, mode.hardware, entity);
     }
     CFQRelease(entity);
 

@@ -5,13 +5,12 @@
 // and the entries taken from it are a snapshot of the hardware at the moment the iterator was made: a device
 // that is pulled out meanwhile keeps its entry, and fails nobody.
 //
-// Entries and their properties (strings unless told otherwise; what cannot be had is left out):
+// Entries and their properties (strings unless said otherwise; what cannot be had is left out):
 // - "IOEthernetInterface", each network interface of Ethernet type with hardware behind it, wireless ones
 //   included: "BSD Name" (the kernel's name, always there).
-//   - Its parent, the controller: "IOMACAddress" (data, 6 bytes: the address that the card was made with,
-//   else
-//     the one in use), "IOClass" (the driver's name, with "AirPort" before it when the card is wireless),
-//     "IOProviderClass" (always there: "IOPCIDevice", "IOUSBDevice", else "IOPlatformDevice").
+//   - Its parent, the controller: "IOMACAddress" (data, 6 bytes: the address that the card was made with, or
+//     else the one in use), "IOClass" (the driver's name, with "AirPort" before it when the card is
+//     wireless), "IOProviderClass" (always there: "IOPCIDevice", "IOUSBDevice", else "IOPlatformDevice").
 //     - The controller's parent, the bus (both data, ASCII with a NUL at the end): "name" (always there; the
 //       bus and the place on it), "AAPL,slot-name" (for PCI: "SLOT-" and the firmware's label for the slot or
 //       the device, else the PCI address); "IOChildIndex" (number, from 0), when one card carries several
@@ -40,7 +39,6 @@ inline constexpr kern_return_t KERN_SUCCESS = 0;
 inline constexpr mach_port_t MACH_PORT_NULL = 0;
 inline constexpr io_object_t IO_OBJECT_NULL = 0;
 inline constexpr kern_return_t kIOReturnError = static_cast<kern_return_t>(0xE00002BC);
-inline constexpr kern_return_t kIOReturnNoMemory = static_cast<kern_return_t>(0xE00002BD);
 inline constexpr kern_return_t kIOReturnBadArgument = static_cast<kern_return_t>(0xE00002C2);
 // There is no such parent.
 inline constexpr kern_return_t kIOReturnNoDevice = static_cast<kern_return_t>(0xE00002C0);
@@ -49,7 +47,8 @@ inline constexpr const char* kIOServicePlane = "IOService";
 
 // The handle through which the registry is asked, to be released with IOObjectRelease.
 kern_return_t IOMasterPort(mach_port_t bootstrapPort, mach_port_t* masterPort) noexcept;
-// A dictionary that matches every entry of a class ("IOProviderClass"); null without memory.
+// A dictionary that matches every entry of a class ("IOProviderClass"); null when the name is null or no
+// UTF-8.
 CFMutableDictionaryRef IOServiceMatching(const char* className) noexcept;
 // Consumes one reference of the matching dictionary, on failure too. Matches the entries of the class under
 // "IOProviderClass" whose properties equal whatever else the dictionary holds; nothing when there is no such

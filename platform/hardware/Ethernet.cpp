@@ -4,17 +4,18 @@
 #include <cstdint>
 #include <map>
 #include <optional>
+#include <set>
 #include <tuple>
 #include <utility>
 
 #include "platform/base/DeviceText.h"
 #include "platform/hardware/Entry.h"
-#include "platform/hardware/Properties.h"
 #include "platform/hardware/Sysfs.h"
 
 namespace platform::hardware {
 namespace {
 
+using Value = values::Owned<CFTypeRef>;
 using MacAddress = std::array<std::uint8_t, 6>;
 
 enum class Bus { pci, usb, other };
@@ -65,11 +66,8 @@ std::optional<MacAddress> macAddressFrom(std::string_view text) {
             return std::nullopt;
         }
     }
-    // What a driver shows that has no address to give.
-    if (bytes == MacAddress{}) {
-        return std::nullopt;
-    }
-    return bytes;
+    // Zeros are what a driver shows that has no address to give.
+    return bytes == MacAddress{} ? std::nullopt : std::optional(bytes);
 }
 
 // The address that the card was made with, before the one that it happens to use: a wireless card may use a
@@ -126,19 +124,14 @@ std::optional<Port> portNamed(const std::string& name, const std::string& root) 
 // Tells the ports of one card apart by the PCI function, or by the driver's number of the port within its
 // only function; by their order where neither does.
 void numberPortsOfCard(std::vector<Port*>& ports) {
-    const auto allDiffer = [&ports](int Port::*number) {
-        std::vector<int> numbers;
-        for (const Port* port : ports) {
-            numbers.push_back(port->*number);
-        }
-        std::sort(numbers.begin(), numbers.end());
-        return std::adjacent_find(numbers.begin(), numbers.end()) == numbers.end();
-    };
-    const bool oneFunction = std::all_of(ports.begin(), ports.end(), [&ports](const Port* port) {
-        return port->function == ports.front()->function;
-    });
-    const bool byFunction = allDiffer(&Port::function);
-    const bool byDevPort = oneFunction && allDiffer(&Port::devPort);
+    std::set<int> functions;
+    std::set<int> devPorts;
+    for (const Port* port : ports) {
+        functions.insert(port->function);
+        devPorts.insert(port->devPort);
+    }
+    const bool byFunction = functions.size() == ports.size();
+    const bool byDevPort = functions.size() == 1 && devPorts.size() == ports.size();
     std::stable_sort(ports.begin(), ports.end(), [](const Port* lhs, const Port* rhs) {
         return std::tie(lhs->function, lhs->devPort) < std::tie(rhs->function, rhs->devPort);
     });
@@ -149,6 +142,7 @@ void numberPortsOfCard(std::vector<Port*>& ports) {
     }
 }
 
+// A card with a single port has none to tell it from.
 void numberPorts(std::vector<Port>& ports) {
     std::map<std::string, std::vector<Port*>> cards;
     for (Port& port : ports) {
@@ -197,59 +191,53 @@ std::string slotLabelOf(const Port& port, const std::map<std::string, std::strin
 }
 
 EntryRef busEntry(const Port& port, const std::map<std::string, std::string>& slots) {
-    Properties properties;
-    // With the bus in front the text is never by accident one that a name rule looks for.
-    properties.setFirmwareText(CFSTR("name"), linkedName(port.busDevice + "/subsystem").value_or("device") +
-                                                  ":" + std::string(lastComponent(port.busDevice)));
-    if (port.bus == Bus::pci) {
-        properties.setFirmwareText(CFSTR("AAPL,slot-name"), "SLOT-" + slotLabelOf(port, slots));
-    }
-    if (port.index) {
-        properties.setNumber(CFSTR("IOChildIndex"), *port.index);
-    }
-    return std::make_shared<const Entry>(Entry{{}, properties.take(), nullptr});
+    // With the bus in front the name is never by accident one that a name rule looks for.
+    const std::string name = linkedName(port.busDevice + "/subsystem").value_or("device") + ":" +
+                             std::string(lastComponent(port.busDevice));
+    const bool isPci = port.bus == Bus::pci;
+    return std::make_shared<const Entry>(
+        "",
+        std::vector<Property>{
+            {CFSTR("name"), firmwareValue(name)},
+            {CFSTR("AAPL,slot-name"), isPci ? firmwareValue("SLOT-" + slotLabelOf(port, slots)) : Value()},
+            {CFSTR("IOChildIndex"), port.index ? numberValue(*port.index) : Value()}},
+        nullptr);
 }
 
 EntryRef controllerEntry(const Port& port, EntryRef bus) {
-    Properties properties;
-    if (const auto address = macAddressOf(port)) {
-        properties.setData(CFSTR("IOMACAddress"), *address);
-    }
+    const auto address = macAddressOf(port);
     const bool isWireless = exists(port.node + "/phy80211") || exists(port.node + "/wireless");
     const std::string driverClass =
         (isWireless ? "AirPort" : "") + linkedName(port.device + "/driver").value_or("");
-    if (!driverClass.empty()) {
-        properties.setText(CFSTR("IOClass"), driverClass);
-    }
-    properties.setText(CFSTR("IOProviderClass"), providerClassOf(port.bus));
-    return std::make_shared<const Entry>(Entry{{}, properties.take(), std::move(bus)});
+    return std::make_shared<const Entry>(
+        "",
+        std::vector<Property>{{CFSTR("IOMACAddress"), address ? dataValue(*address) : Value()},
+                              {CFSTR("IOClass"), driverClass.empty() ? Value() : textValue(driverClass)},
+                              {CFSTR("IOProviderClass"), textValue(providerClassOf(port.bus))}},
+        std::move(bus));
 }
 
 }  // namespace
 
 std::optional<std::vector<EntryRef>> scanEthernet(const std::string& sysfsRoot) {
-    std::vector<EntryRef> entries;
-    const auto root = resolved(sysfsRoot);
-    if (!root) {
-        return entries;
-    }
-    const auto names = namesInClass(*root + "/class/net");
+    const std::string root = resolved(sysfsRoot).value_or(sysfsRoot);
+    const auto names = namesInClass(root + "/class/net");
     if (!names) {
         return std::nullopt;
     }
     std::vector<Port> ports;
     for (const std::string& name : *names) {
-        if (auto port = portNamed(name, *root)) {
+        if (auto port = portNamed(name, root)) {
             ports.push_back(std::move(*port));
         }
     }
     numberPorts(ports);
-    const auto slots = labelsOfSlots(*root);
+    const auto slots = labelsOfSlots(root);
+    std::vector<EntryRef> entries;
     for (const Port& port : ports) {
-        Properties properties;
-        properties.setText(CFSTR("BSD Name"), port.name);
         entries.push_back(std::make_shared<const Entry>(
-            Entry{ethernetClass, properties.take(), controllerEntry(port, busEntry(port, slots))}));
+            ethernetClass, std::vector<Property>{{CFSTR("BSD Name"), textValue(port.name)}},
+            controllerEntry(port, busEntry(port, slots))));
     }
     return entries;
 }

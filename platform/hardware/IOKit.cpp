@@ -1,7 +1,6 @@
 #include "platform/IOKit.h"
 
 #include <map>
-#include <new>
 #include <string_view>
 #include <utility>
 #include <variant>
@@ -23,21 +22,22 @@ struct Iterator {
     std::size_t next = 0;
 };
 
-using Meaning = std::variant<Master, Iterator, EntryRef>;
+// What a handle is one of.
+using Object = std::variant<Master, Iterator, EntryRef>;
 
-std::map<io_object_t, Meaning>& handles() {
-    static std::map<io_object_t, Meaning> ofThisProcess;
+std::map<io_object_t, Object>& handles() {
+    static std::map<io_object_t, Object> ofThisProcess;
     return ofThisProcess;
 }
 
 // A number is not given out again, so that a handle that was given back is found out; once all were given
-// out, those still in use are passed over.
-io_object_t addHandle(Meaning meaning) {
+// out, the next free one is.
+io_object_t addHandle(Object object) {
     static io_object_t last = IO_OBJECT_NULL;
     do {
         ++last;
     } while (last == IO_OBJECT_NULL || handles().count(last) != 0);
-    handles().emplace(last, std::move(meaning));
+    handles().emplace(last, std::move(object));
     return last;
 }
 
@@ -88,18 +88,6 @@ std::optional<std::vector<EntryRef>> matchingEntries(CFDictionaryRef matching) {
     return entries;
 }
 
-// Nothing but a lack of memory is thrown here, and no exception may pass the face.
-template <class Operation>
-kern_return_t guarded(Operation operation) noexcept {
-    try {
-        return operation();
-    } catch (const std::bad_alloc&) {
-        return kIOReturnNoMemory;
-    } catch (...) {
-        return kIOReturnError;
-    }
-}
-
 }  // namespace
 }  // namespace platform::hardware
 
@@ -110,25 +98,19 @@ kern_return_t IOMasterPort(mach_port_t /*bootstrapPort*/, mach_port_t* masterPor
     if (masterPort == nullptr) {
         return kIOReturnBadArgument;
     }
-    return guarded([masterPort] {
-        *masterPort = addHandle(Master{});
-        return KERN_SUCCESS;
-    });
+    *masterPort = addHandle(Master{});
+    return KERN_SUCCESS;
 }
 
 CFMutableDictionaryRef IOServiceMatching(const char* className) noexcept {
-    if (className == nullptr) {
+    const auto name = textValue(className != nullptr ? className : "");
+    if (className == nullptr || !name) {
         return nullptr;
     }
-    const auto name = Owned<CFStringRef>::adopt(
-        CFStringCreateWithCString(kCFAllocatorDefault, className, kCFStringEncodingUTF8));
-    auto matching = Owned<CFMutableDictionaryRef>::adopt(CFDictionaryCreateMutable(
-        kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
-    if (!name || !matching) {
-        return nullptr;
-    }
-    CFDictionarySetValue(matching.get(), CFSTR("IOProviderClass"), name.get());
-    return matching.take();
+    auto* matching = CFDictionaryCreateMutable(kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks,
+                                               &kCFTypeDictionaryValueCallBacks);
+    CFDictionarySetValue(matching, CFSTR("IOProviderClass"), name.get());
+    return matching;
 }
 
 kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryRef matching,
@@ -137,14 +119,12 @@ kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryR
     if (matching == nullptr || iterator == nullptr || find<Master>(masterPort) == nullptr) {
         return kIOReturnBadArgument;
     }
-    return guarded([matching, iterator] {
-        auto entries = matchingEntries(matching);
-        if (!entries) {
-            return kIOReturnError;
-        }
-        *iterator = addHandle(Iterator{std::move(*entries)});
-        return KERN_SUCCESS;
-    });
+    auto entries = matchingEntries(matching);
+    if (!entries) {
+        return kIOReturnError;
+    }
+    *iterator = addHandle(Iterator{std::move(*entries)});
+    return KERN_SUCCESS;
 }
 
 io_object_t IOIteratorNext(io_iterator_t iterator) noexcept {
@@ -152,13 +132,7 @@ io_object_t IOIteratorNext(io_iterator_t iterator) noexcept {
     if (position == nullptr || position->next == position->entries.size()) {
         return IO_OBJECT_NULL;
     }
-    io_object_t entry = IO_OBJECT_NULL;
-    static_cast<void>(guarded([position, &entry] {
-        entry = addHandle(position->entries[position->next]);
-        ++position->next;
-        return KERN_SUCCESS;
-    }));
-    return entry;
+    return addHandle(position->entries[position->next++]);
 }
 
 CFTypeRef IORegistryEntryCreateCFProperty(io_registry_entry_t entry, CFStringRef key,
@@ -181,7 +155,7 @@ kern_return_t IORegistryEntryCreateCFProperties(io_registry_entry_t entry, CFMut
         return kIOReturnBadArgument;
     }
     *properties = CFDictionaryCreateMutableCopy(allocator, 0, found->properties.get());
-    return *properties == nullptr ? kIOReturnNoMemory : KERN_SUCCESS;
+    return KERN_SUCCESS;
 }
 
 kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const char* plane,
@@ -197,10 +171,8 @@ kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const cha
     if (!found->parent) {
         return kIOReturnNoDevice;
     }
-    return guarded([found, parent] {
-        *parent = addHandle(found->parent);
-        return KERN_SUCCESS;
-    });
+    *parent = addHandle(found->parent);
+    return KERN_SUCCESS;
 }
 
 Boolean IOObjectConformsTo(io_object_t object, const char* className) noexcept {

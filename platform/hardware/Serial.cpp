@@ -3,11 +3,12 @@
 
 #include "platform/base/DeviceText.h"
 #include "platform/hardware/Entry.h"
-#include "platform/hardware/Properties.h"
 #include "platform/hardware/Sysfs.h"
 
 namespace platform::hardware {
 namespace {
+
+using Value = values::Owned<CFTypeRef>;
 
 struct Stream {
     const char* type;
@@ -46,41 +47,35 @@ std::vector<std::string> activeConsoles(const std::string& root) {
 
 EntryRef serialEntry(const std::string& name, const std::string& device, const std::string& root) {
     const Stream stream = streamOf(name);
-    Properties properties;
-    properties.setText(CFSTR("IOTTYDevice"), name);
-    properties.setText(CFSTR("IOTTYBaseName"), stream.baseName);
-    properties.setText(CFSTR("IOSerialBSDClientType"), stream.type);
-    Properties deviceProperties;
-    if (const std::string product = productOf(device, root); !product.empty()) {
-        deviceProperties.setText(CFSTR("Product Name"), product);
-    }
+    const std::string product = productOf(device, root);
+    const auto above = std::make_shared<const Entry>(
+        "", std::vector<Property>{{CFSTR("Product Name"), product.empty() ? Value() : textValue(product)}},
+        nullptr);
     return std::make_shared<const Entry>(
-        Entry{serialClass, properties.take(),
-              std::make_shared<const Entry>(Entry{{}, deviceProperties.take(), nullptr})});
+        serialClass,
+        std::vector<Property>{{CFSTR("IOTTYDevice"), textValue(name)},
+                              {CFSTR("IOTTYBaseName"), textValue(stream.baseName)},
+                              {CFSTR("IOSerialBSDClientType"), textValue(stream.type)}},
+        above);
 }
 
 }  // namespace
 
 std::optional<std::vector<EntryRef>> scanSerial(const std::string& sysfsRoot) {
-    std::vector<EntryRef> entries;
-    const auto root = resolved(sysfsRoot);
-    if (!root) {
-        return entries;
-    }
-    const auto names = namesInClass(*root + "/class/tty");
+    const std::string root = resolved(sysfsRoot).value_or(sysfsRoot);
+    const auto names = namesInClass(root + "/class/tty");
     if (!names) {
         return std::nullopt;
     }
-    const std::vector<std::string> consoles = activeConsoles(*root);
+    const std::vector<std::string> consoles = activeConsoles(root);
+    std::vector<EntryRef> entries;
     for (const std::string& name : *names) {
-        const std::string node = *root + "/class/tty/" + name;
+        const std::string node = root + "/class/tty/" + name;
         const auto device = resolved(node + "/device");
-        constexpr std::string_view noUart = "0";
-        if (!device || readAttribute(node + "/type") == noUart ||
-            std::find(consoles.begin(), consoles.end(), name) != consoles.end()) {
-            continue;
+        const bool hasUart = readAttribute(node + "/type") != "0";
+        if (device && hasUart && std::find(consoles.begin(), consoles.end(), name) == consoles.end()) {
+            entries.push_back(serialEntry(name, *device, root));
         }
-        entries.push_back(serialEntry(name, *device, *root));
     }
     return entries;
 }

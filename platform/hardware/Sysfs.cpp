@@ -1,39 +1,24 @@
 #include "platform/hardware/Sysfs.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <climits>
-#include <cstdlib>
 #include <cstring>
-#include <memory>
+#include <filesystem>
+#include <system_error>
 #include <utility>
 
 #include "platform/base/DeviceText.h"
 #include "platform/base/FileDescriptor.h"
 
 namespace platform::hardware {
-namespace {
-
-struct Closer {
-    void operator()(DIR* directory) const noexcept { closedir(directory); }
-};
-struct Freer {
-    void operator()(char* text) const noexcept { std::free(text); }
-};
-
-}  // namespace
 
 std::optional<std::string> readAttribute(const std::string& path) {
     // Never blocking, and never a controlling terminal: the root may be a tree that somebody made.
     const FileDescriptor file(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
-    if (!file.isOpen()) {
-        return std::nullopt;
-    }
     std::array<char, 4096> page;
     ssize_t got;
     do {
@@ -43,7 +28,7 @@ std::optional<std::string> readAttribute(const std::string& path) {
         return std::nullopt;
     }
     std::string text(page.data(), static_cast<std::size_t>(got));
-    if (!text.empty() && text.back() == '\n') {
+    if (text.ends_with('\n')) {
         text.pop_back();
     }
     return text;
@@ -54,25 +39,19 @@ bool exists(const std::string& path) {
 }
 
 std::optional<std::string> resolved(const std::string& path) {
-    const std::unique_ptr<char, Freer> real(realpath(path.c_str(), nullptr));
-    if (!real) {
-        return std::nullopt;
-    }
-    return std::string(real.get());
+    std::error_code error;
+    const std::filesystem::path real = std::filesystem::canonical(path, error);
+    return error ? std::nullopt : std::optional(real.string());
 }
 
 std::optional<std::string> linkedName(const std::string& path) {
-    std::array<char, PATH_MAX> target;
-    const ssize_t got = readlink(path.c_str(), target.data(), target.size());
-    if (got <= 0 || static_cast<std::size_t>(got) == target.size()) {
-        return std::nullopt;
-    }
-    return std::string(lastComponent({target.data(), static_cast<std::size_t>(got)}));
+    std::error_code error;
+    const std::filesystem::path target = std::filesystem::read_symlink(path, error);
+    return error ? std::nullopt : std::optional(target.filename().string());
 }
 
 std::string_view lastComponent(std::string_view path) noexcept {
-    const std::size_t slash = path.rfind('/');
-    return slash == std::string_view::npos ? path : path.substr(slash + 1);
+    return path.substr(path.rfind('/') + 1);
 }
 
 std::vector<std::string> upwards(const std::string& path, const std::string& root) {
@@ -89,28 +68,24 @@ std::optional<std::vector<std::string>> namesIn(const std::string& folder,
                                                 const std::function<bool(const std::string&)>& isWanted) {
     constexpr std::size_t most = 4096;
     std::vector<std::string> names;
-    const std::unique_ptr<DIR, Closer> directory(opendir(folder.c_str()));
-    if (!directory) {
-        return errno == ENOENT || errno == ENOTDIR ? std::optional(names) : std::nullopt;
+    std::error_code error;
+    std::filesystem::directory_iterator entry(folder, error);
+    if (error == std::errc::no_such_file_or_directory || error == std::errc::not_a_directory) {
+        return names;
     }
-    errno = 0;
-    while (const dirent* entry = readdir(directory.get())) {
-        std::string name = entry->d_name;
-        if (name != "." && name != ".." && isWanted(name)) {
+    for (; !error && entry != std::filesystem::directory_iterator(); entry.increment(error)) {
+        std::string name = entry->path().filename().string();
+        if (isWanted(name)) {
             names.push_back(std::move(name));
         }
         if (names.size() > most) {
             return std::nullopt;
         }
-        errno = 0;
-    }
-    if (errno != 0) {
-        return std::nullopt;
     }
     std::sort(names.begin(), names.end(), [](const std::string& lhs, const std::string& rhs) {
         return strverscmp(lhs.c_str(), rhs.c_str()) < 0;
     });
-    return names;
+    return error ? std::nullopt : std::optional(std::move(names));
 }
 
 std::optional<std::vector<std::string>> namesInClass(const std::string& folder) {

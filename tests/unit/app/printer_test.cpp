@@ -6,7 +6,7 @@
 #include <vector>
 
 #include "app/ArvAssistant.h"
-#include "app/Reachability.h"
+#include "app/Printer.h"
 #include "app/Trace.h"
 #include "platform/base/Host.h"
 #include "platform/live/NetworkState.h"

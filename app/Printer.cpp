@@ -1,4 +1,4 @@
-#include "app/Reachability.h"
+#include "app/Printer.h"
 
 #include <netdb.h>
 #include <netinet/in.h>
@@ -15,15 +15,16 @@
 #include "platform/CoreServices.h"
 #include "platform/SystemConfiguration.h"
 
-char gQF_config_URL1[] = "http://192.0.0.192/dot11_config_start.htm";
+char gQF_config_URL1[] = "http://" LA_PRINTER_ADDRESS "/dot11_config_start.htm";
 
 namespace {
 
-constexpr const char* kPrinterAddress = "192.0.0.192";
 constexpr std::uint16_t kPrinterPort = 80;
 // The printer has no such page: that it says so proves that its web server is up.
-constexpr const char* kProbeURL = "http://192.0.0.192/mactestfoo.html";
+constexpr const char* kProbeURL = "http://" LA_PRINTER_ADDRESS "/mactestfoo.html";
 constexpr OSStatus kHTTPNotFound = 404;
+// A query asks the kernel alone and is answered at once, so this is no time for a network to come up:
+// whoever activated the location waited for that.
 constexpr useconds_t kPauseBetweenQueries = 30;  // microseconds
 
 bool LookUpPrinter(sockaddr_in* address) {
@@ -39,8 +40,8 @@ bool LookUpPrinter(sockaddr_in* address) {
     return true;
 }
 
-bool IsReachable(Boolean checked, SCNetworkConnectionFlags flags) {
-    return checked != 0 && (flags & kSCNetworkFlagsReachable) != 0;
+int IsReachable(Boolean checked, SCNetworkConnectionFlags flags) {
+    return checked != 0 && (flags & kSCNetworkFlagsReachable) != 0 ? 1 : 0;
 }
 
 }  // namespace
@@ -56,14 +57,11 @@ int IsWirelessPrinterReachableViaSCF(int maxtries) {
         TRACE("IsWirelessPrinterReachableViaSCF() try %d\n", counter);
         Boolean checked = SCNetworkCheckReachabilityByName(kPrinterAddress, &flags);
         TRACE("from SCNetworkCheckReachabilityByName(), flags = %d\n", static_cast<int>(flags));
-        if (IsReachable(checked, flags)) {
-            reachable = 1;
-        } else if (lookedUp) {
+        reachable = IsReachable(checked, flags);
+        if (reachable == 0 && lookedUp) {
             checked = SCNetworkCheckReachabilityByAddress(reinterpret_cast<const sockaddr*>(&address),
                                                           static_cast<int>(sizeof address), &flags);
-            if (IsReachable(checked, flags)) {
-                reachable = 1;
-            }
+            reachable = IsReachable(checked, flags);
             TRACE("from SCNetworkCheckReachabilityByAddress(), flags = %d\n", static_cast<int>(flags));
         }
         ++counter;

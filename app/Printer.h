@@ -1,8 +1,12 @@
-// Whether the printer answers at its fixed set-up address, its configuration page, and the prompt that waits
-// for the user.
+// The printer on its own set-up network: its address, whether it answers there, its configuration page, and
+// the prompt that waits for the user.
 #pragma once
 
 #include "platform/CoreFoundation.h"
+
+// A macro, so that the URLs below can be made of it.
+#define LA_PRINTER_ADDRESS "192.0.0.192"
+inline constexpr const char* kPrinterAddress = LA_PRINTER_ADDRESS;
 
 // The printer's configuration start page.
 extern char gQF_config_URL1[];
@@ -15,12 +19,12 @@ int IsWirelessPrinterReachableViaSCF(int maxtries);
 // 0. Probes at most maxtries times (once when it is below 1), one second apart.
 int IsWirelessPrinterReachableViaHTTP(int maxtries);
 
-// Opens gQF_config_URL1 in the user's browser without waiting for it. A page that cannot be opened is passed
-// over.
+// Opens gQF_config_URL1 in the user's browser without waiting for it. A page that cannot be opened is no
+// failure.
 void OpenConfigurationPage();
 
 // Asks on standard output until standard input answers "y"; always 0. Line breaks in front of an answer
-// are passed over, and one character behind each answer is taken away unread. Without a "y" it asks for ever,
+// are ignored, and one character behind each answer is taken away unread. Without a "y" it asks for ever,
 // at the end of the input too; while it asks, SIGPIPE ends the process when nobody reads the questions, and
 // so does the end of the input when they cannot be written.
 OSStatus WaitForUserToBeDone();
