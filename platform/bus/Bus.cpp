@@ -6,6 +6,7 @@
 #include <system_error>
 #include <utility>
 
+#include "platform/base/Hexadecimal.h"
 #include "platform/base/Host.h"
 
 namespace platform::bus {
@@ -21,14 +22,12 @@ std::uint64_t microseconds(Clock::duration duration) {
 
 // A D-Bus address keeps only these as they are; every other byte is escaped.
 std::string addressOf(const std::string& path) {
-    static constexpr const char* digits = "0123456789abcdef";
     std::string address = "unix:path=";
     for (const char c : path) {
-        const auto byte = static_cast<unsigned char>(c);
-        if (std::isalnum(byte) != 0 || std::strchr("-_/.\\*", c) != nullptr) {
+        if (std::isalnum(static_cast<unsigned char>(c)) != 0 || std::strchr("-_/.\\*", c) != nullptr) {
             address += c;
         } else {
-            address += {'%', digits[byte >> 4U], digits[byte & 15U]};
+            address += '%' + hexOf({&c, 1});
         }
     }
     return address;

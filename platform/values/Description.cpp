@@ -1,3 +1,4 @@
+#include "platform/base/Hexadecimal.h"
 #include "platform/values/Containers.h"
 #include "platform/values/PropertyListXML.h"
 #include "platform/values/Scalars.h"
@@ -15,13 +16,8 @@ void describeText(std::string& text, std::string_view content) {
 }
 
 void describeBytes(std::string& text, std::string_view bytes) {
-    constexpr std::string_view digits = "0123456789abcdef";
     text.push_back('<');
-    for (const char character : bytes) {
-        const auto byte = static_cast<unsigned char>(character);
-        text.push_back(digits[byte >> 4]);
-        text.push_back(digits[byte & 0xF]);
-    }
+    text += platform::hexOf(bytes);
     text.push_back('>');
 }
 

@@ -11,6 +11,7 @@
 #include "platform/apply/direct/Process.h"
 #include "platform/base/ChildProcess.h"
 #include "platform/base/FileDescriptor.h"
+#include "platform/base/Hexadecimal.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
 
@@ -64,17 +65,6 @@ Outcome findHook(std::string& hook) {
         }
     }
     return isProgram(hook) ? Outcome() : Outcome::fromErrno("cannot run the DHCP client's program " + hook);
-}
-
-std::string hexOf(std::string_view bytes) {
-    constexpr const char* digits = "0123456789abcdef";
-    std::string text;
-    for (const char c : bytes) {
-        const auto byte = static_cast<unsigned char>(c);
-        text += digits[byte >> 4U];
-        text += digits[byte & 0xFU];
-    }
-    return text;
 }
 
 std::vector<std::string> argumentsFor(const DhcpSettings& settings, const std::string& hook) {

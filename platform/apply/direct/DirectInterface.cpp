@@ -64,9 +64,9 @@ template <class List>
 List lasting(List list) {
     std::erase_if(list, [](const auto& one) {
         if constexpr (requires { one.isShared; }) {
-            return one.comesByItself || one.isShared;
+            return one.isKernelManaged || one.isShared;
         }
-        return one.comesByItself;
+        return one.isKernelManaged;
     });
     std::ranges::sort(list, {}, [](const auto& one) { return one.key; });
     return list;

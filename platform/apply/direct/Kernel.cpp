@@ -113,7 +113,7 @@ bool contains(const std::vector<Route>& list, const Route& route) {
 std::vector<Address> ofFamily(const std::vector<Address>& list, int family) {
     std::vector<Address> result;
     std::copy_if(list.begin(), list.end(), std::back_inserter(result),
-                 [family](const Address& a) { return a.family() == family && !a.comesByItself; });
+                 [family](const Address& a) { return a.family() == family && !a.isKernelManaged; });
     return result;
 }
 
@@ -209,7 +209,7 @@ std::optional<Address> decodeAddress(const MessageView& message, int index) {
     const bool fromKernel = address.protocol != 0 && address.protocol <= lastKernelProtocol;
     const bool advertised = (flags & IFA_F_PERMANENT) == 0 &&
                             (flags & (IFA_F_TEMPORARY | IFA_F_MANAGETEMPADDR | IFA_F_STABLE_PRIVACY)) != 0;
-    address.comesByItself = header->ifa_family == AF_INET6 && (fromKernel || advertised);
+    address.isKernelManaged = header->ifa_family == AF_INET6 && (fromKernel || advertised);
 
     attributes.erase(IFA_CACHEINFO);
     attributes.erase(addressProtocol);
@@ -274,8 +274,8 @@ std::optional<Route> decodeRoute(const MessageView& message, int index,
     }
     attributes.erase(RTA_CACHEINFO);
     header->rtm_flags &= RTNH_F_ONLINK;
-    route.comesByItself = header->rtm_family == AF_INET6 &&
-                          (header->rtm_protocol == RTPROT_KERNEL || header->rtm_protocol == RTPROT_RA);
+    route.isKernelManaged = header->rtm_family == AF_INET6 &&
+                            (header->rtm_protocol == RTPROT_KERNEL || header->rtm_protocol == RTPROT_RA);
     route.key = encodeKey(*header, attributes);
     return route;
 }
@@ -449,7 +449,7 @@ Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, b
     InterfaceState state;
     RETURN_IF_FAILED(read(link, state));
     for (const Route& route : state.routes) {
-        const bool stays = route.comesByItself || route.isElsewhere || contains(wanted, route) ||
+        const bool stays = route.isKernelManaged || route.isElsewhere || contains(wanted, route) ||
                            (keepConnected && isConnected(route));
         if (!stays) {
             RETURN_IF_FAILED(removeRoute(link, route));
@@ -459,7 +459,7 @@ Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, b
     // The ways to the neighbours first: a route through one of them is refused until then.
     for (const bool throughGateway : {false, true}) {
         for (const Route& route : wanted) {
-            if (route.comesByItself || route.hasGateway() != throughGateway ||
+            if (route.isKernelManaged || route.hasGateway() != throughGateway ||
                 contains(state.routes, route)) {
                 continue;
             }

@@ -43,7 +43,7 @@ struct Address {
     std::uint32_t valid = forever;  // seconds from the reading on
     std::uint32_t preferred = forever;
     // Whether the kernel makes it without being asked, as link-local and router-advertised ones.
-    bool comesByItself = false;
+    bool isKernelManaged = false;
 
     [[nodiscard]] int family() const noexcept;
     [[nodiscard]] std::uint8_t scope() const noexcept;  // RT_SCOPE_
@@ -56,14 +56,14 @@ struct Address {
         fields("Protocol", self.protocol);
         fields("Valid", self.valid);
         fields("Preferred", self.preferred);
-        fields("ComesByItself", self.comesByItself);
+        fields("KernelManaged", self.isKernelManaged);
     }
 };
 
 struct Route {
     netlink::Bytes key;     // rtmsg and attributes
     bool preceded = false;  // an equally good route to the same place stood before it
-    bool comesByItself = false;
+    bool isKernelManaged = false;
     // It needs more than this interface: other ones, a next-hop object, a source address that the network has
     // to confirm first.
     bool isShared = false;
@@ -78,7 +78,7 @@ struct Route {
     static void listFields(Self& self, Fields& fields) {
         fields("Message", self.key);
         fields("Preceded", self.preceded);
-        fields("ComesByItself", self.comesByItself);
+        fields("KernelManaged", self.isKernelManaged);
         fields("Shared", self.isShared);
         fields("EndsAt", self.endsAt);
         fields("Elsewhere", self.isElsewhere);

@@ -6,6 +6,7 @@
 
 #include "platform/apply/WirelessChoice.h"
 #include "platform/apply/direct/SupplicantSocket.h"
+#include "platform/base/Hexadecimal.h"
 
 namespace platform::apply {
 namespace {
@@ -16,17 +17,6 @@ using std::chrono::steady_clock;
 constexpr std::chrono::seconds scanAgain{2};
 // Between two looks at the state when no notice tells of a change.
 constexpr std::chrono::milliseconds lookAgain{250};
-
-std::string hexOf(std::string_view bytes) {
-    constexpr const char* digits = "0123456789abcdef";
-    std::string text;
-    for (const char c : bytes) {
-        const auto byte = static_cast<unsigned char>(c);
-        text += digits[byte >> 4U];
-        text += digits[byte & 0xFU];
-    }
-    return text;
-}
 
 bool contains(const std::vector<int>& list, int number) {
     return std::ranges::find(list, number) != list.end();
