@@ -1,62 +1,72 @@
-// Preferences trees for the tests, written as property lists.
+// Preferences trees for the tests, in the notation.
 #pragma once
 
-#include <gtest/gtest.h>
+#include <arpa/inet.h>
 
 #include <string>
-#include <utility>
 #include <vector>
 
-#include "platform/values/Object.h"
-#include "platform/values/PropertyListXML.h"
+#include "platform/apply/Plan.h"
+#include "tests/unit/support/Notation.h"
 
 namespace platform::apply {
 
-inline constexpr const char* switchedOff = "<key>__INACTIVE__</key><integer>1</integer>";
+using Lines = std::vector<std::string>;
 
 struct Service {
     std::string device;
-    std::string entries;  // of the service, beside its "Interface"
+    std::string entries;  // beside its "Interface"
 };
+
+inline const std::string switchedOff = "__INACTIVE__ = #1;";
 
 // A service that is on, with a fixed address.
 inline Service fixedService(const std::string& device, const std::string& address = "192.0.0.199") {
-    return {device,
-            "<key>IPv4</key><dict><key>ConfigMethod</key><string>Manual</string><key>Addresses</"
-            "key><array><string>" +
-                address +
-                "</string></array><key>SubnetMasks</key><array><string>255.255.255.0</string></array>"
-                "<key>Router</key><string>192.0.0.192</string></dict>"};
+    return {device, "IPv4 = {ConfigMethod = Manual; Addresses = (" + address +
+                        "); SubnetMasks = (255.255.255.0); Router = 192.0.0.192};"};
 }
 
-inline values::Owned<CFDictionaryRef> parseTree(const std::string& body) {
-    values::ParseError error;
-    const auto value =
-        values::parsePropertyListXML("<plist version=\"1.0\"><dict>" + body + "</dict></plist>", error);
-    EXPECT_TRUE(value) << error.reason << " in " << body;
-    return values::Owned<CFDictionaryRef>::retained(static_cast<CFDictionaryRef>(value.get()));
+inline values::Owned<CFDictionaryRef> readTree(const std::string& text) {
+    return values::Owned<CFDictionaryRef>::adopt(
+        static_cast<CFDictionaryRef>(testing_support::read(text).take()));
 }
 
-// One location, "7", current, with these services in this order.
-inline values::Owned<CFDictionaryRef> makeTree(const std::vector<Service>& services) {
+// One location, current, with these services in this order.
+inline values::Owned<CFDictionaryRef> makeTree(const std::vector<Service>& services,
+                                               const std::string& location = "7") {
     std::string all;
     std::string links;
     std::string order;
     for (std::size_t i = 0; i < services.size(); ++i) {
-        const Service& service = services[i];
         const std::string id = std::to_string(100 + i);
-        all += "<key>" + id + "</key><dict><key>Interface</key><dict><key>DeviceName</key><string>" +
-               service.device + "</string><key>Type</key><string>Ethernet</string></dict>" + service.entries +
-               "</dict>";
-        links += "<key>" + id + "</key><dict><key>__LINK__</key><string>/NetworkServices/" + id +
-                 "</string></dict>";
-        order += "<string>" + id + "</string>";
+        all += id + " = {Interface = {DeviceName = " + services[i].device + "; Type = Ethernet}; " +
+               services[i].entries + "}; ";
+        links += id + " = {__LINK__ = /NetworkServices/" + id + "}; ";
+        order += id + ", ";
     }
-    return parseTree(
-        "<key>CurrentSet</key><string>/Sets/7</string><key>Sets</key><dict><key>7</key><dict><key>Network"
-        "</key><dict><key>Service</key><dict>" +
-        links + "</dict><key>Global</key><dict><key>IPv4</key><dict><key>ServiceOrder</key><array>" + order +
-        "</array></dict></dict></dict></dict></dict><key>NetworkServices</key><dict>" + all + "</dict>");
+    return readTree("{CurrentSet = /Sets/" + location + "; Sets = {" + location +
+                    " = {Network = {Service = {" + links + "}; Global = {IPv4 = {ServiceOrder = (" + order +
+                    ")}}}}}; NetworkServices = {" + all + "}}");
+}
+
+inline IPv4Address address(const char* text) {
+    in_addr address{};
+    inet_pton(AF_INET, text, &address);
+    return address.s_addr;
+}
+
+inline std::string quad(IPv4Address address) {
+    char text[INET_ADDRSTRLEN] = "";
+    inet_ntop(AF_INET, &address, text, sizeof text);
+    return text;
+}
+
+inline std::string quads(const char* prefix, const std::vector<IPv4Address>& addresses) {
+    std::string text;
+    for (const IPv4Address one : addresses) {
+        text += prefix + quad(one);
+    }
+    return text;
 }
 
 }  // namespace platform::apply

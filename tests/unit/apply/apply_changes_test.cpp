@@ -1,24 +1,11 @@
 #include <functional>
 
+#include "tests/unit/apply/Trees.h"
 #include "tests/unit/preferences/Fixture.h"
 #include "tests/unit/support/RecordingAgent.h"
 
 namespace preferences_test {
 namespace {
-
-std::string locationOf(std::string_view device) {
-    return "<plist version=\"1.0\"><dict><key>CurrentSet</key><string>/Sets/1</string>"
-           "<key>NetworkServices</key><dict><key>1</key><dict><key>Interface</key><dict>"
-           "<key>DeviceName</key><string>" +
-           std::string(device) +
-           "</string><key>Type</key><string>Ethernet</string></dict>"
-           "<key>IPv4</key><dict><key>ConfigMethod</key><string>DHCP</string></dict></dict></dict>"
-           "<key>Sets</key><dict><key>1</key><dict><key>Network</key><dict>"
-           "<key>Global</key><dict><key>IPv4</key><dict><key>ServiceOrder</key><array><string>1</string>"
-           "</array></dict></dict>"
-           "<key>Service</key><dict><key>1</key><dict><key>__LINK__</key>"
-           "<string>/NetworkServices/1</string></dict></dict></dict></dict></dict></dict></plist>";
-}
 
 // Lets something happen in the middle of an apply.
 class InterruptedAgent : public testing_support::RecordingAgent {
@@ -37,7 +24,12 @@ class ApplyTest : public StoreTest {
   protected:
     ApplyTest() {
         agent->machine = {{"eth0", "as found"}, {"eth1", "as found"}};
-        (void)directory.write("store/preferences.plist", locationOf("eth0"));
+        putLocationOf("eth0");
+        session = open();
+    }
+    void putLocationOf(const std::string& device) {
+        const auto tree = platform::apply::makeTree({platform::apply::fixedService(device)}, "1");
+        (void)directory.write("store/preferences.plist", *platform::values::writePropertyListXML(tree.get()));
     }
     static int apply(const SessionRef& session) {
         return SCPreferencesApplyChanges(session.get()) != 0 ? 0 : SCError();
@@ -59,40 +51,33 @@ class ApplyTest : public StoreTest {
         made.agents = {agent};
         return made;
     }()};
+    SessionRef session;
 };
 
 TEST_F(ApplyTest, OnlyWhatIsCommittedIsApplied) {
-    SessionRef session = open();
     EXPECT_EQ(apply(session), 0);
     EXPECT_EQ(taken(), "") << "without a commit there is nothing to apply, and nothing that was left undone";
-    EXPECT_EQ(activate(session), 0);
-    EXPECT_EQ(taken(), "eth0") << "a commit that changes nothing asks for just that";
-    ASSERT_TRUE(SCPreferencesPathRemoveValue(session.get(), CFSTR("/NetworkServices/1/Interface")));
-    EXPECT_EQ(apply(session), 0);
-    EXPECT_EQ(taken(), "eth0");
-    ASSERT_TRUE(commit(session));
-    EXPECT_EQ(taken(), "eth0");
-    EXPECT_EQ(apply(session), 0);
-    EXPECT_EQ(taken(), "");
-}
-
-TEST_F(ApplyTest, ACommitThatLeavesThePlanAloneLeavesTheMachineAlone) {
-    SessionRef session = open();
     ASSERT_TRUE(set(session, "/Sets/2", "another location"));
     EXPECT_EQ(activate(session), 0);
-    EXPECT_EQ(taken(), "");
+    EXPECT_EQ(taken(), "") << "a commit that leaves the plan alone leaves the machine alone";
     EXPECT_TRUE(agent->calls.empty());
+    EXPECT_EQ(activate(session), 0);
+    EXPECT_EQ(taken(), "eth0") << "a commit that changes nothing asks for just that";
+    ASSERT_TRUE(SCPreferencesPathRemoveValue(session.get(), CFSTR("/NetworkServices/100/Interface")));
+    EXPECT_EQ(apply(session), 0);
+    EXPECT_EQ(taken(), "eth0");
+    EXPECT_EQ(activate(session), 0);
+    EXPECT_EQ(taken(), "");
 }
 
 TEST_F(ApplyTest, ATreeCommittedInTheMiddleOfAnApplyIsAppliedAsWell) {
-    agent->interruption = [this] { (void)directory.write("store/preferences.plist", locationOf("eth1")); };
-    EXPECT_EQ(activate(open()), 0);
+    agent->interruption = [this] { putLocationOf("eth1"); };
+    EXPECT_EQ(activate(session), 0);
     EXPECT_EQ(taken(), "eth1");
 }
 
 TEST_F(ApplyTest, FailuresAreTold) {
     agent->failing = {"takeOver eth0"};
-    SessionRef session = open();
     EXPECT_EQ(activate(session), 1001);
     EXPECT_TRUE(logHas("takeOver eth0 was told to fail"));
     EXPECT_EQ(apply(session), 0) << "what is left undone is tried again in the background of the status";

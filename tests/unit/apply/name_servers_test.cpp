@@ -1,109 +1,77 @@
 #include "platform/apply/direct/NameServers.h"
 
-#include <gtest/gtest.h>
-#include <sys/stat.h>
-
-#include <filesystem>
-#include <memory>
-#include <string>
-
 #include "platform/apply/StateFile.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
-#include "tests/unit/support/TemporaryDirectory.h"
+#include "tests/unit/apply/Trees.h"
+#include "tests/unit/support/PrivateNetwork.h"
 
 namespace platform::apply {
 namespace {
 
-namespace fs = std::filesystem;
+using testing_support::shell;
 
-IPv4Address server(unsigned last) {
-    return 10U | (last << 24U);
-}
+const std::string before = "nameserver 9.9.9.9 options edns0 ";
 
-class NameServersTest : public testing::Test {
+class NameServersTest : public testing_support::PrivateNetworkTest {
   protected:
-    NameServersTest() {
-        Host host;
-        host.runtimeDirectory = folder_.at("run");
-        host.resolverFile = path_;
-        override_ = std::make_unique<HostOverride>(host);
-        EXPECT_TRUE(makeRuntimeDirectory().ok());
+    static void run(const std::function<void()>& body) {
+        testing_support::PrivateNetwork::run([&body] {
+            const LogCapture quiet([](LogLevel, std::string_view) {});
+            ASSERT_TRUE(makeRuntimeDirectory().ok());
+            shell("printf 'nameserver 9.9.9.9\noptions edns0\n' >/etc/resolv.conf");
+            body();
+            EXPECT_EQ("", shell("ls /run/location-assistant/*.plist 2>/dev/null || true"));
+        });
     }
-    void bring(const std::string& interface, unsigned rank, const NameService& service) {
+    // What is in the file then; without servers and domains the interface has none any more.
+    static std::string bring(const std::string& interface, unsigned rank,
+                             const std::vector<const char*>& servers,
+                             const std::vector<std::string>& domains = {}) {
+        NameService service{{}, domains};
+        std::ranges::transform(servers, std::back_inserter(service.servers), address);
         std::string trouble;
-        const Outcome done = setInterfaceNameServers(interface, rank, service, trouble);
-        EXPECT_TRUE(done.ok()) << done.reason();
-        EXPECT_EQ("", trouble);
+        EXPECT_EQ("", setInterfaceNameServers(interface, rank, service, trouble).reason());
+        return (trouble.empty() ? "" : "trouble ") + shell("grep -hv '^#' /etc/resolv.conf | tr '\n' ' '");
     }
-    // The lines that a resolver reads; kind, mode and content in one.
-    std::string content() {
-        if (!fs::exists(fs::symlink_status(path_))) {
-            return "absent";
-        }
-        if (fs::is_symlink(path_)) {
-            return "-> " + fs::read_symlink(path_).string();
-        }
-        struct stat status {};
-        EXPECT_EQ(0, stat(path_.c_str(), &status));
-        std::string all;
-        EXPECT_TRUE(readWholeFile(path_, all).ok());
-        std::string lines;
-        for (std::size_t at = 0; at < all.size(); at = all.find('\n', at) + 1) {
-            lines += all[at] == '#' ? "" : all.substr(at, all.find('\n', at) + 1 - at);
-        }
-        return (status.st_mode & 07777U) == 0644 ? lines
-                                                 : std::to_string(status.st_mode & 07777U) + " " + lines;
-    }
-
-    const testing_support::TemporaryDirectory folder_;
-    const std::string path_ = folder_.at("etc/resolv.conf");
-    const LogCapture quiet_{[](LogLevel, std::string_view) {}};
-    std::unique_ptr<HostOverride> override_;
 };
 
-TEST_F(NameServersTest, EveryKindOfFileComesBack) {
-    fs::create_directories(folder_.at("etc"));
-    const auto goAndComeBack = [this](const std::string& before) {
-        EXPECT_EQ(before, content());
-        bring("eth0", 0, {});
-        EXPECT_EQ(before, content());
-        bring("eth0", 0, {{server(1), server(2)}, {"example.org"}});
-        EXPECT_EQ("search example.org\nnameserver 10.0.0.1\nnameserver 10.0.0.2\n", content());
-        bring("eth0", 0, {});
-        EXPECT_EQ(before, content());
-        EXPECT_FALSE(fs::exists(folder_.at("run/name-servers.plist")));
-        EXPECT_FALSE(fs::exists(temporaryFor(path_)));
-    };
-    goAndComeBack("absent");
-    folder_.write("etc/resolv.conf", "nameserver 9.9.9.9\n");
-    fs::permissions(path_, fs::perms{0640});
-    goAndComeBack("416 nameserver 9.9.9.9\n");
-    fs::remove(path_);
-    fs::create_symlink("../somewhere/stub.conf", path_);
-    goAndComeBack("-> ../somewhere/stub.conf");
-}
-
 TEST_F(NameServersTest, SeveralInterfacesShareTheFileInTheirOrder) {
-    folder_.write("etc/resolv.conf", "nameserver 9.9.9.9\n");
-    bring("wlan0", 1, {{server(3), server(1), server(4)}, {}});
-    bring("eth0", 0, {{server(1), server(2)}, {}});
-    EXPECT_EQ("nameserver 10.0.0.1\nnameserver 10.0.0.2\nnameserver 10.0.0.3\n", content());
-    bring("eth0", 0, {});
-    EXPECT_EQ("nameserver 10.0.0.3\nnameserver 10.0.0.1\nnameserver 10.0.0.4\n", content());
-    bring("wlan0", 1, {});
-    EXPECT_EQ("nameserver 9.9.9.9\n", content());
+    run([] {
+        const std::string a0 = "search x nameserver 10.0.0.3 nameserver 10.0.0.1 nameserver 10.0.0.4 ";
+        EXPECT_EQ(a0, bring("a0", 1, {"10.0.0.3", "10.0.0.1", "10.0.0.4"}, {"x"}));
+        EXPECT_EQ("search x nameserver 10.0.0.1 nameserver 10.0.0.2 nameserver 10.0.0.3 ",
+                  bring("e0", 0, {"10.0.0.1", "10.0.0.2"}));
+        EXPECT_EQ(a0, bring("e0", 0, {}));
+        EXPECT_EQ(a0, bring("e1", 0, {}));
+        EXPECT_EQ(before, bring("a0", 1, {}));
+    });
 }
 
 TEST_F(NameServersTest, WhatSomebodyElseWroteStays) {
-    folder_.write("etc/resolv.conf", "nameserver 9.9.9.9\n");
-    bring("eth0", 0, {{server(1)}, {}});
-    folder_.write("etc/resolv.conf", "nameserver 8.8.8.8\n");
-    bring("eth0", 0, {{server(2)}, {}});
-    EXPECT_EQ("nameserver 8.8.8.8\n", content());
-    bring("eth0", 0, {});
-    EXPECT_EQ("nameserver 8.8.8.8\n", content());
-    EXPECT_FALSE(fs::exists(folder_.at("run/name-servers.plist")));
+    run([] {
+        bring("e0", 0, {"10.0.0.1"});
+        shell("echo nameserver 8.8.8.8 >/etc/resolv.conf");
+        EXPECT_EQ("nameserver 8.8.8.8 ", bring("e0", 0, {"10.0.0.2"}));
+        EXPECT_EQ("nameserver 8.8.8.8 ", bring("e0", 0, {}));
+    });
+}
+
+// What cannot be replaced is written in place, and a run may be ended in the middle of that.
+TEST_F(NameServersTest, WritesAFileThatIsAMountInPlace) {
+    run([] {
+        shell(
+            "mv /etc/resolv.conf /run/outer; touch /etc/resolv.conf; mount --bind /run/outer "
+            "/etc/resolv.conf");
+        for (const char* const ended : {"true", "truncate -s 0 /run/outer", "truncate -s 9 /run/outer"}) {
+            EXPECT_EQ("nameserver 10.0.0.53 ", bring("e0", 0, {"10.0.0.53"}));
+            shell(ended);
+            EXPECT_EQ(before, bring("e0", 0, {}));
+        }
+        shell("mount -o remount,bind,ro /etc/resolv.conf");
+        EXPECT_EQ("trouble " + before, bring("e0", 0, {"10.0.0.53"})) << "the addresses stand without it";
+        EXPECT_EQ(before, bring("e0", 0, {}));
+    });
 }
 
 }  // namespace

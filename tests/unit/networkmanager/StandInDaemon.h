@@ -1,22 +1,16 @@
-// A NetworkManager without cards: on a bus of its own it keeps profiles, judges them as the real one does,
-// plays activations and their failures, and records what it is asked to change.
+// A NetworkManager that meets what the real one only meets by chance: switches that nobody can turn, cards
+// that fail or hang, cells that are heard late, refusals. One card on a bus of its own; what it is asked to
+// change is recorded.
 #pragma once
 
-#include <sys/types.h>
-#include <systemd/sd-bus.h>
-
-#include <atomic>
-#include <chrono>
-#include <cstdint>
-#include <functional>
+#include <csignal>
 #include <map>
-#include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
 
-#include "platform/apply/Agents.h"
-#include "platform/bus/Value.h"
+#include "platform/apply/networkmanager/Daemon.h"
+#include "tests/unit/support/Child.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
 namespace testing_support {
@@ -24,114 +18,62 @@ namespace testing_support {
 // A message bus that ends with its scope.
 class PrivateBus {
   public:
-    PrivateBus();
-    ~PrivateBus();
-    PrivateBus(const PrivateBus&) = delete;
-    PrivateBus& operator=(const PrivateBus&) = delete;
+    ~PrivateBus() { kill(process_.number(), SIGKILL); }
     [[nodiscard]] std::string socket() const { return directory_.at("bus"); }
+    // A connection, once the bus takes some.
+    [[nodiscard]] sd_bus* connect() const;
 
   private:
     TemporaryDirectory directory_;
-    pid_t process_ = 0;
+    Child process_{[this] {
+        (void)!freopen("/dev/null", "w", stderr);
+        const std::string address = "--address=unix:path=" + socket();
+        return execl("/usr/bin/dbus-daemon", "dbus-daemon", "--session", "--nofork", "--nopidfile",
+                     "--nosyslog", address.c_str(), nullptr);
+    }};
 };
 
 class StandInDaemon {
   public:
-    struct Point {
-        std::string network;
-        bool adHoc = false;
-        bool privacy = false;
-        std::uint32_t protection = 0;
-        bool announced = true;  // false: heard only once it is looked for
-        int age = 0;            // seconds since it was heard
-    };
-    struct Card {
-        std::string name;
-        std::uint32_t type = 20;
-        std::uint32_t state = 30;
-        bool managed = true;
-        bool autoconnect = true;
-        std::uint32_t capabilities = 0;
-        std::vector<Point> points = {};
-        std::uint32_t failure = 0;  // the reason for which activations fail; 0: they succeed
-        bool external = false;
-        bool hangs = false;       // activations get no address
-        std::string active = {};  // a path
-        unsigned metric = 0;
-    };
-
-    // Somebody on the same bus who keeps sending that every activation has succeeded.
-    class Forger {
-      public:
-        explicit Forger(const std::string& socket);
-        ~Forger();
-        Forger(const Forger&) = delete;
-        Forger& operator=(const Forger&) = delete;
-
-      private:
-        sd_bus* bus_ = nullptr;
-        std::atomic<bool> stop_ = false;
-        std::thread thread_;
-    };
-
-    StandInDaemon(const std::string& socket, std::vector<Card> cards);
+    explicit StandInDaemon(const PrivateBus& bus);
     ~StandInDaemon();
     StandInDaemon(const StandInDaemon&) = delete;
     StandInDaemon& operator=(const StandInDaemon&) = delete;
 
+    // The properties of each object, of all its interfaces together.
+    std::map<std::string, platform::apply::Dictionary> objects;
+    std::map<std::string, platform::apply::Sections> profiles;  // by path, with secrets
+    // A network on the air; one that keeps quiet is told of once a profile was activated.
+    void offer(const std::string& network, std::uint32_t mode, std::uint32_t privacy,
+               std::uint32_t protection, bool isQuiet = false);
     // What the next requests meet. Set these between requests.
-    bool radio = true;
-    bool radioHardware = true;
-    bool forbidsChanges = false;
-    bool leavesAtActivation = false;
-    std::uint32_t profileFlags = 0;
-    std::vector<Card> cards;
-    // Every request that changes something, in order, as "Member what".
+    std::uint32_t failure = 0;  // the reason for which activations fail
+    bool hangs = false;         // activations get no address
+    std::string refusal;        // why nothing may be changed
+    // Every request that changes something, in order.
     std::vector<std::string> changes;
-    // By UUID, with secrets.
-    [[nodiscard]] platform::bus::Sections profile(const std::string& uuid) const;
+
+    static inline const std::string manager = "/org/freedesktop/NetworkManager";
+    static inline const std::string card = manager + "/Devices/1";
 
   private:
-    struct Profile {
-        std::string uuid;
-        platform::bus::Sections sections;
-    };
-    struct Active {
-        std::size_t card = 0;
-        std::string profile;
-        std::uint32_t state = 1;
-    };
-    using Answer = std::function<int(sd_bus_message*)>;
-
     static int handle(sd_bus_message* call, void* self, sd_bus_error* error);
-    int answer(sd_bus_message* call);
-    int manager(sd_bus_message* call, const std::string& member);
-    int settings(sd_bus_message* call, const std::string& member);
-    int profileCall(sd_bus_message* call, const std::string& member, Profile& profile);
-    int cardCall(sd_bus_message* call, const std::string& member, std::size_t card);
-    int properties(sd_bus_message* call, const std::string& path);
-    int setProperty(sd_bus_message* call, const std::string& path);
-    int activate(sd_bus_message* call);
-    void finish(const std::string& active);
-    void leave(std::size_t card, std::uint32_t reason);
-    void signalCard(std::size_t card, std::uint32_t state, std::uint32_t reason);
-    void signalActive(const std::string& path, std::uint32_t state);
-    static int reply(sd_bus_message* call, const Answer& append = {});
-    [[nodiscard]] platform::bus::Dictionary describe(const std::string& path, const std::string& interface);
+    // The name of the error, behind the daemon's own, or nothing.
+    std::string answer(sd_bus_message* call, sd_bus_message* reply);
+    std::string change(const std::string& member, const std::string& path, sd_bus_message* call,
+                       sd_bus_message* reply);
+    void activate(const std::string& profile, sd_bus_message* reply);
+    void leave(std::uint32_t reason);
+    void moveCard(std::uint32_t state, std::uint32_t reason = 0);
+    void moveActive(const std::string& path, std::uint32_t state);
 
-    mutable std::mutex mutex_;
-    sd_bus* bus_ = nullptr;
-    std::map<std::string, Profile> profiles_;
-    std::map<std::string, Active> actives_;
-    std::vector<std::function<void()>> later_;
+    sd_bus* bus_;
+    platform::apply::Texts points_;
+    platform::apply::Texts quietPoints_;
+    std::vector<platform::apply::Message> signals_;  // behind the answer
     unsigned next_ = 0;
-    std::atomic<bool> stop_ = false;
+    std::atomic<bool> isOver_ = false;
     std::thread thread_;
 };
-
-// Gives the agent one task and waits for its end, or for as long as it may take.
-platform::apply::Task run(platform::apply::Agent& agent, const platform::apply::Captured& before,
-                          const platform::apply::InterfacePlan* plan,
-                          std::chrono::milliseconds bound = std::chrono::seconds(10));
 
 }  // namespace testing_support

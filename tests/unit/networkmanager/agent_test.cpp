@@ -1,16 +1,11 @@
-// What only a daemon without cards can play: radios, access points, failures.
-#include <arpa/inet.h>
+// What only a daemon that lies, fails or hangs can show; what the real one does by itself, the laboratories
+// show.
 #include <gtest/gtest.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 
-#include <cstring>
 #include <memory>
 #include <utility>
 
 #include "platform/apply/Agents.h"
-#include "platform/apply/networkmanager/Daemon.h"
-#include "platform/base/FileDescriptor.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
 #include "tests/unit/networkmanager/StandInDaemon.h"
@@ -18,26 +13,19 @@
 namespace platform::apply {
 namespace {
 
-using testing_support::PrivateBus;
-using testing_support::run;
 using testing_support::StandInDaemon;
-using testing_support::TemporaryDirectory;
+using Lines = std::vector<std::string>;
 
 const std::string canary = "canary-e7c1";
 const std::string home = "11111111-2222-4333-8444-555555555555";
+const std::string oursAdded = "AddConnection2 held back";
+const std::string oursActivated = "Activate location-assistant wlan0";
+constexpr std::uint32_t adHoc = 1;
+constexpr std::uint32_t infrastructure = 2;
 constexpr std::uint32_t sharedKey = 0x100;
 
 class NetworkManager : public ::testing::Test {
   protected:
-    NetworkManager() : standIn_(bus_.socket(), {wlan0()}), override_(host(bus_.socket())) {}
-
-    static StandInDaemon::Card wlan0() {
-        StandInDaemon::Card card{"wlan0"};
-        card.type = 2;
-        card.points = {
-            {"Printer", true}, {"Office", false, true, sharedKey}, {"Quiet", false, true, 0, false}};
-        return card;
-    }
     static Host host(const std::string& socket) {
         Host host;
         host.systemBusSocket = socket;
@@ -53,144 +41,181 @@ class NetworkManager : public ::testing::Test {
     }
     // Puts the card on a network of the user's.
     void joinHome() {
-        const InterfacePlan joined = plan("Home", canary);
         const WirelessLink link{JoinChoice{true, false, Security::wpa, 0}, {}};
-        Sections sections = makeProfile(joined, &link, {});
+        Sections& sections = daemon_.profiles["/home"];
+        sections = makeProfile(plan("Home", canary), &link, {});
         sections.erase("user");
         sections["connection"]["uuid"] = {home};
         sections["connection"]["id"] = {std::string("Home")};
-        Daemon daemon;
-        std::string path;
-        std::optional<Device> device;
-        std::string active;
-        std::uint32_t state = 0;
-        ASSERT_TRUE(daemon.connect().ok() && daemon.listen().ok() &&
-                    daemon.addProfile(sections, Adding::heldBack, {}, path).ok() &&
-                    daemon.findDevice("wlan0", device).ok() && daemon.activate(path, *device, active).ok());
-        while (state != activeActivated && daemon.activeState(active, state).ok() &&
-               daemon.handleSignals(Clock::now() + std::chrono::milliseconds(20)).ok()) {
-        }
-        standIn_.changes.clear();
+        daemon_.objects["/home"];
+        daemon_.objects["/onHome"] = {
+            {"Connection", {std::string("/home")}}, {"Uuid", {home}}, {"State", {2U}}};
+        card("ActiveConnection", {std::string("/onHome")});
+        card("State", {deviceActivated});
+    }
+    void card(const char* property, Value value) {
+        daemon_.objects[StandInDaemon::card][property] = std::move(value);
     }
     Captured capture() {
         std::vector<Captured> captured;
-        const std::vector<std::string> interfaces = {"wlan0"};
-        const Outcome outcome = agent_->capture(interfaces, captured, leftAlone_);
+        leftAlone_.clear();
+        const Outcome outcome = agent_->capture(std::vector<std::string>{"wlan0"}, captured, leftAlone_);
         EXPECT_TRUE(outcome.ok()) << outcome.reason();
         return captured.empty() ? Captured() : captured[0];
     }
-    Task takeOver(const InterfacePlan& plan, const Captured& before) { return run(*agent_, before, &plan); }
-    Task giveBack(const Captured& before) { return run(*agent_, before, nullptr); }
-    // Nothing was refused and nothing stood against it.
-    static std::string wrong(const Task& task) { return task.refusal.reason() + task.trouble; }
-    using Changes = std::vector<std::string>;
-    Changes changes() { return std::exchange(standIn_.changes, {}); }
-    Sections ours() { return standIn_.profile(profileUUID("wlan0")); }
-
-    // Somebody's wired profile, on its way.
-    void joinHomeUnfinished() {
-        InterfacePlan wired = plan({});
-        wired.wireless.reset();
-        Sections sections = makeProfile(wired, nullptr, {});
-        sections.erase("user");
-        sections["connection"]["uuid"] = {home};
-        Daemon daemon;
-        std::string path;
-        std::optional<Device> device;
-        std::string active;
-        ASSERT_TRUE(daemon.connect().ok() && daemon.addProfile(sections, Adding::heldBack, {}, path).ok() &&
-                    daemon.findDevice("wlan0", device).ok() && daemon.activate(path, *device, active).ok());
-        while (daemon.findDevice("wlan0", device).ok() && device->state != deviceGetsAddresses) {
+    // What stood against it; the status of a refusal goes before its reason.
+    std::string run(const Captured& before, const InterfacePlan* plan, double seconds = 10) {
+        std::vector<Task> tasks{{&before, plan, {}, {}}};
+        const auto bound = std::chrono::duration<double>(seconds);
+        const Clock::time_point deadline = Clock::now() + std::chrono::duration_cast<Clock::duration>(bound);
+        agent_->start(tasks, deadline);
+        while (!agent_->settle(deadline)) {
         }
-        standIn_.changes.clear();
+        const Outcome& refusal = tasks[0].refusal;
+        return refusal.ok() ? tasks[0].trouble : std::to_string(refusal.status()) + " " + refusal.reason();
+    }
+    std::string takeOver(const InterfacePlan& plan, const Captured& before, double seconds = 10) {
+        return run(before, &plan, seconds);
+    }
+    std::string giveBack(const Captured& before) { return run(before, nullptr); }
+    Lines changes() { return std::exchange(daemon_.changes, {}); }
+    Sections ours() {
+        for (const auto& [path, sections] : daemon_.profiles) {
+            if (valueOf<std::string>(sections.at("connection"), "uuid") == profileUUID("wlan0")) {
+                return sections;
+            }
+        }
+        return {};
     }
 
     const InterfacePlan printer_ = plan("Printer");
-    PrivateBus bus_;
-    StandInDaemon standIn_;
-    HostOverride override_;
-    std::shared_ptr<Agent> agent_ = makeNetworkManagerAgent();
+    const testing_support::PrivateBus bus_;
+    StandInDaemon daemon_{bus_};
+    const HostOverride override_{host(bus_.socket())};
+    const std::shared_ptr<Agent> agent_ = makeNetworkManagerAgent();
     std::vector<Trouble> leftAlone_;
-    LogCapture log_{
+    const LogCapture log_{
         [](LogLevel, std::string_view line) { EXPECT_EQ(line.find(canary), std::string_view::npos); }};
 };
 
-TEST_F(NetworkManager, joinsWhatIsOnTheAir) {
-    joinHome();
-    const Captured before = capture();
+TEST_F(NetworkManager, ReadsWhatIsOnTheAir) {
     const struct {
-        const char* network;
-        std::optional<std::string> key;
-        const char* mode;
-        const char* security;
+        std::uint32_t mode, privacy, protection;
+        const char* made;
     } rows[] = {
-        {"Printer", {}, "adhoc", ""},
-        {"Office", canary, "infrastructure", "wpa-psk"},
-        {"Quiet", "abcde", "infrastructure", "none"},
-        {"Nowhere", {}, "infrastructure", ""},
+        {adHoc, 0, 0, "adhoc "},
+        {infrastructure, 1, 0, "infrastructure none"},
+        {infrastructure, 1, sharedKey | 0x400, "infrastructure wpa-psk"},
+        {infrastructure, 1, 0x400, "infrastructure sae"},
+        {infrastructure, 1, 0x200, " "},
     };
+    const Captured before = capture();
     for (const auto& row : rows) {
-        EXPECT_EQ(wrong(takeOver(plan(row.network, row.key), before)), "");
-        Sections profile = ours();
-        EXPECT_EQ(networkOf(profile), row.network);
-        EXPECT_EQ(valueOf<std::string>(profile["802-11-wireless"], "mode"), row.mode);
-        EXPECT_EQ(valueOf<std::string>(profile["802-11-wireless-security"], "key-mgmt").value_or(""),
-                  row.security);
+        const std::string name = row.made;
+        daemon_.offer(name, row.mode, row.privacy, row.protection);
+        const bool isOpen = row.privacy == 0;
+        (void)takeOver(plan(name, isOpen ? std::optional<std::string>() : "abcdefghijklm"), before);
+        Sections made = ours();
+        EXPECT_EQ(name, valueOf<std::string>(made["802-11-wireless"], "mode").value_or("") + " " +
+                            valueOf<std::string>(made["802-11-wireless-security"], "key-mgmt").value_or(""));
+        daemon_.profiles.clear();
     }
+}
+
+TEST_F(NetworkManager, GoesAndComesBack) {
+    joinHome();
+    daemon_.offer("Printer", infrastructure, 0, 0);
+    const Captured before = capture();
+    EXPECT_EQ("", takeOver(printer_, before));
+    EXPECT_EQ((Lines{oursAdded, oursActivated}), changes());
+    // The same again changes nothing; another address does.
+    EXPECT_EQ("", takeOver(printer_, before));
+    EXPECT_EQ(Lines{"Update2"}, changes());
+    InterfacePlan other = printer_;
+    other.rank = 1;
+    EXPECT_EQ("", takeOver(other, before));
+    EXPECT_EQ((Lines{"Update2", oursActivated}), changes());
+    // The record of how it was may be lost: the profile has it too.
+    const Captured again = capture();
+    EXPECT_EQ("", giveBack(again));
+    EXPECT_EQ((Lines{"Activate Home", "Delete"}), changes());
+    EXPECT_EQ("", giveBack(again));
+    EXPECT_EQ(Lines{}, changes());
+
+    InterfacePlan off;
+    off.name = "wlan0";
+    EXPECT_EQ("", takeOver(off, before));
+    EXPECT_EQ((Lines{"Disconnect", "Managed off"}), changes());
+    EXPECT_EQ("", takeOver(off, before));
+    EXPECT_EQ(Lines{}, changes());
+    EXPECT_EQ("", giveBack(before));
+    EXPECT_EQ((Lines{"Managed on", "Activate Home"}), changes());
+
+    // Somebody's own profile under our UUID is nobody's to change.
+    daemon_.profiles["/theirs"] = {{"connection", {{"uuid", {profileUUID("wlan0")}}}}};
+    EXPECT_EQ("1001 another program has a profile under this system's UUID", takeOver(printer_, before));
+    EXPECT_EQ("", giveBack(before));
+    EXPECT_TRUE(daemon_.profiles.contains("/theirs"));
+}
+
+TEST_F(NetworkManager, WaitsForACellThatIsNotHeardYet) {
+    joinHome();
+    daemon_.offer("Printer", adHoc, 0, 0, true);
+    const Captured before = capture();
+    EXPECT_EQ("", takeOver(printer_, before));
+    EXPECT_EQ((Lines{"Disconnect", oursAdded, oursActivated}), changes()) << "the card does not stay at home";
+    EXPECT_EQ("", giveBack(before));
+    daemon_.objects.erase(daemon_.manager + "/AccessPoint/1");
+
+    // One that never comes: looked for until the end, and then left to the daemon.
+    daemon_.failure = 53;
     changes();
-    EXPECT_EQ(wrong(giveBack(before)), "");
-    EXPECT_EQ(changes(), (Changes{"ActivateConnection Home on wlan0", "Delete location-assistant wlan0"}));
+    EXPECT_EQ("the network was not found", takeOver(printer_, before, 1));
+    EXPECT_EQ((Lines{"Disconnect", oursAdded, oursActivated, "RequestScan", "Delete", "AddConnection2",
+                     "Autoconnect on"}),
+              changes());
+
+    // It comes while an access point of the name is looked for.
+    daemon_.failure = 0;
+    daemon_.hangs = true;
+    daemon_.offer("Printer", adHoc, 0, 0, true);
+    EXPECT_EQ("no DHCP server answered; NetworkManager goes on asking", takeOver(printer_, before, 3));
+    EXPECT_EQ("adhoc", valueOf<std::string>(ours()["802-11-wireless"], "mode"));
 }
 
-TEST_F(NetworkManager, turnsToACellOnceItIsHeard) {
-    standIn_.cards[0].hangs = true;
-    standIn_.cards[0].points = {{"Printer", true, false, 0, false}};
-    EXPECT_NE(run(*agent_, capture(), &printer_, std::chrono::seconds(3)).trouble, "");
-    EXPECT_EQ(valueOf<std::string>(ours()["802-11-wireless"], "mode"), "adhoc");
-    EXPECT_EQ(changes(), (Changes{"AddConnection2 location-assistant wlan0",
-                                  "ActivateConnection location-assistant wlan0 on wlan0",
-                                  "Update2 location-assistant wlan0",
-                                  "ActivateConnection location-assistant wlan0 on wlan0"}));
-}
-
-TEST_F(NetworkManager, keepsTheNetworkOfTheCard) {
-    EXPECT_EQ(takeOver(plan({}), capture()).trouble,
-              "no network is named and the card is on none, so it joins none");
-    EXPECT_EQ(changes(), Changes());
-
+TEST_F(NetworkManager, KeepsTheNetworkOfTheCard) {
+    EXPECT_EQ("no network is named and the card is on none, so it joins none", takeOver(plan({}), capture()));
+    EXPECT_EQ(Lines(), changes());
     joinHome();
-    const Captured before = capture();
-    EXPECT_EQ(wrong(takeOver(plan({}), before)), "");
-    EXPECT_EQ(changes(), (Changes{"AddConnection2 location-assistant wlan0",
-                                  "ActivateConnection location-assistant wlan0 on wlan0"}));
-    EXPECT_EQ(networkOf(ours()), "Home");
-    EXPECT_EQ(valueOf<std::string>(ours()["802-11-wireless-security"], "psk"), canary);
+    EXPECT_EQ("", takeOver(plan({}), capture()));
+    EXPECT_EQ((Lines{oursAdded, oursActivated}), changes());
+    EXPECT_EQ("Home", networkOf(ours()));
+    EXPECT_EQ(canary, valueOf<std::string>(ours()["802-11-wireless-security"], "psk"));
+    // With a key it is joined anew.
+    EXPECT_EQ("", takeOver(plan("Home", "another key"), capture()));
+    EXPECT_EQ("another key", valueOf<std::string>(ours()["802-11-wireless-security"], "psk"));
 }
 
-TEST_F(NetworkManager, radio) {
-    standIn_.radio = false;
-    standIn_.cards[0].state = 20;
+TEST_F(NetworkManager, Radio) {
+    daemon_.objects[daemon_.manager]["WirelessEnabled"] = {false};
+    card("State", {20U});
+    daemon_.offer("Printer", infrastructure, 0, 0);
     const Captured before = capture();
-    EXPECT_EQ(wrong(takeOver(printer_, before)), "");
-    EXPECT_EQ(changes(), (Changes{"Set WirelessEnabled on", "AddConnection2 location-assistant wlan0",
-                                  "ActivateConnection location-assistant wlan0 on wlan0"}));
-    EXPECT_EQ(wrong(giveBack(before)), "");
-    EXPECT_EQ(changes(), (Changes{"Disconnect wlan0", "Delete location-assistant wlan0",
-                                  "Set Autoconnect of wlan0 on", "Set WirelessEnabled off"}));
-    EXPECT_FALSE(standIn_.radio);
+    EXPECT_EQ("", takeOver(printer_, before));
+    EXPECT_EQ((Lines{"WirelessEnabled on", oursAdded, oursActivated}), changes());
+    EXPECT_EQ("", giveBack(before));
+    EXPECT_EQ((Lines{"Disconnect", "Delete", "Autoconnect on", "WirelessEnabled off"}), changes());
 
-    // The daemon is told all the same, for the day when the switch is on again.
-    standIn_.radio = true;
-    standIn_.radioHardware = false;
-    standIn_.cards[0].state = 20;
-    const Task task = takeOver(printer_, before);
-    EXPECT_TRUE(task.refusal.ok());
-    EXPECT_EQ(task.trouble, "the radio is switched off by a switch on the computer");
-    EXPECT_EQ(changes(), (Changes{"AddConnection2 location-assistant wlan0", "Set Autoconnect of wlan0 on"}));
+    // The daemon is told all the same, for the day when the switch on the computer is on again.
+    daemon_.objects[daemon_.manager] = {{"WirelessEnabled", {true}}, {"WirelessHardwareEnabled", {false}}};
+    card("State", {20U});
+    EXPECT_EQ("the radio is switched off by a switch on the computer", takeOver(printer_, before));
+    EXPECT_EQ((Lines{"AddConnection2", "Autoconnect on"}), changes());
 }
 
-TEST_F(NetworkManager, failures) {
+TEST_F(NetworkManager, Failures) {
     joinHome();
+    daemon_.offer("Office", infrastructure, 1, sharedKey);
     const Captured before = capture();
     const InterfacePlan office = plan("Office", canary);
     const struct {
@@ -204,139 +229,89 @@ TEST_F(NetworkManager, failures) {
                 {60, "somebody else took over the card"},
                 {999, "NetworkManager gives the reason 999"}};
     for (const auto& row : rows) {
-        standIn_.cards[0].failure = row.reason;
-        const Task task = takeOver(office, before);
-        EXPECT_TRUE(task.refusal.ok())
-            << "a network that does not take the card is no refusal of the machine";
-        EXPECT_EQ(task.trouble, row.said);
-        standIn_.cards[0].failure = 0;
-        EXPECT_EQ(wrong(giveBack(before)), "");
-        EXPECT_TRUE(ours().empty());
+        daemon_.failure = row.reason;
+        EXPECT_EQ(row.said, takeOver(office, before)) << "no refusal of the machine";
+        EXPECT_EQ(Lines({oursAdded, oursActivated, "Autoconnect off"}), changes())
+            << "it turns to no other network";
+        daemon_.failure = 0;
+        EXPECT_EQ("", giveBack(before));
+        EXPECT_EQ(Lines({"Activate Home", "Delete"}), changes());
     }
-    standIn_.cards[0].hangs = true;
-    EXPECT_EQ(run(*agent_, before, &office, std::chrono::milliseconds(300)).trouble,
-              "no DHCP server answered; NetworkManager goes on asking");
-    standIn_.cards[0].hangs = false;
-
-    standIn_.cards[0].failure = 5;
-    EXPECT_EQ(wrong(giveBack(before)),
-              "the profile that was active before does not come up: no DHCP server answered");
+    EXPECT_EQ("", takeOver(office, before));
+    daemon_.failure = 5;
+    EXPECT_EQ("the profile that was active before does not come up: no DHCP server answered",
+              giveBack(before));
     EXPECT_TRUE(ours().empty()) << "the temporary profile does not stay in its place";
-    standIn_.cards[0].failure = 0;
-    EXPECT_EQ(wrong(giveBack(before)), "");
-
-    standIn_.forbidsChanges = true;
-    EXPECT_EQ(takeOver(office, before).refusal.status(), kSCStatusAccessError);
-    standIn_.forbidsChanges = false;
-    EXPECT_EQ(wrong(takeOver(office, before)), "");
-    standIn_.forbidsChanges = true;
-    EXPECT_EQ(giveBack(before).refusal.status(), kSCStatusAccessError)
-        << "a profile that stays is tried again";
-    standIn_.forbidsChanges = false;
-
-    standIn_.leavesAtActivation = true;
-    EXPECT_EQ(takeOver(office, before).refusal.reason(),
-              "org.freedesktop.NetworkManager left the bus while it was waited for");
-    agent_ = makeNetworkManagerAgent();
-    EXPECT_EQ(giveBack(before).refusal.reason(), "NetworkManager does not run");
+    daemon_.failure = 0;
+    EXPECT_EQ("", giveBack(before));
+    daemon_.refusal = "to " + canary;
+    EXPECT_EQ("1003 AddConnection2: org.freedesktop.NetworkManager.PermissionDenied",
+              takeOver(office, before))
+        << "nothing that holds the key is repeated";
+    daemon_.refusal.clear();
+    EXPECT_EQ("", takeOver(office, before));
+    daemon_.refusal = "!";
+    EXPECT_EQ("1003", giveBack(before).substr(0, 4)) << "a profile that stays is tried again";
 }
 
-// What was still connecting before is asked for, and not waited for.
-TEST_F(NetworkManager, waitsOnlyForWhatWasUpBefore) {
-    standIn_.cards[0].hangs = true;
-    standIn_.cards[0].type = 20;
-    joinHomeUnfinished();
+TEST_F(NetworkManager, BelievesNoSignalFromSomebodyElse) {
+    daemon_.hangs = true;
+    daemon_.offer("Printer", infrastructure, 0, 0);
+    sd_bus* const forger = bus_.connect();
     const Captured before = capture();
-    InterfacePlan wired = plan({});
-    wired.wireless.reset();
-    standIn_.cards[0].hangs = false;
-    EXPECT_EQ(wrong(takeOver(wired, before)), "");
-    standIn_.cards[0].hangs = true;
-    const Clock::time_point begin = Clock::now();
-    EXPECT_EQ(wrong(giveBack(before)), "");
-    EXPECT_LT(Clock::now() - begin, std::chrono::seconds(1));
+    std::thread forging([forger] {
+        for (int i = 0; i < 40; ++i) {
+            for (const char* number : {"1", "2", "3", "4"}) {
+                sd_bus_emit_signal(forger, (StandInDaemon::manager + "/ActiveConnection/" + number).c_str(),
+                                   "org.freedesktop.NetworkManager.Connection.Active", "StateChanged", "uu",
+                                   2U, 0U);
+            }
+            sd_bus_flush(forger);
+            std::this_thread::sleep_for(std::chrono::milliseconds(10));
+        }
+    });
+    EXPECT_EQ("no DHCP server answered; NetworkManager goes on asking", takeOver(printer_, before, 0.5));
+    forging.join();
+    sd_bus_flush_close_unref(forger);
 }
 
-TEST_F(NetworkManager, believesNoSignalFromSomebodyElse) {
-    standIn_.cards[0].hangs = true;
-    StandInDaemon::Forger forger(bus_.socket());
-    const Captured before = capture();
-    EXPECT_EQ(run(*agent_, before, &printer_, std::chrono::seconds(1)).trouble,
-              "no DHCP server answered; NetworkManager goes on asking");
-}
-
-TEST_F(NetworkManager, leavesAloneWhatIsNotItsOwn) {
+TEST_F(NetworkManager, LeavesAloneWhatIsNotItsOwn) {
     joinHome();
-    for (const bool external : {true, false}) {
-        standIn_.cards[0].external = external;
-        standIn_.profileFlags = external ? 0 : 4;
+    const struct {
+        const char *object, *property;
+        std::uint32_t flags;
+        const char* reason;
+    } rows[] = {{"/home", "Flags", 4, "it is left as it is: its profile would be lost with its connection"},
+                {"/onHome", "StateFlags", 0x80,
+                 "it is left as it is: another program than NetworkManager configured it"},
+                {StandInDaemon::card.c_str(), "DeviceType", 13,
+                 "it is left as it is: it is neither a wired nor a wireless card"}};
+    for (const auto& row : rows) {
+        const Dictionary before = daemon_.objects[row.object];
+        daemon_.objects[row.object][row.property] = {row.flags};
         capture();
-        ASSERT_EQ(leftAlone_.size(), 1U);
-        EXPECT_EQ(leftAlone_[0].interface, "wlan0");
-        EXPECT_NE(leftAlone_[0].reason.find(external ? "another program" : "would be lost"),
-                  std::string::npos);
+        ASSERT_EQ(1U, leftAlone_.size());
+        EXPECT_EQ(row.reason, leftAlone_[0].reason);
+        daemon_.objects[row.object] = before;
     }
+    card("Managed", {false});
+    EXPECT_EQ("", capture().interface);
+    EXPECT_TRUE(leftAlone_.empty()) << "it may have another agent";
 }
 
-TEST_F(NetworkManager, aWiredCardJoinsNoNetwork) {
-    standIn_.cards[0].type = 1;
-    EXPECT_EQ(takeOver(printer_, capture()).trouble,
-              "a network to join is named, and the card is not a wireless one");
-    EXPECT_EQ(changes(), (Changes{"AddConnection2 location-assistant wlan0",
-                                  "ActivateConnection location-assistant wlan0 on wlan0"}))
-        << "the other settings stand";
-}
-
-TEST_F(NetworkManager, cardWithoutCarrier) {
+TEST_F(NetworkManager, CardWithoutCarrier) {
     joinHome();
     const Captured before = capture();
-    EXPECT_EQ(wrong(takeOver(printer_, before)), "");
-    standIn_.cards[0].state = 20;
-    standIn_.cards[0].active.clear();
-    changes();
-    EXPECT_EQ(giveBack(before).trouble, "no profile can be active on it now");
-    EXPECT_EQ(changes(), Changes{"Delete location-assistant wlan0"});
-
-    agent_ = makeNetworkManagerAgent();
-    standIn_.cards[0].type = 1;
-    standIn_.cards[0].state = 20;
+    card("State", {20U});
+    card("ActiveConnection", {std::string("/")});
+    EXPECT_EQ("no profile can be active on it now", giveBack(before));
+    EXPECT_EQ(Lines{}, changes());
+    card("DeviceType", {1U});
     InterfacePlan wired = plan({});
     wired.wireless.reset();
-    EXPECT_EQ(takeOver(wired, before).trouble, "it has no carrier: the cable is out");
-    EXPECT_EQ(changes(), (Changes{"AddConnection2 location-assistant wlan0", "Set Autoconnect of wlan0 on"}))
+    EXPECT_EQ("it has no carrier: the cable is out", takeOver(wired, before));
+    EXPECT_EQ((Lines{"AddConnection2", "Autoconnect on"}), changes())
         << "the daemon activates it when the cable is in";
-}
-
-// Whether it runs decides which agent leads, so a doubt is no answer.
-TEST(NetworkManagerIsRunning, inEveryStateOfTheBus) {
-    const auto ask = [](const std::string& socket, bool& running) {
-        Host host;
-        host.systemBusSocket = socket;
-        const HostOverride override(host);
-        return isNetworkManagerRunning(running);
-    };
-    const TemporaryDirectory directory;
-    bool running = true;
-    EXPECT_TRUE(ask(directory.at("no bus"), running).ok());
-    EXPECT_FALSE(running);
-    {
-        const PrivateBus bus;
-        EXPECT_TRUE(ask(bus.socket(), running).ok());
-        EXPECT_FALSE(running);
-        const StandInDaemon daemon(bus.socket(), {});
-        EXPECT_TRUE(ask(bus.socket(), running).ok());
-        EXPECT_TRUE(running);
-    }
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    std::strncpy(address.sun_path, directory.at("mute, %").c_str(), sizeof address.sun_path - 1);
-    const FileDescriptor mute(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    ASSERT_EQ(bind(mute.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
-    EXPECT_FALSE(ask(address.sun_path, running).ok()) << "nobody listens";
-    ASSERT_EQ(listen(mute.get(), 1), 0);
-    const Outcome outcome = ask(address.sun_path, running);
-    EXPECT_EQ(outcome.reason(), "connecting to the system bus: no answer in 1 s");
-    EXPECT_FALSE(running);
 }
 
 }  // namespace

@@ -32,6 +32,9 @@ class Child {
     Child(const Child&) = delete;
     Child& operator=(const Child&) = delete;
 
+    // 0 once it was waited for.
+    [[nodiscard]] pid_t number() const noexcept { return process_; }
+
     // Its exit status, or -1 when it ended otherwise.
     int wait() {
         if (process_ > 0) {

@@ -8,7 +8,6 @@
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/prctl.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
@@ -17,6 +16,9 @@
 #include <cstdlib>
 #include <functional>
 #include <string>
+
+#include "tests/unit/support/Child.h"
+#include "tests/unit/support/Skip.h"
 
 namespace testing_support {
 
@@ -36,59 +38,29 @@ inline std::string shell(const std::string& command) {
     return output;
 }
 
-inline bool hasProgram(const std::string& name) {
-    return std::system(("command -v " + name + " >/dev/null 2>&1").c_str()) == 0;
-}
-
-// For a test that needs something that is not here; the test returns after it.
-inline void skip(const std::string& reason) {
-    if (const char* forbidden = std::getenv("LA_FORBID_SKIPS"); forbidden != nullptr && *forbidden == '1') {
-        FAIL() << reason << ", and skips are forbidden";
-    }
-    GTEST_SKIP() << reason;
-}
-
 class PrivateNetwork {
   public:
-    // True when namespaces can be made here. Otherwise the test is to skip, which LA_FORBID_SKIPS=1 forbids.
+    // True when namespaces can be made here.
     static bool isAvailable() {
-        const pid_t child = fork();
-        if (child == 0) {
-            _exit(enter() && access("/proc/sys/net/ipv4", F_OK) == 0 ? 0 : 1);
-        }
-        int status = 1;
-        waitpid(child, &status, 0);
-        return status == 0 && hasProgram("ip");
+        Child child([] { return enter() && access("/proc/sys/net/ipv4", F_OK) == 0 ? 0 : 1; });
+        return child.wait() == 0 && std::system("command -v ip >/dev/null") == 0;
     }
 
     // The body's failures are the test's. Its process is the first one of its namespace.
     static void run(const std::function<void()>& body) {
-        std::fflush(nullptr);
-        const pid_t between = fork();
-        if (between == 0) {
+        const auto inside = [&body] {
             prctl(PR_SET_PDEATHSIG, SIGKILL);
-            if (!enter()) {
-                std::printf("cannot enter private namespaces\n");
-                std::fflush(nullptr);
-                _exit(2);
-            }
-            const pid_t child = fork();
-            if (child == 0) {
-                prctl(PR_SET_PDEATHSIG, SIGKILL);
-                mount("proc", "/proc", "proc", 0, nullptr);
-                shell("ip link set lo up");
-                body();
-                std::fflush(nullptr);
-                _exit(testing::Test::HasFailure() ? 1 : 0);
-            }
-            int status = 1;
-            waitpid(child, &status, 0);
-            _exit(WIFEXITED(status) ? WEXITSTATUS(status) : 3);
-        }
-        int status = 1;
-        waitpid(between, &status, 0);
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0)
-            << "the part of the test in its own namespaces failed, see above (" << status << ")";
+            mount("proc", "/proc", "proc", 0, nullptr);
+            shell("ip link set lo up");
+            body();
+            return testing::Test::HasFailure() ? 1 : 0;
+        };
+        const auto between = [&inside] {
+            prctl(PR_SET_PDEATHSIG, SIGKILL);
+            return enter() ? Child(inside).wait() : 2;
+        };
+        EXPECT_EQ(0, Child(between).wait())
+            << "the part of the test in its own namespaces failed, see above (2: it could not enter them)";
     }
 
   private:
@@ -124,7 +96,7 @@ class PrivateNetworkTest : public testing::Test {
     void SetUp() override {
         static const bool isAvailable = PrivateNetwork::isAvailable();
         if (!isAvailable) {
-            skip("needs user, network and mount namespaces, and ip");
+            LA_SKIP("needs user, network and mount namespaces, and ip");
         }
     }
 };

@@ -1,5 +1,5 @@
 // An agent that works on a made-up machine: a table of interfaces, each with one line that tells how it is.
-// It records what it is asked for, and can fail or "crash" (throw) at any of its steps.
+// It records what it is asked for, and can fail at any of it.
 #pragma once
 
 #include <chrono>
@@ -16,8 +16,6 @@
 
 namespace testing_support {
 
-struct Crash {};
-
 class RecordingAgent : public platform::apply::Agent {
   public:
     explicit RecordingAgent(std::string name = "recording") : name_(std::move(name)) {}
@@ -30,7 +28,6 @@ class RecordingAgent : public platform::apply::Agent {
     std::set<std::string> foreign;               // interfaces that are left alone
     int slow = 0;                                // how often settle has to be asked once more
     double seconds = 0;                          // that the last start was given
-    int crashAt = -1;  // throws at that step: each change has one before and one behind it
 
     [[nodiscard]] std::string_view name() const noexcept override { return name_; }
 
@@ -40,36 +37,30 @@ class RecordingAgent : public platform::apply::Agent {
         std::string call = "capture";
         for (const std::string& interface : interfaces) {
             call += " " + interface;
-        }
-        platform::Outcome done = begin(call);
-        for (const std::string& interface : interfaces) {
-            if (!done.ok() || machine.count(interface) == 0) {
-                continue;
-            }
-            if (foreign.count(interface) != 0) {
+            if (foreign.contains(interface)) {
                 leftAlone.push_back({interface, "it is somebody else's"});
-                continue;
+            } else if (machine.contains(interface)) {
+                platform::apply::DictionaryBuilder state;
+                captured.push_back({interface, state.setText(CFSTR("State"), machine[interface]).take()});
             }
-            platform::apply::DictionaryBuilder state;
-            state.setText(CFSTR("State"), machine[interface]);
-            captured.push_back({interface, state.take()});
         }
-        return done;
+        return begin(call);
     }
 
     void start(std::span<platform::apply::Task> tasks, platform::apply::Clock::time_point deadline) override {
-        const auto left = deadline - platform::apply::Clock::now();
-        seconds = std::chrono::duration_cast<std::chrono::duration<double>>(left).count();
+        seconds = std::chrono::duration<double>(deadline - platform::apply::Clock::now()).count();
         for (platform::apply::Task& task : tasks) {
             const std::string& interface = task.before->interface;
             const std::string call = (task.plan != nullptr ? "takeOver " : "giveBack ") + interface;
             task.refusal = begin(call);
-            task.trouble = troubled.count(call) != 0 ? call + " met trouble" : "";
-            if (task.refusal.ok() && machine.count(interface) != 0) {
-                change(interface,
-                       task.plan != nullptr
-                           ? "ours: " + describe(*task.plan)
-                           : platform::apply::textIn(task.before->state.get(), CFSTR("State")).value_or("?"));
+            task.trouble = troubled.contains(call) ? call + " met trouble" : "";
+            if (task.refusal.ok() && machine.contains(interface)) {
+                const auto before = platform::apply::textIn(task.before->state.get(), CFSTR("State"));
+                const std::string wanted = task.plan != nullptr ? describe(*task.plan) : before.value_or("?");
+                const std::string now = std::exchange(machine[interface], wanted);
+                if (now != wanted) {
+                    changes.push_back(interface + ": " + now + " -> " + wanted);
+                }
             }
         }
         unsettled_ = slow;
@@ -80,35 +71,17 @@ class RecordingAgent : public platform::apply::Agent {
         return unsettled_-- <= 0;
     }
 
-    static std::string describe(const platform::apply::InterfacePlan& plan) {
-        if (!plan.active) {
-            return "off";
-        }
-        static constexpr const char* methods[] = {"none", "manual", "dhcp"};
-        return std::string(methods[static_cast<int>(plan.method)]) + " " + std::to_string(plan.rank);
-    }
-
   private:
+    static std::string describe(const platform::apply::InterfacePlan& plan) {
+        static constexpr const char* methods[] = {"none ", "manual ", "dhcp "};
+        return plan.active ? std::string("ours: ") + methods[static_cast<int>(plan.method)] +
+                                 std::to_string(plan.rank)
+                           : "ours: off";
+    }
     platform::Outcome begin(const std::string& call) {
-        step();
         calls.push_back(call);
-        if (failing.count(call) != 0) {
-            return {kSCStatusFailed, call + " was told to fail"};
-        }
-        return {};
-    }
-    void change(const std::string& interface, const std::string& state) {
-        std::string& now = machine[interface];
-        if (now != state) {
-            changes.push_back(interface + ": " + now + " -> " + state);
-            now = state;
-        }
-        step();
-    }
-    void step() {
-        if (crashAt >= 0 && crashAt-- == 0) {
-            throw Crash();
-        }
+        return failing.contains(call) ? platform::Outcome(kSCStatusFailed, call + " was told to fail")
+                                      : platform::Outcome();
     }
 
     std::string name_;
