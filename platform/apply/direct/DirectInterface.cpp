@@ -3,7 +3,6 @@
 #include <sys/socket.h>
 
 #include <algorithm>
-#include <ctime>
 
 #include "platform/apply/Radio.h"
 #include "platform/apply/direct/DhcpClient.h"
@@ -17,12 +16,6 @@ namespace {
 
 // What is left at least to an address whose own DHCP client renews it.
 constexpr std::uint32_t shortestLife = 60;
-
-std::int64_t secondsSinceStart() {
-    timespec now{};
-    ::clock_gettime(CLOCK_BOOTTIME, &now);
-    return now.tv_sec;
-}
 
 // Does what follows even when something failed, and keeps the first failure.
 class Steps {

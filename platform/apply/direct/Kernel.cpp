@@ -1,6 +1,5 @@
 #include "platform/apply/direct/Kernel.h"
 
-#include <arpa/inet.h>
 #include <linux/if_addr.h>
 #include <linux/neighbour.h>
 #include <net/if.h>
@@ -9,95 +8,19 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <ctime>
-#include <map>
+#include <iterator>
 #include <thread>
 #include <utility>
 
 namespace platform::apply {
 namespace {
 
-using netlink::Attribute;
-using netlink::Attributes;
 using netlink::Bytes;
-using netlink::ByteView;
 using netlink::Message;
-using netlink::MessageView;
 using netlink::OwnedMessage;
 
-// Not in every distribution's kernel headers yet.
-constexpr std::uint16_t addressProtocol = 11;  // IFA_PROTO
-constexpr std::uint8_t lastKernelProtocol = 3;
-
-constexpr int ticksPerSecond = 100;  // USER_HZ, of RTA_CACHEINFO
 constexpr std::chrono::milliseconds confirmationTime{3000};
 constexpr std::chrono::milliseconds lookAgain{50};
-
-constexpr std::uint32_t lastingAddressFlags =
-    IFA_F_NODAD | IFA_F_HOMEADDRESS | IFA_F_MANAGETEMPADDR | IFA_F_NOPREFIXROUTE | IFA_F_MCAUTOJOIN;
-
-// Attributes by type, so that the order in which the kernel lists them does not count.
-using AttributeMap = std::map<std::uint16_t, Bytes>;
-
-AttributeMap mapOf(const Attributes& attributes) {
-    AttributeMap map;
-    for (const Attribute& attribute : attributes) {
-        map[attribute.type] = Bytes(attribute.payload.begin(), attribute.payload.end());
-    }
-    return map;
-}
-
-template <class T>
-Bytes ownBytes(const T& value) {
-    const ByteView view = netlink::bytesOf(value);
-    return {view.begin(), view.end()};
-}
-
-template <class Family>
-Bytes encodeKey(const Family& family, const AttributeMap& attributes) {
-    Message message(0, 0, family);
-    for (const auto& [type, payload] : attributes) {
-        message.add(type, payload);
-    }
-    return {message.payload().begin(), message.payload().end()};
-}
-
-template <class Family>
-Attributes attributesOf(const Bytes& key) {
-    return MessageView({}, key).attributes<Family>();
-}
-
-// Calls `each` with the hops of a multipath route; what `each` changes is written back.
-template <class Each>
-void forEachHop(Bytes& hops, const Each& each) {
-    std::size_t offset = 0;
-    while (offset + sizeof(rtnexthop) <= hops.size()) {
-        rtnexthop hop{};
-        std::memcpy(&hop, hops.data() + offset, sizeof hop);
-        if (hop.rtnh_len < sizeof hop || hop.rtnh_len > hops.size() - offset) {
-            return;
-        }
-        each(hop);
-        std::memcpy(hops.data() + offset, &hop, sizeof hop);
-        offset += RTNH_ALIGN(hop.rtnh_len);
-    }
-}
-
-// The place that a route leads to and how good it is: routes that agree in it are tried in the order of the
-// list.
-Bytes placeOf(const MessageView& message) {
-    auto header = message.family<rtmsg>().value_or(rtmsg{});
-    const Attributes attributes = message.attributes<rtmsg>();
-    header.rtm_protocol = header.rtm_scope = header.rtm_type = 0;
-    header.rtm_flags = 0;
-    AttributeMap kept;
-    for (const Attribute& attribute : attributes) {
-        if (attribute.type == RTA_TABLE || attribute.type == RTA_DST || attribute.type == RTA_PRIORITY) {
-            kept[attribute.type] = Bytes(attribute.payload.begin(), attribute.payload.end());
-        }
-    }
-    return encodeKey(header, kept);
-}
 
 bool isConnected(const Route& route) {
     return route.family() == AF_INET && route.protocol() == RTPROT_KERNEL;
@@ -117,221 +40,7 @@ std::vector<Address> ofFamily(const std::vector<Address>& list, int family) {
     return result;
 }
 
-// The message for a kept address or route, with the interface's index of now in place of 0.
-Message requestFor(std::uint16_t type, std::uint16_t flags, const Address& address, const Link& link) {
-    auto header = netlink::valueFrom<ifaddrmsg>(address.key).value_or(ifaddrmsg{});
-    header.ifa_index = static_cast<unsigned>(link.index);
-    Message message(type, static_cast<std::uint16_t>(NLM_F_REQUEST | NLM_F_ACK | flags), header);
-    for (const Attribute& attribute : attributesOf<ifaddrmsg>(address.key)) {
-        message.add(attribute.type, attribute.payload);
-    }
-    return message;
-}
-
-Message requestFor(std::uint16_t type, std::uint16_t flags, const Route& route, const Link& link) {
-    const auto header = netlink::valueFrom<rtmsg>(route.key).value_or(rtmsg{});
-    Message message(type, static_cast<std::uint16_t>(NLM_F_REQUEST | NLM_F_ACK | flags), header);
-    const auto index = static_cast<std::uint32_t>(link.index);
-    for (const Attribute& attribute : attributesOf<rtmsg>(route.key)) {
-        if (attribute.type == RTA_OIF && attribute.u32() == 0U) {
-            message.addValue(RTA_OIF, index);
-        } else if (attribute.type == RTA_MULTIPATH) {
-            Bytes hops(attribute.payload.begin(), attribute.payload.end());
-            forEachHop(hops, [&link](rtnexthop& hop) {
-                hop.rtnh_ifindex = hop.rtnh_ifindex == 0 ? link.index : hop.rtnh_ifindex;
-            });
-            message.add(RTA_MULTIPATH, hops);
-        } else {
-            message.add(attribute.type, attribute.payload);
-        }
-    }
-    return message;
-}
-
-// The kernel takes no IPv6 address for a route's source before the network has confirmed that nobody else has
-// it, which takes a second or two with a carrier.
-bool needsConfirmedSource(const Route& route) {
-    return route.family() == AF_INET6 && attributesOf<rtmsg>(route.key).find(RTA_PREFSRC);
-}
-
-std::int64_t secondsSinceStart() {
-    timespec now{};
-    ::clock_gettime(CLOCK_BOOTTIME, &now);
-    return now.tv_sec;
-}
-
-std::uint32_t maskOf(unsigned prefixLength) {
-    return prefixLength == 0 ? 0 : htonl(0xFFFFFFFFU << (32U - std::min(prefixLength, 32U)));
-}
-
 }  // namespace
-
-int Address::family() const noexcept {
-    return netlink::valueFrom<ifaddrmsg>(key).value_or(ifaddrmsg{}).ifa_family;
-}
-
-std::uint8_t Address::scope() const noexcept {
-    return netlink::valueFrom<ifaddrmsg>(key).value_or(ifaddrmsg{}).ifa_scope;
-}
-
-int Route::family() const noexcept {
-    return netlink::valueFrom<rtmsg>(key).value_or(rtmsg{}).rtm_family;
-}
-
-std::uint8_t Route::protocol() const noexcept {
-    return netlink::valueFrom<rtmsg>(key).value_or(rtmsg{}).rtm_protocol;
-}
-
-bool Route::hasGateway() const noexcept {
-    const Attributes attributes = attributesOf<rtmsg>(key);
-    return attributes.find(RTA_GATEWAY) || attributes.find(RTA_VIA) || attributes.find(RTA_MULTIPATH);
-}
-
-std::optional<Address> decodeAddress(const MessageView& message, int index) {
-    auto header = message.family<ifaddrmsg>();
-    if (message.type() != RTM_NEWADDR || !header || static_cast<int>(header->ifa_index) != index ||
-        (header->ifa_family != AF_INET && header->ifa_family != AF_INET6)) {
-        return std::nullopt;
-    }
-    AttributeMap attributes = mapOf(message.attributes<ifaddrmsg>());
-    const Attributes all = message.attributes<ifaddrmsg>();
-    const std::uint32_t flags = all.u32(IFA_FLAGS).value_or(header->ifa_flags);
-    Address address;
-    if (const auto protocol = all.find(addressProtocol)) {
-        address.protocol = protocol->u8().value_or(0);
-    }
-    if (const auto times = all.find(IFA_CACHEINFO)) {
-        const auto cache = netlink::valueFrom<ifa_cacheinfo>(times->payload).value_or(ifa_cacheinfo{});
-        address.valid = cache.ifa_valid;
-        // Of a lasting IPv4 address only the flag says that no new connection is to use it.
-        address.preferred = (flags & IFA_F_DEPRECATED) != 0 ? 0 : cache.ifa_prefered;
-    }
-    const bool fromKernel = address.protocol != 0 && address.protocol <= lastKernelProtocol;
-    const bool advertised = (flags & IFA_F_PERMANENT) == 0 &&
-                            (flags & (IFA_F_TEMPORARY | IFA_F_MANAGETEMPADDR | IFA_F_STABLE_PRIVACY)) != 0;
-    address.isKernelManaged = header->ifa_family == AF_INET6 && (fromKernel || advertised);
-
-    attributes.erase(IFA_CACHEINFO);
-    attributes.erase(addressProtocol);
-    attributes[IFA_FLAGS] = ownBytes(flags & lastingAddressFlags);
-    header->ifa_index = 0;
-    header->ifa_flags = 0;
-    address.key = encodeKey(*header, attributes);
-    return address;
-}
-
-std::optional<Route> decodeRoute(const MessageView& message, int index,
-                                 const std::vector<Address>& addresses) {
-    auto header = message.family<rtmsg>();
-    if (message.type() != RTM_NEWROUTE || !header || (header->rtm_flags & RTM_F_CLONED) != 0 ||
-        (header->rtm_family != AF_INET && header->rtm_family != AF_INET6)) {
-        return std::nullopt;
-    }
-    const Attributes all = message.attributes<rtmsg>();
-    if (all.u32(RTA_TABLE).value_or(header->rtm_table) == RT_TABLE_LOCAL) {
-        return std::nullopt;
-    }
-    AttributeMap attributes = mapOf(all);
-    Route route;
-    bool isOurs = all.u32(RTA_OIF).value_or(0) == static_cast<std::uint32_t>(index);
-    if (isOurs) {
-        attributes[RTA_OIF] = ownBytes(std::uint32_t{0});
-    }
-    if (const auto hops = attributes.find(RTA_MULTIPATH); hops != attributes.end()) {
-        forEachHop(hops->second, [&isOurs, &route, index](rtnexthop& hop) {
-            // Whether a hop is dead or offloaded now is not the route's own.
-            hop.rtnh_flags = static_cast<unsigned char>(hop.rtnh_flags & RTNH_F_ONLINK);
-            (hop.rtnh_ifindex == index ? isOurs : route.isShared) = true;
-            hop.rtnh_ifindex = hop.rtnh_ifindex == index ? 0 : hop.rtnh_ifindex;
-        });
-    }
-    if (const auto source = attributes.find(RTA_PREFSRC); source != attributes.end() && !isOurs) {
-        // The kernel drops such a route together with the address.
-        isOurs = std::any_of(addresses.begin(), addresses.end(), [&source](const Address& address) {
-            const auto local = attributesOf<ifaddrmsg>(address.key).find(IFA_LOCAL);
-            return local && std::equal(local->payload.begin(), local->payload.end(), source->second.begin(),
-                                       source->second.end());
-        });
-        route.isShared = route.isElsewhere = isOurs;
-    } else if (source != attributes.end() && header->rtm_family == AF_INET6) {
-        route.isShared = true;
-    }
-    if (!isOurs) {
-        return std::nullopt;
-    }
-    if (attributes.count(RTA_NH_ID) != 0) {
-        route.isShared = true;
-        // A route by next-hop object may not repeat what the object says.
-        for (const std::uint16_t type : {RTA_OIF, RTA_GATEWAY, RTA_VIA, RTA_MULTIPATH}) {
-            attributes.erase(type);
-        }
-    }
-    if (const auto times = all.find(RTA_CACHEINFO); times && header->rtm_family == AF_INET6) {
-        const auto cache = netlink::valueFrom<rta_cacheinfo>(times->payload).value_or(rta_cacheinfo{});
-        route.endsAt = cache.rta_expires == 0
-                           ? 0
-                           : secondsSinceStart() + std::max(cache.rta_expires, 0) / ticksPerSecond;
-    }
-    attributes.erase(RTA_CACHEINFO);
-    header->rtm_flags &= RTNH_F_ONLINK;
-    route.isKernelManaged = header->rtm_family == AF_INET6 &&
-                            (header->rtm_protocol == RTPROT_KERNEL || header->rtm_protocol == RTPROT_RA);
-    route.key = encodeKey(*header, attributes);
-    return route;
-}
-
-Address makeAddress(const std::string& interface, const ManualAddress& address) {
-    ifaddrmsg header{};
-    header.ifa_family = AF_INET;
-    header.ifa_prefixlen = static_cast<std::uint8_t>(address.prefixLength);
-    header.ifa_scope = RT_SCOPE_UNIVERSE;
-    AttributeMap attributes;
-    attributes[IFA_ADDRESS] = ownBytes(address.address);
-    attributes[IFA_LOCAL] = ownBytes(address.address);
-    attributes[IFA_FLAGS] = ownBytes(std::uint32_t{0});
-    if (address.prefixLength < 31) {
-        attributes[IFA_BROADCAST] = ownBytes(IPv4Address{address.address | ~maskOf(address.prefixLength)});
-    }
-    Bytes label(interface.size() + 1);
-    std::memcpy(label.data(), interface.data(), interface.size());
-    attributes[IFA_LABEL] = label;
-    return {encodeKey(header, attributes)};
-}
-
-std::vector<Route> makeDefaultRoute(IPv4Address router, unsigned metric,
-                                    const std::vector<ManualAddress>& addresses) {
-    std::vector<Route> routes;
-    if (router == 0 || addresses.empty()) {
-        return routes;
-    }
-    rtmsg header{};
-    header.rtm_family = AF_INET;
-    header.rtm_table = RT_TABLE_MAIN;
-    header.rtm_protocol = ourRouteProtocol;
-    header.rtm_type = RTN_UNICAST;
-    AttributeMap attributes;
-    attributes[RTA_TABLE] = ownBytes(std::uint32_t{RT_TABLE_MAIN});
-    attributes[RTA_OIF] = ownBytes(std::uint32_t{0});
-    if (metric != 0) {
-        attributes[RTA_PRIORITY] = ownBytes(std::uint32_t{metric});
-    }
-    const bool isNear =
-        std::any_of(addresses.begin(), addresses.end(), [router](const ManualAddress& address) {
-            return ((address.address ^ router) & maskOf(address.prefixLength)) == 0;
-        });
-    if (!isNear) {
-        rtmsg toRouter = header;
-        toRouter.rtm_dst_len = 32;
-        toRouter.rtm_scope = RT_SCOPE_LINK;
-        AttributeMap way = attributes;
-        way[RTA_DST] = ownBytes(router);
-        routes.push_back({encodeKey(toRouter, way)});
-    }
-    header.rtm_scope = RT_SCOPE_UNIVERSE;
-    attributes[RTA_GATEWAY] = ownBytes(router);
-    routes.push_back({encodeKey(header, attributes)});
-    return routes;
-}
 
 Outcome Kernel::setUp(const Link& link, bool up) {
     ifinfomsg header{};

@@ -9,6 +9,7 @@
 #include <string_view>
 
 #include "platform/apply/StateFile.h"
+#include "platform/apply/direct/Kernel.h"
 #include "platform/base/Log.h"
 
 namespace platform::apply {

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "platform/apply/Plan.h"
-#include "platform/apply/direct/Kernel.h"
+#include "platform/apply/direct/Addressing.h"
 #include "platform/apply/direct/NameServers.h"
 #include "platform/base/Outcome.h"
 

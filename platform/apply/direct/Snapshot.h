@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "platform/apply/Plan.h"
-#include "platform/apply/direct/Kernel.h"
+#include "platform/apply/direct/Addressing.h"
 #include "platform/apply/direct/OtherDaemons.h"
 #include "platform/apply/direct/Supplicant.h"
 #include "platform/apply/direct/WirelessCard.h"
