@@ -12,10 +12,12 @@
 
 #include "platform/CoreFoundation.h"
 
+LA_BEGIN_DECLARATIONS
+
 // A key on the path is absent; when removing, also the last one.
-inline constexpr OSStatus kCFQPathKeyMissingErr = 5400;
+LA_CONSTANT(OSStatus, kCFQPathKeyMissingErr, 5400);
 // A value on the path, before its last key, is null or no dictionary.
-inline constexpr OSStatus kCFQPathNotDictionaryErr = 5401;
+LA_CONSTANT(OSStatus, kCFQPathNotDictionaryErr, 5401);
 
 // --- Retain and release ---
 
@@ -71,9 +73,9 @@ OSStatus CFQDictionaryRemoveValueAtPathArray(CFMutableDictionaryRef dict, CFArra
 
 // --- Walks ---
 
-using CFQPropertyListDeepApplierFunction = void (*)(CFPropertyListRef node, void* context);
+typedef void (*CFQPropertyListDeepApplierFunction)(CFPropertyListRef node, void* context);
 // key is a dictionary's key or, for an array, a number that holds the index; it may not outlive the call.
-using CFQPropertyListShallowApplierFunction = void (*)(CFTypeRef key, CFPropertyListRef node, void* context);
+typedef void (*CFQPropertyListShallowApplierFunction)(CFTypeRef key, CFPropertyListRef node, void* context);
 
 // Calls func with the node itself, then with everything inside, each container before its content: a
 // dictionary's values in its order (never its keys), an array's elements by index. func may change the
@@ -87,3 +89,5 @@ void CFQPropertyListShallowApplyFunction(CFPropertyListRef propList,
                                          CFQPropertyListShallowApplierFunction func, void* context);
 // Whether the node is neither a dictionary nor an array. An empty container is no leaf.
 Boolean CFQPropertyListIsLeaf(CFPropertyListRef node);
+
+LA_END_DECLARATIONS

@@ -55,6 +55,8 @@
 #include "platform/CoreFoundation.h"
 #include "platform/SystemConfiguration.h"
 
+LA_BEGIN_DECLARATIONS
+
 // --- Session ---
 
 // Begins one use of the session, opening it when none is open. lockThePrefs takes the store's lock against
@@ -72,9 +74,9 @@ void MoreSCClose(OSStatus* err, Boolean dirty);
 // Always 0.
 OSStatus MoreSCSetClient(CFStringRef clientName);
 // The name as it was set, borrowed; null when none was.
-CFStringRef MoreSCGetClient();
+CFStringRef MoreSCGetClient(void);
 // The open session, borrowed; null when none is open.
-SCPreferencesRef MoreSCGetSCPreferencesRef();
+SCPreferencesRef MoreSCGetSCPreferencesRef(void);
 
 // The status of the store's last call, for a call that reports failure by false (null): 0 when mustBeTrue
 // (the value is not null), else what SCError gives, or 1001 when that is 0.
@@ -203,3 +205,5 @@ OSStatus MoreSCIsEntityActive(CFStringRef setID, CFStringRef serviceID, CFString
 // Changes and marks nothing when the entity already is so.
 OSStatus MoreSCSetEntityActive(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
                                Boolean active);
+
+LA_END_DECLARATIONS

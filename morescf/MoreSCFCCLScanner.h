@@ -3,6 +3,8 @@
 
 #include "platform/CoreFoundation.h"
 
+LA_BEGIN_DECLARATIONS
+
 // The names of the scripts in the modem-script folders of the user, the network, the computer and the system,
 // as a new array of strings: sorted without regard to case and with numbers by value ("Modem 9" before
 // "Modem 10"), each name once; names that differ in case are different. A folder that is not there, or
@@ -14,3 +16,5 @@
 // -108 without memory, -4960 when a value cannot be made, or the status of the folder that cannot be read.
 // The array is then null and the index untouched.
 OSStatus MoreSCCreateCCLArray(CFArrayRef* result, CFIndex* indexOfDefaultCCL);
+
+LA_END_DECLARATIONS

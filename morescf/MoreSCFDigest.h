@@ -16,20 +16,22 @@
 
 #include "platform/CoreFoundation.h"
 
+LA_BEGIN_DECLARATIONS
+
 // "Interface": the port that a service runs on.
-struct MoreSCInterfaceDigest {
+typedef struct MoreSCInterfaceDigest {
     CFStringRef deviceName;       // "DeviceName", required: the device's name, as "en0"
     CFStringRef hardware;         // "Hardware", required: "Ethernet", "AirPort" or "Modem"
     CFStringRef variant;          // "HardwareVariant"
     CFStringRef type;             // "Type", required: "Ethernet" or "PPP"
     CFStringRef subType;          // "SubType"
     CFStringRef userDefinedName;  // "UserDefinedName", required: the port's name as the user sees it
-};
+} MoreSCInterfaceDigest;
 
 // "Proxies": "ExceptionsList", "FTPPassive" and, for each of FTP, Gopher, HTTP, HTTPS, RTSP and SOCKS, a flag
 // ("FTPEnable", always there), a host ("FTPProxy") and a port ("FTPPort", left out when 0).
 // NOLINTNEXTLINE(clang-analyzer-optin.performance.Padding): callers rely on the order of the members.
-struct MoreSCProxiesDigest {
+typedef struct MoreSCProxiesDigest {
     CFArrayRef exceptionsList;  // strings: hosts that are reached without a proxy
     Boolean ftpPassive;
     Boolean ftpEnable;
@@ -50,38 +52,38 @@ struct MoreSCProxiesDigest {
     Boolean socksEnable;
     CFStringRef socksProxy;
     UInt16 socksPort;
-};
+} MoreSCProxiesDigest;
 
 // "AppleTalk"
-struct MoreSCAppleTalkDigest {
+typedef struct MoreSCAppleTalkDigest {
     Boolean active;            // false: "__INACTIVE__" = 1
     CFStringRef configMethod;  // "ConfigMethod", required, as "Node"
     Boolean manual;            // the next two are given by hand; else they are left out
     UInt16 networkID;          // "NetworkID"
     UInt8 nodeID;              // "NodeID"
     CFStringRef defaultZone;   // "DefaultZone"
-};
+} MoreSCAppleTalkDigest;
 
 // "DNS"; all zeros make an empty dictionary.
-struct MoreSCDNSDigest {
+typedef struct MoreSCDNSDigest {
     UInt32 serverAddressesCount;
-    const in_addr* serverAddresses;  // "ServerAddresses", an array of dotted quads
+    const struct in_addr* serverAddresses;  // "ServerAddresses", an array of dotted quads
     UInt32 searchDomainsCount;
     const CFStringRef* searchDomains;  // "SearchDomains", an array; none of them null
-};
+} MoreSCDNSDigest;
 
 // "IPv4"; an address of 0 is absent.
-struct MoreSCIPv4Digest {
-    CFStringRef configMethod;  // "ConfigMethod", required: "DHCP", "Manual" or "PPP"
-    in_addr address;           // "Addresses", an array of one
-    in_addr subnetMask;        // "SubnetMasks", an array of one
-    in_addr router;            // "Router", a string, not an array
-    CFStringRef clientID;      // "DHCPClientID"
-};
+typedef struct MoreSCIPv4Digest {
+    CFStringRef configMethod;   // "ConfigMethod", required: "DHCP", "Manual" or "PPP"
+    struct in_addr address;     // "Addresses", an array of one
+    struct in_addr subnetMask;  // "SubnetMasks", an array of one
+    struct in_addr router;      // "Router", a string, not an array
+    CFStringRef clientID;       // "DHCPClientID"
+} MoreSCIPv4Digest;
 
 // How a dial-up or PPPoE connection behaves; each is stored under its own name with a capital letter
 // ("DialOnDemand", "LCPEchoEnabled", "IPCPCompressionVJ"). Times are in seconds.
-struct MoreSCPPPOptions {
+typedef struct MoreSCPPPOptions {
     Boolean dialOnDemand;
     Boolean idleReminder;
     SInt32 idleReminderTimer;
@@ -95,11 +97,11 @@ struct MoreSCPPPOptions {
     Boolean ipcpCompressionVJ;  // Van Jacobson's header compression
     Boolean commDisplayTerminalWindow;
     Boolean verboseLogging;
-};
+} MoreSCPPPOptions;
 
 // "PPP"; besides what stands here the entity holds "Logfile" = "/tmp/ppp.log", "LCPEchoInterval" = 10,
 // "LCPEchoFailure" = 4 (3 on systems before 10.2) and, from 10.2 on, "CommUseTerminalScript" = 0.
-struct MoreSCPPPDigest {
+typedef struct MoreSCPPPDigest {
     Boolean active;                          // false: "__INACTIVE__" = 1
     CFStringRef userDefinedName;             // "UserDefinedName"
     CFStringRef authName;                    // "AuthName": the account
@@ -107,31 +109,31 @@ struct MoreSCPPPDigest {
     CFStringRef commRemoteAddress;           // "CommRemoteAddress": telephone number or server
     CFStringRef commAlternateRemoteAddress;  // "CommAlternateRemoteAddress"
     const MoreSCPPPOptions* options;         // null: MoreSCGetDefaultPPPOptions(false)
-};
+} MoreSCPPPDigest;
 
 // "AirPort"
-struct MoreSCAirPortDigest {
+typedef struct MoreSCAirPortDigest {
     UInt8 macAddress[6];           // "MACAddress"
     CFStringRef preferredNetwork;  // "PreferredNetwork": the network to join
-};
+} MoreSCAirPortDigest;
 
 // "Ethernet"
-struct MoreSCEthernetDigest {
+typedef struct MoreSCEthernetDigest {
     UInt8 macAddress[6];  // "MACAddress"
-};
+} MoreSCEthernetDigest;
 
 // "Modem"
-struct MoreSCModemDigest {
+typedef struct MoreSCModemDigest {
     CFStringRef connectionScript;            // "ConnectionScript", required: a name of MoreSCFCCLScanner.h
     Boolean dataCompressionErrorCorrection;  // both "DataCompression" and "ErrorCorrection"
     Boolean speaker;                         // "Speaker"
     Boolean pulseDial;                       // "PulseDial"
     Boolean waitForDialTone;                 // "DialMode": "WaitForDialTone", else "IgnoreDialTone"
-};
+} MoreSCModemDigest;
 
 // For callers that learn the protocol at run time. Zero it whole (memset: an initializer of {} reaches only
 // the first member), then fill the member of the protocol.
-union MoreSCDigest {
+typedef union MoreSCDigest {
     MoreSCInterfaceDigest interface;
     MoreSCProxiesDigest proxies;
     MoreSCAppleTalkDigest appleTalk;
@@ -141,19 +143,19 @@ union MoreSCDigest {
     MoreSCAirPortDigest airPort;
     MoreSCEthernetDigest ethernet;
     MoreSCModemDigest modem;
-};
+} MoreSCDigest;
 
 // The digests of a location's global entities; nothing in them is read yet.
-struct MoreSCIPv4GlobalDigest {
+typedef struct MoreSCIPv4GlobalDigest {
     UInt32 dummy;
-};
-struct MoreSCNetInfoGlobalDigest {
+} MoreSCIPv4GlobalDigest;
+typedef struct MoreSCNetInfoGlobalDigest {
     UInt32 dummy;
-};
-union MoreSCGlobalDigest {
+} MoreSCNetInfoGlobalDigest;
+typedef union MoreSCGlobalDigest {
     MoreSCIPv4GlobalDigest ipv4;
     MoreSCNetInfoGlobalDigest netInfo;
-};
+} MoreSCGlobalDigest;
 
 // --- Builders ---
 
@@ -191,9 +193,10 @@ OSStatus MoreSCFCreateStringWithMacAddress(const UInt8 macAddr[6], CFStringRef* 
 // hold six bytes, -50 for a null string; the output is then untouched.
 OSStatus MoreSCFStringToMacAddress(CFStringRef str, UInt8 macAddr[6]);
 // The address in network byte order as a dotted quad.
-OSStatus MoreSCFCreateStringWithInetAddress(in_addr addr, CFStringRef* result);
+OSStatus MoreSCFCreateStringWithInetAddress(struct in_addr addr, CFStringRef* result);
 // The same for several, as an array; none gives an empty one.
-OSStatus MoreSCFCreateArrayWithInetAddresses(CFIndex count, const in_addr* addresses, CFArrayRef* result);
+OSStatus MoreSCFCreateArrayWithInetAddresses(CFIndex count, const struct in_addr* addresses,
+                                             CFArrayRef* result);
 // A password as it is stored under "AuthPassword": its UTF-16 code units, each as two bytes with the higher
 // one first, and nothing else. -50 for a null password, -108 without memory for the copy.
 OSStatus MoreSCFCopyEncodedPPPPassword(CFStringRef password, CFDataRef* encodedPassword);
@@ -210,3 +213,5 @@ extern const MoreSCModemDigest kMoreSCModemDigestDefault;
 // PPPoE, before it one for both; a version that cannot be had counts as an old one. Never null, never to be
 // freed.
 const MoreSCPPPOptions* MoreSCGetDefaultPPPOptions(Boolean isPPPoE);
+
+LA_END_DECLARATIONS

@@ -5,6 +5,8 @@
 #include "morescf/MoreSCFDigest.h"
 #include "platform/CoreFoundation.h"
 
+LA_BEGIN_DECLARATIONS
+
 // Whether a service of the location that is on has an "AppleTalk" entity that is on. *active is false on
 // failure. A service that is on and has no such entity fails the question with 1004, unless one before it
 // answered it.
@@ -36,3 +38,5 @@ OSStatus MoreSCMakeNewDialupSet(CFStringRef modemBSDName, CFStringRef userVisibl
                                 const MoreSCModemDigest* modemDigest, const MoreSCPPPDigest* pppDigest,
                                 const MoreSCIPv4Digest* ipv4Digest, const MoreSCDNSDigest* dnsDigest,
                                 CFStringRef* newSetID);
+
+LA_END_DECLARATIONS

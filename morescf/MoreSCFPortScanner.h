@@ -19,6 +19,8 @@
 #include "platform/CoreFoundation.h"
 #include "platform/IOKit.h"
 
+LA_BEGIN_DECLARATIONS
+
 // All ports as a new array, by "SortOrder" and then by name, equal ones as the registry gives them; empty
 // when there is none. The first port that cannot be described fails the whole call: -1 for a property that is
 // required, -4960 for a value that cannot be made, the registry's status, or the hook's. The output is then
@@ -31,7 +33,9 @@ OSStatus MoreSCCreatePortArray(CFArrayRef* portArray);
 // Its status replaces that of the rules. In the name the first "%1$@" stands for "BSD Name" in the port's
 // dictionary, "%2$@" for "AAPL,slot-name", "%3$@" for "IOChildIndex" and "%4$@" for "IOTTYBaseName"; one that
 // is not there reads "unknown".
-using MoreSCFPortNameCallback = OSStatus (*)(io_object_t port, CFMutableDictionaryRef portDict,
-                                             CFStringRef proposedName, CFStringRef* baseName);
+typedef OSStatus (*MoreSCFPortNameCallback)(io_object_t port, CFMutableDictionaryRef portDict,
+                                            CFStringRef proposedName, CFStringRef* baseName);
 // Installs a hook in place of any other, for all scans to come; null removes it.
 void MoreSCFSetPortNameCallback(MoreSCFPortNameCallback callback);
+
+LA_END_DECLARATIONS

@@ -3,55 +3,54 @@
 
 #include "platform/CoreFoundation.h"
 
-inline constexpr OSErr noErr = 0;
-inline constexpr OSErr paramErr = -50;
-inline constexpr OSErr memFullErr = -108;
-inline constexpr OSErr fnfErr = -43;  // no such folder or file
-inline constexpr OSErr ioErr = -36;
-inline constexpr OSErr permErr = -54;
-inline constexpr OSErr coreFoundationUnknownErr = -4960;
+LA_BEGIN_DECLARATIONS
+
+LA_CONSTANT(OSErr, noErr, 0);
+LA_CONSTANT(OSErr, paramErr, -50);
+LA_CONSTANT(OSErr, memFullErr, -108);
+LA_CONSTANT(OSErr, fnfErr, -43);  // no such folder or file
+LA_CONSTANT(OSErr, ioErr, -36);
+LA_CONSTANT(OSErr, permErr, -54);
+LA_CONSTANT(OSErr, coreFoundationUnknownErr, -4960);
 
 // --- System version ---
 
-inline constexpr OSType gestaltSystemVersion = 0x73797376;  // 'sysv'
-inline constexpr OSErr gestaltUndefSelectorErr = -5551;     // no such question, or no answer to it
+LA_CONSTANT(OSType, gestaltSystemVersion, 0x73797376);  // 'sysv'
+LA_CONSTANT(OSErr, gestaltUndefSelectorErr, -5551);     // no such question, or no answer to it
 // For gestaltSystemVersion a BCD number: 0x1020 is 10.2.0. The response is untouched on failure.
-OSErr Gestalt(OSType selector, SInt32* response) noexcept;
+OSErr Gestalt(OSType selector, SInt32* response) LA_NOEXCEPT;
 
 // --- Folders ---
 
 // Names a file or folder for as long as the process lives.
-struct FSRef {
+typedef struct FSRef {
     UInt8 hidden[80];
-};
-static_assert(sizeof(FSRef) == 80);
+} FSRef;
 
 // A name as UTF-16 code units in host byte order.
-struct HFSUniStr255 {
+typedef struct HFSUniStr255 {
     UInt16 length;
     UniChar unicode[255];
-};
-static_assert(sizeof(HFSUniStr255) == 512);
+} HFSUniStr255;
 
-inline constexpr SInt16 kUserDomain = -32763;
-inline constexpr SInt16 kNetworkDomain = -32764;
-inline constexpr SInt16 kLocalDomain = -32765;
-inline constexpr SInt16 kSystemDomain = -32766;
-inline constexpr OSType kModemScriptsFolderType = 0xC46D6F64;
+LA_CONSTANT(SInt16, kUserDomain, -32763);
+LA_CONSTANT(SInt16, kNetworkDomain, -32764);
+LA_CONSTANT(SInt16, kLocalDomain, -32765);
+LA_CONSTANT(SInt16, kSystemDomain, -32766);
+#define kModemScriptsFolderType 0xC46D6F64U  // more than an int of C holds
 
 // The folder of that kind in a domain. createFolder must be false. fnfErr when it does not exist, permErr
 // when it may not be seen, paramErr for an unknown kind or domain; the reference is then untouched. The user
 // is the one who runs the process, and the home is that of the password database.
-OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder) noexcept;
+OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder) LA_NOEXCEPT;
 
-struct OpaqueFSIterator;
-using FSIterator = OpaqueFSIterator*;
-inline constexpr UInt32 kFSIterateFlat = 0;
-inline constexpr UInt32 kFSCatInfoNone = 0;
-inline constexpr OSErr errFSNoMoreItems = -1417;
+typedef struct OpaqueFSIterator* FSIterator;
+LA_CONSTANT(UInt32, kFSIterateFlat, 0);
+LA_CONSTANT(UInt32, kFSCatInfoNone, 0);
+LA_CONSTANT(OSErr, errFSNoMoreItems, -1417);
 
 // An iterator over the items directly in a folder, ended with FSCloseIterator; null on failure.
-OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) noexcept;
+OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) LA_NOEXCEPT;
 // Up to maximumItems references and names, in no order. errFSNoMoreItems marks the last batch, which may hold
 // items; what actualItems tells was delivered even when the status is another failure. A name that is not
 // printable UTF-8 of at most 64 bytes is passed over: it could not be named in a location. More than 4096
@@ -59,57 +58,58 @@ OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) no
 // names may be.
 OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems,
                            Boolean* containerChanged, UInt32 whichInfo, void* catalogInfos, FSRef* refs,
-                           void* specs, HFSUniStr255* names) noexcept;
-OSErr FSCloseIterator(FSIterator iterator) noexcept;
+                           void* specs, HFSUniStr255* names) LA_NOEXCEPT;
+OSErr FSCloseIterator(FSIterator iterator) LA_NOEXCEPT;
 
-struct LSItemInfoRecord {
+typedef struct LSItemInfoRecord {
     UInt32 flags;
-};
-inline constexpr UInt32 kLSRequestBasicFlagsOnly = 0x4;
-inline constexpr UInt32 kLSItemInfoIsPlainFile = 0x1;
-inline constexpr UInt32 kLSItemInfoIsContainer = 0x8;
-inline constexpr UInt32 kLSItemInfoIsInvisible = 0x40;
+} LSItemInfoRecord;
+LA_CONSTANT(UInt32, kLSRequestBasicFlagsOnly, 0x4);
+LA_CONSTANT(UInt32, kLSItemInfoIsPlainFile, 0x1);
+LA_CONSTANT(UInt32, kLSItemInfoIsContainer, 0x8);
+LA_CONSTANT(UInt32, kLSItemInfoIsInvisible, 0x40);
 // What the item is; links are followed, and a name that begins with a dot is invisible. An item that is gone
 // since it was listed, and a link that leads nowhere, are neither a plain file nor a container, and no
 // failure: neither of them may spoil the listing of the folder. permErr and ioErr when the item is there and
 // cannot be looked at.
-OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInfoRecord* info) noexcept;
+OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInfoRecord* info) LA_NOEXCEPT;
 
 // --- Download ---
 
-struct HandleBlock;
 // A growable buffer.
-using Handle = HandleBlock*;
+typedef struct HandleBlock* Handle;
 // A buffer of that many zero bytes; null without memory. It lives until the process ends or DisposeHandle.
-Handle NewHandle(long size) noexcept;
-void DisposeHandle(Handle handle) noexcept;
-long GetHandleSize(Handle handle) noexcept;
-const char* GetHandleData(Handle handle) noexcept;
+Handle NewHandle(long size) LA_NOEXCEPT;
+void DisposeHandle(Handle handle) LA_NOEXCEPT;
+long GetHandleSize(Handle handle) LA_NOEXCEPT;
+const char* GetHandleData(Handle handle) LA_NOEXCEPT;
 
-inline constexpr OSStatus kURLInvalidURLError = -30773;  // or a host that is not a numeric address
-inline constexpr OSStatus kURLUnsupportedSchemeError = -30774;
-inline constexpr OSStatus kURLUnreachableError = -30790;      // refused, no route, no network
-inline constexpr OSStatus kURLTimedOutError = -30791;         // the server was silent, or the answer too slow
-inline constexpr OSStatus kURLConnectionLostError = -30792;   // broken off before the answer was complete
-inline constexpr OSStatus kURLMalformedAnswerError = -30793;  // what came is not HTTP
-inline constexpr OSStatus kURLAnswerTooLargeError = -30794;
-inline constexpr OSStatus kURLClientError = -30795;  // the HTTP client library is missing or does not work
+LA_CONSTANT(OSStatus, kURLInvalidURLError, -30773);  // or a host that is not a numeric address
+LA_CONSTANT(OSStatus, kURLUnsupportedSchemeError, -30774);
+LA_CONSTANT(OSStatus, kURLUnreachableError, -30790);      // refused, no route, no network
+LA_CONSTANT(OSStatus, kURLTimedOutError, -30791);         // the server was silent, or the answer too slow
+LA_CONSTANT(OSStatus, kURLConnectionLostError, -30792);   // broken off before the answer was complete
+LA_CONSTANT(OSStatus, kURLMalformedAnswerError, -30793);  // what came is not HTTP
+LA_CONSTANT(OSStatus, kURLAnswerTooLargeError, -30794);
+LA_CONSTANT(OSStatus, kURLClientError, -30795);  // the HTTP client library is missing or does not work
 // Fetches an http URL into the buffer, replacing what it holds. No proxy, no redirects, and never longer or
 // larger than the bounds of platform/services/Download.h. 0 for an answer of class 2xx; the HTTP status for
 // every other answer (404, a redirect's 302), whatever its body; a negative value when there was no answer,
 // or a 2xx did not arrive whole, with the reason in the log. Only a 2xx fills the buffer. destination,
 // eventProc and context are null, flags is 0.
 OSStatus URLSimpleDownload(const char* url, const void* destination, Handle buffer, UInt32 flags,
-                           const void* eventProc, void* context) noexcept;
+                           const void* eventProc, void* context) LA_NOEXCEPT;
 
 // --- Opening a URL ---
 
 // Opens the URL in the browser of the user who sits at the computer, as that user, and returns without
 // waiting for it. Nothing happens when nobody does (fnfErr). openedURL must be null.
-OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL) noexcept;
+OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL) LA_NOEXCEPT;
 
 // --- System log ---
 
 // Writes one line to the system log, as a warning of this system, without waiting: where nobody reads the log
 // it is lost.
-void SystemLog(const char* line) noexcept;
+void SystemLog(const char* line) LA_NOEXCEPT;
+
+LA_END_DECLARATIONS

@@ -26,47 +26,51 @@
 
 #include "platform/CoreFoundation.h"
 
-using kern_return_t = int;
-using mach_port_t = unsigned int;
-using io_object_t = mach_port_t;
-using io_registry_entry_t = io_object_t;
-using io_iterator_t = io_object_t;
-using io_service_t = io_object_t;
-using io_name_t = char[128];
-using IOOptionBits = UInt32;
+LA_BEGIN_DECLARATIONS
 
-inline constexpr kern_return_t KERN_SUCCESS = 0;
-inline constexpr mach_port_t MACH_PORT_NULL = 0;
-inline constexpr io_object_t IO_OBJECT_NULL = 0;
-inline constexpr kern_return_t kIOReturnError = static_cast<kern_return_t>(0xE00002BC);
-inline constexpr kern_return_t kIOReturnBadArgument = static_cast<kern_return_t>(0xE00002C2);
+typedef int kern_return_t;
+typedef unsigned int mach_port_t;
+typedef mach_port_t io_object_t;
+typedef io_object_t io_registry_entry_t;
+typedef io_object_t io_iterator_t;
+typedef io_object_t io_service_t;
+typedef char io_name_t[128];
+typedef UInt32 IOOptionBits;
+
+LA_CONSTANT(kern_return_t, KERN_SUCCESS, 0);
+LA_CONSTANT(mach_port_t, MACH_PORT_NULL, 0);
+LA_CONSTANT(io_object_t, IO_OBJECT_NULL, 0);
+LA_CONSTANT(kern_return_t, kIOReturnError, -0x1FFFFD44);        // 0xE00002BC
+LA_CONSTANT(kern_return_t, kIOReturnBadArgument, -0x1FFFFD3E);  // 0xE00002C2
 // There is no such parent.
-inline constexpr kern_return_t kIOReturnNoDevice = static_cast<kern_return_t>(0xE00002C0);
+LA_CONSTANT(kern_return_t, kIOReturnNoDevice, -0x1FFFFD40);  // 0xE00002C0
 
-inline constexpr const char* kIOServicePlane = "IOService";
+#define kIOServicePlane "IOService"
 
 // The handle through which the registry is asked, to be released with IOObjectRelease.
-kern_return_t IOMasterPort(mach_port_t bootstrapPort, mach_port_t* masterPort) noexcept;
+kern_return_t IOMasterPort(mach_port_t bootstrapPort, mach_port_t* masterPort) LA_NOEXCEPT;
 // A dictionary that matches every entry of a class ("IOProviderClass"); null when the name is null or no
 // UTF-8.
-CFMutableDictionaryRef IOServiceMatching(const char* className) noexcept;
+CFMutableDictionaryRef IOServiceMatching(const char* className) LA_NOEXCEPT;
 // Consumes one reference of the matching dictionary, on failure too. Matches the entries of the class under
 // "IOProviderClass" whose properties equal whatever else the dictionary holds; nothing when there is no such
 // class. They come in the order of the kernel's names, numbers in them by value. Hardware that cannot be
 // listed whole, or of more than 4096 devices, is kIOReturnError. The output is untouched on failure.
 kern_return_t IOServiceGetMatchingServices(mach_port_t masterPort, CFDictionaryRef matching,
-                                           io_iterator_t* iterator) noexcept;
+                                           io_iterator_t* iterator) LA_NOEXCEPT;
 // The next entry, which the caller releases, or 0 at the end.
-io_object_t IOIteratorNext(io_iterator_t iterator) noexcept;
+io_object_t IOIteratorNext(io_iterator_t iterator) LA_NOEXCEPT;
 // One property as a value of the caller's, or null.
 CFTypeRef IORegistryEntryCreateCFProperty(io_registry_entry_t entry, CFStringRef key,
-                                          CFAllocatorRef allocator, IOOptionBits options) noexcept;
+                                          CFAllocatorRef allocator, IOOptionBits options) LA_NOEXCEPT;
 // All properties as a dictionary of the caller's; null on failure.
 kern_return_t IORegistryEntryCreateCFProperties(io_registry_entry_t entry, CFMutableDictionaryRef* properties,
-                                                CFAllocatorRef allocator, IOOptionBits options) noexcept;
+                                                CFAllocatorRef allocator, IOOptionBits options) LA_NOEXCEPT;
 // The parent, which the caller releases. plane is kIOServicePlane. The output is 0 on failure.
 kern_return_t IORegistryEntryGetParentEntry(io_registry_entry_t entry, const char* plane,
-                                            io_registry_entry_t* parent) noexcept;
+                                            io_registry_entry_t* parent) LA_NOEXCEPT;
 // Whether the entry is of the class; no parent is of any.
-Boolean IOObjectConformsTo(io_object_t object, const char* className) noexcept;
-kern_return_t IOObjectRelease(io_object_t object) noexcept;
+Boolean IOObjectConformsTo(io_object_t object, const char* className) LA_NOEXCEPT;
+kern_return_t IOObjectRelease(io_object_t object) LA_NOEXCEPT;
+
+LA_END_DECLARATIONS
