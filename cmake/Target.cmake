@@ -1,5 +1,5 @@
 # la_library(NAME SOURCES ... [LINK ...]) and la_program(NAME SOURCES ... [LINK ...]): a target with this
-# project's warnings and sanitizers.
+# project's warnings and sanitizers. What is below app/ becomes a part of the library that is installed (Library.cmake).
 #
 # la_public_headers(NAME FOLDER HEADER ...): what other folders may include of a library. The headers are linked
 # into a directory of their own, and only that directory travels with the target, never the project's root: a
@@ -8,7 +8,8 @@
 
 function(la_options target)
     target_compile_options(${target} PRIVATE -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wsign-conversion
-        -Wnon-virtual-dtor -Wold-style-cast -Wcast-qual -Wformat=2 -Wundef -Wimplicit-fallthrough
+        $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor> $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast>
+        -Wcast-qual -Wformat=2 -Wundef -Wimplicit-fallthrough
         $<$<BOOL:${LA_WARNINGS_AS_ERRORS}>:-Werror>)
     if(LA_SANITIZE)
         target_compile_options(${target} PRIVATE -fsanitize=${LA_SANITIZE} -fno-sanitize-recover=all
@@ -16,7 +17,10 @@ function(la_options target)
         target_link_options(${target} PRIVATE -fsanitize=${LA_SANITIZE})
     else()
         target_compile_options(${target} PRIVATE -fstack-protector-strong)
-        target_compile_definitions(${target} PRIVATE $<$<CONFIG:Release,RelWithDebInfo>:_FORTIFY_SOURCE=2>)
+        # Whoever builds for a distribution may have chosen another level.
+        if(NOT CMAKE_CXX_FLAGS MATCHES _FORTIFY_SOURCE)
+            target_compile_definitions(${target} PRIVATE $<$<NOT:$<CONFIG:Debug>>:_FORTIFY_SOURCE=2>)
+        endif()
         target_link_options(${target} PRIVATE -Wl,-z,relro,-z,now)
     endif()
 endfunction()
@@ -24,6 +28,7 @@ endfunction()
 function(la_library target)
     cmake_parse_arguments(LA "" "" "SOURCES;LINK" ${ARGN})
     add_library(${target} STATIC ${LA_SOURCES})
+    set_property(GLOBAL APPEND PROPERTY LA_PARTS ${target})
     target_link_libraries(${target} PUBLIC ${LA_LINK})
     la_options(${target})
 endfunction()
@@ -41,6 +46,7 @@ function(la_public_headers target folder)
     foreach(header ${ARGN})
         file(CREATE_LINK ${PROJECT_SOURCE_DIR}/${folder}/${header} ${directory}/${folder}/${header} SYMBOLIC)
     endforeach()
+    set_property(TARGET ${target} PROPERTY LA_PUBLIC_HEADERS ${ARGN})
     get_target_property(type ${target} TYPE)
     if(type STREQUAL "INTERFACE_LIBRARY")
         target_include_directories(${target} INTERFACE ${directory})

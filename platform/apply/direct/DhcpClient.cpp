@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "platform/apply/StateFile.h"
+#include "platform/apply/direct/DhcpHookPath.h"
 #include "platform/apply/direct/Process.h"
 #include "platform/base/ChildProcess.h"
 #include "platform/base/FileDescriptor.h"
@@ -41,30 +42,6 @@ struct ClientState {
 bool hasEnded(const FileDescriptor& handle, std::chrono::milliseconds wait) {
     pollfd ended{handle.get(), POLLIN, 0};
     return ::poll(&ended, 1, static_cast<int>(wait.count())) > 0;
-}
-
-bool isProgram(const std::string& path) {
-    return ::access(path.c_str(), X_OK) == 0;
-}
-
-std::string folderOfThisProgram() {
-    std::string path(4096, '\0');
-    const ssize_t size = ::readlink("/proc/self/exe", path.data(), path.size());
-    path.resize(size < 0 ? 0 : static_cast<std::size_t>(size));
-    const std::size_t slash = path.rfind('/');
-    return slash == std::string::npos ? "" : path.substr(0, slash);
-}
-
-Outcome findHook(std::string& hook) {
-    constexpr const char* name = "/location-assistant-dhcp-hook";
-    hook = currentHost().dhcpHook;
-    if (hook.empty()) {
-        hook = folderOfThisProgram() + name;
-        if (!isProgram(hook)) {
-            hook = LA_LIBEXEC_DIRECTORY + std::string(name);
-        }
-    }
-    return isProgram(hook) ? Outcome() : Outcome::fromErrno("cannot run the DHCP client's program " + hook);
 }
 
 std::vector<std::string> argumentsFor(const DhcpSettings& settings, const std::string& hook) {
@@ -140,7 +117,7 @@ Outcome isDhcpClientRunning(const std::string& interface, bool& running) {
 
 Outcome startDhcpClient(const DhcpSettings& settings) {
     std::string hook;
-    RETURN_IF_FAILED(findHook(hook));
+    RETURN_IF_FAILED(findDhcpHook(hook));
     if (!isProgram(currentHost().dhcpClient)) {
         return Outcome::fromErrno("cannot run the DHCP client " + currentHost().dhcpClient);
     }
