@@ -13,8 +13,13 @@
 // encoding is UTF-8, and bytes that are not well-formed UTF-8, or more than 2 GiB of them, make no string.
 #pragma once
 
+#ifdef __cplusplus
+#include <cstddef>
+#include <cstdint>
+#else
 #include <stddef.h>
 #include <stdint.h>
+#endif
 
 #include "platform/Language.h"
 
