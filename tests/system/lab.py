@@ -39,15 +39,6 @@ ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
 PCI = {"eth": "0000:02:00.0", "wlan": "0000:03:00.0", "en": "0000:00:19.0"}
 DRIVER = {"eth": "e1000e", "wlan": "iwlwifi", "en": "e1000e"}
 
-BUS = """<busconfig>
-<type>system</type>
-<listen>unix:path=/run/dbus/system_bus_socket</listen>
-<policy context="default">
-<allow user="*"/><allow own="*"/><allow send_destination="*"/><allow receive_sender="*"/>
-</policy>
-</busconfig>
-"""
-
 NETWORK_MANAGER = """[main]
 plugins=keyfile
 dns=none
@@ -303,8 +294,7 @@ class Lab:
 
     def start_bus(self):
         Path("/run/dbus").mkdir(exist_ok=True)
-        (LAB / "bus.conf").write_text(BUS)
-        self.daemon("dbus-daemon", f"--config-file={LAB}/bus.conf", "--nofork", "--nopidfile")
+        self.daemon("dbus-daemon", f"--config-file={HERE}/bus.conf", "--nofork", "--nopidfile")
         wait_until(Path("/run/dbus/system_bus_socket").exists)
 
     def start_desktop(self):

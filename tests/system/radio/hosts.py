@@ -22,14 +22,6 @@ RESIDENT = 4242  # the user who sits at the computer
 ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
     key: value for key, value in os.environ.items() if key.endswith("SAN_OPTIONS")}
 
-BUS = """<busconfig>
-<type>system</type>
-<listen>unix:path=/run/dbus/system_bus_socket</listen>
-<policy context="default">
-<allow user="*"/><allow own="*"/><allow send_destination="*"/><allow receive_sender="*"/>
-</policy>
-</busconfig>
-"""
 NETWORK_MANAGER = """[main]
 plugins=keyfile
 auth-polkit=false
@@ -216,13 +208,12 @@ class NetworkManager(Host):
         Path("/etc/NetworkManager/NetworkManager.conf").write_text(NETWORK_MANAGER.format(self.backend))
         (folder / "home.nmconnection").write_text(HOME_PROFILE)
         (folder / "home.nmconnection").chmod(0o600)
-        Path("/run/air/bus.conf").write_text(BUS)
         # udev tells NetworkManager of devices and switches.
         self.daemons.append(spawn("/usr/lib/systemd/systemd-udevd", log="udev"))
         wait_until(Path("/run/udev/control").exists, 20, "udev")
         sh("udevadm trigger --action=add --subsystem-match=net --subsystem-match=rfkill --subsystem-match=ieee80211; "
            "udevadm settle")
-        self.daemons.append(spawn("dbus-daemon", "--config-file=/run/air/bus.conf", "--nofork", "--nopidfile"))
+        self.daemons.append(spawn("dbus-daemon", f"--config-file={air.SYSTEM}/bus.conf", "--nofork", "--nopidfile"))
         wait_until(Path("/run/dbus/system_bus_socket").exists, 10, "the bus")
         self.start_supplicant()
         self.start_daemon()

@@ -1,24 +1,9 @@
-#include <functional>
-
 #include "tests/unit/apply/Trees.h"
 #include "tests/unit/preferences/Fixture.h"
 #include "tests/unit/support/RecordingAgent.h"
 
 namespace preferences_test {
 namespace {
-
-// Lets something happen in the middle of an apply.
-class InterruptedAgent : public testing_support::RecordingAgent {
-  public:
-    std::function<void()> interruption;
-
-    bool settle(platform::apply::Clock::time_point until) override {
-        if (const std::function<void()> once = std::exchange(interruption, nullptr)) {
-            once();
-        }
-        return RecordingAgent::settle(until);
-    }
-};
 
 class ApplyTest : public StoreTest {
   protected:
@@ -31,21 +16,19 @@ class ApplyTest : public StoreTest {
         const auto tree = platform::apply::makeTree({platform::apply::fixedService(device)}, "1");
         (void)directory.write("store/preferences.plist", *platform::values::writePropertyListXML(tree.get()));
     }
-    static int apply(const SessionRef& session) {
-        return SCPreferencesApplyChanges(session.get()) != 0 ? 0 : SCError();
+    // The status, and the interfaces that are ours.
+    std::string apply() {
+        std::string text = std::to_string(SCPreferencesApplyChanges(session.get()) != 0 ? 0 : SCError());
+        for (const auto& [name, state] : agent->machine) {
+            text += state != "as found" ? " " + name : "";
+        }
+        return text;
     }
     // Commits the tree as it is, and applies it.
-    static int activate(const SessionRef& session) { return commit(session) ? apply(session) : SCError(); }
-    // The interfaces that are ours.
-    [[nodiscard]] std::string taken() const {
-        std::string names;
-        for (const auto& [name, state] : agent->machine) {
-            names += state != "as found" ? name : "";
-        }
-        return names;
-    }
+    std::string activate() { return commit(session) ? apply() : "not committed"; }
 
-    std::shared_ptr<InterruptedAgent> agent = std::make_shared<InterruptedAgent>();
+    const std::shared_ptr<testing_support::RecordingAgent> agent =
+        std::make_shared<testing_support::RecordingAgent>();
     platform::HostOverride withAgent{[this] {
         platform::Host made = hostIn(directory.path().string());
         made.agents = {agent};
@@ -55,34 +38,28 @@ class ApplyTest : public StoreTest {
 };
 
 TEST_F(ApplyTest, OnlyWhatIsCommittedIsApplied) {
-    EXPECT_EQ(apply(session), 0);
-    EXPECT_EQ(taken(), "") << "without a commit there is nothing to apply, and nothing that was left undone";
+    EXPECT_EQ("0", apply()) << "without a commit there is nothing to apply, and nothing that was left undone";
     ASSERT_TRUE(set(session, "/Sets/2", "another location"));
-    EXPECT_EQ(activate(session), 0);
-    EXPECT_EQ(taken(), "") << "a commit that leaves the plan alone leaves the machine alone";
+    EXPECT_EQ("0", activate()) << "a commit that leaves the plan alone leaves the machine alone";
     EXPECT_TRUE(agent->calls.empty());
-    EXPECT_EQ(activate(session), 0);
-    EXPECT_EQ(taken(), "eth0") << "a commit that changes nothing asks for just that";
+    EXPECT_EQ("0 eth0", activate()) << "a commit that changes nothing asks for just that";
     ASSERT_TRUE(SCPreferencesPathRemoveValue(session.get(), CFSTR("/NetworkServices/100/Interface")));
-    EXPECT_EQ(apply(session), 0);
-    EXPECT_EQ(taken(), "eth0");
-    EXPECT_EQ(activate(session), 0);
-    EXPECT_EQ(taken(), "");
+    EXPECT_EQ("0 eth0", apply());
+    EXPECT_EQ("0", activate());
 }
 
 TEST_F(ApplyTest, ATreeCommittedInTheMiddleOfAnApplyIsAppliedAsWell) {
     agent->interruption = [this] { putLocationOf("eth1"); };
-    EXPECT_EQ(activate(session), 0);
-    EXPECT_EQ(taken(), "eth1");
+    EXPECT_EQ("0 eth1", activate());
 }
 
 TEST_F(ApplyTest, FailuresAreTold) {
     agent->failing = {"takeOver eth0"};
-    EXPECT_EQ(activate(session), 1001);
+    EXPECT_EQ("1001", activate());
     EXPECT_TRUE(logHas("takeOver eth0 was told to fail"));
-    EXPECT_EQ(apply(session), 0) << "what is left undone is tried again in the background of the status";
+    EXPECT_EQ("0", apply()) << "what is left undone is tried again in the background of the status";
     (void)directory.write("store/preferences.plist", "garbage");
-    EXPECT_EQ(apply(session), 1001);
+    EXPECT_EQ("1001", apply());
     EXPECT_TRUE(logHas("tester: " + file + ", line 1"));
 }
 

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <chrono>
+#include <functional>
 #include <map>
 #include <set>
 #include <span>
@@ -28,6 +29,7 @@ class RecordingAgent : public platform::apply::Agent {
     std::set<std::string> foreign;               // interfaces that are left alone
     int slow = 0;                                // how often settle has to be asked once more
     double seconds = 0;                          // that the last start was given
+    std::function<void()> interruption;          // what happens once while it is waited for
 
     [[nodiscard]] std::string_view name() const noexcept override { return name_; }
 
@@ -68,6 +70,9 @@ class RecordingAgent : public platform::apply::Agent {
 
     bool settle(platform::apply::Clock::time_point /*until*/) override {
         calls.emplace_back("settle");
+        if (const std::function<void()> once = std::exchange(interruption, nullptr)) {
+            once();
+        }
         return unsettled_-- <= 0;
     }
 
