@@ -5,6 +5,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/apply/Agent.h"
 #include "platform/apply/networkmanager/Daemon.h"
@@ -20,6 +21,7 @@ struct EarlierCard {
     bool wasUp = false;  // the profile was complete, with its addresses
     // The card's own switch, which the daemon sees only where there is a device manager; nothing without one.
     std::optional<bool> radioOff = {};
+    std::vector<std::string> iwdAutoconnect = {};  // the networks that iwd joins of its own accord
 
     template <class Self, class Fields>
     static void listFields(Self& self, Fields& fields) {
@@ -28,6 +30,7 @@ struct EarlierCard {
         fields("Radio", self.note.radio);
         fields("WasUp", self.wasUp);
         fields("RadioOff", self.radioOff);
+        fields("IwdAutoconnect", self.iwdAutoconnect);
     }
 };
 

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "platform/apply/WirelessChoice.h"
+#include "platform/apply/networkmanager/Iwd.h"
 #include "platform/apply/networkmanager/Profile.h"
 #include "platform/base/Outcome.h"
 #include "platform/bus/Bus.h"
@@ -114,6 +115,9 @@ class Daemon {
     // Success when the daemon does not look now.
     Outcome scanFor(const Device& device, const std::string& network);
 
+    // Whom it may have left the radio to.
+    [[nodiscard]] Iwd& iwd() noexcept { return iwd_; }
+
     // From here on the signals of cards and profiles are taken in.
     Outcome listen();
     // Waits for a signal at most until the time; fails when the daemon left the bus.
@@ -136,6 +140,7 @@ class Daemon {
     void noteDevice(const char* path, std::uint32_t state, std::uint32_t reason);
 
     Bus bus_;
+    Iwd iwd_;
     bool isConnected_ = false;
     bool isListening_ = false;
     bool starting_ = false;

@@ -191,6 +191,8 @@ class GoingCard final : public Card {
             link_.emplace();
         }
         link_->choice = *decision.choice;
+        // Or it would turn to another one as soon as this one goes away.
+        RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(earlier_.iwdAutoconnect, network()));
         stage_ = Stage::store;
         if (!link_->choice->isHeard && isReady_ && active_ && !isOurProfileActive()) {
             stage_ = Stage::leaveOther;
@@ -240,7 +242,18 @@ class GoingCard final : public Card {
         if (known) {
             RETURN_IF_FAILED(update(*known, sections, secret, isChanged));
             path = known->path;
-        } else {
+        }
+        if (known && (isChanged || !active_ || active_->profile != path)) {
+            // iwd is given a key only at the first activation of a profile.
+            bool isIwdRunning = false;
+            RETURN_IF_FAILED(daemon_.iwd().isRunning(isIwdRunning));
+            if (isIwdRunning) {
+                RETURN_IF_FAILED(daemon_.deleteProfile(path));
+                active_.reset();
+                known.reset();
+            }
+        }
+        if (!known) {
             RETURN_IF_FAILED(daemon_.addProfile(sections, Adding::heldBack, secret, path));
         }
         if (isChanged || !active_ || active_->profile != path) {

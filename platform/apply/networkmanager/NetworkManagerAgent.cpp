@@ -67,7 +67,8 @@ Outcome NetworkManagerAgent::captureCard(const Device& device, const std::string
         const bool isKnown = profile && isOurs(profile->sections);
         earlier = {isKnown ? noteOf(profile->sections) : ProfileNote(), true, {}};
     }
-    return {};
+    return device.kind == Device::Kind::wireless ? daemon_.iwd().readAutoconnect(earlier.iwdAutoconnect)
+                                                 : Outcome();
 }
 
 Outcome NetworkManagerAgent::capture(std::span<const std::string> interfaces, std::vector<Captured>& captured,

@@ -43,6 +43,7 @@ class ReturningCard final : public Card {
     [[nodiscard]] const ProfileNote& note() const { return earlier_.note; }
 
     Outcome begin() {
+        RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(earlier_.iwdAutoconnect, std::nullopt));
         std::optional<Device> device;
         RETURN_IF_FAILED(findCard(device));
         if (!device) {

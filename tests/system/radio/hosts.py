@@ -267,7 +267,8 @@ class Iwd(NetworkManager):
 
     def start_supplicant(self):
         sh("modprobe -a af_alg algif_hash algif_skcipher algif_aead des_generic ecb md4 cmac ccm sha512_generic "
-           "pkcs8_key_parser; rm -rf /var/lib/iwd")
+           "pkcs8_key_parser; rm -rf /var/lib/iwd; mkdir /var/lib/iwd; cd /var/lib/iwd; : >Elsewhere.open; "
+           "printf '[Settings]\\nAutoConnect=false\\n' >Never.open")
         self.daemons.append(spawn("/usr/libexec/iwd", log="iwd"))
 
     def start_daemon(self):
@@ -276,6 +277,14 @@ class Iwd(NetworkManager):
         # NetworkManager gives iwd the key of a profile that was never activated, and asks for a new one afterwards.
         wait_until(lambda: f"{air.HOME}\n" in self.nmcli("-f SSID device wifi list"), 60, "home heard")
         self.nmcli(f"-w 60 connection up {air.HOME}")
+
+    def state(self):
+        # NetworkManager shows what iwd alone knows under new UUIDs at each start.
+        state = super().state() | {"known, and joined unasked": {
+            path.name: "AutoConnect=false" not in path.read_text() for path in Path("/var/lib/iwd").glob("[!.]*.*")}}
+        state["profiles"] = [line for line in state["profiles"] if not line.startswith(("Elsewhere:", "Never:"))]
+        state["files"] = {path: text for path, text in state["files"].items() if "/etc/" in path or "assistant" in path}
+        return state
 
     def log(self):
         return air.log_of("iwd") + super().log()

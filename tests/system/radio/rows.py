@@ -224,6 +224,7 @@ def goes_away_and_comes_back(visit):
     visit.remember()
     visit.create()
     visit.page()
+    time.sleep(10)  # until nobody scans any more: iwd would at once join what it has just heard
     network.stop()
     time.sleep(15)
     assert visit.host.joined() is None, visit.host.joined()
