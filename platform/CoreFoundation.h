@@ -148,15 +148,16 @@ CFIndex CFStringGetLength(CFStringRef string) LA_NOEXCEPT;
 // Copies the units of the range, in host byte order, into the buffer, which must have room for them.
 void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) LA_NOEXCEPT;
 // Copies the text and a final NUL. False, with the buffer's content undefined, when it does not fit in
-// bufferSize bytes or the encoding cannot carry it.
+// bufferSize bytes or the encoding, of which ASCII and Mac OS Roman carry ASCII characters only, cannot carry
+// it.
 Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
                            CFStringEncoding encoding) LA_NOEXCEPT;
 // The string's own bytes, NUL-terminated, borrowed until it is changed or released; null when the encoding is
 // neither UTF-8 nor, for a string of ASCII characters only, ASCII or Mac OS Roman.
 const char* CFStringGetCStringPtr(CFStringRef string, CFStringEncoding encoding) LA_NOEXCEPT;
 Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix) LA_NOEXCEPT;
-// Without flags a literal comparison by code point. kCFCompareLocalized compares by the root collation, with
-// kCFCompareCaseInsensitive and kCFCompareNumerically as they say; the two also work without it.
+// Without kCFCompareLocalized a literal comparison by code point, whatever the other flags; with it one by
+// the root collation, kCFCompareCaseInsensitive and kCFCompareNumerically as they say.
 CFComparisonResult CFStringCompare(CFStringRef lhs, CFStringRef rhs, CFStringCompareFlags flags) LA_NOEXCEPT;
 // The first occurrence, searched literally, or location kCFNotFound and length 0, as for an empty string.
 // flags is 0.
@@ -192,7 +193,6 @@ CFStringRef CFStringMakeConstant(const char* text) LA_NOEXCEPT;
 typedef CFIndex CFNumberType;
 LA_CONSTANT(CFNumberType, kCFNumberSInt32Type, 3);
 LA_CONSTANT(CFNumberType, kCFNumberSInt64Type, 4);
-LA_CONSTANT(CFNumberType, kCFNumberFloat64Type, 6);
 // The system's long integer: 32 bits, signed, whatever the machine's own long is.
 LA_CONSTANT(CFNumberType, kCFNumberLongType, kCFNumberSInt32Type);
 

@@ -14,23 +14,14 @@ const CFArrayCallBacks kCFTypeArrayCallBacks{};
 namespace {
 
 std::span<const CFTypeRef> itemsIn(CFArrayRef array, CFRange range) {
-    return array->items().subspan(static_cast<std::size_t>(range.location),
+    return itemsOf(array).subspan(static_cast<std::size_t>(range.location),
                                   static_cast<std::size_t>(range.length));
 }
 
 }  // namespace
 
-OpaqueCFArray* platform::values::shareStorage(const OpaqueCFArray& array, bool isMutable) {
-    Storage* const storage = array.storage();
-    auto* const handle = new OpaqueCFArray(isMutable, array.retainsValues(), storage);
-    if (storage != nullptr) {
-        storage->retain();
-    }
-    return handle;
-}
-
 std::span<const CFTypeRef> platform::values::itemsOf(CFArrayRef array) noexcept {
-    return array->items();
+    return array->storage().items();
 }
 
 CFTypeID CFArrayGetTypeID() noexcept {
@@ -39,7 +30,7 @@ CFTypeID CFArrayGetTypeID() noexcept {
 
 CFArrayRef CFArrayCreate(CFAllocatorRef, const void** values, CFIndex count,
                          const CFArrayCallBacks* callBacks) noexcept {
-    auto* const array = new OpaqueCFArray(false, callBacks != nullptr, nullptr);
+    auto* const array = makeContainer<OpaqueCFArray>(false, callBacks != nullptr);
     for (CFIndex i = 0; i < count; ++i) {
         array->writable().append(values[i]);
     }
@@ -47,7 +38,7 @@ CFArrayRef CFArrayCreate(CFAllocatorRef, const void** values, CFIndex count,
 }
 
 CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef, CFIndex, const CFArrayCallBacks* callBacks) noexcept {
-    return new OpaqueCFArray(true, callBacks != nullptr, nullptr);
+    return makeContainer<OpaqueCFArray>(true, callBacks != nullptr);
 }
 
 CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef, CFIndex, CFArrayRef array) noexcept {
@@ -59,7 +50,7 @@ CFIndex CFArrayGetCount(CFArrayRef array) noexcept {
 }
 
 const void* CFArrayGetValueAtIndex(CFArrayRef array, CFIndex index) noexcept {
-    return array->items()[static_cast<std::size_t>(index)];
+    return itemsOf(array)[static_cast<std::size_t>(index)];
 }
 
 void CFArrayGetValues(CFArrayRef array, CFRange range, const void** values) noexcept {

@@ -1,3 +1,5 @@
+#include <utility>
+
 #include "platform/base/Hexadecimal.h"
 #include "platform/values/Containers.h"
 #include "platform/values/PropertyListXML.h"
@@ -21,36 +23,25 @@ void describeBytes(std::string& text, std::string_view bytes) {
     text.push_back('>');
 }
 
-void describeDictionary(std::string& text, CFDictionaryRef dictionary, int depth) {
-    text.push_back('{');
-    bool isFirst = true;
+// A value that its container does not look at is shown as "?".
+void describeContainer(std::string& text, CFDictionaryRef dictionary, int depth) {
+    const char* separator = "{";
     for (const Entry& entry : entriesOf(dictionary)) {
-        text += isFirst ? "" : "; ";
-        isFirst = false;
+        text += std::exchange(separator, "; ");
         describe(text, entry.key, depth);
         text += " = ";
-        if (dictionary->retainsValues()) {
-            describe(text, entry.value, depth);
-        } else {
-            text += "?";
-        }
+        dictionary->retainsValues() ? describe(text, entry.value, depth) : text.push_back('?');
     }
-    text.push_back('}');
+    text += dictionary->count() == 0 ? "{}" : "}";
 }
 
-void describeArray(std::string& text, CFArrayRef array, int depth) {
-    text.push_back('(');
-    bool isFirst = true;
-    for (const CFTypeRef item : array->items()) {
-        text += isFirst ? "" : ", ";
-        isFirst = false;
-        if (array->retainsValues()) {
-            describe(text, item, depth);
-        } else {
-            text += "?";
-        }
+void describeContainer(std::string& text, CFArrayRef array, int depth) {
+    const char* separator = "(";
+    for (const CFTypeRef item : itemsOf(array)) {
+        text += std::exchange(separator, ", ");
+        array->retainsValues() ? describe(text, item, depth) : text.push_back('?');
     }
-    text.push_back(')');
+    text += array->count() == 0 ? "()" : ")";
 }
 
 void describe(std::string& text, CFTypeRef value, int depth) {
@@ -63,10 +54,10 @@ void describe(std::string& text, CFTypeRef value, int depth) {
             describeText(text, static_cast<CFStringRef>(value)->text());
             return;
         case PropertyListType::dictionary:
-            describeDictionary(text, static_cast<CFDictionaryRef>(value), depth + 1);
+            describeContainer(text, static_cast<CFDictionaryRef>(value), depth + 1);
             return;
         case PropertyListType::array:
-            describeArray(text, static_cast<CFArrayRef>(value), depth + 1);
+            describeContainer(text, static_cast<CFArrayRef>(value), depth + 1);
             return;
         case PropertyListType::number: {
             const auto* const number = static_cast<CFNumberRef>(value);
@@ -93,12 +84,11 @@ void describe(std::string& text, CFTypeRef value, int depth) {
 }  // namespace
 
 std::string platform::values::descriptionOf(CFTypeRef value) {
-    std::string text;
     if (value == nullptr) {
-        text = "(null)";
-    } else {
-        describe(text, value, 0);
+        return "(null)";
     }
+    std::string text;
+    describe(text, value, 0);
     return text;
 }
 

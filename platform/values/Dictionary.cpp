@@ -11,53 +11,26 @@ struct CFDictionaryValueCallBacks {};
 const CFDictionaryKeyCallBacks kCFTypeDictionaryKeyCallBacks{};
 const CFDictionaryValueCallBacks kCFTypeDictionaryValueCallBacks{};
 
-bool OpaqueCFDictionary::find(CFTypeRef key, CFTypeRef* value) const {
-    if (storage() == nullptr) {
-        return false;
-    }
-    const std::size_t position = storage()->find(key);
-    if (position == Storage::absent) {
-        return false;
-    }
-    *value = storage()->valueAt(position);
-    return true;
-}
-
 void OpaqueCFDictionary::set(CFTypeRef key, CFTypeRef value, bool replace) {
-    if (storage() != nullptr) {
-        std::size_t position = storage()->find(key);
-        if (position != Storage::absent) {
-            if (replace && storage()->valueAt(position) != value) {
-                // Making room may fill holes, and with them move the entry.
-                Storage& own = writable();
-                position = own.find(key);
-                own.replaceValue(position, value);
-            }
-            return;
-        }
+    const std::size_t position = storage().find(key);
+    if (position == Storage::absent) {
+        writable().addEntry(key, value);
+    } else if (replace && storage().valueAt(position) != value) {
+        // A copy of its own has no holes, which may move the entry.
+        Storage& own = writable();
+        own.replaceValue(own.find(key), value);
     }
-    writable().addEntry(key, value);
 }
 
 void OpaqueCFDictionary::remove(CFTypeRef key) {
-    if (storage() == nullptr || storage()->find(key) == Storage::absent) {
-        return;
+    if (storage().find(key) != Storage::absent) {
+        Storage& own = writable();
+        own.removeEntry(own.find(key));
     }
-    Storage& own = writable();
-    own.removeEntry(own.find(key));
-}
-
-OpaqueCFDictionary* platform::values::shareStorage(const OpaqueCFDictionary& dictionary, bool isMutable) {
-    Storage* const storage = dictionary.storage();
-    auto* const handle = new OpaqueCFDictionary(isMutable, dictionary.retainsValues(), storage);
-    if (storage != nullptr) {
-        storage->retain();
-    }
-    return handle;
 }
 
 std::span<const Entry> platform::values::entriesOf(CFDictionaryRef dictionary) {
-    return dictionary->storage() != nullptr ? dictionary->storage()->entries() : std::span<const Entry>();
+    return dictionary->storage().entries();
 }
 
 CFTypeID CFDictionaryGetTypeID() noexcept {
@@ -67,7 +40,7 @@ CFTypeID CFDictionaryGetTypeID() noexcept {
 CFDictionaryRef CFDictionaryCreate(CFAllocatorRef, const void** keys, const void** values, CFIndex count,
                                    const CFDictionaryKeyCallBacks*,
                                    const CFDictionaryValueCallBacks* valueCallBacks) noexcept {
-    auto* const dictionary = new OpaqueCFDictionary(false, valueCallBacks != nullptr, nullptr);
+    auto* const dictionary = makeContainer<OpaqueCFDictionary>(false, valueCallBacks != nullptr);
     for (CFIndex i = 0; i < count; ++i) {
         dictionary->set(keys[i], values[i], false);
     }
@@ -76,7 +49,7 @@ CFDictionaryRef CFDictionaryCreate(CFAllocatorRef, const void** keys, const void
 
 CFMutableDictionaryRef CFDictionaryCreateMutable(CFAllocatorRef, CFIndex, const CFDictionaryKeyCallBacks*,
                                                  const CFDictionaryValueCallBacks* valueCallBacks) noexcept {
-    return new OpaqueCFDictionary(true, valueCallBacks != nullptr, nullptr);
+    return makeContainer<OpaqueCFDictionary>(true, valueCallBacks != nullptr);
 }
 
 CFMutableDictionaryRef CFDictionaryCreateMutableCopy(CFAllocatorRef, CFIndex,
@@ -90,19 +63,17 @@ CFIndex CFDictionaryGetCount(CFDictionaryRef dictionary) noexcept {
 
 const void* CFDictionaryGetValue(CFDictionaryRef dictionary, const void* key) noexcept {
     CFTypeRef value = nullptr;
-    return dictionary->find(key, &value) ? value : nullptr;
+    CFDictionaryGetValueIfPresent(dictionary, key, &value);
+    return value;
 }
 
 Boolean CFDictionaryGetValueIfPresent(CFDictionaryRef dictionary, const void* key,
                                       const void** value) noexcept {
-    CFTypeRef found = nullptr;
-    if (!dictionary->find(key, &found)) {
-        return 0;
+    const std::size_t position = dictionary->storage().find(key);
+    if (position != Storage::absent && value != nullptr) {
+        *value = dictionary->storage().valueAt(position);
     }
-    if (value != nullptr) {
-        *value = found;
-    }
-    return 1;
+    return static_cast<Boolean>(position != Storage::absent);
 }
 
 Boolean CFDictionaryContainsKey(CFDictionaryRef dictionary, const void* key) noexcept {

@@ -14,33 +14,29 @@ enum class Copying { frozen, allMutable };
 
 Owned<CFTypeRef> copyDeep(CFTypeRef value, Copying how, int depth);
 
-bool isKey(CFTypeRef value) {
-    return as<CFStringRef>(value) != nullptr;
+// Its items, for a dictionary key, value, key, value, ...
+std::span<const CFTypeRef> slotsOf(const OpaqueCFArray& array) {
+    return array.storage().items();
+}
+std::span<const CFTypeRef> slotsOf(const OpaqueCFDictionary& dictionary) {
+    (void)dictionary.storage().entries();
+    return dictionary.storage().items();
 }
 
 template <class Handle>
-Owned<CFTypeRef> copyContainer(const Handle& container, Storage::Shape shape, Copying how, int depth) {
+Owned<CFTypeRef> copyContainer(const Handle& container, Copying how, int depth) {
     const bool isMutable = how == Copying::allMutable;
     if (depth >= deepestPropertyList || !container.retainsValues()) {
         return {};
     }
-    const bool isDictionary = shape == Storage::Shape::dictionary;
-    std::span<const CFTypeRef> from;
-    if (container.count() > 0) {
-        from = container.storage()->items();
-        if (isDictionary) {
-            const std::span<const Entry> entries = container.storage()->entries();
-            from = {&entries.front().key, entries.size() * 2};
-        }
-    }
+    const std::span<const CFTypeRef> from = slotsOf(container);
     std::vector<Owned<CFTypeRef>> copies(from.size());
     bool isSame = !isMutable;
     for (std::size_t i = 0; i < from.size(); ++i) {
-        const bool isKeySlot = isDictionary && i % 2 == 0;
-        if (!isKeySlot) {
+        if (Handle::shape == Storage::Shape::dictionary && i % 2 == 0) {
+            copies[i] = Owned<CFTypeRef>::retained(as<CFStringRef>(from[i]));
+        } else {
             copies[i] = copyDeep(from[i], how, depth + 1);
-        } else if (isKey(from[i])) {
-            copies[i] = Owned<CFTypeRef>::retained(from[i]);
         }
         if (!copies[i]) {
             return {};
@@ -50,11 +46,8 @@ Owned<CFTypeRef> copyContainer(const Handle& container, Storage::Shape shape, Co
     if (isSame && !container.isMutable()) {
         return Owned<CFTypeRef>::retained(&container);
     }
-    if (isSame) {
-        return Owned<CFTypeRef>::adopt(shareStorage(container, false));
-    }
-    Storage* const storage = from.empty() ? nullptr : Storage::create(shape, copies);
-    return Owned<CFTypeRef>::adopt(new Handle(isMutable, true, storage));
+    return Owned<CFTypeRef>::adopt(isSame ? shareStorage(container, false)
+                                          : new Handle(isMutable, new Storage(Handle::shape, copies)));
 }
 
 Owned<CFTypeRef> copyDeep(CFTypeRef value, Copying how, int depth) {
@@ -66,10 +59,9 @@ Owned<CFTypeRef> copyDeep(CFTypeRef value, Copying how, int depth) {
                                                : CFStringCreateMutableCopy(nullptr, 0, string));
         }
         case PropertyListType::dictionary:
-            return copyContainer(*static_cast<CFDictionaryRef>(value), Storage::Shape::dictionary, how,
-                                 depth);
+            return copyContainer(*static_cast<CFDictionaryRef>(value), how, depth);
         case PropertyListType::array:
-            return copyContainer(*static_cast<CFArrayRef>(value), Storage::Shape::array, how, depth);
+            return copyContainer(*static_cast<CFArrayRef>(value), how, depth);
         case PropertyListType::number:
         case PropertyListType::boolean:
         case PropertyListType::data:
@@ -100,7 +92,7 @@ OpaqueCFDictionary& uniquelyOwned(Owned<CFDictionaryRef>& root, std::span<const 
         const std::size_t position = entries.find(key.get());
         Owned<CFDictionaryRef> own;
         if (position == Storage::absent) {
-            own = Owned<CFDictionaryRef>::adopt(new OpaqueCFDictionary(false, true, nullptr));
+            own = Owned<CFDictionaryRef>::adopt(makeContainer<OpaqueCFDictionary>(false, true));
             entries.addEntry(key.get(), own.get());
         } else if (const auto child = as<CFDictionaryRef>(entries.valueAt(position)); !isUnique(child)) {
             own = Owned<CFDictionaryRef>::adopt(shareStorage(*child, false));

@@ -1,4 +1,5 @@
 // Numbers, booleans, data and dates.
+#include <algorithm>
 #include <charconv>
 #include <chrono>
 #include <cmath>
@@ -15,26 +16,17 @@ namespace {
 constinit Immortal<OpaqueCFBoolean> trueValue(true);
 constinit Immortal<OpaqueCFBoolean> falseValue(false);
 
-// The nearest integer towards zero that the type holds; whether that is the very value.
+// The nearest integer towards zero that the type holds, 0 for what is not a number; whether that is the very
+// value.
 bool integerFromReal(double real, std::int64_t& integer) {
     constexpr double beyond = 9223372036854775808.0;
-    if (std::isnan(real)) {
-        integer = 0;
-        return false;
-    }
-    if (real < -beyond || real >= beyond) {
-        integer =
-            real < 0 ? std::numeric_limits<std::int64_t>::min() : std::numeric_limits<std::int64_t>::max();
+    using Limits = std::numeric_limits<std::int64_t>;
+    if (!(real >= -beyond && real < beyond)) {
+        integer = std::isnan(real) ? 0 : real < 0 ? Limits::min() : Limits::max();
         return false;
     }
     integer = static_cast<std::int64_t>(real);
     return static_cast<double>(integer) == real;
-}
-
-bool realFromInteger(std::int64_t integer, double& real) {
-    std::int64_t back = 0;
-    real = static_cast<double>(integer);
-    return integerFromReal(real, back) && back == integer;
 }
 
 }  // namespace
@@ -92,31 +84,14 @@ CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* value)
             return makeNumber(*static_cast<const SInt32*>(value)).take();
         case kCFNumberSInt64Type:
             return makeNumber(*static_cast<const std::int64_t*>(value)).take();
-        case kCFNumberFloat64Type:
-            return makeReal(*static_cast<const double*>(value)).take();
         default:
             return nullptr;
     }
 }
 
 Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value) noexcept {
-    bool exact = true;
-    if (type == kCFNumberFloat64Type) {
-        double real = 0;
-        if (number->isReal) {
-            real = number->real;
-        } else {
-            exact = realFromInteger(number->integer, real);
-        }
-        *static_cast<double*>(value) = real;
-        return static_cast<Boolean>(exact);
-    }
-    std::int64_t integer = 0;
-    if (number->isReal) {
-        exact = integerFromReal(number->real, integer);
-    } else {
-        integer = number->integer;
-    }
+    std::int64_t integer = number->isReal ? 0 : number->integer;
+    const bool exact = !number->isReal || integerFromReal(number->real, integer);
     if (type == kCFNumberSInt64Type) {
         *static_cast<std::int64_t*>(value) = integer;
         return static_cast<Boolean>(exact);
@@ -125,11 +100,9 @@ Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value) noe
         return 0;
     }
     using Limits = std::numeric_limits<SInt32>;
-    const bool fits = integer >= Limits::min() && integer <= Limits::max();
-    *static_cast<SInt32*>(value) = fits          ? static_cast<SInt32>(integer)
-                                   : integer < 0 ? Limits::min()
-                                                 : Limits::max();
-    return static_cast<Boolean>(exact && fits);
+    const auto nearest = static_cast<SInt32>(std::clamp<std::int64_t>(integer, Limits::min(), Limits::max()));
+    *static_cast<SInt32*>(value) = nearest;
+    return static_cast<Boolean>(exact && nearest == integer);
 }
 
 Boolean CFNumberIsFloatType(CFNumberRef number) noexcept {

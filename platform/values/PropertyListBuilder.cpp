@@ -33,44 +33,25 @@ std::optional<Number> numberFrom(std::string_view text) {
     return result.ec == std::errc() && result.ptr == end ? std::optional(number) : std::nullopt;
 }
 
-// Takes a number of exactly that many digits and what must follow it.
-std::optional<unsigned> takeDigits(std::string_view& text, std::size_t digits, char after) {
-    unsigned number = 0;
-    for (std::size_t i = 0; i <= digits; ++i) {
-        if (text.empty()) {
-            return std::nullopt;
-        }
-        const char character = text.front();
-        text.remove_prefix(1);
-        if (i == digits) {
-            return character == after ? std::optional(number) : std::nullopt;
-        }
-        if (character < '0' || character > '9') {
-            return std::nullopt;
-        }
-        number = number * 10 + static_cast<unsigned>(character - '0');
-    }
-    return std::nullopt;
-}
-
 std::optional<std::int64_t> secondsFrom(std::string_view text) {
     using namespace std::chrono;
+    constexpr std::string_view shape = "0000-00-00T00:00:00Z";
     text = trimmed(text);
-    const auto years = takeDigits(text, 4, '-');
-    const auto months = takeDigits(text, 2, '-');
-    const auto days = takeDigits(text, 2, 'T');
-    const auto hours = takeDigits(text, 2, ':');
-    const auto minutes = takeDigits(text, 2, ':');
-    const auto seconds = takeDigits(text, 2, 'Z');
-    if (!years || !months || !days || !hours || !minutes || !seconds || !text.empty()) {
+    const auto fits = [](char character, char wanted) {
+        return wanted == '0' ? character >= '0' && character <= '9' : character == wanted;
+    };
+    if (!std::ranges::equal(text, shape, fits)) {
         return std::nullopt;
     }
-    const year_month_day date(year(static_cast<int>(*years)), month(*months), day(*days));
-    if (!date.ok() || *hours > 23 || *minutes > 59 || *seconds > 59) {
+    const auto number = [text](std::size_t place, std::size_t digits) {
+        return static_cast<unsigned>(numberFrom<std::int64_t>(text.substr(place, digits)).value_or(0));
+    };
+    const year_month_day date(year(static_cast<int>(number(0, 4))), month(number(5, 2)), day(number(8, 2)));
+    if (!date.ok() || number(11, 2) > 23 || number(14, 2) > 59 || number(17, 2) > 59) {
         return std::nullopt;
     }
-    const std::int64_t midnight = sys_days(date).time_since_epoch().count() * 86'400LL;
-    return midnight + *hours * 3600LL + *minutes * 60LL + *seconds;
+    return sys_days(date).time_since_epoch().count() * 86'400LL + number(11, 2) * 3600LL +
+           number(14, 2) * 60LL + number(17, 2);
 }
 
 constexpr std::array<std::int16_t, 256> makeBase64Values() {
@@ -232,12 +213,16 @@ const char* PropertyListBuilder::endContainer() {
         return "a key without a value";
     }
     const std::span<Owned<CFTypeRef>> slots = std::span(values_).subspan(level.firstValue);
-    const auto shape = isDictionary ? Storage::Shape::dictionary : Storage::Shape::array;
-    Storage* const storage = slots.empty() ? nullptr : Storage::create(shape, slots);
-    auto container = isDictionary ? Owned<CFTypeRef>::adopt(new OpaqueCFDictionary(false, true, storage))
-                                  : Owned<CFTypeRef>::adopt(new OpaqueCFArray(false, true, storage));
-    if (isDictionary && storage != nullptr && !storage->hasDistinctKeys()) {
-        return "a dictionary with the same key twice";
+    Owned<CFTypeRef> container;
+    if (isDictionary) {
+        const auto storage = new Storage(Storage::Shape::dictionary, slots);
+        container = Owned<CFTypeRef>::adopt(new OpaqueCFDictionary(false, storage));
+        if (!storage->hasDistinctKeys()) {
+            return "a dictionary with the same key twice";
+        }
+    } else {
+        container =
+            Owned<CFTypeRef>::adopt(new OpaqueCFArray(false, new Storage(Storage::Shape::array, slots)));
     }
     values_.resize(level.firstValue);
     levels_.pop_back();

@@ -95,7 +95,7 @@ bool Writer::writeArray(CFArrayRef array, std::size_t depth) {
         return true;
     }
     put("<array>\n");
-    for (const CFTypeRef item : array->items()) {
+    for (const CFTypeRef item : itemsOf(array)) {
         if (!write(item, depth + 1)) {
             return false;
         }

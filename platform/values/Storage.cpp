@@ -1,11 +1,6 @@
 #include <algorithm>
-#include <bit>
-#include <cstring>
-#include <memory>
-#include <new>
 
 #include "platform/values/Containers.h"
-#include "platform/values/Scalars.h"
 
 namespace platform::values {
 
@@ -21,17 +16,15 @@ constinit thread_local Storage* doomed = nullptr;
 
 }  // namespace
 
-Storage* Storage::create(Shape shape, bool retainsValues, std::size_t capacity) {
-    const std::size_t size = sizeof(Storage) + capacity * static_cast<std::size_t>(shape) * sizeof(CFTypeRef);
-    return ::new (::operator new(size)) Storage(shape, retainsValues, static_cast<std::uint32_t>(capacity));
+Storage::Storage(Shape shape, std::span<Owned<CFTypeRef>> slots)
+    : shape_(shape), retainsValues_(true), slots_(slots.size()), live_(slots.size() / width()) {
+    std::ranges::transform(slots, slots_.begin(), [](Owned<CFTypeRef>& slot) { return slot.take(); });
 }
 
-Storage* Storage::create(Shape shape, std::span<Owned<CFTypeRef>> slots) {
-    const std::size_t count = slots.size() / static_cast<std::size_t>(shape);
-    Storage* const storage = create(shape, true, count);
-    std::ranges::transform(slots, storage->firstSlot(), [](Owned<CFTypeRef>& slot) { return slot.take(); });
-    storage->used_ = storage->live_ = static_cast<std::uint32_t>(count);
-    return storage;
+Storage::~Storage() {
+    for (std::size_t slot = 0; slot < slots_.size(); ++slot) {
+        releaseSlot(slot);
+    }
 }
 
 void Storage::release() noexcept {
@@ -39,256 +32,158 @@ void Storage::release() noexcept {
         return;
     }
     if (destructionDepth >= deepestDestruction) {
-        dropIndex();
         nextDoomed_ = doomed;
         doomed = this;
         return;
     }
     ++destructionDepth;
-    destroy(this);
+    delete this;
     while (destructionDepth == 1 && doomed != nullptr) {
         Storage* const next = doomed;
         doomed = next->nextDoomed_;
-        next->index_ = nullptr;
-        destroy(next);
+        delete next;
     }
     --destructionDepth;
 }
 
-void Storage::destroy(Storage* storage) noexcept {
-    storage->releaseContent();
-    storage->dropIndex();
-    storage->~Storage();
-    ::operator delete(storage);
-}
-
-void Storage::releaseContent() noexcept {
-    CFTypeRef* const slot = firstSlot();
-    const std::size_t step = width();
-    for (std::size_t i = 0; i < used_ * step; i += step) {
-        const CFTypeRef value = slot[i + step - 1];
-        if (shape_ == Shape::dictionary) {
-            if (slot[i] == nullptr) {
-                continue;
-            }
-            CFRelease(slot[i]);
-        }
-        if (retainsValues_) {
-            CFRelease(value);
-        }
+// Nothing of a hole.
+void Storage::releaseSlot(std::size_t slot) const noexcept {
+    const bool isKey = shape_ == Shape::dictionary && slot % 2 == 0;
+    if ((isKey || retainsValues_) && slots_[slot] != nullptr) {
+        CFRelease(slots_[slot]);
     }
-}
-
-Storage* Storage::copy(std::size_t capacity) const {
-    Storage* const storage = create(shape_, retainsValues_, std::max<std::size_t>(capacity, live_));
-    CFTypeRef* to = storage->firstSlot();
-    const CFTypeRef* const from = firstSlot();
-    const std::size_t step = width();
-    for (std::size_t i = 0; i < used_ * step; i += step) {
-        if (shape_ == Shape::dictionary) {
-            if (from[i] == nullptr) {
-                continue;
-            }
-            *to++ = CFRetain(from[i]);
-        }
-        const CFTypeRef value = from[i + step - 1];
-        *to++ = retainsValues_ ? CFRetain(value) : value;
-    }
-    storage->used_ = storage->live_ = live_;
-    return storage;
 }
 
 Storage* Storage::writable() {
-    const bool isShared = references_.load(std::memory_order_acquire) != 1;
-    if (!isShared && used_ < capacity_) {
+    if (references_.load(std::memory_order_acquire) == 1) {
         return this;
     }
-    const std::size_t roomy = live_ + std::max<std::size_t>(4, live_ / 2);
-    if (isShared) {
-        Storage* const own = copy(live_ < capacity_ ? capacity_ : roomy);
-        release();
-        return own;
-    }
-    if (live_ < used_ - used_ / 4) {
-        fillHoles();
-        return this;
-    }
-    // The references move along with the items.
     fillHoles();
-    Storage* const larger = create(shape_, retainsValues_, roomy);
-    std::memcpy(larger->firstSlot(), firstSlot(), live_ * width() * sizeof(CFTypeRef));
-    larger->used_ = larger->live_ = live_;
-    used_ = live_ = 0;
+    auto* const own = new Storage(shape_, retainsValues_);
+    own->slots_ = slots_;
+    own->live_ = live_;
+    for (std::size_t slot = 0; slot < slots_.size(); ++slot) {
+        if (retainsValues_ || (shape_ == Shape::dictionary && slot % 2 == 0)) {
+            CFRetain(slots_[slot]);
+        }
+    }
     release();
-    return larger;
+    return own;
 }
 
 void Storage::append(CFTypeRef value) {
-    firstSlot()[used_++] = retainsValues_ ? CFRetain(value) : value;
+    slots_.push_back(retainsValues_ ? CFRetain(value) : value);
     ++live_;
 }
 
 void Storage::removeItem(std::size_t position) {
-    CFTypeRef* const slot = firstSlot() + position;
-    const CFTypeRef removed = *slot;
-    std::memmove(slot, slot + 1, (used_ - position - 1) * sizeof(CFTypeRef));
-    --used_;
+    releaseSlot(position);
+    slots_.erase(slots_.begin() + static_cast<std::ptrdiff_t>(position));
     --live_;
-    if (retainsValues_) {
-        CFRelease(removed);
-    }
 }
 
 void Storage::reorder(std::span<const CFTypeRef> items, std::size_t position) noexcept {
-    std::ranges::copy(items, firstSlot() + position);
+    std::ranges::copy(items, slots_.begin() + static_cast<std::ptrdiff_t>(position));
 }
 
 std::span<const Entry> Storage::entries() {
     static_assert(sizeof(Entry) == 2 * sizeof(CFTypeRef) && alignof(Entry) == alignof(CFTypeRef));
     fillHoles();
-    return {reinterpret_cast<const Entry*>(firstSlot()), live_};
+    return {reinterpret_cast<const Entry*>(slots_.data()), live_};
 }
 
-void Storage::fillHoles() noexcept {
-    if (live_ == used_) {
+void Storage::fillHoles() {
+    if (live_ * width() == slots_.size()) {
         return;
     }
-    CFTypeRef* to = firstSlot();
-    for (CFTypeRef* from = firstSlot(); from != firstSlot() + used_ * 2UL; from += 2) {
-        if (from[0] != nullptr) {
-            to[0] = from[0];
-            to[1] = from[1];
-            to += 2;
+    std::size_t to = 0;
+    for (std::size_t from = 0; from < slots_.size(); from += 2) {
+        if (slots_[from] != nullptr) {
+            slots_[to++] = slots_[from];
+            slots_[to++] = slots_[from + 1];
         }
     }
-    used_ = live_;
-    dropIndex();
+    slots_.resize(to);
+    index_.reset();
 }
 
-std::size_t Storage::indexSize() const noexcept {
-    return std::bit_ceil(std::size_t{capacity_} * 2);
-}
-
-void Storage::dropIndex() noexcept {
-    ::operator delete(index_);
-    index_ = nullptr;
-}
-
-void Storage::enterIntoIndex(std::uint32_t position) noexcept {
-    const std::size_t mask = indexSize() - 1;
-    std::size_t place = hashOfValue(firstSlot()[position * 2UL]) & mask;
-    while (index_[place] != 0) {
-        place = (place + 1) & mask;
-    }
-    index_[place] = position + 1;
+bool Storage::isIndexed() const noexcept {
+    return slots_.size() > linearLimit * 2;
 }
 
 void Storage::buildIndex() {
     fillHoles();
-    const std::size_t size = indexSize() * sizeof(std::uint32_t);
-    index_ = static_cast<std::uint32_t*>(::operator new(size));
-    std::memset(index_, 0, size);
-    for (std::uint32_t position = 0; position < used_; ++position) {
-        enterIntoIndex(position);
+    index_ = std::make_unique<Index>(live_);
+    for (std::size_t position = 0; position < live_; ++position) {
+        index_->emplace(slots_[position * 2], position);
     }
 }
 
 std::size_t Storage::find(CFTypeRef key) {
-    const CFTypeRef* const slot = firstSlot();
-    if (used_ <= linearLimit) {
-        for (std::size_t position = 0; position < used_; ++position) {
-            if (slot[position * 2] == key) {
-                return position;
-            }
+    if (isIndexed()) {
+        if (!index_) {
+            buildIndex();
         }
-        const std::uint32_t hash = hashOfValue(key);
-        for (std::size_t position = 0; position < used_; ++position) {
-            const CFTypeRef candidate = slot[position * 2];
-            if (candidate != nullptr && hashOfValue(candidate) == hash && equalValues(candidate, key)) {
-                return position;
-            }
-        }
-        return absent;
-    }
-    if (index_ == nullptr) {
-        buildIndex();
+        const auto found = index_->find(key);
+        return found != index_->end() ? found->second : absent;
     }
     const std::uint32_t hash = hashOfValue(key);
-    const std::size_t mask = indexSize() - 1;
-    for (std::size_t place = hash & mask; index_[place] != 0; place = (place + 1) & mask) {
-        const std::size_t position = index_[place] - 1;
-        const CFTypeRef candidate = slot[position * 2];
+    for (std::size_t slot = 0; slot < slots_.size(); slot += 2) {
+        const CFTypeRef candidate = slots_[slot];
         if (candidate == key ||
             (candidate != nullptr && hashOfValue(candidate) == hash && equalValues(candidate, key))) {
-            return position;
+            return slot / 2;
         }
     }
     return absent;
 }
 
 bool Storage::hasDistinctKeys() {
-    const CFTypeRef* const slot = firstSlot();
-    if (used_ > linearLimit) {
-        std::size_t position = 0;
-        while (position < used_ && find(slot[position * 2]) == position) {
-            ++position;
-        }
-        return position == used_;
+    if (isIndexed()) {
+        buildIndex();
+        return index_->size() == live_;
     }
-    std::uint32_t hashes[linearLimit];
-    for (std::size_t later = 0; later < used_; ++later) {
-        hashes[later] = hashOfValue(slot[later * 2]);
-        for (std::size_t earlier = 0; earlier < later; ++earlier) {
-            if (hashes[earlier] == hashes[later] && equalValues(slot[earlier * 2], slot[later * 2])) {
-                return false;
-            }
-        }
+    std::size_t position = 0;
+    while (position < live_ && find(slots_[position * 2]) == position) {
+        ++position;
     }
-    return true;
+    return position == live_;
 }
 
 void Storage::addEntry(CFTypeRef key, CFTypeRef value) {
+    if (slots_.size() > 4 * (live_ + linearLimit)) {
+        fillHoles();
+    }
     // A key that somebody could still change would be lost in the index.
     const auto* const text = as<CFStringRef>(key);
-    CFTypeRef* const slot = firstSlot() + used_ * 2UL;
-    slot[0] = text != nullptr ? CFStringCreateCopy(nullptr, text) : CFRetain(key);
-    slot[1] = retainsValues_ ? CFRetain(value) : value;
-    if (index_ != nullptr) {
-        enterIntoIndex(used_);
-    }
-    ++used_;
+    slots_.push_back(text != nullptr ? CFStringCreateCopy(nullptr, text) : CFRetain(key));
+    slots_.push_back(retainsValues_ ? CFRetain(value) : value);
     ++live_;
+    if (index_) {
+        index_->emplace(slots_[slots_.size() - 2], slots_.size() / 2 - 1);
+    }
 }
 
 void Storage::replaceValue(std::size_t position, CFTypeRef value) {
-    CFTypeRef& slot = firstSlot()[position * 2 + 1];
-    const CFTypeRef replaced = slot;
-    slot = retainsValues_ ? CFRetain(value) : value;
+    const CFTypeRef replaced = std::exchange(slots_[position * 2 + 1], value);
     if (retainsValues_) {
+        CFRetain(value);
         CFRelease(replaced);
     }
 }
 
 void Storage::removeEntry(std::size_t position) {
-    CFTypeRef* const slot = firstSlot() + position * 2;
-    const CFTypeRef key = slot[0];
-    const CFTypeRef value = slot[1];
-    slot[0] = slot[1] = nullptr;
+    if (index_) {
+        index_->erase(slots_[position * 2]);
+    }
+    // Out of the way before anything is released.
+    const CFTypeRef key = std::exchange(slots_[position * 2], nullptr);
+    const CFTypeRef value = std::exchange(slots_[position * 2 + 1], nullptr);
     --live_;
     CFRelease(key);
     if (retainsValues_) {
         CFRelease(value);
     }
-}
-
-Storage& Container::writable() {
-    if (storage_ == nullptr) {
-        const auto shape = type() == Type::array ? Storage::Shape::array : Storage::Shape::dictionary;
-        storage_ = Storage::create(shape, retainsValues_, 4);
-    } else {
-        storage_ = storage_->writable();
-    }
-    return *storage_;
 }
 
 }  // namespace platform::values

@@ -26,15 +26,8 @@ Converter openMacRoman() {
     Converter converter(ucnv_open("macintosh", &status));
     if (succeeded(status)) {
         ucnv_setToUCallBack(converter.get(), UCNV_TO_U_CALLBACK_STOP, nullptr, nullptr, nullptr, &status);
-        ucnv_setFromUCallBack(converter.get(), UCNV_FROM_U_CALLBACK_STOP, nullptr, nullptr, nullptr, &status);
     }
     return succeeded(status) ? std::move(converter) : nullptr;
-}
-
-std::vector<UniChar> unitsOf(CFStringRef string) {
-    std::vector<UniChar> units(static_cast<std::size_t>(CFStringGetLength(string)));
-    CFStringGetCharacters(string, CFRangeMake(0, static_cast<CFIndex>(units.size())), units.data());
-    return units;
 }
 
 CFStringRef createFromMacRoman(std::string_view bytes) {
@@ -51,23 +44,6 @@ CFStringRef createFromMacRoman(std::string_view bytes) {
         return nullptr;
     }
     return CFStringCreateWithCharacters(nullptr, reinterpret_cast<const UniChar*>(units.data()), count);
-}
-
-bool copyAsMacRoman(CFStringRef string, char* buffer, std::size_t bufferSize) {
-    const Converter converter = openMacRoman();
-    const std::vector<UniChar> units = unitsOf(string);
-    if (!converter || units.size() >= bufferSize) {
-        return false;
-    }
-    UErrorCode status = U_ZERO_ERROR;
-    const std::int32_t size = ucnv_fromUChars(
-        converter.get(), buffer, static_cast<std::int32_t>(units.size()),
-        reinterpret_cast<const UChar*>(units.data()), static_cast<std::int32_t>(units.size()), &status);
-    if (!succeeded(status)) {
-        return false;
-    }
-    buffer[size] = '\0';
-    return true;
 }
 
 }  // namespace
@@ -118,9 +94,6 @@ CFStringRef CFStringCreateWithCharacters(CFAllocatorRef, const UniChar* characte
 
 Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
                            CFStringEncoding encoding) noexcept {
-    if (!string->isAscii() && encoding == kCFStringEncodingMacRoman && bufferSize > 0) {
-        return static_cast<Boolean>(copyAsMacRoman(string, buffer, static_cast<std::size_t>(bufferSize)));
-    }
     const char* const bytes = CFStringGetCStringPtr(string, encoding);
     const std::size_t size = string->text().size() + 1;
     if (bytes == nullptr || bufferSize < 0 || size > static_cast<std::size_t>(bufferSize)) {

@@ -41,7 +41,7 @@ bool equalSoFar(const Container& lhs, const Container& rhs, std::vector<Pair>& p
     if (lhs.count() != rhs.count() || lhs.retainsValues() != rhs.retainsValues()) {
         return false;
     }
-    if (lhs.storage() == rhs.storage() || lhs.count() == 0) {
+    if (&lhs.storage() == &rhs.storage()) {
         return true;
     }
     const auto note = [&](CFTypeRef left, CFTypeRef right) {
@@ -51,8 +51,8 @@ bool equalSoFar(const Container& lhs, const Container& rhs, std::vector<Pair>& p
         return left == right || lhs.retainsValues();
     };
     if (lhs.type() == Type::array) {
-        const std::span<const CFTypeRef> left = lhs.storage()->items();
-        const std::span<const CFTypeRef> right = rhs.storage()->items();
+        const std::span<const CFTypeRef> left = lhs.storage().items();
+        const std::span<const CFTypeRef> right = rhs.storage().items();
         for (std::size_t i = 0; i < left.size(); ++i) {
             if (!note(left[i], right[i])) {
                 return false;
@@ -60,9 +60,9 @@ bool equalSoFar(const Container& lhs, const Container& rhs, std::vector<Pair>& p
         }
         return true;
     }
-    for (const Entry& entry : lhs.storage()->entries()) {
-        const std::size_t position = rhs.storage()->find(entry.key);
-        if (position == Storage::absent || !note(entry.value, rhs.storage()->valueAt(position))) {
+    for (const Entry& entry : lhs.storage().entries()) {
+        const std::size_t position = rhs.storage().find(entry.key);
+        if (position == Storage::absent || !note(entry.value, rhs.storage().valueAt(position))) {
             return false;
         }
     }

@@ -37,9 +37,6 @@ TEST(Number, TellsALossyReading) {
         EXPECT_EQ(CFNumberGetValue(row.number.get(), kCFNumberSInt64Type, &as64) != 0, row.fits64);
         EXPECT_EQ(as64, row.as64);
     }
-    double real = 0;
-    EXPECT_TRUE(CFNumberGetValue(makeNumber(1LL << 53).get(), kCFNumberFloat64Type, &real));
-    EXPECT_FALSE(CFNumberGetValue(makeNumber((1LL << 53) + 1).get(), kCFNumberFloat64Type, &real));
 }
 
 TEST(Number, EqualsByValue) {
@@ -52,14 +49,14 @@ TEST(Number, EqualsByValue) {
 
 TEST(URL, HasASchemeAndNothingToEscape) {
     for (const char* good : {"http://192.0.0.192/dot11_config_start.htm", "http://[::1]:80/a%20b?c=d&e#f",
-                             "mailto:a@b", "a+b.c-1:"}) {
+                             "mailto:a@b", "a+b.c-1:", "http://a?b", "x:/a%20/b#"}) {
         const auto url = Owned<CFURLRef>::adopt(CFURLCreateWithString(nullptr, str(good).get(), nullptr));
         ASSERT_TRUE(url) << good;
         EXPECT_EQ(textOf(CFURLGetString(url.get())), good);
     }
-    for (const char* bad :
-         {"", "192.0.0.192/x", "1a:b", ":x", "http://a b/", "http://a/%2", "http://a/%zz", "http://a/\"",
-          "http://a/[x]", "http://a/#b#c", "http://\xC3\xA4/", "http://a/\n"}) {
+    for (const char* bad : {"", "192.0.0.192/x", "1a:b", ":x", "http://a b/", "http://a/%2", "http://a/%",
+                            "a:%4", "http://a/%zz", "http://a/\"", "http://a/[x]", "http://a/#b#c",
+                            "http://\xC3\xA4/", "http://a/\n", "x:a[b]"}) {
         EXPECT_EQ(CFURLCreateWithString(nullptr, str(bad).get(), nullptr), nullptr) << bad;
     }
 }
