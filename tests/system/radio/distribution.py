@@ -42,6 +42,8 @@ class Debian(hosts.Host):
 
     def start(self):
         self.home.stop()
+        # Else an address that an earlier host held is kept from this one, and free when the lease has ended.
+        (air.LOGS / "home.leases").unlink(missing_ok=True)
         self.home.dhcp = LEASE
         self.home.start()
         for path, text in self.files.items():
