@@ -10,7 +10,9 @@ function(la_options target)
     target_compile_options(${target} PRIVATE -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wsign-conversion
         $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor> $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast>
         -Wcast-qual -Wformat=2 -Wundef -Wimplicit-fallthrough
-        $<$<BOOL:${LA_WARNINGS_AS_ERRORS}>:-Werror>)
+        $<$<BOOL:${LA_WARNINGS_AS_ERRORS}>:-Werror>
+        # Before 13 the compiler sees copies in std::string's operator+ that cannot be.
+        $<$<AND:$<NOT:$<CONFIG:Debug>>,$<CXX_COMPILER_ID:GNU>,$<VERSION_LESS:$<CXX_COMPILER_VERSION>,13>>:-Wno-restrict>)
     if(LA_SANITIZE)
         target_compile_options(${target} PRIVATE -fsanitize=${LA_SANITIZE} -fno-sanitize-recover=all
             -fno-omit-frame-pointer)

@@ -1,0 +1,15 @@
+# Run by cpack before it packs: what Debian wants beside what is installed everywhere.
+foreach(component ${CPACK_COMPONENTS_ALL})
+    string(TOUPPER ${component} upper)
+    set(package ${CPACK_DEBIAN_${upper}_PACKAGE_NAME})
+    set(share ${CPACK_TEMPORARY_INSTALL_DIRECTORY}/${component}/usr/share)
+    file(COPY ${CPACK_LA_PACKAGING}/copyright ${CPACK_LA_PACKAGING}/changelog DESTINATION ${share}/doc/${package}
+        FILE_PERMISSIONS OWNER_READ OWNER_WRITE GROUP_READ WORLD_READ)
+    if(EXISTS ${share}/zsh/site-functions)
+        file(RENAME ${share}/zsh/site-functions ${share}/zsh/vendor-completions)
+    endif()
+    file(GLOB_RECURSE large ${share}/man/* ${share}/doc/*/changelog)
+    foreach(file ${large})
+        execute_process(COMMAND gzip -9nf ${file} COMMAND_ERROR_IS_FATAL ANY)
+    endforeach()
+endforeach()

@@ -1,0 +1,57 @@
+"""The Debian packages, which lie in /report, on a whole Debian with NetworkManager: installed, used, removed."""
+import os
+import sys
+from pathlib import Path
+
+import distribution
+import hosts
+import rows
+from air import sh
+
+TOOL = "/usr/sbin/location-assistant"
+# What running daemons and the package manager write by themselves.
+OTHERS = ("/proc", "/sys", "/dev", "/host", "/report", "/build", "/lab", "/run/systemd", "/run/udev", "/run/user",
+          "/run/NetworkManager", "/run/wpa_supplicant", "/var/lib/NetworkManager", "/var/lib/dpkg", "/var/log", "/var/cache",
+          "/tmp/air", "/run/air", "/run/netns")
+
+
+def files():
+    skipped = " -o ".join(f"-path {path}" for path in OTHERS)
+    return set(sh(rf"find / \( {skipped} \) -prune -o -print").splitlines())
+
+
+def installed_used_and_removed(visit):
+    before = files()
+    sh("dpkg -i /report/*.deb >/report/dpkg.txt 2>&1")
+    assert "status 'install ok installed'" not in sh("dpkg --audit"), "half installed"
+    visit.say("installed: " + " ".join(sorted(path for path in files() - before if "location-assistant" in path)))
+    assert Path(TOOL).exists()
+    os.environ["LA_BINARY"] = TOOL
+    visit.offer()
+    visit.there_and_back()
+    assert visit.host.tool("create", "from_intro", visit.name)
+    visit.page()
+    # Removed at the printer, it leads back first.
+    sh("dpkg -r location-assistant libmorescf-dev libmorescf1 >>/report/dpkg.txt 2>&1")
+    visit.as_before(within=20)
+    left = {path for path in files() - before if not path.startswith(str(hosts.STORE))}
+    assert not left, f"left behind: {sorted(left)}"
+    assert not before - files(), f"gone: {sorted(before - files())}"
+    assert Path(hosts.STORE, "preferences.plist").exists()
+    sh("dpkg -P location-assistant")
+    assert not Path(hosts.STORE).exists()
+    visit.say("removed and purged")
+
+
+rows.ROWS["installed_used_and_removed"] = installed_used_and_removed, ()
+
+
+def main():
+    log, held = rows.play(distribution.HOSTS["networkmanager"](), "installed_used_and_removed")
+    print(log, flush=True)
+    print(Path("/report/dpkg.txt").read_text(), flush=True)
+    sys.exit(0 if held else 1)
+
+
+if __name__ == "__main__":
+    main()
