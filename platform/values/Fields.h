@@ -102,8 +102,8 @@ class FieldReader {
     }
     template <class T>
     static bool decode(CFTypeRef value, std::optional<T>& result) {
-        result.reset();
-        return value == nullptr || decode(value, result.emplace());
+        result = value != nullptr ? std::optional<T>(std::in_place) : std::nullopt;
+        return value == nullptr || decode(value, *result);
     }
     template <class T>
     static bool decode(CFTypeRef value, std::vector<T>& list) {
