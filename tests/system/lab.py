@@ -196,21 +196,16 @@ class Lab:
             ip(f"link add {card} address 02:00:00:00:0{card[-1]}:{ord(card[0]):02x} type veth peer name far-{card} netns far")
             ip(f"-n far link set far-{card} up")
         # The machine before the tool comes: both cards in use, the wired one leads out.
-        if "eth0" in cards:
-            ip("-n far addr add 192.168.77.1/24 dev far-eth0")
-            if not daemon:
-                ip("link set eth0 up")
-                ip("addr add 192.168.77.10/24 brd + dev eth0")
-                ip("addr add 192.168.77.11/24 dev eth0")
-                ip("route add default via 192.168.77.1 dev eth0 metric 100")
-        if "wlan0" in cards:
-            ip("-n far addr add 192.0.0.192/24 dev far-wlan0")
-            if not daemon:
-                ip("link set wlan0 up")
-                ip("addr add 10.20.0.7/16 dev wlan0")
-                ip("route add 10.30.0.0/16 via 10.20.0.1 dev wlan0 metric 600")
-            if printer:
-                self.start_printer(printer)
+        for card, far, own in (
+                ("eth0", "192.168.77.1", ("addr add 192.168.77.10/24 brd + dev eth0", "addr add 192.168.77.11/24 dev eth0",
+                                          "route add default via 192.168.77.1 dev eth0 metric 100")),
+                ("wlan0", "192.0.0.192", ("addr add 10.20.0.7/16 dev wlan0",
+                                          "route add 10.30.0.0/16 via 10.20.0.1 dev wlan0 metric 600"))):
+            for command in (f"-n far addr add {far}/24 dev far-{card}",
+                            *(() if daemon else (f"link set {card} up", *own))) if card in cards else ():
+                ip(command)
+        if printer and "wlan0" in cards:
+            self.start_printer(printer)
         if dhcp:
             net, server = ("192.0.0", "192.0.0.192") if dhcp == "wlan0" else ("192.168.77", "192.168.77.1")
             self.daemon("dnsmasq", "--no-daemon", "--conf-file=/dev/null", "--port=0", f"--interface=far-{dhcp}",

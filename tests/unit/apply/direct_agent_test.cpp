@@ -51,9 +51,11 @@ std::string defaultRoutes() {
     return shell("ip route show default | sed 's/ linkdown//'");
 }
 
-// What is kept of the time before.
+// What is kept of the time before, and the DHCP clients that still run.
 std::string kept() {
-    return shell("ls /run/location-assistant | grep -v -e lock$ -e new$ || true");
+    return shell(
+        "ls /run/location-assistant | grep -v -e lock$ -e new$ || true;"
+        "grep -l '[u]dhcpc' /proc/[0-9]*/cmdline 2>/dev/null || true");
 }
 
 // What a commit that changes nothing asks for: why it failed.
@@ -143,8 +145,9 @@ TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
             EXPECT_EQ("192.0.0.192 dev card0 src 192.0.0.199 uid 0 \n    cache \n",
                       shell("ip route get 192.0.0.192"));
             EXPECT_EQ("default via 192.0.0.192 dev card0 proto 76 \n", defaultRoutes());
-            EXPECT_EQ("nameserver 192.0.0.53\n1\n",
-                      shell("grep -v '^#' /etc/resolv.conf; cat /proc/sys/net/ipv6/conf/card0/disable_ipv6"));
+            EXPECT_EQ("nameserver 192.0.0.53\n1\n600\n",
+                      shell("grep -v '^#' /etc/resolv.conf; cat /proc/sys/net/ipv6/conf/card0/disable_ipv6;"
+                            "stat -c %a /run/location-assistant/applied.plist"));
             EXPECT_EQ("", shell("ip -br addr show up dev card1"));
             EXPECT_EQ("", activate(there.get()));
             EXPECT_EQ(made, machineState());
@@ -249,6 +252,21 @@ TEST_F(DirectAgentTest, LooksAtTheMachineAgain) {
     });
 }
 
+TEST_F(DirectAgentTest, KeepsWhatAWayBackNeedsUntilItIsBack) {
+    run([] {
+        shell(
+            "echo nameserver 9.9.9.9 >/run/outer; touch /etc/resolv.conf; mount --bind /run/outer "
+            "/etc/resolv.conf");
+        const std::string before = machineState();
+        EXPECT_EQ("", activate(thereTree().get()));
+        shell("mount -o remount,bind,ro /etc/resolv.conf");
+        EXPECT_EQ("cannot open /etc/resolv.conf: Read-only file system", activate(makeTree({}).get()));
+        shell("mount -o remount,bind,rw /etc/resolv.conf");
+        EXPECT_EQ("", activate(makeTree({}).get()));
+        EXPECT_EQ(before + kept(), machineState());
+    });
+}
+
 // A DHCP client that does what the test writes into /run/offer, once each; $hook is the program that it
 // calls.
 const char* const client = R"(#!/bin/sh
@@ -304,7 +322,7 @@ TEST_F(DirectAgentTest, FollowsItsDhcpClient) {
         EXPECT_EQ("", activate(makeTree({}).get()));
         EXPECT_EQ(before, machineState());
         EXPECT_EQ("/run/real\n", shell("readlink /etc/resolv.conf"));
-        EXPECT_EQ("", kept() + shell("grep -l '[u]dhcpc' /proc/[0-9]*/cmdline 2>/dev/null || true"));
+        EXPECT_EQ("", kept());
         EXPECT_EQ("", log());
 
         // The location's own name servers; a client that does not end.
@@ -313,7 +331,7 @@ TEST_F(DirectAgentTest, FollowsItsDhcpClient) {
         EXPECT_EQ("nameserver 10.0.0.53\n", shell("grep -v '^#' /etc/resolv.conf"));
         EXPECT_EQ("", activate(makeTree({}).get()));
         EXPECT_EQ("card0: the DHCP client does not end by itself and is ended\n", log());
-        EXPECT_EQ(before, machineState());
+        EXPECT_EQ(before + kept(), machineState());
 
         // What no machine can have; a client that dies, and the one after it.
         offer("export ip=127.0.0.1; $hook bound");
@@ -349,8 +367,10 @@ TEST_F(DirectAgentTest, StaysOnTheNetworkThatItJoined) {
             const char *address, *key;
             int number;
             bool isJoined;
-        } rows[] = {
-            {"192.0.0.1", key, 1, true}, {"192.0.0.2", key, 0, false}, {"192.0.0.2", otherKey, 2, true}};
+        } rows[] = {{"192.0.0.1", key, 1, true},
+                    {"192.0.0.2", key, 0, false},
+                    {"192.0.0.2", otherKey, 2, true},
+                    {"192.0.0.3", "0066", 0, true}};
         for (const auto& row : rows) {
             supplicant.join(row.number);
             EXPECT_EQ("", activate(tree(row.address, row.key).get()));

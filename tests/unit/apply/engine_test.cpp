@@ -115,18 +115,23 @@ TEST_F(EngineTest, TellsWhatTheMachineRefusedAndOnlyLogsTheRest) {
     EXPECT_EQ(Lines{}, taken()) << "nothing of this is unfinished";
     EXPECT_EQ(Lines{}, log());
 
-    agent_->troubled.clear();
-    agent_->failing = {"takeOver eth0", "takeOver wlan0"};
-    EXPECT_EQ("takeOver eth0 was told to fail", apply(there_));
-    EXPECT_EQ((Lines{"eth0: takeOver eth0 was told to fail", "wlan0: takeOver wlan0 was told to fail"}),
-              log());
     // What failed is tried again, once in a process, and is only logged.
+    agent_->troubled.clear();
     agent_->failing = {"takeOver eth0"};
+    EXPECT_EQ("takeOver eth0 was told to fail", apply(there_));
     taken();
     EXPECT_EQ("", commitOther());
     EXPECT_EQ((Lines{"takeOver eth0", "takeOver wlan0", "settle"}), taken());
     EXPECT_EQ("", commitOther());
     EXPECT_EQ(Lines{}, taken());
+    log();
+    agent_->failing.insert("takeOver wlan0");
+    EXPECT_EQ("takeOver eth0 was told to fail", apply(there_));
+    EXPECT_EQ((Lines{"eth0: takeOver eth0 was told to fail", "wlan0: takeOver wlan0 was told to fail"}),
+              log());
+    agent_->failing = {"capture eth7"};
+    EXPECT_EQ("capture eth7 was told to fail", apply({there_[0], there_[1], fixedService("eth7")}));
+    EXPECT_EQ(Lines{"capture eth7 was told to fail"}, log());
 
     // What cannot be given back keeps its entry until it can; trouble on the way back is no reason to keep
     // it.

@@ -56,8 +56,11 @@ TEST(Plan, ReadsEveryKindOfService) {
              {"eth6", ""},
              fixedService("eth6"),
              {"eth6", switchedOff},
+             {"eth7", switchedOff},
              fixedService("*"),
-             {"abcdefghijklmno", switchedOff}})
+             {"", "Interface = {DeviceName = modem; Type = PPP};"},
+             {"abcdefghijklmno", switchedOff},
+             {"eth7", switchedOff}})
             .get(),
         troubles);
     EXPECT_TRUE(troubles.empty());
@@ -66,7 +69,8 @@ TEST(Plan, ReadsEveryKindOfService) {
         "eth0 off\n"
         "eth1 on 1 dhcp id me dns 10.0.0.53 dns 10.0.0.54 in example.org\n"
         "eth2 on 2 manual 10.1.0.1/32 172.16.0.1/16 192.168.0.1/24 via 10.1.0.9\n"
-        "eth3 on 3 manual\neth4 on 4 none\neth5 on 5 none no-power\neth6 on 6 none\nabcdefghijklmno off\n",
+        "eth3 on 3 manual\neth4 on 4 none\neth5 on 5 none no-power\neth6 on 6 none\neth7 "
+        "off\nabcdefghijklmno off\n",
         describe(plan));
 }
 

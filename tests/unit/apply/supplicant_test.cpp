@@ -5,9 +5,9 @@
 
 #include <memory>
 
+#include "platform/base/Hexadecimal.h"
 #include "platform/base/Host.h"
 #include "tests/unit/apply/StandInSupplicant.h"
-#include "tests/unit/support/Hexadecimal.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
 namespace platform::apply {
@@ -74,7 +74,7 @@ TEST_F(SupplicantTest, JoinsByWhatIsOnTheAir) {
         supplicant_->next = 2;
         supplicant_->hear(row.air, row.age);
         supplicant_->join(2);
-        const std::string name = testing_support::toHex(std::as_bytes(std::span(*row.settings.network)));
+        const std::string name = hexOf(*row.settings.network);
         Lines expected{"ADD_NETWORK", "SET_NETWORK 2 id_str \"location-assistant\"",
                        "SET_NETWORK 2 ssid " + name, "SET_NETWORK 2 scan_ssid 1"};
         std::ranges::transform(row.set, std::back_inserter(expected),

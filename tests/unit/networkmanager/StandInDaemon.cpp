@@ -219,20 +219,12 @@ void StandInDaemon::leave(std::uint32_t reason) {
     moveCard(deviceDisconnected);
 }
 
-void StandInDaemon::moveCard(std::uint32_t state, std::uint32_t reason) {
-    objects[card]["State"] = {state};
-    sd_bus_message* made = nullptr;
-    sd_bus_message_new_signal(bus_, &made, card.c_str(), (prefix + ".Device").c_str(), "StateChanged");
-    sd_bus_message_append(made, "uuu", state, 0U, reason);
-    signals_.emplace_back(made);
-}
-
-void StandInDaemon::moveActive(const std::string& path, std::uint32_t state) {
+void StandInDaemon::tell(const std::string& path, const char* interface, const char* types,
+                         std::uint32_t state, std::uint32_t reason) {
     objects[path]["State"] = {state};
     sd_bus_message* made = nullptr;
-    sd_bus_message_new_signal(bus_, &made, path.c_str(), (prefix + ".Connection.Active").c_str(),
-                              "StateChanged");
-    sd_bus_message_append(made, "uu", state, 0U);
+    sd_bus_message_new_signal(bus_, &made, path.c_str(), (prefix + interface).c_str(), "StateChanged");
+    sd_bus_message_append(made, types, state, 0U, reason);
     signals_.emplace_back(made);
 }
 

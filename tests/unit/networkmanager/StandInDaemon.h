@@ -64,8 +64,14 @@ class StandInDaemon {
                        sd_bus_message* reply);
     void activate(const std::string& profile, sd_bus_message* reply);
     void leave(std::uint32_t reason);
-    void moveCard(std::uint32_t state, std::uint32_t reason = 0);
-    void moveActive(const std::string& path, std::uint32_t state);
+    void tell(const std::string& path, const char* interface, const char* types, std::uint32_t state,
+              std::uint32_t reason);
+    void moveCard(std::uint32_t state, std::uint32_t reason = 0) {
+        tell(card, ".Device", "uuu", state, reason);
+    }
+    void moveActive(const std::string& path, std::uint32_t state) {
+        tell(path, ".Connection.Active", "uu", state, 0);
+    }
 
     sd_bus* bus_;
     platform::apply::Texts points_;

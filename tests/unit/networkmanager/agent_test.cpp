@@ -18,8 +18,11 @@ using Lines = std::vector<std::string>;
 
 const std::string canary = "canary-e7c1";
 const std::string home = "11111111-2222-4333-8444-555555555555";
-const std::string oursAdded = "AddConnection2 held back";
-const std::string oursActivated = "Activate location-assistant wlan0";
+const std::string added = "AddConnection2 held back";
+const std::string activated = "Activate location-assistant wlan0";
+const Lines going{added, activated};
+const Lines returning{"Activate Home", "Delete"};
+const std::string noServer = "no DHCP server answered; NetworkManager goes on asking";
 constexpr std::uint32_t adHoc = 1;
 constexpr std::uint32_t infrastructure = 2;
 constexpr std::uint32_t sharedKey = 0x100;
@@ -63,22 +66,26 @@ class NetworkManager : public ::testing::Test {
         EXPECT_TRUE(outcome.ok()) << outcome.reason();
         return captured.empty() ? Captured() : captured[0];
     }
-    // What stood against it; the status of a refusal goes before its reason.
-    std::string run(const Captured& before, const InterfacePlan* plan, double seconds = 10) {
+    // What was changed, and what stood against it; the status of a refusal goes before its reason.
+    Lines takeOver(const InterfacePlan* plan, const Captured& before, double seconds = 10) {
         std::vector<Task> tasks{{&before, plan, {}, {}}};
         const auto bound = std::chrono::duration<double>(seconds);
         const Clock::time_point deadline = Clock::now() + std::chrono::duration_cast<Clock::duration>(bound);
         agent_->start(tasks, deadline);
         while (!agent_->settle(deadline)) {
         }
+        Lines lines = std::exchange(daemon_.changes, {});
         const Outcome& refusal = tasks[0].refusal;
-        return refusal.ok() ? tasks[0].trouble : std::to_string(refusal.status()) + " " + refusal.reason();
+        if (!refusal.ok() || !tasks[0].trouble.empty()) {
+            lines.push_back(refusal.ok() ? tasks[0].trouble
+                                         : std::to_string(refusal.status()) + " " + refusal.reason());
+        }
+        return lines;
     }
-    std::string takeOver(const InterfacePlan& plan, const Captured& before, double seconds = 10) {
-        return run(before, &plan, seconds);
+    Lines takeOver(const InterfacePlan& plan, const Captured& before, double seconds = 10) {
+        return takeOver(&plan, before, seconds);
     }
-    std::string giveBack(const Captured& before) { return run(before, nullptr); }
-    Lines changes() { return std::exchange(daemon_.changes, {}); }
+    Lines giveBack(const Captured& before) { return takeOver(nullptr, before); }
     Sections ours() {
         for (const auto& [path, sections] : daemon_.profiles) {
             if (valueOf<std::string>(sections.at("connection"), "uuid") == profileUUID("wlan0")) {
@@ -126,35 +133,28 @@ TEST_F(NetworkManager, GoesAndComesBack) {
     joinHome();
     daemon_.offer("Printer", infrastructure, 0, 0);
     const Captured before = capture();
-    EXPECT_EQ("", takeOver(printer_, before));
-    EXPECT_EQ((Lines{oursAdded, oursActivated}), changes());
-    // The same again changes nothing; another address does.
-    EXPECT_EQ("", takeOver(printer_, before));
-    EXPECT_EQ(Lines{"Update2"}, changes());
+    EXPECT_EQ(going, takeOver(printer_, before));
+    // The same again changes nothing; another rank does.
+    EXPECT_EQ(Lines{"Update2"}, takeOver(printer_, before));
     InterfacePlan other = printer_;
     other.rank = 1;
-    EXPECT_EQ("", takeOver(other, before));
-    EXPECT_EQ((Lines{"Update2", oursActivated}), changes());
+    EXPECT_EQ((Lines{"Update2", activated}), takeOver(other, before));
     // The record of how it was may be lost: the profile has it too.
     const Captured again = capture();
-    EXPECT_EQ("", giveBack(again));
-    EXPECT_EQ((Lines{"Activate Home", "Delete"}), changes());
-    EXPECT_EQ("", giveBack(again));
-    EXPECT_EQ(Lines{}, changes());
+    EXPECT_EQ(returning, giveBack(again));
+    EXPECT_EQ(Lines{}, giveBack(again));
 
     InterfacePlan off;
     off.name = "wlan0";
-    EXPECT_EQ("", takeOver(off, before));
-    EXPECT_EQ((Lines{"Disconnect", "Managed off"}), changes());
-    EXPECT_EQ("", takeOver(off, before));
-    EXPECT_EQ(Lines{}, changes());
-    EXPECT_EQ("", giveBack(before));
-    EXPECT_EQ((Lines{"Managed on", "Activate Home"}), changes());
+    EXPECT_EQ((Lines{"Disconnect", "Managed off"}), takeOver(off, before));
+    EXPECT_EQ(Lines{}, takeOver(off, before));
+    EXPECT_EQ((Lines{"Managed on", "Activate Home"}), giveBack(before));
 
     // Somebody's own profile under our UUID is nobody's to change.
     daemon_.profiles["/theirs"] = {{"connection", {{"uuid", {profileUUID("wlan0")}}}}};
-    EXPECT_EQ("1001 another program has a profile under this system's UUID", takeOver(printer_, before));
-    EXPECT_EQ("", giveBack(before));
+    EXPECT_EQ(Lines{"1001 another program has a profile under this system's UUID"},
+              takeOver(printer_, before));
+    EXPECT_EQ(Lines{}, giveBack(before));
     EXPECT_TRUE(daemon_.profiles.contains("/theirs"));
 }
 
@@ -162,37 +162,34 @@ TEST_F(NetworkManager, WaitsForACellThatIsNotHeardYet) {
     joinHome();
     daemon_.offer("Printer", adHoc, 0, 0, true);
     const Captured before = capture();
-    EXPECT_EQ("", takeOver(printer_, before));
-    EXPECT_EQ((Lines{"Disconnect", oursAdded, oursActivated}), changes()) << "the card does not stay at home";
-    EXPECT_EQ("", giveBack(before));
+    EXPECT_EQ((Lines{"Disconnect", added, activated}), takeOver(printer_, before))
+        << "it does not stay at home";
+    EXPECT_EQ(returning, giveBack(before));
     daemon_.objects.erase(daemon_.manager + "/AccessPoint/1");
 
     // One that never comes: looked for until the end, and then left to the daemon.
     daemon_.failure = 53;
-    changes();
-    EXPECT_EQ("the network was not found", takeOver(printer_, before, 1));
-    EXPECT_EQ((Lines{"Disconnect", oursAdded, oursActivated, "RequestScan", "Delete", "AddConnection2",
-                     "Autoconnect on"}),
-              changes());
+    EXPECT_EQ((Lines{"Disconnect", added, activated, "RequestScan", "Delete", "AddConnection2",
+                     "Autoconnect on", "the network was not found"}),
+              takeOver(printer_, before, 1));
 
     // It comes while an access point of the name is looked for.
     daemon_.failure = 0;
     daemon_.hangs = true;
     daemon_.offer("Printer", adHoc, 0, 0, true);
-    EXPECT_EQ("no DHCP server answered; NetworkManager goes on asking", takeOver(printer_, before, 3));
+    EXPECT_EQ(noServer, takeOver(printer_, before, 3).back());
     EXPECT_EQ("adhoc", valueOf<std::string>(ours()["802-11-wireless"], "mode"));
 }
 
 TEST_F(NetworkManager, KeepsTheNetworkOfTheCard) {
-    EXPECT_EQ("no network is named and the card is on none, so it joins none", takeOver(plan({}), capture()));
-    EXPECT_EQ(Lines(), changes());
+    EXPECT_EQ(Lines{"no network is named and the card is on none, so it joins none"},
+              takeOver(plan({}), capture()));
     joinHome();
-    EXPECT_EQ("", takeOver(plan({}), capture()));
-    EXPECT_EQ((Lines{oursAdded, oursActivated}), changes());
+    EXPECT_EQ(going, takeOver(plan({}), capture()));
     EXPECT_EQ("Home", networkOf(ours()));
     EXPECT_EQ(canary, valueOf<std::string>(ours()["802-11-wireless-security"], "psk"));
     // With a key it is joined anew.
-    EXPECT_EQ("", takeOver(plan("Home", "another key"), capture()));
+    (void)takeOver(plan("Home", "another key"), capture());
     EXPECT_EQ("another key", valueOf<std::string>(ours()["802-11-wireless-security"], "psk"));
 }
 
@@ -201,57 +198,54 @@ TEST_F(NetworkManager, Radio) {
     card("State", {20U});
     daemon_.offer("Printer", infrastructure, 0, 0);
     const Captured before = capture();
-    EXPECT_EQ("", takeOver(printer_, before));
-    EXPECT_EQ((Lines{"WirelessEnabled on", oursAdded, oursActivated}), changes());
-    EXPECT_EQ("", giveBack(before));
-    EXPECT_EQ((Lines{"Disconnect", "Delete", "Autoconnect on", "WirelessEnabled off"}), changes());
+    EXPECT_EQ((Lines{"WirelessEnabled on", added, activated}), takeOver(printer_, before));
+    EXPECT_EQ((Lines{"Disconnect", "Delete", "Autoconnect on", "WirelessEnabled off"}), giveBack(before));
 
     // The daemon is told all the same, for the day when the switch on the computer is on again.
     daemon_.objects[daemon_.manager] = {{"WirelessEnabled", {true}}, {"WirelessHardwareEnabled", {false}}};
     card("State", {20U});
-    EXPECT_EQ("the radio is switched off by a switch on the computer", takeOver(printer_, before));
-    EXPECT_EQ((Lines{"AddConnection2", "Autoconnect on"}), changes());
+    EXPECT_EQ(
+        (Lines{"AddConnection2", "Autoconnect on", "the radio is switched off by a switch on the computer"}),
+        takeOver(printer_, before));
 }
 
 TEST_F(NetworkManager, Failures) {
     joinHome();
     daemon_.offer("Office", infrastructure, 1, sharedKey);
+    daemon_.offer("Users", infrastructure, 1, 0x200);
     const Captured before = capture();
     const InterfacePlan office = plan("Office", canary);
-    const struct {
-        std::uint32_t reason;
-        const char* said;
-    } rows[] = {{5, "no DHCP server answered"},
-                {7, "the network's key is wrong or missing"},
-                {8, "the network broke off the joining"},
-                {40, "the cable is out, or the network went away"},
-                {53, "the network was not found"},
-                {60, "somebody else took over the card"},
-                {999, "NetworkManager gives the reason 999"}};
-    for (const auto& row : rows) {
-        daemon_.failure = row.reason;
-        EXPECT_EQ(row.said, takeOver(office, before)) << "no refusal of the machine";
-        EXPECT_EQ(Lines({oursAdded, oursActivated, "Autoconnect off"}), changes())
-            << "it turns to no other network";
+    EXPECT_EQ((Lines{"Autoconnect off", "Disconnect",
+                     "the network asks each user for a name and a password, which a location does not hold"}),
+              takeOver(plan("Users", canary), before));
+    // None of these is a refusal of the machine, and the card turns to no other network.
+    for (const auto& [reason, said] : {std::pair{5U, "no DHCP server answered"},
+                                       {7U, "the network's key is wrong or missing"},
+                                       {8U, "the network broke off the joining"},
+                                       {40U, "the cable is out, or the network went away"},
+                                       {53U, "the network was not found"},
+                                       {60U, "somebody else took over the card"},
+                                       {999U, "NetworkManager gives the reason 999"}}) {
+        daemon_.failure = reason;
+        EXPECT_EQ((Lines{added, activated, "Autoconnect off", said}), takeOver(office, before));
         daemon_.failure = 0;
-        EXPECT_EQ("", giveBack(before));
-        EXPECT_EQ(Lines({"Activate Home", "Delete"}), changes());
+        EXPECT_EQ(returning, giveBack(before));
     }
-    EXPECT_EQ("", takeOver(office, before));
+    EXPECT_EQ(going, takeOver(office, before));
     daemon_.failure = 5;
-    EXPECT_EQ("the profile that was active before does not come up: no DHCP server answered",
+    EXPECT_EQ((Lines{"Activate Home", "Delete",
+                     "the profile that was active before does not come up: no DHCP server answered"}),
               giveBack(before));
-    EXPECT_TRUE(ours().empty()) << "the temporary profile does not stay in its place";
     daemon_.failure = 0;
-    EXPECT_EQ("", giveBack(before));
+    EXPECT_EQ(Lines{"Activate Home"}, giveBack(before));
     daemon_.refusal = "to " + canary;
-    EXPECT_EQ("1003 AddConnection2: org.freedesktop.NetworkManager.PermissionDenied",
+    EXPECT_EQ(Lines{"1003 AddConnection2: org.freedesktop.NetworkManager.PermissionDenied"},
               takeOver(office, before))
         << "nothing that holds the key is repeated";
     daemon_.refusal.clear();
-    EXPECT_EQ("", takeOver(office, before));
+    EXPECT_EQ(going, takeOver(office, before));
     daemon_.refusal = "!";
-    EXPECT_EQ("1003", giveBack(before).substr(0, 4)) << "a profile that stays is tried again";
+    EXPECT_EQ("1003", giveBack(before).back().substr(0, 4)) << "a profile that stays is tried again";
 }
 
 TEST_F(NetworkManager, BelievesNoSignalFromSomebodyElse) {
@@ -270,7 +264,7 @@ TEST_F(NetworkManager, BelievesNoSignalFromSomebodyElse) {
             std::this_thread::sleep_for(std::chrono::milliseconds(10));
         }
     });
-    EXPECT_EQ("no DHCP server answered; NetworkManager goes on asking", takeOver(printer_, before, 0.5));
+    EXPECT_EQ(noServer, takeOver(printer_, before, 0.5).back());
     forging.join();
     sd_bus_flush_close_unref(forger);
 }
@@ -304,13 +298,12 @@ TEST_F(NetworkManager, CardWithoutCarrier) {
     const Captured before = capture();
     card("State", {20U});
     card("ActiveConnection", {std::string("/")});
-    EXPECT_EQ("no profile can be active on it now", giveBack(before));
-    EXPECT_EQ(Lines{}, changes());
+    EXPECT_EQ(Lines{"no profile can be active on it now"}, giveBack(before));
     card("DeviceType", {1U});
     InterfacePlan wired = plan({});
     wired.wireless.reset();
-    EXPECT_EQ("it has no carrier: the cable is out", takeOver(wired, before));
-    EXPECT_EQ((Lines{"AddConnection2", "Autoconnect on"}), changes())
+    EXPECT_EQ((Lines{"AddConnection2", "Autoconnect on", "it has no carrier: the cable is out"}),
+              takeOver(wired, before))
         << "the daemon activates it when the cable is in";
 }
 

@@ -7,6 +7,8 @@
 #include <string_view>
 #include <vector>
 
+#include "platform/base/Hexadecimal.h"
+
 namespace testing_support {
 
 inline std::vector<std::byte> fromHex(std::string_view text) {
@@ -18,12 +20,7 @@ inline std::vector<std::byte> fromHex(std::string_view text) {
 }
 
 inline std::string toHex(std::span<const std::byte> bytes) {
-    std::string text;
-    for (const std::byte byte : bytes) {
-        text += "0123456789abcdef"[std::to_integer<unsigned>(byte) >> 4U];
-        text += "0123456789abcdef"[std::to_integer<unsigned>(byte) & 0xFU];
-    }
-    return text;
+    return platform::hexOf({reinterpret_cast<const char*>(bytes.data()), bytes.size()});
 }
 
 }  // namespace testing_support

@@ -3,7 +3,6 @@
 // with the code.
 #pragma once
 
-#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sched.h>
 #include <sys/mount.h>
@@ -14,6 +13,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <fstream>
 #include <functional>
 #include <string>
 
@@ -65,11 +65,7 @@ class PrivateNetwork {
 
   private:
     static bool write(const char* path, const std::string& text) {
-        const int file = open(path, O_WRONLY | O_CREAT | O_CLOEXEC, 0644);
-        const bool done =
-            file >= 0 && ::write(file, text.data(), text.size()) == static_cast<ssize_t>(text.size());
-        close(file);
-        return done;
+        return static_cast<bool>(std::ofstream(path) << text << std::flush);
     }
 
     static bool enter() {

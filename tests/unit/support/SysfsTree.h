@@ -30,9 +30,8 @@ class SysfsTree {
     }
     // A virtual machine's card: the virtio device stands between the port and the PCI device.
     void addVirtioEthernet(const std::string& name, const std::string& address) {
-        const std::string device = pciDevice(address, "virtio-pci") + "/virtio0";
-        describe(device, "virtio", "virtio_net");
-        addPort(name, device, "02:00:00:00:00:04");
+        addPort(name, describe(pciDevice(address, "virtio-pci") + "/virtio0", "virtio", "virtio_net"),
+                "02:00:00:00:00:04");
     }
     // `port` is the place on the USB bus, as in "1-2".
     void addUsbEthernet(const std::string& name, const std::string& port,
@@ -41,9 +40,8 @@ class SysfsTree {
     }
     // A port soldered to the board.
     void addPlatformEthernet(const std::string& name) {
-        const std::string device = "devices/platform/" + name + ".ethernet";
-        describe(device, "platform", "fec");
-        addPort(name, device, "02:00:00:00:00:06");
+        addPort(name, describe("devices/platform/" + name + ".ethernet", "platform", "fec"),
+                "02:00:00:00:00:06");
     }
     // An interface without hardware: a bridge, a tunnel, the loopback.
     void addVirtual(const std::string& name, int type = 1) {
@@ -59,9 +57,7 @@ class SysfsTree {
 
     // A port of the PC's own; without a UART the kernel shows type 0.
     void addSerial(const std::string& name, bool hasUart = true) {
-        const std::string device = "devices/platform/serial8250";
-        describe(device, "platform", "serial8250");
-        addTty(name, device);
+        addTty(name, describe("devices/platform/serial8250", "platform", "serial8250"));
         attribute("class/tty/" + name + "/type", hasUart ? "4" : "0");
     }
     // ttyUSB* or ttyACM*; the product stays unnamed when it is empty.
@@ -70,8 +66,7 @@ class SysfsTree {
     }
     // A Bluetooth serial port, connected or only bound.
     void addBluetoothSerial(const std::string& name, bool connected = true) {
-        const std::string device = "devices/virtual/bluetooth/hci0/hci0:42";
-        describe(device, "bluetooth", "");
+        const std::string device = describe("devices/virtual/bluetooth/hci0/hci0:42", "bluetooth", "");
         addTty(name, connected ? device : "");
     }
     // A console or a pseudo-terminal.
@@ -103,7 +98,7 @@ class SysfsTree {
     }
 
   private:
-    void describe(const std::string& device, const std::string& subsystem, const std::string& driver) {
+    std::string describe(const std::string& device, const std::string& subsystem, const std::string& driver) {
         folder(device);
         folder("bus/" + subsystem);
         link(device + "/subsystem", "bus/" + subsystem);
@@ -111,27 +106,21 @@ class SysfsTree {
             folder("bus/" + subsystem + "/drivers/" + driver);
             link(device + "/driver", "bus/" + subsystem + "/drivers/" + driver);
         }
-    }
-    std::string pciDevice(const std::string& address, const std::string& driver) {
-        std::string device = "devices/pci0000:00/" + address;
-        describe(device, "pci", driver);
         return device;
     }
+    std::string pciDevice(const std::string& address, const std::string& driver) {
+        return describe("devices/pci0000:00/" + address, "pci", driver);
+    }
     std::string usbInterface(const std::string& port, const std::string& driver, const std::string& product) {
-        const std::string controller = "devices/pci0000:00/0000:00:14.0";
-        describe(controller, "pci", "xhci_hcd");
-        const std::string device = controller + "/usb1/" + port;
-        describe(controller + "/usb1", "usb", "usb");
-        attribute(controller + "/usb1/idVendor", "1d6b");
-        attribute(controller + "/usb1/product", "Host Controller");
-        describe(device, "usb", "usb");
+        const std::string hub = describe(pciDevice("0000:00:14.0", "xhci_hcd") + "/usb1", "usb", "usb");
+        attribute(hub + "/idVendor", "1d6b");
+        attribute(hub + "/product", "Host Controller");
+        const std::string device = describe(hub + "/" + port, "usb", "usb");
         attribute(device + "/idVendor", "0525");
         if (!product.empty()) {
             attribute(device + "/product", product);
         }
-        std::string interface = device + "/" + port + ":1.0";
-        describe(interface, "usb", driver);
-        return interface;
+        return describe(device + "/" + port + ":1.0", "usb", driver);
     }
     void addPort(const std::string& name, const std::string& device, const std::string& mac) {
         const std::string node = device + "/net/" + name;
