@@ -5,7 +5,6 @@
 #include <sys/eventfd.h>
 #include <unistd.h>
 
-#include <cstdint>
 #include <filesystem>
 #include <memory>
 #include <optional>
@@ -19,7 +18,8 @@
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
 #include "platform/live/NetworkState.h"
-#include "platform/values/Values.h"
+#include "platform/values/PropertyListXML.h"
+#include "tests/unit/support/Notation.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
 namespace live_test {
@@ -42,15 +42,16 @@ class FakeNetworkState : public platform::live::NetworkState {
   public:
     std::optional<PrimaryRoute> primary;
     bool isFailing = false;
+    int looks = 0;
     std::vector<Destination> asked;
 
     void change(std::optional<PrimaryRoute> route) {
         primary = std::move(route);
-        const std::uint64_t one = 1;
-        EXPECT_EQ(write(news_.get(), &one, sizeof one), static_cast<ssize_t>(sizeof one));
+        EXPECT_EQ(eventfd_write(news_.get(), 1), 0);
     }
 
     Outcome primaryRoute(std::optional<PrimaryRoute>& route) override {
+        ++looks;
         route = primary;
         return outcome();
     }
@@ -70,8 +71,8 @@ class FakeNetworkState : public platform::live::NetworkState {
         explicit FakeNotices(int news) : news_(news) {}
         [[nodiscard]] int descriptor() const noexcept override { return news_.get(); }
         bool drain() override {
-            std::uint64_t count = 0;
-            return read(news_.get(), &count, sizeof count) > 0;
+            eventfd_t count = 0;
+            return eventfd_read(news_.get(), &count) == 0;
         }
 
       private:
@@ -91,12 +92,10 @@ inline Owned<CFStringRef> text(std::string_view bytes) {
     return platform::values::makeString(bytes);
 }
 
-inline Owned<CFArrayRef> arrayOf(const std::vector<std::string_view>& texts) {
-    CFMutableArrayRef const array = CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks);
-    for (const std::string_view item : texts) {
-        CFArrayAppendValue(array, text(item).get());
-    }
-    return Owned<CFArrayRef>::adopt(array);
+// "(a, b)" as an array.
+inline Owned<CFArrayRef> arrayOf(std::string_view notation) {
+    return Owned<CFArrayRef>::retained(
+        platform::values::as<CFArrayRef>(testing_support::read(notation).get()));
 }
 
 // The value at a key as one line, or "status <n>".
@@ -106,12 +105,13 @@ inline std::string valueAt(SCDynamicStoreRef store, std::string_view key) {
 }
 
 constexpr std::string_view globalKey = "State:/Network/Global/IPv4";
+const std::string global = std::string(globalKey) + " = ";
+constexpr std::string_view onlyGlobal = "(State:/Network/Global/IPv4)";
 
 // Records what a session's callback is told: "<key> = <value>".
 class Watcher {
   public:
-    explicit Watcher(const std::vector<std::string_view>& keys,
-                     const std::vector<std::string_view>& patterns = {}) {
+    explicit Watcher(std::string_view keys, std::string_view patterns = "()") {
         SCDynamicStoreContext context{0, this, nullptr, nullptr, nullptr};
         store = StoreRef::adopt(SCDynamicStoreCreate(nullptr, CFSTR("watcher"), &Watcher::changed, &context));
         EXPECT_TRUE(
@@ -150,6 +150,10 @@ class Watcher {
     Owned<CFRunLoopSourceRef> source_;
 };
 
+inline StoreRef openStore() {
+    return StoreRef::adopt(SCDynamicStoreCreate(nullptr, CFSTR("tester"), nullptr, nullptr));
+}
+
 class LiveTest : public testing::Test {
   protected:
     [[nodiscard]] platform::Host makeHost() const {
@@ -158,12 +162,13 @@ class LiveTest : public testing::Test {
         made.networkState = network;
         return made;
     }
-    void writePreferences(std::string_view plist) const {
-        (void)directory.write("store/new.plist", plist);
+    // Commits a tree, or something else.
+    void writePreferences(std::string_view notation) const {
+        (void)directory.write("store/new.plist", notation.starts_with('{')
+                                                     ? *platform::values::writePropertyListXML(
+                                                           testing_support::read(notation).get())
+                                                     : std::string(notation));
         std::filesystem::rename(directory.at("store/new.plist"), directory.at("store/preferences.plist"));
-    }
-    static StoreRef openStore() {
-        return StoreRef::adopt(SCDynamicStoreCreate(nullptr, CFSTR("tester"), nullptr, nullptr));
     }
 
     testing_support::TemporaryDirectory directory;

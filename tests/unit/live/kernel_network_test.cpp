@@ -39,10 +39,6 @@ class KernelNetworkTest : public testing_support::PrivateNetworkTest {
             usleep(10'000);
         }
     }
-    static std::string now() { return valueAt(openStore().get(), globalKey); }
-    static StoreRef openStore() {
-        return StoreRef::adopt(SCDynamicStoreCreate(nullptr, CFSTR("tester"), nullptr, nullptr));
-    }
 };
 
 std::string overCard(const std::string& card, const std::string& router = "") {
@@ -74,20 +70,16 @@ TEST_F(KernelNetworkTest, TheGlobalStateFollowsTheDefaultRoute) {
             {"ip route del blackhole default metric 7", overCard("5", "10.0.1.1")},
             {"ip link del card5", "status 1004"},
         };
-        Watcher watcher({globalKey});
+        Watcher watcher(onlyGlobal);
         std::string before = "status 1004";
         for (const auto& step : steps) {
             SCOPED_TRACE(step.command);
             watcher.notices.clear();
             shell(step.command);
             watcher.waitFor(before == step.state ? 0 : 1);
-            EXPECT_EQ(now(), step.state);
-            if (before != step.state) {
-                ASSERT_FALSE(watcher.notices.empty());
-                EXPECT_EQ(watcher.notices.back(), std::string(globalKey) + " = " + step.state);
-            } else {
-                EXPECT_TRUE(watcher.notices.empty());
-            }
+            EXPECT_EQ(valueAt(openStore().get(), globalKey), step.state);
+            EXPECT_EQ(watcher.notices.empty() ? "" : watcher.notices.back(),
+                      before == step.state ? "" : global + step.state);
             before = step.state;
         }
     });
@@ -106,11 +98,10 @@ TEST_F(KernelNetworkTest, ARouteThatGoesWithSomethingElseIsNoticed) {
         };
         for (const auto& row : rows) {
             shell(row.come);
-            Watcher watcher({globalKey});
+            Watcher watcher(onlyGlobal);
             shell(row.go);
             watcher.waitFor(1);
-            EXPECT_EQ(watcher.notices, std::vector<std::string>{std::string(globalKey) + " = status 1004"})
-                << row.go;
+            EXPECT_EQ(watcher.notices, std::vector<std::string>{global + "status 1004"}) << row.go;
         }
     });
 }
@@ -126,31 +117,26 @@ unsigned long droppedNotices() {
     return dropped;
 }
 
-void writeBurst(const std::string& path, int changes) {
-    std::ofstream batch(path);
-    for (int i = 0; i < changes; i += 2) {
-        const std::string address =
-            "10.7." + std::to_string(i / 200 % 250) + "." + std::to_string(i % 200 + 1) + "/24 dev card1\n";
-        batch << "address add " << address << "address del " << address;
-    }
-    batch << "route del default\nroute add default via 10.0.1.1\n";
-}
-
 TEST_F(KernelNetworkTest, TenThousandChangesUnreadAreSurvived) {
     run([] {
         shell("ip route add default via 10.0.0.1");
-        Watcher watcher({globalKey});
+        Watcher watcher(onlyGlobal);
         const testing_support::TemporaryDirectory directory;
-        writeBurst(directory.at("batch"), 10000);
-        shell("ip -batch " + directory.at("batch"));
+        std::string batch;
+        for (int i = 0; i < 5000; ++i) {
+            const std::string address = "10.7." + std::to_string(i / 100 % 250) + "." +
+                                        std::to_string(i % 100 + 1) + "/24 dev card1\n";
+            batch += "address add " + address + "address del " + address;
+        }
+        batch += "route del default\nroute add default via 10.0.1.1\n";
+        shell("ip -batch " + directory.write("batch", batch));
         EXPECT_GT(droppedNotices(), 0U) << "the socket was not overrun, so this shows nothing";
         watcher.waitFor(1);
         EXPECT_EQ(watcher.calls, 1U);
-        EXPECT_EQ(watcher.notices,
-                  std::vector<std::string>{std::string(globalKey) + " = " + overCard("1", "10.0.1.1")});
+        EXPECT_EQ(watcher.notices, std::vector<std::string>{global + overCard("1", "10.0.1.1")});
         shell("ip route del default");
         watcher.waitFor(2);
-        EXPECT_EQ(watcher.notices.back(), std::string(globalKey) + " = status 1004");
+        EXPECT_EQ(watcher.notices.back(), global + "status 1004");
     });
 }
 

@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <fstream>
 #include <iterator>
 #include <string>
@@ -13,29 +14,20 @@
 #include "platform/SystemConfiguration.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
-#include "platform/values/PropertyListXML.h"
-#include "platform/values/Values.h"
+#include "tests/unit/support/Notation.h"
 #include "tests/unit/support/TemporaryDirectory.h"
 
 namespace preferences_test {
 
 using platform::values::as;
-using platform::values::makeString;
 using platform::values::Owned;
+using testing_support::read;
+using testing_support::show;
 
 using SessionRef = Owned<SCPreferencesRef>;
 
 inline Owned<CFStringRef> text(std::string_view bytes) {
-    return makeString(bytes);
-}
-
-// {"Name": name}
-inline Owned<CFDictionaryRef> named(std::string_view name) {
-    const auto value = text(name);
-    const void* key = CFSTR("Name");
-    const void* item = value.get();
-    return Owned<CFDictionaryRef>::adopt(CFDictionaryCreate(
-        nullptr, &key, &item, 1, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
+    return platform::values::makeString(bytes);
 }
 
 inline std::string contentOf(const std::string& path) {
@@ -49,23 +41,25 @@ inline struct stat statusOf(const std::string& path) {
     return status;
 }
 
-inline Owned<CFPropertyListRef> parsed(std::string_view xml) {
-    platform::values::ParseError error;
-    auto value = platform::values::parsePropertyListXML(xml, error);
-    EXPECT_TRUE(value) << error.reason;
-    return value;
+// Puts {Name = name} at the path.
+inline bool set(const SessionRef& session, std::string_view path, std::string_view name) {
+    const auto value = Owned<CFMutableDictionaryRef>::adopt(CFDictionaryCreateMutable(
+        nullptr, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
+    CFDictionarySetValue(value.get(), CFSTR("Name"), text(name).get());
+    return SCPreferencesPathSetValue(session.get(), text(path).get(), value.get()) != 0;
 }
 
-inline bool set(const SessionRef& session, std::string_view path, std::string_view name) {
-    return SCPreferencesPathSetValue(session.get(), text(path).get(), named(name).get()) != 0;
+inline std::string shown(const SessionRef& session, std::string_view path = "/") {
+    return show(SCPreferencesPathGetValue(session.get(), text(path).get()));
 }
 
 // The "Name" in the dictionary at the path; "-" without one.
 inline std::string nameAt(const SessionRef& session, std::string_view path) {
     CFDictionaryRef const dictionary = SCPreferencesPathGetValue(session.get(), text(path).get());
-    const auto name =
-        dictionary != nullptr ? as<CFStringRef>(CFDictionaryGetValue(dictionary, CFSTR("Name"))) : nullptr;
-    return name != nullptr ? std::string(platform::values::textOf(name)) : "-";
+    const void* name = nullptr;
+    const bool isThere =
+        dictionary != nullptr && CFDictionaryGetValueIfPresent(dictionary, CFSTR("Name"), &name) != 0;
+    return isThere ? show(name) : "-";
 }
 
 class StoreTest : public testing::Test {
@@ -73,27 +67,25 @@ class StoreTest : public testing::Test {
     [[nodiscard]] static platform::Host hostIn(const std::string& directory) {
         platform::Host host;
         host.preferencesDirectory = directory + "/store";
-        host.runtimeDirectory = directory + "/run";
         return host;
     }
     static SessionRef open() {
         return SessionRef::adopt(SCPreferencesCreate(nullptr, CFSTR("tester"), nullptr));
     }
     static bool commit(const SessionRef& session) { return SCPreferencesCommitChanges(session.get()) != 0; }
-    // A store that holds {"Sets": {"1": {"Name": "one"}}}.
-    void makeStore() const { (void)directory.write("store/preferences.plist", smallTree); }
+    void writeStore(std::string_view content) const {
+        (void)directory.write("store/preferences.plist", content);
+    }
+    // A store that holds {Sets = {1 = {Name = one}}}.
+    void makeStore() const { writeStore(smallTree); }
     [[nodiscard]] bool logHas(std::string_view fragment) const {
-        for (const std::string& line : log) {
-            if (line.find(fragment) != std::string::npos) {
-                return true;
-            }
-        }
-        return false;
+        return std::ranges::any_of(
+            log, [&](const std::string& line) { return line.find(fragment) != std::string::npos; });
     }
 
     static constexpr std::string_view smallTree =
-        "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">\n<dict><key>Sets</key><dict>"
-        "<key>1</key><dict><key>Name</key><string>one</string></dict></dict></dict></plist>";
+        "<plist version=\"1.0\">\n<dict><key>Sets</key><dict><key>1</key><dict><key>Name</key>"
+        "<string>one</string></dict></dict></dict></plist>";
 
     testing_support::TemporaryDirectory directory;
     std::string store = directory.at("store");

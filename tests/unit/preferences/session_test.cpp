@@ -1,9 +1,7 @@
 #include "platform/preferences/Session.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <filesystem>
+#include <functional>
 
 #include "tests/unit/preferences/Fixture.h"
 #include "tests/unit/support/Child.h"
@@ -27,8 +25,7 @@ TEST_F(SessionTest, AnUnchangedTreeIsNotWrittenAgain) {
     EXPECT_EQ(contentOf(file), smallTree);
     // Nor is what this process wrote read again.
     ASSERT_TRUE(set(session, "/Sets/2", "two") && commit(session));
-    SessionRef next = open();
-    EXPECT_EQ(SCPreferencesPathGetValue(next.get(), CFSTR("/")),
+    EXPECT_EQ(SCPreferencesPathGetValue(open().get(), CFSTR("/")),
               SCPreferencesPathGetValue(session.get(), CFSTR("/")));
 }
 
@@ -38,7 +35,7 @@ TEST_F(SessionTest, AFileThatSomebodyElseChangedIsNotOverwritten) {
             SessionRef other = open();
             ASSERT_TRUE(set(other, "/Sets/9", "theirs") && commit(other));
         },
-        [this] { (void)directory.write("store/preferences.plist", std::string(smallTree) + "\n"); },
+        [this] { writeStore(std::string(smallTree) + "\n"); },
         [this] { std::filesystem::remove(file); },
     };
     for (const auto& change : changes) {
@@ -88,6 +85,10 @@ TEST_F(SessionTest, TheLockKeepsOthersOut) {
     EXPECT_EQ(tryAsOther(), 0) << "another session of the same process";
     ASSERT_TRUE(set(session, "/Sets/3", "three") && commit(session));
     EXPECT_EQ(testing_support::Child(tryAsOther).wait(), 0) << "a commit keeps the lock";
+    writeStore(smallTree);
+    ASSERT_TRUE(set(session, "/Sets/3", "again"));
+    EXPECT_FALSE(commit(session)) << "an editor heeds no lock";
+    EXPECT_EQ(SCError(), 3005);
     EXPECT_TRUE(SCPreferencesLock(session.get(), 0)) << "twice";
     session = {};
     session = open();

@@ -1,11 +1,9 @@
-#include <fcntl.h>
 #include <unistd.h>
 
 #include <filesystem>
 #include <functional>
 
 #include "tests/unit/preferences/Fixture.h"
-#include "tests/unit/support/Notation.h"
 
 namespace preferences_test {
 namespace {
@@ -16,9 +14,7 @@ class StoreFileTest : public StoreTest {
 };
 
 TEST_F(StoreFileTest, WhatIsNoPreferencesFileIsRefusedAndLeftAlone) {
-    const auto write = [this](const char* content) {
-        return [this, content] { (void)directory.write("store/preferences.plist", content); };
-    };
+    const auto write = [this](const char* content) { return [this, content] { writeStore(content); }; };
     const struct {
         const char* what;
         std::function<void()> make;
@@ -59,24 +55,26 @@ TEST_F(StoreFileTest, TheFirstRunTreeIsCommittedAsItIs) {
     ASSERT_TRUE(session);
     EXPECT_FALSE(std::filesystem::exists(store));
     ASSERT_TRUE(commit(session));
-    EXPECT_EQ(
-        testing_support::show(parsed(contentOf(file)).get()),
-        "{CurrentSet = /Sets/0; NetworkServices = {0 = {UserDefinedName = Managed by the system; Interface = "
-        "{DeviceName = *; Hardware = System; Type = System}}}; Sets = {0 = {UserDefinedName = Automatic; "
-        "Network "
-        "= {Global = {IPv4 = {PPPOverridePrimary = #0; ServiceOrder = (0)}; NetInfo = {}}; Service = {0 = "
-        "{__LINK__ = /NetworkServices/0}}}}}}");
+    const std::string written = contentOf(file);
+    writeStore(written);
+    EXPECT_EQ(shown(open()),
+              "{CurrentSet = /Sets/0; NetworkServices = {0 = {UserDefinedName = Managed by the system; "
+              "Interface = {DeviceName = *; Hardware = System; Type = System}}}; Sets = {0 = "
+              "{UserDefinedName = Automatic; Network = {Global = {IPv4 = {PPPOverridePrimary = #0; "
+              "ServiceOrder = (0)}; NetInfo = {}}; Service = {0 = {__LINK__ = /NetworkServices/0}}}}}}");
 }
 
 TEST_F(StoreFileTest, WhatItWritesIsPrivate) {
     const mode_t before = umask(0);
-    std::filesystem::remove_all(store);
     for (const mode_t wide : {0600U, 0666U, 0640U}) {
         SessionRef session = open();
         ASSERT_TRUE(set(session, "/Sets/1", std::to_string(wide)) && commit(session));
         EXPECT_EQ(statusOf(store).st_mode & 07777U, 0700U);
         EXPECT_EQ(statusOf(file).st_mode & 07777U, 0600U);
         EXPECT_EQ(statusOf(lockFile).st_mode & 07777U, 0600U);
+        ASSERT_EQ(chmod(file.c_str(), wide), 0);
+        (void)open();
+        EXPECT_EQ(statusOf(file).st_mode & 07777U, 0600U) << "what an editor or a copy made of it";
         ASSERT_EQ(chmod(file.c_str(), wide), 0);
     }
     umask(before);
