@@ -5,11 +5,13 @@
 #include <string_view>
 
 #include "platform/values/PropertyListXML.h"
-#include "platform/values/Values.h"
+#include "tests/unit/support/Notation.h"
 
 namespace values_test {
 
 using namespace platform::values;
+using testing_support::read;
+using testing_support::show;
 
 inline Owned<CFStringRef> str(std::string_view text) {
     return makeString(text);
@@ -21,18 +23,14 @@ inline Owned<CFPropertyListRef> parsed(std::string_view inner) {
     return parsePropertyListXML("<plist version=\"1.0\">" + std::string(inner) + "</plist>", error);
 }
 
-template <class Ref>
-Owned<Ref> parsedAs(std::string_view inner) {
-    return Owned<Ref>::adopt(as<Ref>(parsed(inner).take()));
+// Empty, or of what the notation says.
+inline Owned<CFMutableDictionaryRef> mutableDictionary(std::string_view notation = "{}") {
+    return Owned<CFMutableDictionaryRef>::adopt(
+        const_cast<CFMutableDictionaryRef>(as<CFDictionaryRef>(read(notation).take())));
 }
-
-inline Owned<CFMutableDictionaryRef> mutableDictionary() {
-    return Owned<CFMutableDictionaryRef>::adopt(CFDictionaryCreateMutable(
-        nullptr, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks));
-}
-
-inline Owned<CFMutableArrayRef> mutableArray() {
-    return Owned<CFMutableArrayRef>::adopt(CFArrayCreateMutable(nullptr, 0, &kCFTypeArrayCallBacks));
+inline Owned<CFMutableArrayRef> arrayOf(std::string_view notation) {
+    return Owned<CFMutableArrayRef>::adopt(
+        const_cast<CFMutableArrayRef>(as<CFArrayRef>(read(notation).take())));
 }
 
 // Immutable arrays, one inside the other.

@@ -2,51 +2,43 @@
 
 #include <vector>
 
+#include "platform/values/Fields.h"
 #include "tests/unit/values/Values.h"
 
 using namespace values_test;
 
 namespace {
 
-constexpr const char* treeText =
-    "<dict>"
-    "<key>Sets</key><dict><key>0</key><dict><key>Name</key><string>a</string></dict>"
-    "<key>1</key><dict><key>Name</key><string>b</string></dict></dict>"
-    "<key>CurrentSet</key><string>/Sets/0</string>"
-    "</dict>";
+constexpr const char* tree = "{Sets = {0 = {Name = a}; 1 = {Name = b}}; CurrentSet = /Sets/0}";
 
 CFDictionaryRef childOf(CFDictionaryRef parent, CFStringRef key) {
     return as<CFDictionaryRef>(CFDictionaryGetValue(parent, key));
 }
 
-TEST(Frozen, IsARetainOfWhatNobodyCanChange) {
-    const auto tree = parsed(treeText);
-    EXPECT_EQ(frozen(tree.get()).get(), tree.get());
-    const auto built = nestedArrays(deepestPropertyList);
-    EXPECT_EQ(frozen(built.get()).get(), built.get());
+TEST(Frozen, IsARetainOfWhatNobodyCanChangeAndBoundsTheDepth) {
+    const auto deepest = nestedArrays(deepestPropertyList);
+    EXPECT_EQ(frozen(deepest.get()).get(), deepest.get());
     EXPECT_FALSE(frozen(nestedArrays(deepestPropertyList + 1).get()));
     EXPECT_TRUE(frozen(nestedArrays(12).get(), deepestPropertyList - 12));
     EXPECT_FALSE(frozen(nestedArrays(12).get(), deepestPropertyList - 11));
 }
 
 TEST(Frozen, FindsTheMutablePartHoweverDeepAndSharesTheRest) {
-    const auto tree = parsedAs<CFDictionaryRef>(treeText);
+    const auto first = frozen(read(tree).get());
     const auto name = Owned<CFMutableStringRef>::adopt(CFStringCreateMutableCopy(nullptr, 0, CFSTR("c")));
     CFTypeRef item = name.get();
     const auto holder = Owned<CFArrayRef>::adopt(CFArrayCreate(nullptr, &item, 1, &kCFTypeArrayCallBacks));
-    const auto root =
-        Owned<CFMutableDictionaryRef>::adopt(CFDictionaryCreateMutableCopy(nullptr, 0, tree.get()));
+    const auto root = Owned<CFMutableDictionaryRef>::adopt(
+        CFDictionaryCreateMutableCopy(nullptr, 0, as<CFDictionaryRef>(first.get())));
+    const auto same = frozen(root.get());
     CFDictionarySetValue(root.get(), CFSTR("New"), holder.get());
-
+    EXPECT_EQ(show(same.get()), tree);
     const auto copy = frozen(root.get());
-    const auto* const dictionary = as<CFDictionaryRef>(copy.get());
-    ASSERT_NE(dictionary, nullptr);
-    EXPECT_TRUE(CFEqual(copy.get(), root.get()));
-    EXPECT_EQ(childOf(dictionary, CFSTR("Sets")), childOf(tree.get(), CFSTR("Sets")));
     CFStringReplace(name.get(), CFRangeMake(0, 1), CFSTR("changed"));
     CFDictionaryRemoveValue(root.get(), CFSTR("Sets"));
-    EXPECT_EQ(descriptionOf(copy.get()),
-              "{Sets = {0 = {Name = a}; 1 = {Name = b}}; CurrentSet = /Sets/0; New = (c)}");
+    EXPECT_EQ(show(copy.get()), std::string(tree).replace(std::string(tree).size() - 1, 1, "; New = (c)}"));
+    EXPECT_EQ(childOf(as<CFDictionaryRef>(copy.get()), CFSTR("Sets")),
+              childOf(as<CFDictionaryRef>(first.get()), CFSTR("Sets")));
     EXPECT_EQ(frozen(copy.get()).get(), copy.get());
 }
 
@@ -54,43 +46,86 @@ TEST(Frozen, RefusesWhatIsNoPropertyList) {
     const auto dictionary = mutableDictionary();
     CFDictionarySetValue(dictionary.get(), makeNumber(1).get(), CFSTR("key is no string"));
     EXPECT_FALSE(frozen(dictionary.get()));
-    const auto array = mutableArray();
-    const auto url =
-        Owned<CFURLRef>::adopt(CFURLCreateWithString(nullptr, CFSTR("http://192.0.0.192/"), nullptr));
-    CFArrayAppendValue(array.get(), url.get());
+    EXPECT_FALSE(writePropertyListXML(dictionary.get()));
+    const auto array = arrayOf("()");
+    CFArrayAppendValue(
+        array.get(),
+        Owned<CFURLRef>::adopt(CFURLCreateWithString(nullptr, CFSTR("http://a/"), nullptr)).get());
     EXPECT_FALSE(frozen(array.get()));
+    EXPECT_FALSE(writePropertyListXML(array.get()));
 }
 
 TEST(Frozen, DeepMutableCopyIsApartThroughout) {
-    const auto tree = parsedAs<CFDictionaryRef>(treeText);
+    const auto original = frozen(read(tree).get());
     const auto copy = Owned<CFDictionaryRef>::adopt(static_cast<CFDictionaryRef>(
-        CFPropertyListCreateDeepCopy(nullptr, tree.get(), kCFPropertyListMutableContainersAndLeaves)));
+        CFPropertyListCreateDeepCopy(nullptr, original.get(), kCFPropertyListMutableContainersAndLeaves)));
     auto* const sets = const_cast<CFMutableDictionaryRef>(childOf(copy.get(), CFSTR("Sets")));
-    auto* const set = const_cast<CFMutableDictionaryRef>(childOf(sets, CFSTR("0")));
-    auto* const name =
-        const_cast<CFMutableStringRef>(as<CFStringRef>(CFDictionaryGetValue(set, CFSTR("Name"))));
-    CFStringReplace(name, CFRangeMake(0, 1), CFSTR("changed"));
+    const void* const name = CFDictionaryGetValue(childOf(sets, CFSTR("0")), CFSTR("Name"));
+    CFStringReplace(const_cast<CFMutableStringRef>(as<CFStringRef>(name)), CFRangeMake(0, 1),
+                    CFSTR("changed"));
     CFDictionaryRemoveValue(sets, CFSTR("1"));
-    EXPECT_EQ(descriptionOf(copy.get()), "{Sets = {0 = {Name = changed}}; CurrentSet = /Sets/0}");
-    EXPECT_TRUE(CFEqual(tree.get(), parsed(treeText).get()));
-}
-
-void setName(Owned<CFDictionaryRef>& root, std::string_view set, std::string_view name) {
-    setAtPath(root, std::vector{str("Sets"), str(set), str("Name")}, str(name).get());
+    EXPECT_EQ(show(copy.get()), "{Sets = {0 = {Name = changed}}; CurrentSet = /Sets/0}");
+    EXPECT_EQ(show(original.get()), tree);
 }
 
 TEST(Editing, WritesInPlaceWhatNobodyElseHolds) {
-    auto root = parsedAs<CFDictionaryRef>(treeText);
+    auto root = Owned<CFDictionaryRef>::adopt(as<CFDictionaryRef>(frozen(read(tree).get()).take()));
     const CFDictionaryRef handle = root.get();
     const CFDictionaryRef sets = childOf(handle, CFSTR("Sets"));
     const CFDictionaryRef set = childOf(sets, CFSTR("1"));
-    setName(root, "1", "new");
+    const auto rename = [&](std::string_view name) {
+        setAtPath(root, std::vector{str("Sets"), str("1"), str("Name")}, str(name).get());
+    };
+    rename("new");
     EXPECT_EQ(root.get(), handle);
     EXPECT_EQ(childOf(sets, CFSTR("1")), set);
+    const auto held = Owned<CFDictionaryRef>::retained(set);
+    rename("newer");
+    EXPECT_EQ(show(held.get()), "{Name = new}");
     removeAtPath(root, std::vector{str("Sets"), str("0")});
     setAtPath(root, std::vector{str("a"), str("b"), str("c")}, kCFBooleanTrue);
-    EXPECT_EQ(descriptionOf(root.get()),
-              "{Sets = {1 = {Name = new}}; CurrentSet = /Sets/0; a = {b = {c = true}}}");
+    EXPECT_EQ(show(root.get()), "{Sets = {1 = {Name = newer}}; CurrentSet = /Sets/0; a = {b = {c = #true}}}");
+}
+
+struct Kept {
+    enum class Kind { one, two, last = two };
+    bool flag = true;
+    Kind kind = Kind::two;
+    std::uint8_t small = 255;
+    std::string text = "\xFF";
+    std::array<std::uint8_t, 2> address{1, 2};
+    std::vector<std::string> list{"a", "b"};
+    std::optional<std::string> absent;
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Flag", self.flag);
+        fields("Kind", self.kind);
+        fields("Small", self.small);
+        fields("Text", self.text);
+        fields("Address", self.address);
+        fields("List", self.list);
+        fields("Absent", self.absent);
+    }
+};
+
+TEST(Fields, ReadBackWhatTheyWroteAndNothingElse) {
+    const std::string kept = show(toPropertyList(Kept()).get());
+    EXPECT_EQ(kept, "{Flag = #true; Kind = #1; Small = #255; Text = <ff>; Address = <0102>; List = (a, b)}");
+    Kept other{false, Kept::Kind::one, 0, "", {}, {}, "there"};
+    EXPECT_TRUE(fromPropertyList(mutableDictionary(kept).get(), other));
+    EXPECT_EQ(show(toPropertyList(other).get()), kept);
+    for (const auto& [from, to] :
+         {std::pair("Flag = #true; ", ""), std::pair("#true", "#1"), std::pair("Kind = #1", "Kind = #2"),
+          std::pair("Kind = #1", "Kind = #-1"), std::pair("#255", "#256"), std::pair("<ff>", "#7"),
+          std::pair("<0102>", "<010203>"), std::pair("<0102>", "<01>"), std::pair("(a, b)", "(a, #1)"),
+          std::pair("List = (a, b)", "List = a"), std::pair("(a, b)", "(a, b); Absent = #1")}) {
+        std::string wrong = kept;
+        wrong.replace(wrong.find(from), std::string_view(from).size(), to);
+        Kept untouched;
+        untouched.text = "as it was";
+        EXPECT_FALSE(fromPropertyList(mutableDictionary(wrong).get(), untouched)) << wrong;
+        EXPECT_EQ(untouched.text, "as it was");
+    }
 }
 
 }  // namespace

@@ -53,6 +53,7 @@ TEST(PropertyListXML, WritesWhatItRead) {
 TEST(PropertyListXML, ReadsWhatOthersWrite) {
     const std::pair<const char*, const char*> rows[] = {
         {"<string>a<!-- c -->b<![CDATA[<&>]]>&#x41;\r\n</string>", "ab<&>A "},
+        {"<string>a\r\nb &amp;&lt;&gt;&quot;&apos;</string>", "a b &<>\"'"},
         {"<data>3q2+\n\t7w==</data>", "<deadbeef>"},
         {"<data/>", "<>"},
         {"<integer> +12 </integer>", "12"},
@@ -82,7 +83,7 @@ TEST(PropertyListXML, RefusesWhatIsNoPropertyList) {
     // clang-format off
     for (const char* inner : {
         "", "text", "<string>a</string><string>b</string>", "<key>a</key>",
-        "<dict><string>a</string></dict>", "<dict><key>a</key><key>b</key></dict>",
+        "<dict><string>a</string></dict>", "<dict><key>a</key><key>b</key></dict>", "<dict><key>a</key></dict>",
         "<dict><key>a</key><true/><key>a</key><true/></dict>", "<array><key>a</key></array>",
         "<string><true/></string>", "<true>x</true>", "<set/>", "<dict id=\"1\"/>", "<integer/>",
         "<integer>9223372036854775808</integer>", "<integer>+-1</integer>", "<integer>0x10</integer>",

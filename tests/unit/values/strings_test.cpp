@@ -49,7 +49,8 @@ TEST(String, CountsInUnits) {
     EXPECT_EQ(units, (std::vector<UniChar>{'a', 0xE4, 0x20AC, 0xD83D, 0xDE00, 'z'}));
     const auto back = Owned<CFStringRef>::adopt(CFStringCreateWithCharacters(nullptr, units.data(), 6));
     EXPECT_TRUE(CFEqual(back.get(), string.get()));
-    for (const auto& unpaired : {std::vector<UniChar>{0xD83D, 'a'}, {'a', 0xD83D}, {0xDE00, 0xD83D}}) {
+    for (const auto& unpaired :
+         {std::vector<UniChar>{0xD83D, 'a'}, {'a', 0xD83D}, {0xDE00, 0xD83D}, {0xDE00, 0xDE00}}) {
         EXPECT_EQ(CFStringCreateWithCharacters(nullptr, unpaired.data(), 2), nullptr);
     }
     const auto part = [&](CFIndex location, CFIndex length) {
