@@ -26,8 +26,11 @@ class Progress {
         : task_(&task), name_(task.before->interface), interface_(name_), deadline_(deadline) {}
 
     void start() {
-        task_->refusal = task_->plan != nullptr ? apply(*task_->plan) : giveBack();
-        isSettled_ = !task_->refusal.ok();
+        if (task_->plan != nullptr) {
+            check(apply(*task_->plan));
+        } else {
+            check(giveBack());
+        }
         carrierDeadline_ = std::min(deadline_, Clock::now() + carrierBound);
     }
 
@@ -51,21 +54,34 @@ class Progress {
     }
 
     Outcome giveBack() {
-        const std::optional<Snapshot> before = snapshot();
-        if (!before) {
+        before_ = snapshot();
+        if (!before_) {
             return {kSCStatusFailed, "what the record says of the time before cannot be understood"};
         }
         RETURN_IF_FAILED(interface_.open());
-        RETURN_IF_FAILED(interface_.giveBack(*before, join_));
-        waitsForNetworkd_ = waitsForCarrier_ =
-            interface_.link() && before->others.networkd && !before->state.addresses.empty();
-        return {};
+        // Asked before there is a network to answer, a DHCP client would ask again many seconds later.
+        waitsForCarrier_ = waitsForOthers_ = interface_.link() && before_->hasLedAddress();
+        return interface_.giveBack(*before_, join_);
     }
 
     [[nodiscard]] std::optional<Snapshot> snapshot() const {
         Snapshot before;
         return values::fromPropertyList(task_->before->state.get(), before) ? std::optional(before)
                                                                             : std::nullopt;
+    }
+
+    // Keeps the machine's refusal, after which nothing is waited for.
+    bool check(const Outcome& outcome) {
+        if (!outcome.ok()) {
+            task_->refusal = outcome;
+            stopWaiting();
+        }
+        return outcome.ok();
+    }
+
+    void stopWaiting() {
+        join_.reset();
+        waitsForCarrier_ = waitsForLease_ = waitsForOthers_ = false;
     }
 
     // Takes one step; false when there is something to wait for.
@@ -79,38 +95,46 @@ class Progress {
         if (waitsForLease_) {
             return advanceLease();
         }
-        if (waitsForNetworkd_ && !isLate() && !isNetworkdSettled(interface_.link()->index)) {
-            return false;
+        if (before_ && !isResumed_) {
+            isResumed_ = true;
+            resumedAt_ = Clock::now();
+            check(interface_.letOthersIn(*before_, task_->refusal.ok()));
+        } else if (waitsForOthers_ && !isLate()) {
+            return advanceOthers();
+        } else {
+            isSettled_ = true;
         }
-        isSettled_ = true;
         return true;
     }
 
     bool advanceJoin() {
         WirelessJoin::State state{};
         std::string reason;
-        task_->refusal = join_->poll(state, reason);
-        if (task_->refusal.ok() && state == WirelessJoin::State::waiting && !isLate()) {
+        if (!check(join_->poll(state, reason))) {
+            return true;
+        }
+        if (state == WirelessJoin::State::waiting && !isLate()) {
             return false;
         }
         join_.reset();
         carrierDeadline_ = std::min(deadline_, Clock::now() + carrierBound);
-        if (task_->refusal.ok() && state != WirelessJoin::State::joined) {
+        if (state != WirelessJoin::State::joined) {
             giveUp(reason.empty() ? "the network was not joined in time" : reason);
-        } else if (task_->refusal.ok()) {
-            interface_.noteJoined();
-            if (waitsForLease_) {
-                hurryDhcpClient(name_);
-            }
+            return true;
         }
-        isSettled_ = isSettled_ || !task_->refusal.ok();
+        interface_.noteJoined();
+        if (waitsForLease_) {
+            hurryDhcpClient(name_);
+        }
         return true;
     }
 
     bool advanceCarrier() {
-        task_->refusal = interface_.refresh();
-        if (!task_->refusal.ok() || !interface_.link()) {
-            giveUp(task_->refusal.ok() ? "the card was taken out" : "");
+        if (!check(interface_.refresh())) {
+            return true;
+        }
+        if (!interface_.link()) {
+            giveUp("the card was taken out");
         } else if (interface_.link()->running) {
             waitsForCarrier_ = false;
         } else if (Clock::now() >= carrierDeadline_) {
@@ -124,17 +148,15 @@ class Progress {
     bool advanceLease() {
         bool isRunning = false;
         LeaseState lease;
-        task_->refusal = isDhcpClientRunning(name_, isRunning);
-        if (task_->refusal.ok()) {
-            task_->refusal = readLease(name_, lease);
+        if (!check(isDhcpClientRunning(name_, isRunning)) || !check(readLease(name_, lease))) {
+            return true;
         }
-        if (!task_->refusal.ok() || lease.isTaken) {
-            isSettled_ = true;
+        if (lease.isTaken) {
+            waitsForLease_ = false;
         } else if (!lease.refusal.empty()) {
             giveUp(lease.refusal);
         } else if (!isRunning) {
-            task_->refusal = {kSCStatusFailed, "the DHCP client ended before it had a lease"};
-            isSettled_ = true;
+            check({kSCStatusFailed, "the DHCP client ended before it had a lease"});
         } else if (isLate()) {
             giveUp("no DHCP server answered; the DHCP client goes on asking");
         } else {
@@ -143,12 +165,27 @@ class Progress {
         return true;
     }
 
+    // systemd-networkd configures the interface anew. A client whose lease has ended meanwhile takes the
+    // address away first, and then brings one.
+    bool advanceOthers() {
+        bool has = false;
+        if (!check(interface_.hasAddress(has))) {
+            return true;
+        }
+        wasWithout_ = wasWithout_ || !has;
+        const bool isRenewed =
+            wasWithout_ || !before_->hasLeaseEnded() || Clock::now() - resumedAt_ > carrierBound;
+        waitsForOthers_ =
+            before_->others.networkd ? !isNetworkdSettled(interface_.link()->index) : !has || !isRenewed;
+        return !waitsForOthers_;
+    }
+
     // What was told first is what the rest follows from.
     void giveUp(const std::string& trouble) {
         if (task_->trouble.empty()) {
             task_->trouble = trouble;
         }
-        isSettled_ = true;
+        stopWaiting();
     }
     [[nodiscard]] bool isLate() const { return Clock::now() >= deadline_; }
 
@@ -160,7 +197,12 @@ class Progress {
     std::unique_ptr<WirelessJoin> join_;
     bool waitsForCarrier_ = false;
     bool waitsForLease_ = false;
-    bool waitsForNetworkd_ = false;  // which configures the interface anew
+    // Giving back: how it was, and the others who led it.
+    std::optional<Snapshot> before_;
+    bool isResumed_ = false;
+    Clock::time_point resumedAt_;
+    bool waitsForOthers_ = false;
+    bool wasWithout_ = false;
     bool isSettled_ = false;
 };
 

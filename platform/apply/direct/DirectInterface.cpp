@@ -287,9 +287,21 @@ Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<Wirele
             }
         }
     }
-    // Also when something failed: they bring what they can.
-    steps.take(resumeOtherDaemons(interface_, before.others));
-    return steps.ok() ? removeNotes(interface_) : steps.first();
+    return steps.first();
+}
+
+Outcome DirectInterface::letOthersIn(const Snapshot& before, bool isBack) {
+    RETURN_IF_FAILED(resumeOtherDaemons(interface_, before.others));
+    return isBack ? removeNotes(interface_) : Outcome();
+}
+
+Outcome DirectInterface::hasAddress(bool& has) {
+    InterfaceState now;
+    RETURN_IF_FAILED(kernel_.read(*link_, now));
+    has = std::ranges::any_of(now.addresses, [](const Address& address) {
+        return address.family() == AF_INET && address.scope() == RT_SCOPE_UNIVERSE;
+    });
+    return {};
 }
 
 Outcome DirectInterface::isTakenOver(const Notes& notes, const Snapshot& before, bool& taken) {

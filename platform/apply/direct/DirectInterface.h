@@ -34,8 +34,13 @@ class DirectInterface {
     // to wait for. trouble is told when settings stand that help nothing.
     Outcome apply(const InterfacePlan& plan, const std::optional<Snapshot>& before,
                   std::unique_ptr<WirelessJoin>& join, std::string& trouble);
-    // Makes it as it was, and compares. The same for `join`.
+    // Makes it as it was, and compares. The same for `join`. Once this was begun, letOthersIn ends it, also
+    // after a failure.
     Outcome giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join);
+    // Lets those lead it again who did before. With isBack, nothing is left to be given back.
+    Outcome letOthersIn(const Snapshot& before, bool isBack);
+    // Whether it has an IPv4 address that reaches further than its link.
+    Outcome hasAddress(bool& has);
 
     // The card has got onto its network: who was asked for in vain before can answer now.
     void noteJoined();

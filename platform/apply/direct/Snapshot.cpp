@@ -2,7 +2,10 @@
 
 #include <fcntl.h>
 #include <sys/random.h>
+#include <sys/socket.h>
 #include <unistd.h>
+
+#include <algorithm>
 
 #include "platform/apply/Digest.h"
 #include "platform/apply/StateFile.h"
@@ -25,6 +28,19 @@ std::uint32_t checkOf(const WirelessSettings& settings, const Salt& salt) {
 }
 
 }  // namespace
+
+bool Snapshot::hasLedAddress() const {
+    return (others.networkd || !others.dhcpClients.empty()) &&
+           std::ranges::any_of(state.addresses,
+                               [](const Address& address) { return address.family() == AF_INET; });
+}
+
+bool Snapshot::hasLeaseEnded() const {
+    const std::int64_t elapsed = secondsSinceStart() - takenAt;
+    return std::ranges::any_of(state.addresses, [elapsed](const Address& address) {
+        return address.family() == AF_INET && address.valid != forever && address.valid <= elapsed;
+    });
+}
 
 JoinedNetwork makeJoinedNetwork(const WirelessSettings& settings) {
     JoinedNetwork joined;

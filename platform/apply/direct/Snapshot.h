@@ -27,6 +27,10 @@ struct Snapshot {
     OtherDaemons others;
     std::int64_t takenAt = 0;  // seconds since the machine's start, sleep included
 
+    // Whether it had an IPv4 address that somebody else led, and whether its lease has ended since.
+    [[nodiscard]] bool hasLedAddress() const;
+    [[nodiscard]] bool hasLeaseEnded() const;
+
     template <class Self, class Fields>
     static void listFields(Self& self, Fields& fields) {
         fields("Up", self.up);
