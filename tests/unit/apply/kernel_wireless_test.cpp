@@ -1,6 +1,7 @@
 #include "platform/apply/direct/WirelessMessages.h"
 
 #include <gtest/gtest.h>
+#include <linux/nl80211.h>
 
 #include <string>
 #include <vector>
@@ -75,6 +76,43 @@ TEST(WirelessMessages, TellsWhatAScanHeard) {
         const Bytes part(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(length));
         (void)decodeScanEntry(MessageView({}, part));
     }
+}
+
+TEST(WirelessMessages, AsksWithAKeyAsTheKernelWantsIt) {
+    const WirelessRequests requests({32, {}}, 3);
+    const ScanEntry cell{"WepCell1", {}, 2412, 0, {}, true};
+    const std::string head = "0008000300030000000c00340057657043656c6c310a000600000000000000000008002600";
+    EXPECT_EQ("2b0000" + head +
+                  "6c09000004003c0004004600280051802400018009000100616263646500000008000300"
+                  "01ac0f00050002000000000004000500",
+              toHex(requests.join(cell, "abcde").payload()));
+    const std::string longKey = toHex(requests.join(cell, "6162636465666768696a6b6c6d").payload());
+    EXPECT_NE(std::string::npos, longKey.find("6162636465666768696a6b6c6d0000000800030005ac0f00"));
+}
+
+TEST(WirelessMessages, TellsWhatANoticeMeans) {
+    const netlink::GenericFamily family{32, {}};
+    const auto meaning = [&family](std::uint8_t command, std::uint32_t index, int status = -1,
+                                   bool isTimedOut = false) {
+        netlink::Message message = family.request(command, 0);
+        message.addValue(NL80211_ATTR_IFINDEX, index);
+        if (status >= 0) {
+            message.addValue(NL80211_ATTR_STATUS_CODE, static_cast<std::uint16_t>(status));
+        }
+        if (isTimedOut) {
+            message.add(NL80211_ATTR_TIMED_OUT, {});
+        }
+        const auto notice = decodeNotice(MessageView({}, message.payload()), 3);
+        return !notice             ? "nothing"
+               : notice->isScanEnd ? "scan over"
+                                   : std::to_string(notice->joinStatus.value_or(1));
+    };
+    EXPECT_EQ("scan over", meaning(NL80211_CMD_NEW_SCAN_RESULTS, 3));
+    EXPECT_EQ("scan over", meaning(NL80211_CMD_SCAN_ABORTED, 3));
+    EXPECT_EQ("nothing", meaning(NL80211_CMD_SCAN_ABORTED, 4));
+    EXPECT_EQ("nothing", meaning(NL80211_CMD_TRIGGER_SCAN, 3));
+    EXPECT_EQ("15", meaning(NL80211_CMD_CONNECT, 3, 15));
+    EXPECT_EQ("65535", meaning(NL80211_CMD_CONNECT, 3, 1, true));
 }
 
 TEST(KernelWireless, ChoosesOnlyWhatWasHeardAndCanBeJoined) {
