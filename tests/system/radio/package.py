@@ -10,20 +10,19 @@ from air import sh
 
 TOOL = "/usr/sbin/location-assistant"
 # What running daemons and the package manager write by themselves.
-OTHERS = ("/proc", "/sys", "/dev", "/host", "/report", "/build", "/lab", "/run/systemd", "/run/udev", "/run/user",
-          "/run/NetworkManager", "/run/wpa_supplicant", "/var/lib/NetworkManager", "/var/lib/dpkg", "/var/log", "/var/cache",
-          "/tmp/air", "/run/air", "/run/netns")
+OTHERS = ("/run/systemd", "/run/udev", "/run/user", "/run/dbus", "/run/NetworkManager", "/run/wpa_supplicant", "/run/air",
+          "/run/netns", "/var/lib/NetworkManager", "/var/lib/dpkg", "/var/lib/systemd", "/var/log", "/var/cache", "/tmp/systemd*")
 
 
 def files():
-    skipped = " -o ".join(f"-path {path}" for path in OTHERS)
-    return set(sh(rf"find / \( {skipped} \) -prune -o -print").splitlines())
+    skipped = " -o ".join(f"-path '{path}'" for path in OTHERS)
+    return set(sh(rf"find / /run /tmp -xdev \( {skipped} \) -prune -o -print").splitlines())
 
 
 def installed_used_and_removed(visit):
     before = files()
     sh("dpkg -i /report/*.deb >/report/dpkg.txt 2>&1")
-    assert "status 'install ok installed'" not in sh("dpkg --audit"), "half installed"
+    assert sh("dpkg --audit") == "", "half installed"
     visit.say("installed: " + " ".join(sorted(path for path in files() - before if "location-assistant" in path)))
     assert Path(TOOL).exists()
     os.environ["LA_BINARY"] = TOOL
