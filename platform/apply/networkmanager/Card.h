@@ -1,4 +1,4 @@
-// A card that NetworkManager leads, on its way to what a plan says or back to how it was.
+// A card that NetworkManager leads, while it is given the settings of a plan or is restored to how it was.
 #pragma once
 
 #include <algorithm>
@@ -82,9 +82,10 @@ class Card {
     bool isSettled_ = false;
 };
 
-[[nodiscard]] std::unique_ptr<Card> makeGoingCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
-                                                  Clock::time_point deadline);
-[[nodiscard]] std::unique_ptr<Card> makeReturningCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+[[nodiscard]] std::unique_ptr<Card> makeConfiguringCard(Daemon& daemon, Task& task,
+                                                        const EarlierCard& earlier,
+                                                        Clock::time_point deadline);
+[[nodiscard]] std::unique_ptr<Card> makeRestoringCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
                                                       std::shared_ptr<Place> place,
                                                       Clock::time_point deadline);
 

@@ -121,8 +121,8 @@ void NetworkManagerAgent::start(std::span<Task> tasks, Clock::time_point deadlin
             task.refusal = {kSCStatusFailed, "the note of how the interface was cannot be read"};
         } else {
             cards_.push_back(task.plan != nullptr
-                                 ? makeGoingCard(daemon_, task, earlier, deadline)
-                                 : makeReturningCard(daemon_, task, earlier, places[i], deadline));
+                                 ? makeConfiguringCard(daemon_, task, earlier, deadline)
+                                 : makeRestoringCard(daemon_, task, earlier, places[i], deadline));
         }
     }
     std::erase_if(cards_, [](const auto& card) { return card->step(); });

@@ -162,8 +162,9 @@ class Host:
             device.write(struct.pack("=IBBBB", int(self._rfkill().name[6:]), 0, 2, off, 0))
 
     def addresses(self):
-        (link,) = json.loads(sh(f"ip -j -4 addr show {CARD}"))
-        return [f"{each['local']}/{each['prefixlen']}" for each in link["addr_info"]]
+        # A card without an address is left out, or comes as an empty entry.
+        return [f"{each['local']}/{each['prefixlen']}" for link in json.loads(sh(f"ip -j -4 addr show {CARD}"))
+                for each in link.get("addr_info", ())]
 
     def log(self):
         """What the daemons said."""

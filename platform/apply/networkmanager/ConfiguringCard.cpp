@@ -1,4 +1,4 @@
-// A card on its way to what a plan says.
+// A card that is given the settings of a plan.
 #include <algorithm>
 #include <utility>
 
@@ -12,9 +12,9 @@ namespace {
 constexpr std::chrono::seconds lookAgain{2};
 constexpr std::chrono::seconds scanAgain{3};
 
-class GoingCard final : public Card {
+class ConfiguringCard final : public Card {
   public:
-    GoingCard(Daemon& daemon, Task& task, EarlierCard earlier, Clock::time_point deadline)
+    ConfiguringCard(Daemon& daemon, Task& task, EarlierCard earlier, Clock::time_point deadline)
         : Card(daemon, task, deadline), plan_(*task.plan), earlier_(std::move(earlier)) {}
 
   private:
@@ -383,9 +383,9 @@ class GoingCard final : public Card {
 
 }  // namespace
 
-std::unique_ptr<Card> makeGoingCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
-                                    Clock::time_point deadline) {
-    return std::make_unique<GoingCard>(daemon, task, earlier, deadline);
+std::unique_ptr<Card> makeConfiguringCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+                                          Clock::time_point deadline) {
+    return std::make_unique<ConfiguringCard>(daemon, task, earlier, deadline);
 }
 
 }  // namespace platform::apply

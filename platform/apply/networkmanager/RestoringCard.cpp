@@ -1,4 +1,4 @@
-// A card on its way back to how it was.
+// A card that is given back: what was active on it before is active again.
 #include <utility>
 
 #include "platform/apply/Radio.h"
@@ -8,14 +8,14 @@
 namespace platform::apply {
 namespace {
 
-class ReturningCard final : public Card {
+class RestoringCard final : public Card {
   public:
-    ReturningCard(Daemon& daemon, Task& task, EarlierCard earlier, std::shared_ptr<Place> place,
+    RestoringCard(Daemon& daemon, Task& task, EarlierCard earlier, std::shared_ptr<Place> place,
                   Clock::time_point deadline)
         : Card(daemon, task, deadline), earlier_(std::move(earlier)), place_(std::move(place)) {}
-    ReturningCard(const ReturningCard&) = delete;
-    ReturningCard& operator=(const ReturningCard&) = delete;
-    ~ReturningCard() override { place_->isTaken = true; }
+    RestoringCard(const RestoringCard&) = delete;
+    RestoringCard& operator=(const RestoringCard&) = delete;
+    ~RestoringCard() override { place_->isTaken = true; }
 
   private:
     enum class Stage { begin, becomeReady, comeToRest, awaitPlace, comeUp, tellFailure, finish };
@@ -204,9 +204,9 @@ class ReturningCard final : public Card {
 
 }  // namespace
 
-std::unique_ptr<Card> makeReturningCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+std::unique_ptr<Card> makeRestoringCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
                                         std::shared_ptr<Place> place, Clock::time_point deadline) {
-    return std::make_unique<ReturningCard>(daemon, task, earlier, std::move(place), deadline);
+    return std::make_unique<RestoringCard>(daemon, task, earlier, std::move(place), deadline);
 }
 
 }  // namespace platform::apply
