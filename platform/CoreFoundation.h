@@ -140,16 +140,14 @@ CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef allocator, CFIndex m
 // Null when the range leaves the string or cuts a character of two units.
 CFStringRef CFStringCreateWithSubstring(CFAllocatorRef allocator, CFStringRef string,
                                         CFRange range) LA_NOEXCEPT;
-// The pieces of the string between the separators, empty ones included; a string without the separator is one
-// piece.
+// The pieces between the separators, empty ones included; a string without the separator is one piece.
 CFArrayRef CFStringCreateArrayBySeparatingStrings(CFAllocatorRef allocator, CFStringRef string,
                                                   CFStringRef separator) LA_NOEXCEPT;
 CFIndex CFStringGetLength(CFStringRef string) LA_NOEXCEPT;
 // Copies the units of the range, in host byte order, into the buffer, which must have room for them.
 void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) LA_NOEXCEPT;
 // Copies the text and a final NUL. False, with the buffer's content undefined, when it does not fit in
-// bufferSize bytes or the encoding, of which ASCII and Mac OS Roman carry ASCII characters only, cannot carry
-// it.
+// bufferSize bytes or the encoding cannot carry it; Mac OS Roman here carries no more than ASCII does.
 Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
                            CFStringEncoding encoding) LA_NOEXCEPT;
 // The string's own bytes, NUL-terminated, borrowed until it is changed or released; null when the encoding is

@@ -53,7 +53,7 @@ LA_CONSTANT(OSErr, errFSNoMoreItems, -1417);
 OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) LA_NOEXCEPT;
 // Up to maximumItems references and names, in no order. errFSNoMoreItems marks the last batch, which may hold
 // items; what actualItems tells was delivered even when the status is another failure. A name that is not
-// printable UTF-8 of at most 64 bytes is passed over: it could not be named in a location. More than 4096
+// printable UTF-8 of at most 64 bytes is left out: it could not be named in a location. More than 4096
 // items are ioErr. whichInfo is kFSCatInfoNone; containerChanged, catalogInfos and specs are null; refs and
 // names may be.
 OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems,

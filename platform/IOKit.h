@@ -5,7 +5,7 @@
 // and the entries taken from it are a snapshot of the hardware at the moment the iterator was made: a device
 // that is pulled out meanwhile keeps its entry, and fails nobody.
 //
-// Entries and their properties (strings unless said otherwise; what cannot be had is left out):
+// Entries and their properties (strings unless said otherwise; what is not known is left out):
 // - "IOEthernetInterface", each network interface of Ethernet type with hardware behind it, wireless ones
 //   included: "BSD Name" (the kernel's name, always there).
 //   - Its parent, the controller: "IOMACAddress" (data, 6 bytes: the address that the card was made with, or
@@ -49,8 +49,7 @@ LA_CONSTANT(kern_return_t, kIOReturnNoDevice, -0x1FFFFD40);  // 0xE00002C0
 
 // The handle through which the registry is asked, to be released with IOObjectRelease.
 kern_return_t IOMasterPort(mach_port_t bootstrapPort, mach_port_t* masterPort) LA_NOEXCEPT;
-// A dictionary that matches every entry of a class ("IOProviderClass"); null when the name is null or no
-// UTF-8.
+// A dictionary that matches every entry of a class ("IOProviderClass"); null unless the name is UTF-8.
 CFMutableDictionaryRef IOServiceMatching(const char* className) LA_NOEXCEPT;
 // Consumes one reference of the matching dictionary, on failure too. Matches the entries of the class under
 // "IOProviderClass" whose properties equal whatever else the dictionary holds; nothing when there is no such

@@ -16,7 +16,7 @@ constexpr int channelPlace = 3;
 
 void restoreSignals() {
     for (int signal = 1; signal < NSIG; ++signal) {
-        // Those that cannot be changed, or belong to the C library, refuse, which is as well.
+        // Those that cannot be changed, or belong to the C library, stay as they are.
         static_cast<void>(std::signal(signal, SIG_DFL));
     }
     sigset_t none;

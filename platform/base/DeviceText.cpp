@@ -16,7 +16,7 @@ bool isPrintable(UChar32 character) {
 
 // What the first characters print, as far as they fit.
 std::string printed(std::string_view text, bool& isAnything) {
-    // None of them needs more bytes than its '?' stands for.
+    // No character needs more bytes than this.
     const auto size = static_cast<std::int32_t>(std::min(text.size(), longestDeviceText * U8_MAX_LENGTH));
     const auto* const bytes = reinterpret_cast<const std::uint8_t*>(text.data());
     std::string result;

@@ -11,7 +11,7 @@ namespace platform {
 inline constexpr std::size_t longestDeviceText = 64;  // bytes
 
 // The text as it may be shown and stored: valid UTF-8 of at most 64 bytes, cut between two characters,
-// without blanks at its ends. A '?' stands for each byte that is not UTF-8 and for each character that does
+// without blanks at its ends. A '?' replaces each byte that is not UTF-8 and for each character that does
 // not print: control characters and escapes, direction overrides and other formats, line separators, private
 // and unassigned ones. Empty when nothing of it prints.
 [[nodiscard]] std::string deviceText(std::string_view text);

@@ -28,10 +28,7 @@ bool addTo(int poll, int descriptor) {
 }  // namespace
 
 Outcome ChangeWatch::open(NetworkState& state, const std::string& preferencesDirectory) {
-    Outcome done = state.subscribe(notices_);
-    if (!done.ok()) {
-        return done;
-    }
+    RETURN_IF_FAILED(state.subscribe(notices_));
     directory_ = preferencesDirectory;
     poll_.reset(::epoll_create1(EPOLL_CLOEXEC));
     timer_.reset(::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC));
@@ -45,7 +42,7 @@ Outcome ChangeWatch::open(NetworkState& state, const std::string& preferencesDir
 }
 
 // Watches the directory or, while it is missing, the nearest one above it. False when the one below that has
-// come meanwhile, so that nobody would tell of it.
+// come meanwhile, which nothing would report.
 bool ChangeWatch::watchNearest() {
     std::string path = directory_;
     std::string missing;
@@ -70,7 +67,7 @@ void ChangeWatch::watchPreferences() {
 bool ChangeWatch::drainPreferences() {
     bool any = false;
     alignas(inotify_event) char events[4096];
-    for (int i = 0; i<mostReads&& ::read(files_.get(), events, sizeof events)> 0; ++i) {
+    for (int i = 0; i < mostReads && (::read(files_.get(), events, sizeof events)) > 0; ++i) {
         any = true;
     }
     if (any) {
@@ -79,8 +76,7 @@ bool ChangeWatch::drainPreferences() {
     return any;
 }
 
-// Takes the sources of news out of the poll set rather than masking them: an overrun would be reported even
-// so.
+// Takes the sources of news out of the poll set instead of masking them: an overrun is reported all the same.
 void ChangeWatch::listen(bool on) {
     pacing_ = on ? Pacing::listening : Pacing::pausing;
     for (const int source : {notices_->descriptor(), files_.get()}) {

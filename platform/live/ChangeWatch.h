@@ -14,7 +14,7 @@ namespace platform::live {
 
 // Between two looks there is a pause in which news is left where it is: ten thousand changes in a second cost
 // some thirty looks, not ten thousand, in bounded memory. A look after the pause follows every piece of news,
-// for what the kernel does after it told that it would.
+// because the kernel reports some changes before it makes them.
 class ChangeWatch {
   public:
     static constexpr std::chrono::milliseconds pause{30};

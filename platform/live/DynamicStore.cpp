@@ -130,37 +130,30 @@ class DynamicStore final : public Object {
             return {};
         }
         auto watch = std::make_unique<ChangeWatch>();
-        Outcome done = watch->open(*state_, platform::currentHost().preferencesDirectory);
-        if (done.ok()) {
-            watch_ = std::move(watch);
-        }
-        return done;
+        RETURN_IF_FAILED(watch->open(*state_, platform::currentHost().preferencesDirectory));
+        watch_ = std::move(watch);
+        return {};
     }
 
     // The watch must be open.
     Outcome setWatched(std::vector<std::string> keys, std::vector<KeyPattern> patterns) {
-        std::swap(watchedKeys_, keys);
-        std::swap(patterns_, patterns);
         std::map<std::string, Value> values;
-        Outcome done = look(values);
-        if (done.ok()) {
-            seen_ = std::move(values);
-        } else {
-            std::swap(watchedKeys_, keys);
-            std::swap(patterns_, patterns);
-        }
-        return done;
+        RETURN_IF_FAILED(look(keys, patterns, values));
+        watchedKeys_ = std::move(keys);
+        patterns_ = std::move(patterns);
+        seen_ = std::move(values);
+        return {};
     }
 
     [[nodiscard]] int descriptor() const noexcept { return watch_->descriptor(); }
 
-    // The news is here: tells the client which watched values are no longer what they were.
+    // There is news: calls the client with the keys whose values are no longer what they were.
     void wake() {
         if (!watch_->take()) {
             return;
         }
         std::map<std::string, Value> values;
-        const Outcome done = look(values);
+        const Outcome done = look(watchedKeys_, patterns_, values);
         if (!done.ok()) {
             setStatus(done, name_);
             watch_->retryLater();
@@ -175,31 +168,20 @@ class DynamicStore final : public Object {
     }
 
   private:
-    // What is at the watched keys; a key without a value is not in it.
-    Outcome look(std::map<std::string, Value>& values) const {
+    // What is at the keys and at those that match a pattern; a key without a value is not in it.
+    Outcome look(std::vector<std::string> keys, const std::vector<KeyPattern>& patterns,
+                 std::map<std::string, Value>& values) const {
         const LiveView view(*state_);
-        std::vector<std::string> keys = watchedKeys_;
-        if (!patterns_.empty()) {
-            std::vector<std::string> all;
-            Outcome listed = view.keys(all);
-            if (!listed.ok()) {
-                return listed;
-            }
-            for (const std::string& key : all) {
-                for (const KeyPattern& pattern : patterns_) {
-                    if (pattern.matches(key)) {
-                        keys.push_back(key);
-                        break;
-                    }
-                }
-            }
+        std::vector<std::string> all;
+        if (!patterns.empty()) {
+            RETURN_IF_FAILED(view.keys(all));
         }
+        std::ranges::copy_if(all, std::back_inserter(keys), [&](const std::string& key) {
+            return std::ranges::any_of(patterns, [&](const KeyPattern& each) { return each.matches(key); });
+        });
         for (const std::string& key : keys) {
             Value value;
-            Outcome read = view.value(key, value);
-            if (!read.ok()) {
-                return read;
-            }
+            RETURN_IF_FAILED(view.value(key, value));
             if (value) {
                 values[key] = std::move(value);
             }
@@ -317,11 +299,9 @@ Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef ke
     if (!keyTexts || !patternTexts || !std::ranges::all_of(compiled, &KeyPattern::isValid)) {
         return static_cast<Boolean>(setStatus(kSCStatusInvalidArgument));
     }
-    Outcome done = self->openWatch();
-    if (done.ok()) {
-        done = self->setWatched(std::move(*keyTexts), std::move(compiled));
-    }
-    return static_cast<Boolean>(setStatus(done, self->name()));
+    return static_cast<Boolean>(
+        setStatus(self->openWatch(), self->name()) &&
+        setStatus(self->setWatched(std::move(*keyTexts), std::move(compiled)), self->name()));
 }
 
 CFRunLoopSourceRef SCDynamicStoreCreateRunLoopSource(CFAllocatorRef /*allocator*/, SCDynamicStoreRef store,

@@ -7,6 +7,7 @@
 #include <utility>
 #include <vector>
 
+#include "platform/base/Host.h"
 #include "platform/live/Routes.h"
 #include "platform/netlink/Link.h"
 #include "platform/netlink/Socket.h"
@@ -52,14 +53,9 @@ Outcome KernelNetworkState::primaryRoute(std::optional<PrimaryRoute>& route) {
     route.reset();
     Socket socket;
     std::vector<OwnedMessage> answers;
-    Outcome done = socket.open();
-    if (done.ok()) {
-        // A machine that never had a route has no table for them.
-        done = socket.dump(askForRoutes(), answers, {ENOENT});
-    }
-    if (!done.ok()) {
-        return done;
-    }
+    RETURN_IF_FAILED(socket.open());
+    // A machine that never had a route has no table for them.
+    RETURN_IF_FAILED(socket.dump(askForRoutes(), answers, {ENOENT}));
     for (const DefaultRoute& candidate : defaultRoutesIn(answers)) {
         // The link may have gone or gone down meanwhile, with the route still to follow it.
         std::optional<netlink::Link> link;
@@ -72,32 +68,34 @@ Outcome KernelNetworkState::primaryRoute(std::optional<PrimaryRoute>& route) {
     return {};
 }
 
-Outcome KernelNetworkState::routeTo(const Destination& destination, Route& route) {
-    route = {};
+Outcome KernelNetworkState::reach(const Destination& destination, Reach& reach) {
+    reach = {};
     Socket socket;
     OwnedMessage answer;
-    Outcome done = socket.open();
-    if (done.ok()) {
-        // What the kernel answers without a route, and for routes that are there to refuse: unreachable,
-        // prohibit, blackhole; ENODEV for the scope of a link that is gone.
-        done = socket.ask(askForRouteTo(destination), answer,
-                          {ENETUNREACH, EHOSTUNREACH, EACCES, EINVAL, ESRCH, ENODEV, ENETDOWN});
-    }
-    if (done.ok()) {
-        route = routeIn(answer.view());
-    }
-    return done;
+    RETURN_IF_FAILED(socket.open());
+    // What the kernel answers without a route, and for routes that are there to refuse: unreachable,
+    // prohibit, blackhole; ENODEV for the scope of a link that is gone.
+    RETURN_IF_FAILED(socket.ask(askForRouteTo(destination), answer,
+                                {ENETUNREACH, EHOSTUNREACH, EACCES, EINVAL, ESRCH, ENODEV, ENETDOWN}));
+    reach = reachIn(answer.view());
+    return {};
 }
 
 Outcome KernelNetworkState::subscribe(std::unique_ptr<Notices>& notices) {
     Socket socket;
     // A route that goes with its next-hop object goes without a notice of its own.
     constexpr std::uint32_t nextHops = std::uint32_t{1} << (RTNLGRP_NEXTHOP - 1U);
-    Outcome done = socket.open(RTMGRP_LINK | RTMGRP_IPV4_IFADDR | RTMGRP_IPV4_ROUTE | nextHops);
-    if (done.ok()) {
-        notices = std::make_unique<KernelNotices>(std::move(socket));
+    RETURN_IF_FAILED(socket.open(RTMGRP_LINK | RTMGRP_IPV4_IFADDR | RTMGRP_IPV4_ROUTE | nextHops));
+    notices = std::make_unique<KernelNotices>(std::move(socket));
+    return {};
+}
+
+std::shared_ptr<NetworkState> currentNetworkState() {
+    if (currentHost().networkState) {
+        return currentHost().networkState;
     }
-    return done;
+    static const std::shared_ptr<NetworkState> kernel = std::make_shared<KernelNetworkState>();
+    return kernel;
 }
 
 }  // namespace platform::live

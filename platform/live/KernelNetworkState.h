@@ -9,7 +9,7 @@ namespace platform::live {
 class KernelNetworkState final : public NetworkState {
   public:
     Outcome primaryRoute(std::optional<PrimaryRoute>& route) override;
-    Outcome routeTo(const Destination& destination, Route& route) override;
+    Outcome reach(const Destination& destination, Reach& reach) override;
     Outcome subscribe(std::unique_ptr<Notices>& notices) override;
 };
 

@@ -134,9 +134,9 @@ std::string LiveView::serviceNaming(const std::string& interface) const {
 
 Outcome LiveView::globalIPv4(Value& value) const {
     std::optional<PrimaryRoute> route;
-    Outcome done = state_->primaryRoute(route);
-    if (!done.ok() || !route) {
-        return done;
+    RETURN_IF_FAILED(state_->primaryRoute(route));
+    if (!route) {
+        return {};
     }
     CFMutableDictionaryRef const dictionary = CFDictionaryCreateMutable(
         kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
@@ -179,10 +179,8 @@ Outcome LiveView::value(std::string_view key, Value& value) const {
 Outcome LiveView::keys(std::vector<std::string>& keys) const {
     keys.clear();
     std::optional<PrimaryRoute> route;
-    Outcome done = loaded_.ok() ? state_->primaryRoute(route) : loaded_;
-    if (!done.ok()) {
-        return done;
-    }
+    RETURN_IF_FAILED(loaded_);
+    RETURN_IF_FAILED(state_->primaryRoute(route));
     if (route) {
         keys.emplace_back(globalIPv4Key);
     }

@@ -2,11 +2,10 @@
 //
 //   Setup:/Network/Global/<protocol>               the current location's global entity, as it is stored
 //   Setup:/Network/Service/<ID>/<protocol>         the entity of a service that the current location links to
-//   State:/Network/Global/IPv4                     "PrimaryInterface", "Router" (dotted quad, when there is
-//   one)
-//                                                  and "PrimaryService" (the ID of the first service of the
-//                                                  current location that names the interface, if one does);
-//                                                  no such key without a default route
+//   State:/Network/Global/IPv4                     there while there is a default route: "PrimaryInterface";
+//                                                  "Router", a dotted quad, when the route has one;
+//                                                  "PrimaryService", the ID of the first service of the
+//                                                  current location that names the interface, if one does
 //
 // The stored entities are those of the committed preferences. Services and entities that are switched off are
 // left out, and so are links that lead nowhere and values that are no dictionaries.

@@ -31,7 +31,7 @@ struct Destination {
 };
 
 // How packets for an address travel.
-struct Route {
+struct Reach {
     bool isReachable = false;  // the rest is false without it
     bool isLocal = false;      // the address is one of this computer's own
     bool isDirect = false;     // no gateway on the way
@@ -47,8 +47,8 @@ class Notices {
 
     // Readable while there is news.
     [[nodiscard]] virtual int descriptor() const noexcept = 0;
-    // Takes away what is there, without waiting and a bounded amount of it a call. Whether there was any;
-    // whoever was told so has to look at the state anew.
+    // Takes away what is there, without waiting and a bounded amount of it a call. Whether there was any:
+    // then the state has to be looked at anew.
     virtual bool drain() = 0;
 };
 
@@ -62,8 +62,8 @@ class NetworkState {
     // The default route of IPv4 with the lowest metric, over an interface that is up; nothing without one.
     virtual Outcome primaryRoute(std::optional<PrimaryRoute>& route) = 0;
     // Fails only when the question could not be asked; having no route is an answer, and a route over a link
-    // that is down or without a carrier is none.
-    virtual Outcome routeTo(const Destination& destination, Route& route) = 0;
+    // that is down or without a carrier reaches nothing.
+    virtual Outcome reach(const Destination& destination, Reach& reach) = 0;
     // From then on no change of the primary route goes without news.
     virtual Outcome subscribe(std::unique_ptr<Notices>& notices) = 0;
 };

@@ -16,15 +16,15 @@ namespace {
 
 using platform::Outcome;
 using platform::live::Destination;
-using platform::live::Route;
+using platform::live::Reach;
 using platform::preferences::setStatus;
 
 constexpr const char* who = "reachability";
 
-SCNetworkConnectionFlags flagsOf(const Route& route) {
-    return (route.isReachable ? kSCNetworkFlagsReachable : 0) |
-           (route.isLocal ? kSCNetworkFlagsIsLocalAddress : 0) |
-           (route.isDirect ? kSCNetworkFlagsIsDirect : 0);
+SCNetworkConnectionFlags flagsOf(const Reach& reach) {
+    return (reach.isReachable ? kSCNetworkFlagsReachable : 0) |
+           (reach.isLocal ? kSCNetworkFlagsIsLocalAddress : 0) |
+           (reach.isDirect ? kSCNetworkFlagsIsDirect : 0);
 }
 
 std::optional<Destination> destinationOf(const sockaddr* address, std::size_t length) {
@@ -65,12 +65,12 @@ int resolve(const char* name, int flags, AddressList& list) {
 }
 
 // The first address of the list that can be reached tells the answer.
-Outcome askForAny(const AddressList& list, Route& route) {
+Outcome askForAny(const AddressList& list, Reach& reach) {
     Outcome done;
-    for (const addrinfo* entry = list.get(); entry != nullptr && done.ok() && !route.isReachable;
+    for (const addrinfo* entry = list.get(); entry != nullptr && done.ok() && !reach.isReachable;
          entry = entry->ai_next) {
         if (const auto destination = destinationOf(entry->ai_addr, entry->ai_addrlen)) {
-            done = platform::live::currentNetworkState()->routeTo(*destination, route);
+            done = platform::live::currentNetworkState()->reach(*destination, reach);
         }
     }
     return done;
@@ -85,10 +85,10 @@ Boolean SCNetworkCheckReachabilityByAddress(const sockaddr* address, int address
     if (!destination || flags == nullptr) {
         return static_cast<Boolean>(setStatus(kSCStatusInvalidArgument));
     }
-    Route route;
-    const bool done = setStatus(platform::live::currentNetworkState()->routeTo(*destination, route), who);
+    Reach reach;
+    const bool done = setStatus(platform::live::currentNetworkState()->reach(*destination, reach), who);
     if (done) {
-        *flags = flagsOf(route);
+        *flags = flagsOf(reach);
     }
     return static_cast<Boolean>(done);
 }
@@ -107,10 +107,10 @@ Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnecti
                              std::string("cannot look up ") + nodename + ": " + ::gai_strerror(status));
         return static_cast<Boolean>(setStatus(failed, who));
     }
-    Route route;
-    const bool done = setStatus(askForAny(list, route), who);
+    Reach reach;
+    const bool done = setStatus(askForAny(list, reach), who);
     if (done) {
-        *flags = flagsOf(route);
+        *flags = flagsOf(reach);
     }
     return static_cast<Boolean>(done);
 }

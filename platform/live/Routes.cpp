@@ -110,7 +110,7 @@ Message askForRouteTo(const Destination& destination) {
 std::vector<DefaultRoute> defaultRoutesIn(std::span<const netlink::OwnedMessage> answers) {
     std::vector<DefaultRoute> routes;
     for (const netlink::OwnedMessage& answer : answers) {
-        if (const std::optional<DefaultRoute> route = defaultRouteIn(answer.view())) {
+        if (const auto route = defaultRouteIn(answer.view())) {
             routes.push_back(*route);
         }
     }
@@ -119,7 +119,7 @@ std::vector<DefaultRoute> defaultRoutesIn(std::span<const netlink::OwnedMessage>
     return routes;
 }
 
-Route routeIn(const MessageView& answer) {
+Reach reachIn(const MessageView& answer) {
     const auto header = answer.family<rtmsg>();
     if (answer.type() != RTM_NEWROUTE || !header) {
         return {};

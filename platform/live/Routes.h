@@ -27,10 +27,10 @@ struct DefaultRoute {
 
 // The default routes among the answers to askForRoutes that carry traffic, in the order in which the kernel
 // prefers them, up to one that is there to refuse (unreachable, prohibit, blackhole). Of a route with several
-// next hops the first one that works counts. A gateway that is not of IPv4 is not told.
+// next hops the first one that works counts. A gateway that is not of IPv4 is left out.
 [[nodiscard]] std::vector<DefaultRoute> defaultRoutesIn(std::span<const netlink::OwnedMessage> answers);
 
 // Only a local route reaches anything, or a unicast one over a link that has its carrier.
-[[nodiscard]] Route routeIn(const netlink::MessageView& answer);
+[[nodiscard]] Reach reachIn(const netlink::MessageView& answer);
 
 }  // namespace platform::live

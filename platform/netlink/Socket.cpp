@@ -29,15 +29,10 @@ Outcome outcomeOfError(const MessageView& message, std::initializer_list<int> to
         return {};
     }
     std::string what = "the kernel refused a netlink request";
+    // The request itself is not repeated before them: the socket asks for that too.
     if ((message.flags() & NLM_F_ACK_TLVS) != 0) {
-        std::size_t offset = sizeof(nlmsgerr);
-        if ((message.flags() & NLM_F_CAPPED) == 0 && error->msg.nlmsg_len > NLMSG_HDRLEN) {
-            offset += NLMSG_ALIGN(error->msg.nlmsg_len) - NLMSG_HDRLEN;
-        }
-        if (offset < message.payload().size()) {
-            if (const auto text = Attributes(message.payload().subspan(offset)).find(NLMSGERR_ATTR_MSG)) {
-                what += " (" + std::string(text->text()) + ")";
-            }
+        if (const auto text = message.attributes<nlmsgerr>().find(NLMSGERR_ATTR_MSG)) {
+            what += " (" + std::string(text->text()) + ")";
         }
     }
     return Outcome::fromErrno(what, code);
@@ -171,11 +166,7 @@ Outcome Socket::dump(const Message& message, std::vector<OwnedMessage>& answers,
                      std::initializer_list<int> tolerated) {
     bool interrupted = true;
     for (int attempt = 0; attempt < dumpTries && interrupted; ++attempt) {
-        Outcome done = dumpOnce(message, answers, tolerated, interrupted);
-        if (!done.ok()) {
-            answers.clear();
-            return done;
-        }
+        RETURN_IF_FAILED(dumpOnce(message, answers, tolerated, interrupted));
     }
     // After that many tries the last list is as good as the kernel gives; a caller that acts on it compares
     // later.

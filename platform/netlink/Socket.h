@@ -26,7 +26,7 @@ struct OwnedMessage {
 };
 
 // Every wait for an answer is bounded by answerTime, and every dump by largestDump; only datagrams from the
-// kernel itself are read, and answers to other requests than the one at hand are passed over. A request that
+// kernel itself are read, and answers to other requests than the one at hand are ignored. A request that
 // the kernel refuses fails with its errno and, where it gives one, its own explanation.
 class Socket {
   public:
@@ -50,8 +50,8 @@ class Socket {
     // The one message that answers a request (RTM_GETLINK for one link, RTM_GETROUTE for one destination). An
     // error in `tolerated` leaves the answer with type 0.
     Outcome ask(Message message, OwnedMessage& answer, std::initializer_list<int> tolerated = {});
-    // Everything that a dump request lists; nothing after an error in `tolerated`. A dump that a change ran
-    // into is taken again, a few times.
+    // Everything that a dump request lists; nothing after an error in `tolerated`, something or nothing on
+    // failure. A dump that a change ran into is taken again, a few times.
     Outcome dump(const Message& message, std::vector<OwnedMessage>& answers,
                  std::initializer_list<int> tolerated = {});
 

@@ -13,7 +13,7 @@ namespace platform::preferences {
 // What the store holds at one moment.
 struct Snapshot {
     values::Owned<CFDictionaryRef> tree;  // frozen
-    std::optional<KnownFile> file;        // nothing: there is none, and the tree is the first-run tree
+    std::optional<KnownFile> file;        // nothing without a file: the tree is the first-run tree
 
     // Whether a look at the file found the one that the tree is from.
     [[nodiscard]] bool isOf(const std::optional<FileIdentity>& now) const {

@@ -69,10 +69,6 @@ bool belongsToDisplay(std::string_view name) {
     return std::find(names.begin(), names.end(), name) != names.end();
 }
 
-bool names(const std::string& entry, std::string_view name) {
-    return entry.size() > name.size() && entry.starts_with(name) && entry[name.size()] == '=';
-}
-
 std::vector<std::string> environmentFor(const User& user, const DesktopSession& session,
                                         const std::string& runtimeRoot) {
     const std::string runtime = runtimeRoot + "/" + std::to_string(user.id);
@@ -80,14 +76,14 @@ std::vector<std::string> environmentFor(const User& user, const DesktopSession& 
     std::erase_if(environment, [](const std::string& entry) {
         return !belongsToDisplay(std::string_view(entry).substr(0, entry.find('=')));
     });
-    const auto isSet = [&environment](std::string_view name) {
-        return std::any_of(environment.begin(), environment.end(),
-                           [name](const std::string& entry) { return names(entry, name); });
+    const auto isSet = [&environment](std::string_view start) {
+        return std::ranges::any_of(environment,
+                                   [start](const std::string& entry) { return entry.starts_with(start); });
     };
-    if (!isSet("DISPLAY") && !isSet("WAYLAND_DISPLAY") && !session.display.empty()) {
+    if (!isSet("DISPLAY=") && !isSet("WAYLAND_DISPLAY=") && !session.display.empty()) {
         environment.push_back("DISPLAY=" + session.display);
     }
-    if (!isSet("XDG_SESSION_TYPE")) {
+    if (!isSet("XDG_SESSION_TYPE=")) {
         environment.push_back("XDG_SESSION_TYPE=" + session.type);
     }
     environment.push_back("HOME=" + user.home);

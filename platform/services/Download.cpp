@@ -24,15 +24,11 @@ Handle NewHandle(long size) noexcept {
     if (size < 0) {
         return nullptr;
     }
-    try {
-        auto block = std::make_unique<HandleBlock>();
-        block->content.resize(static_cast<std::size_t>(size));
-        const Handle handle = block.get();
-        buffers().emplace(handle, std::move(block));
-        return handle;
-    } catch (const std::exception&) {
-        return nullptr;
-    }
+    auto block = std::make_unique<HandleBlock>();
+    block->content.resize(static_cast<std::size_t>(size));
+    const Handle handle = block.get();
+    buffers().emplace(handle, std::move(block));
+    return handle;
 }
 
 void DisposeHandle(Handle handle) noexcept {
@@ -53,15 +49,9 @@ OSStatus URLSimpleDownload(const char* url, const void* destination, Handle buff
         eventProc != nullptr || context != nullptr) {
         return paramErr;
     }
-    try {
-        std::shared_ptr<platform::services::Downloader> downloader = platform::currentHost().downloader;
-        if (!downloader) {
-            downloader = platform::services::makeHttpDownloader();
-        }
-        return downloader->fetch(url, buffer->content);
-    } catch (const std::bad_alloc&) {
-        return memFullErr;
-    } catch (const std::exception&) {
-        return ioErr;
+    std::shared_ptr<platform::services::Downloader> downloader = platform::currentHost().downloader;
+    if (!downloader) {
+        downloader = platform::services::makeHttpDownloader();
     }
+    return downloader->fetch(url, buffer->content);
 }

@@ -9,8 +9,6 @@
 #include <iterator>
 #include <map>
 #include <memory>
-#include <new>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -42,20 +40,8 @@ OSErr errorFor(int error) {
         case EACCES:
         case EPERM:
             return permErr;
-        case ENOMEM:
-            return memFullErr;
         default:
             return ioErr;
-    }
-}
-
-// No exception may pass the face, and nothing but a lack of memory is thrown here.
-template <class Status, class Operation>
-Status guarded(Operation operation) noexcept {
-    try {
-        return operation();
-    } catch (...) {
-        return memFullErr;
     }
 }
 
@@ -96,35 +82,22 @@ Paths& paths() {
     return ofThisProcess;
 }
 
-std::optional<std::string> homeOfUser() {
+// "?" when the password database does not say.
+std::string homeOfUser() {
     passwd record{};
     passwd* found = nullptr;
-    std::vector<char> buffer(4096);
-    constexpr std::size_t largest = 1U << 20;
-    int error;
-    while ((error = getpwuid_r(getuid(), &record, buffer.data(), buffer.size(), &found)) == ERANGE &&
-           buffer.size() < largest) {
-        buffer.resize(buffer.size() * 2);
-    }
-    if (error != 0 || found == nullptr || record.pw_dir == nullptr || record.pw_dir[0] != '/') {
-        return std::nullopt;
-    }
-    return std::string(record.pw_dir);
+    std::vector<char> buffer(std::size_t{64} * 1024);
+    const int error = getpwuid_r(getuid(), &record, buffer.data(), buffer.size(), &found);
+    return error == 0 && found != nullptr && record.pw_dir != nullptr ? record.pw_dir : "?";
 }
 
 OSErr findModemScripts(SInt16 domain, std::string& path) {
     const Host& host = currentHost();
     switch (domain) {
         case kUserDomain:
-            path = host.userModemScripts;
-            if (path.empty()) {
-                const auto home = homeOfUser();
-                if (!home) {
-                    return fnfErr;
-                }
-                path = *home + "/.local/share/modem-scripts";
-            }
-            return noErr;
+            path = host.userModemScripts.empty() ? homeOfUser() + "/.local/share/modem-scripts"
+                                                 : host.userModemScripts;
+            return path.starts_with('/') ? noErr : fnfErr;
         case kNetworkDomain:
             path = host.networkModemScripts;
             return noErr;
@@ -186,21 +159,19 @@ OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef
     if (folderType != kModemScriptsFolderType || createFolder != 0 || folder == nullptr) {
         return paramErr;
     }
-    return guarded<OSErr>([domain, folder]() -> OSErr {
-        std::string path;
-        if (const OSErr err = findModemScripts(domain, path); err != noErr) {
-            return err;
-        }
-        struct stat status {};
-        if (stat(path.c_str(), &status) != 0) {
-            return errorFor(errno);
-        }
-        if (!S_ISDIR(status.st_mode)) {
-            return fnfErr;
-        }
-        *folder = paths().referenceTo(path);
-        return noErr;
-    });
+    std::string path;
+    if (const OSErr err = findModemScripts(domain, path); err != noErr) {
+        return err;
+    }
+    struct stat status {};
+    if (stat(path.c_str(), &status) != 0) {
+        return errorFor(errno);
+    }
+    if (!S_ISDIR(status.st_mode)) {
+        return fnfErr;
+    }
+    *folder = paths().referenceTo(path);
+    return noErr;
 }
 
 OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) noexcept {
@@ -212,18 +183,15 @@ OSErr FSOpenIterator(const FSRef* folder, UInt32 flags, FSIterator* iterator) no
     if (path == nullptr || flags != kFSIterateFlat) {
         return paramErr;
     }
-    return guarded<OSErr>([path, iterator]() -> OSErr {
-        auto made = std::make_unique<OpaqueFSIterator>();
-        made->path = *path;
-        made->directory.reset(opendir(path->c_str()));
-        if (!made->directory) {
-            return errorFor(errno);
-        }
-        const FSIterator handle = made.get();
-        iterators().emplace(handle, std::move(made));
-        *iterator = handle;
-        return noErr;
-    });
+    auto made = std::make_unique<OpaqueFSIterator>();
+    made->path = *path;
+    made->directory.reset(opendir(path->c_str()));
+    if (!made->directory) {
+        return errorFor(errno);
+    }
+    *iterator = made.get();
+    iterators().emplace(*iterator, std::move(made));
+    return noErr;
 }
 
 OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* actualItems,
@@ -237,23 +205,21 @@ OSErr FSGetCatalogInfoBulk(FSIterator iterator, UInt32 maximumItems, UInt32* act
         whichInfo != kFSCatInfoNone || catalogInfos != nullptr || specs != nullptr) {
         return paramErr;
     }
-    return guarded<OSErr>([=]() -> OSErr {
-        std::string name;
-        HFSUniStr255 unicode{};
-        while (*actualItems < maximumItems) {
-            if (const OSErr err = nextItem(*iterator, name, unicode); err != noErr) {
-                return err;
-            }
-            if (refs != nullptr) {
-                refs[*actualItems] = paths().referenceTo(iterator->path + "/" + name);
-            }
-            if (names != nullptr) {
-                names[*actualItems] = unicode;
-            }
-            ++*actualItems;
+    std::string name;
+    HFSUniStr255 unicode{};
+    while (*actualItems < maximumItems) {
+        if (const OSErr err = nextItem(*iterator, name, unicode); err != noErr) {
+            return err;
         }
-        return noErr;
-    });
+        if (refs != nullptr) {
+            refs[*actualItems] = paths().referenceTo(iterator->path + "/" + name);
+        }
+        if (names != nullptr) {
+            names[*actualItems] = unicode;
+        }
+        ++*actualItems;
+    }
+    return noErr;
 }
 
 OSErr FSCloseIterator(FSIterator iterator) noexcept {

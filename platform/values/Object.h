@@ -25,7 +25,7 @@ enum class Type : std::uint8_t {
     dynamicStore,
 };
 
-// The types of which a property list is made; everything else is none of them.
+// The types of which a property list is made; none for every other type.
 enum class PropertyListType : std::uint8_t { none, string, dictionary, array, number, boolean, data, date };
 [[nodiscard]] constexpr PropertyListType propertyListTypeOf(Type type) noexcept {
     return type <= Type::date ? static_cast<PropertyListType>(type) : PropertyListType::none;

@@ -135,7 +135,7 @@ bool PlainReader::decode(std::string_view text) {
 }  // namespace
 
 Owned<CFPropertyListRef> parsePlainPropertyListXML(std::string_view text) {
-    // A carriage return stands for a line feed, and "]]>" may not stand in text.
+    // A carriage return is read as a line feed, and "]]>" may not stand in text.
     const bool isPlain =
         text.find('\r') == std::string_view::npos && text.find("]]>") == std::string_view::npos;
     return isPlain ? PlainReader(text).read() : Owned<CFPropertyListRef>();

@@ -1,6 +1,6 @@
-// Every property list that is not in plain form, and the judgement of what is none. Read with expat: of the
-// parsers measured it is the one that is strict about everything XML forbids and bounded in memory; one that
-// builds a tree is faster but lets ill-formed text, stray characters and unknown entities pass.
+// Every property list that is not in plain form, and the reason why something is not one. Read with expat: of
+// the parsers measured it is the one that is strict about everything XML forbids and bounded in memory; one
+// that builds a tree is faster but lets ill-formed text, stray characters and unknown entities pass.
 #include <expat.h>
 
 #include <algorithm>
@@ -66,7 +66,7 @@ Reader& readerOf(void* context) {
     return *static_cast<Reader*>(context);
 }
 
-// A parser that was told to stop still reports the end of an element like <a/>.
+// A parser that was stopped still reports the end of an element like <a/>.
 
 void XMLCALL onStart(void* context, const char* name, const char** attributes) {
     if (Reader& reader = readerOf(context); reader.reason() == nullptr) {

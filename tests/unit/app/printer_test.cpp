@@ -26,7 +26,7 @@ struct Answers : live::NetworkState, services::Downloader, services::Opener {
     std::vector<std::string> opened;
 
     Outcome primaryRoute(std::optional<live::PrimaryRoute>&) override { return {}; }
-    Outcome routeTo(const live::Destination&, live::Route& route) override {
+    Outcome reach(const live::Destination&, live::Reach& route) override {
         route.isReachable = reachable[std::min(queries++, reachable.size() - 1)];
         return {};
     }

@@ -27,7 +27,7 @@ namespace live_test {
 using platform::Outcome;
 using platform::live::Destination;
 using platform::live::PrimaryRoute;
-using platform::live::Route;
+using platform::live::Reach;
 using platform::values::Owned;
 
 inline PrimaryRoute routeOver(std::string interface, std::uint32_t router = 0) {
@@ -55,9 +55,9 @@ class FakeNetworkState : public platform::live::NetworkState {
         route = primary;
         return outcome();
     }
-    Outcome routeTo(const Destination& destination, Route& route) override {
+    Outcome reach(const Destination& destination, Reach& reach) override {
         asked.push_back(destination);
-        route = Route();
+        reach = Reach();
         return outcome();
     }
     Outcome subscribe(std::unique_ptr<platform::live::Notices>& notices) override {
