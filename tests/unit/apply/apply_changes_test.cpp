@@ -1,3 +1,4 @@
+#include "platform/values/PropertyListXML.h"
 #include "tests/unit/apply/Trees.h"
 #include "tests/unit/preferences/Fixture.h"
 #include "tests/unit/support/RecordingAgent.h"
