@@ -10,6 +10,8 @@
 #include "morecfq/MoreCFQ.h"
 #include "platform/values/RunLoop.h"
 #include "tests/unit/live/Fixture.h"
+#include "tests/unit/support/Notation.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace {
 
@@ -24,10 +26,14 @@ class NetworkWatcher : public testing::Test {
         override_ = std::make_unique<HostOverride>(host);
     }
 
-    std::string traceOfOneRun() {
+    template <class Work>
+    static void record(testing_support::Transcript& transcript, const char* what, Work work) {
         testing::internal::CaptureStdout();
-        CFRunLoopRunInMode(kCFRunLoopDefaultMode, 2, true);
-        return testing::internal::GetCapturedStdout();
+        work();
+        transcript.add(std::string("=== ") + what + "\n" + testing::internal::GetCapturedStdout());
+    }
+    static void recordOneRun(testing_support::Transcript& transcript, const char* what) {
+        record(transcript, what, [] { CFRunLoopRunInMode(kCFRunLoopDefaultMode, 2, true); });
     }
 
     testing_support::TemporaryDirectory directory_;
@@ -35,26 +41,14 @@ class NetworkWatcher : public testing::Test {
     std::unique_ptr<HostOverride> override_;
 };
 
-TEST_F(NetworkWatcher, TellsWhatComesAndWhatGoes) {
+TEST_F(NetworkWatcher, TracesWhatComesAndWhatGoes) {
+    testing_support::Transcript transcript("watcher");
     watchForNetworkChanges();
     network_->change(live::PrimaryRoute{"eth7", in_addr{htonl(0xC0A80001)}});
-    EXPECT_EQ(traceOfOneRun(),
-              "the network configuration changed!\n"
-              "Main Key 0=\"State:/Network/Global/IPv4\"\n"
-              "setting gIsNetworkReady to TRUE\n"
-              "Main Key Dict:\n"
-              "key=\"PrimaryInterface\", value=\"eth7\"\n"
-              "key=\"Router\", value=\"192.168.0.1\"\n"
-              "\n");
+    recordOneRun(transcript, "a default route");
     EXPECT_TRUE(gIsNetworkReady);
-
     network_->change(std::nullopt);
-    EXPECT_EQ(traceOfOneRun(),
-              "the network configuration changed!\n"
-              "Main Key 0=\"State:/Network/Global/IPv4\"\n"
-              "Main Key Dict is nil\n"
-              "setting gIsNetworkReady to FALSE\n"
-              "\n");
+    recordOneRun(transcript, "none");
     EXPECT_FALSE(gIsNetworkReady);
 
     // Stopped from within the run, it ends the run and hears nothing more.
@@ -64,48 +58,28 @@ TEST_F(NetworkWatcher, TellsWhatComesAndWhatGoes) {
     EXPECT_EQ(CFRunLoopRunInMode(kCFRunLoopDefaultMode, 10, false), kCFRunLoopRunStopped);
     CFRunLoopRemoveSource(CFRunLoopGetCurrent(), always.get(), kCFRunLoopDefaultMode);
     network_->change(live::PrimaryRoute{"eth7", std::nullopt});
-    EXPECT_EQ(traceOfOneRun(), "");
-}
+    recordOneRun(transcript, "stopped");
 
-TEST_F(NetworkWatcher, TracesStringsAsTheyAreAndReportsNotReadyBehindAMissingValue) {
+    // Strings are traced as they are; a key without a value leaves it not ready for all keys behind.
     directory_.write(
         "preferences/preferences.plist",
         "<plist version=\"1.0\"><dict><key>CurrentSet</key><string>/Sets/0</string><key>Sets</key>"
         "<dict><key>0</key><dict><key>Network</key><dict><key>Global</key><dict><key>DNS</key>"
         "<dict><key>a\nb</key><string>c\n\"d\"</string><key>e</key><array><string>f\ng</string>"
         "</array></dict></dict></dict></dict></dict></dict></plist>");
-    network_->change(live::PrimaryRoute{"eth7", std::nullopt});
     const SCDynamicStoreRef session = SCDynamicStoreCreate(nullptr, CFSTR("test"), nullptr, nullptr);
-    CFMutableArrayRef keys = nullptr;
-    ASSERT_EQ(CFQArrayCreateMutable(&keys), 0);
-    CFArrayAppendValue(keys, CFSTR("Setup:/Network/Global/DNS"));
-    CFArrayAppendValue(keys, CFSTR("State:/Network/Global/None"));
-    CFArrayAppendValue(keys, CFSTR("State:/Network/Global/IPv4"));
-    testing::internal::CaptureStdout();
-    networkChanged(session, keys, nullptr);
-    EXPECT_EQ(testing::internal::GetCapturedStdout(),
-              "the network configuration changed!\n"
-              "Main Key 0=\"Setup:/Network/Global/DNS\"\n"
-              "setting gIsNetworkReady to TRUE\n"
-              "Main Key Dict:\n"
-              "key=\"a\nb\", value=\"c\n\"d\"\"\n"
-              "key=\"e\", value=\"(f g)\"\n"
-              "Main Key 1=\"State:/Network/Global/None\"\n"
-              "Main Key Dict is nil\n"
-              "setting gIsNetworkReady to FALSE\n"
-              "Main Key 2=\"State:/Network/Global/IPv4\"\n"
-              "setting gIsNetworkReady to FALSE\n"
-              "\n");
-    CFQRelease(keys);
+    const testing_support::Value keys = testing_support::read(
+        "(Setup:/Network/Global/DNS, State:/Network/Global/None, State:/Network/Global/IPv4)");
+    record(transcript, "three keys",
+           [&] { networkChanged(session, static_cast<CFArrayRef>(keys.get()), nullptr); });
     CFQRelease(session);
 }
 
-TEST_F(NetworkWatcher, FailureToStartIsToldInTwoLines) {
+TEST_F(NetworkWatcher, AFailureToStartIsReportedInTwoLines) {
     network_->isFailing = true;
     testing::internal::CaptureStderr();
     watchForNetworkChanges();
-    const std::string told = testing::internal::GetCapturedStderr();
-    EXPECT_EQ(told,
+    EXPECT_EQ(testing::internal::GetCapturedStderr(),
               "could not register notification keys\nerror = Failed; the reason is in the system log\n");
     EXPECT_EQ(CFRunLoopRunInMode(kCFRunLoopDefaultMode, 0, true), kCFRunLoopRunFinished);
 }

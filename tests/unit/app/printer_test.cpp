@@ -3,6 +3,7 @@
 #include <cstdio>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "app/ArvAssistant.h"
@@ -12,6 +13,7 @@
 #include "platform/live/NetworkState.h"
 #include "platform/services/Download.h"
 #include "platform/services/Opener.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace {
 
@@ -51,76 +53,52 @@ class Printer : public testing::Test {
         override_ = std::make_unique<HostOverride>(host);
     }
 
-    std::string traceOf(int (*check)(int), int tries, int* result) {
-        testing::internal::CaptureStdout();
-        *result = check(tries);
-        return testing::internal::GetCapturedStdout();
-    }
-
     std::shared_ptr<Answers> answers_ = std::make_shared<Answers>();
     std::unique_ptr<HostOverride> override_;
 };
 
-TEST_F(Printer, IsAskedForByNameAndThenByAddressUntilThereIsARoute) {
+TEST_F(Printer, IsReachableByARouteAndFoundByItsAnswer) {
+    testing_support::Transcript transcript("printer");
+    const auto record = [&transcript](const char* what, int (*check)(int), int tries) {
+        testing::internal::CaptureStdout();
+        const int answer = check(tries);
+        transcript.add(std::string("=== ") + what + ": " + std::to_string(answer) + "\n" +
+                       testing::internal::GetCapturedStdout());
+    };
+    record("no route", IsWirelessPrinterReachableViaSCF, 1);
     answers_->reachable = {false, false, false, true};
-    int reachable = -1;
-    EXPECT_EQ(traceOf(IsWirelessPrinterReachableViaSCF, 5, &reachable),
-              "IsWirelessPrinterReachableViaSCF() try 0\n"
-              "from SCNetworkCheckReachabilityByName(), flags = 0\n"
-              "from SCNetworkCheckReachabilityByAddress(), flags = 0\n"
-              "IsWirelessPrinterReachableViaSCF() try 1\n"
-              "from SCNetworkCheckReachabilityByName(), flags = 0\n"
-              "from SCNetworkCheckReachabilityByAddress(), flags = 2\n"
-              "IsWirelessPrinterReachableViaSCF(): reachable=1\n");
-    EXPECT_EQ(reachable, 1);
-}
-
-TEST_F(Printer, IsFoundByTheAnswerThatItHasNoSuchPage) {
+    answers_->queries = 0;
+    record("a route at the fourth question", IsWirelessPrinterReachableViaSCF, 5);
+    answers_->reachable = {true};
+    record("a route at once", IsWirelessPrinterReachableViaSCF, 5);
     answers_->downloads = {-1, 404};
-    int reachable = -1;
-    EXPECT_EQ(traceOf(IsWirelessPrinterReachableViaHTTP, 3, &reachable),
-              "Looking for the device at 192.0.0.192\n"
-              "IsWirelessPrinterReachableViaHTTP() try 0\n"
-              "*** Device NOT found (result = -1) ****\n"
-              "IsWirelessPrinterReachableViaHTTP() try 1\n"
-              "Device found (result = 404)\n");
-    EXPECT_EQ(reachable, 1);
-
+    record("there is no such page, at the second try", IsWirelessPrinterReachableViaHTTP, 3);
     answers_->downloads = {0};
-    EXPECT_EQ(traceOf(IsWirelessPrinterReachableViaHTTP, 1, &reachable),
-              "Looking for the device at 192.0.0.192\n"
-              "IsWirelessPrinterReachableViaHTTP() try 0\n"
-              "*** Device NOT found (result = 0) ****\n"
-              "*** Bailing out (tries = 1) ****\n");
-    EXPECT_EQ(reachable, 0);
+    record("there is such a page", IsWirelessPrinterReachableViaHTTP, 1);
 }
 
 TEST_F(Printer, PromptWaitsForYes) {
-    const struct {
-        const char* typed;
-        const char* shown;
-    } rows[] = {
-        {"y\n", "Done yet? <y/n>"},
-        {"n\ny\n", "Done yet? <y/n>Done yet? <y/n>"},
-        {"\r\n\ny\n", "Done yet? <y/n>Done yet? <y/n>Done yet? <y/n>Done yet? <y/n>"},
-        {"x\ny\n", "Done yet? <y/n>bad character entered: x\nDone yet? <y/n>"},
-        // The character behind an answer is eaten whatever it is.
-        {"nyy\n", "Done yet? <y/n>Done yet? <y/n>"},
-        {"Y\ny\n", "Done yet? <y/n>bad character entered: Y\nDone yet? <y/n>"},
+    const std::string ask = "Done yet? <y/n>", bad = "bad character entered: ";
+    const std::pair<const char*, std::string> rows[] = {
+        {"n\ny\n", ask + ask},
+        {"\r\n\ny\n", ask + ask + ask + ask},
+        {"x\ny\n", ask + bad + "x\n" + ask},
+        {"nyy\n", ask + ask},  // the character behind an answer is eaten whatever it is
+        {"Y\ny\n", ask + bad + "Y\n" + ask},
     };
     std::FILE* const terminal = stdin;
-    for (const auto& row : rows) {
-        std::string typed = row.typed;
+    for (const auto& [text, shown] : rows) {
+        std::string typed = text;
         stdin = fmemopen(typed.data(), typed.size(), "r");
         testing::internal::CaptureStdout();
         EXPECT_EQ(WaitForUserToBeDone(), 0);
-        EXPECT_EQ(testing::internal::GetCapturedStdout(), row.shown);
+        EXPECT_EQ(testing::internal::GetCapturedStdout(), shown);
         std::fclose(stdin);
     }
     stdin = terminal;
 }
 
-TEST_F(Printer, PageThatCannotBeOpenedIsPassedOver) {
+TEST_F(Printer, APageThatCannotBeOpenedIsNoFailure) {
     OpenConfigurationPage();
     EXPECT_EQ(answers_->opened, std::vector<std::string>{"http://192.0.0.192/dot11_config_start.htm"});
 

@@ -1,16 +1,16 @@
 #include <gtest/gtest.h>
 
 #include <cstdint>
+#include <cstdio>
 #include <filesystem>
 #include <string>
-#include <string_view>
-#include <utility>
 #include <vector>
 
 #include "platform/IOKit.h"
 #include "platform/base/Host.h"
 #include "platform/values/Values.h"
 #include "tests/unit/support/SysfsTree.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace {
 
@@ -35,6 +35,12 @@ class Registry : public testing::Test {
         return find(matching);
     }
 
+    void clear() {
+        for (const char* folder : {"bus", "class", "devices"}) {
+            sysfs.remove(folder);
+        }
+    }
+
     SysfsTree sysfs;
     mach_port_t master = MACH_PORT_NULL;
 
@@ -47,19 +53,17 @@ class Registry : public testing::Test {
     platform::HostOverride host_;
 };
 
+// Data as text, with what does not print as "\\7f".
 std::string asText(CFTypeRef value) {
     const auto data = platform::values::as<CFDataRef>(value);
-    if (data == nullptr) {
-        return platform::values::descriptionOf(value);
-    }
-    std::string text;
-    for (CFIndex i = 0; i < CFDataGetLength(data); ++i) {
-        const char c = static_cast<char>(CFDataGetBytePtr(data)[i]);
-        constexpr std::string_view digits = "0123456789abcdef";
-        const auto byte = static_cast<unsigned char>(c);
-        text += c == '\0'                    ? std::string("\\0")
-                : byte > 0x20 && byte < 0x7F ? std::string(1, c)
-                                             : std::string{'\\', digits[byte >> 4U], digits[byte & 15U]};
+    std::string text = data == nullptr ? platform::values::descriptionOf(value) : "";
+    for (CFIndex i = 0; data != nullptr && i < CFDataGetLength(data); ++i) {
+        const UInt8 byte = CFDataGetBytePtr(data)[i];
+        char shown[4] = {static_cast<char>(byte)};
+        if (byte <= ' ' || byte >= 0x7F) {
+            std::snprintf(shown, sizeof shown, "\\%02x", byte);
+        }
+        text += shown;
     }
     return text;
 }
@@ -91,9 +95,17 @@ Lines linesOf(io_iterator_t iterator) {
     return lines;
 }
 
-TEST_F(Registry, TellsEthernetCardsByBusDriverAndSlot) {
+TEST_F(Registry, Ethernet) {
+    testing_support::Transcript transcript("ethernet");
+    const auto record = [&](const std::string& what) {
+        transcript.add("\n=== " + what);
+        for (const std::string& line : linesOf(findEthernet())) {
+            transcript.add(line);
+        }
+    };
     sysfs.addPciEthernet("eth10", "0000:05:00.0", "00:0a:95:9d:68:16");
     sysfs.addPciEthernet("eth2", "0000:03:00.0", "00:0a:95:9d:68:17", "r8169");
+    sysfs.addPciEthernet("eth11", "0000:09:00.0", "00:0a:95:9d:68:19", "");
     sysfs.addSlot("7", "0000:03:00");
     sysfs.addPciWireless("wlan0", "0000:04:00.0", "00:0a:95:9d:68:18");
     sysfs.attribute("class/net/wlan0/address", "de:ad:be:ef:00:01");
@@ -101,25 +113,9 @@ TEST_F(Registry, TellsEthernetCardsByBusDriverAndSlot) {
     sysfs.addVirtioEthernet("ens3", "0000:00:03.0");
     sysfs.addUsbEthernet("enx1", "1-2");
     sysfs.addPlatformEthernet("end0");
-    const Lines expected = {
-        "BSD Name=end0 < IOMACAddress=\\02\\0\\0\\0\\0\\06 IOClass=fec IOProviderClass=IOPlatformDevice < "
-        "name=platform:end0.ethernet\\0",
-        "BSD Name=ens3 < IOMACAddress=\\02\\0\\0\\0\\0\\04 IOClass=virtio_net IOProviderClass=IOPCIDevice < "
-        "name=pci:0000:00:03.0\\0 AAPL,slot-name=SLOT-0000:00:03.0\\0",
-        "BSD Name=enx1 < IOMACAddress=\\02\\0\\0\\0\\0\\05 IOClass=ax88179_178a IOProviderClass=IOUSBDevice "
-        "< "
-        "name=usb:1-2:1.0\\0",
-        "BSD Name=eth2 < IOMACAddress=\\0\\0a\\95\\9dh\\17 IOClass=r8169 IOProviderClass=IOPCIDevice < "
-        "name=pci:0000:03:00.0\\0 AAPL,slot-name=SLOT-7\\0",
-        "BSD Name=eth10 < IOMACAddress=\\0\\0a\\95\\9dh\\16 IOClass=e1000e IOProviderClass=IOPCIDevice < "
-        "name=pci:0000:05:00.0\\0 AAPL,slot-name=SLOT-0000:05:00.0\\0",
-        "BSD Name=wlan0 < IOMACAddress=\\0\\0a\\95\\9dh\\18 IOClass=AirPortiwlwifi "
-        "IOProviderClass=IOPCIDevice < name=pci:0000:04:00.0\\0 AAPL,slot-name=SLOT-Onboard\\20WLAN\\0",
-    };
-    EXPECT_EQ(linesOf(findEthernet()), expected);
-}
+    record("cards by bus, driver and slot");
+    clear();
 
-TEST_F(Registry, PassesOverWhatIsNoEthernetHardware) {
     sysfs.addVirtual("br0");
     sysfs.addVirtual("lo", 772);
     sysfs.attribute("class/net/bonding_masters", "bond0");
@@ -130,66 +126,44 @@ TEST_F(Registry, PassesOverWhatIsNoEthernetHardware) {
     sysfs.addPciEthernet("eth0", "0000:08:00.0");
     sysfs.remove("devices/pci0000:00/0000:08:00.0");
     sysfs.link("class/net/loop", "class/net/loop");
-    EXPECT_EQ(linesOf(findEthernet()), Lines{});
-}
+    record("nothing that is Ethernet hardware");
+    clear();
 
-TEST_F(Registry, LeavesOutAddressesThatAreNone) {
-    const char* bad[] = {"",
-                         "00:00:00:00:00:00",
-                         "00:0a:95:9d:68",
-                         "00-0a-95-9d-68-16",
-                         "00:0a:95:9d:68:1g",
-                         "+1:0a:95:9d:68:16"};
-    for (const char* mac : bad) {
-        SCOPED_TRACE(mac);
+    for (const char* mac : {"", "00:00:00:00:00:00", "00:0a:95:9d:68", "00-0a-95-9d-68-16",
+                            "00:0a:95:9d:68:1g", "+1:0a:95:9d:68:16"}) {
         sysfs.addPciEthernet("eth0", "0000:03:00.0", mac);
-        const Lines lines = linesOf(findEthernet());
-        ASSERT_EQ(lines.size(), 1U);
-        EXPECT_EQ(lines[0].find("IOMACAddress"), std::string::npos) << lines[0];
+        record("the address \"" + std::string(mac) + "\"");
     }
     sysfs.attribute("class/net/eth0/address", "02:00:00:00:00:09");
     sysfs.attribute("class/net/eth0/bonding_slave/perm_hwaddr", "02:00:00:00:00:0B");
-    EXPECT_NE(linesOf(findEthernet()).at(0).find("IOMACAddress=\\02\\0\\0\\0\\0\\0b"), std::string::npos);
-}
+    record("a member of a bond");
+    clear();
 
-TEST_F(Registry, NumbersThePortsOfOneCard) {
     sysfs.addPciEthernet("single", "0000:02:00.1");
     sysfs.addPciEthernet("fn0", "0000:03:00.0");
     sysfs.addPciEthernet("fn2", "0000:03:00.2");
     sysfs.addPciPort("port1", "0000:04:00.0", 1);
     sysfs.addPciPort("port0", "0000:04:00.0", 0);
-    sysfs.addPciPort("mixA", "0000:05:00.0", 0);
-    sysfs.addPciPort("mixB", "0000:05:00.0", 1);
-    sysfs.addPciPort("mixC", "0000:05:00.1", 0);
-    Lines indices;
-    for (const std::string& line : linesOf(findEthernet())) {
-        constexpr std::string_view key = "IOChildIndex=";
-        const std::string name = line.substr(9, line.find(' ', 9) - 9);
-        const std::size_t at = line.find(key);
-        indices.push_back(name + " " + (at == std::string::npos ? "-" : line.substr(at + key.size())));
-    }
-    EXPECT_EQ(indices,
-              (Lines{"fn0 0", "fn2 2", "mixA 0", "mixB 1", "mixC 2", "port0 0", "port1 1", "single -"}));
-}
+    sysfs.addPciPort("mixA", "0000:05:00.0", 1);
+    sysfs.addPciPort("mixB", "0000:05:00.0", 2);
+    sysfs.addPciPort("mixC", "0000:05:00.1", 3);
+    record("cards of several ports");
+    clear();
 
-TEST_F(Registry, TakesALabelOnlyWhenItReadsTheSameEverywhere) {
-    sysfs.addPciEthernet("eth0", "0000:03:00.0");
+    // A label counts only when it reads the same in every encoding.
     const std::string device = "devices/pci0000:00/0000:03:00.0";
-    const auto slot = [this] {
-        const std::string line = linesOf(findEthernet()).at(0);
-        return line.substr(line.find("SLOT-"));
-    };
+    sysfs.addPciEthernet("eth0", "0000:03:00.0");
     sysfs.attribute(device + "/acpi_index", "2");
-    EXPECT_EQ(slot(), "SLOT-onboard\\202\\0");
     for (const char* label : {"Port \xC3\xA9", "Port \x1b[1m"}) {
         sysfs.attribute(device + "/label", label);
-        EXPECT_EQ(slot(), "SLOT-onboard\\202\\0");
+        record("a label that does not count");
     }
     sysfs.addSlot("3-1", "0000:03:00");
-    EXPECT_EQ(slot(), "SLOT-3-1\\0");
+    record("a slot");
 }
 
-TEST_F(Registry, TellsSerialPortsByTheirKind) {
+TEST_F(Registry, SerialPorts) {
+    testing_support::Transcript transcript("serial_ports");
     sysfs.addSerial("ttyS0");
     sysfs.addSerial("ttyS1", false);
     sysfs.addSerial("ttyS2");
@@ -200,45 +174,25 @@ TEST_F(Registry, TellsSerialPortsByTheirKind) {
     sysfs.addUsbSerial("ttyACM2", "1-5", "");
     sysfs.addBluetoothSerial("rfcomm0");
     sysfs.addBluetoothSerial("rfcomm1", false);
-    EXPECT_EQ(
-        linesOf(findSerial(CFSTR("IOModemSerialStream"))),
-        (Lines{
-            "IOTTYDevice=rfcomm0 IOTTYBaseName=Bluetooth-Modem IOSerialBSDClientType=IOModemSerialStream < ",
-            "IOTTYDevice=ttyACM0 IOTTYBaseName=usbmodem IOSerialBSDClientType=IOModemSerialStream < "
-            "Product Name=56K Modem",
-            "IOTTYDevice=ttyACM2 IOTTYBaseName=usbmodem IOSerialBSDClientType=IOModemSerialStream < "}));
-    EXPECT_EQ(
-        linesOf(findSerial(CFSTR("IORS232SerialStream"))),
-        (Lines{
-            "IOTTYDevice=ttyS0 IOTTYBaseName=ttyS0 IOSerialBSDClientType=IORS232SerialStream < ",
-            "IOTTYDevice=ttyUSB0 IOTTYBaseName=ttyUSB0 IOSerialBSDClientType=IORS232SerialStream < Product "
-            "Name=USB-Serial Controller"}));
+    for (CFStringRef type : {CFSTR("IOModemSerialStream"), CFSTR("IORS232SerialStream")}) {
+        for (const std::string& line : linesOf(findSerial(type))) {
+            transcript.add(line);
+        }
+    }
     EXPECT_EQ(linesOf(find(IOServiceMatching("IOSerialBSDClient"))).size(), 5U);
-}
-
-TEST_F(Registry, ShowsOfAProductsTextWhatPrints) {
+    // What prints of a product's text.
     const std::string fill(62, 'x');
-    const struct {
-        std::string text;
-        std::string shown;
-    } rows[] = {
-        {"\t Caf\xC3\xA9 \xE6\x95\xB0 \r\n", "Caf\xC3\xA9 \xE6\x95\xB0"},
-        {"\x1b]0;root\x07 \x01\x7F", "?]0;root? ??"},
-        {"csi \xC2\x9B", "csi ?"},
-        {"override \xE2\x80\xAE isolate \xE2\x81\xA7 mark \xE2\x80\x8F", "override ? isolate ? mark ?"},
-        {"line\nbreak \xE2\x80\xA8 \xE2\x80\xA9", "line?break ? ?"},
-        {"private \xEE\x80\x80 none \xEF\xBF\xBF tag \xF3\xA0\x81\x81", "private ? none ? tag ?"},
-        {"bad \xFF \xC3( \xC0\x80 \xED\xA0\x80", "bad ? ?( ?? ???"},
-        {fill + "\xC3\xA9tail", fill + "\xC3\xA9"},
-        {fill + "x\xC3\xA9tail", fill + "x"},
-        {fill + " \xF0\x9F\x96\xA8", fill},
-        {std::string(4000, '\x01') + "x", ""},
-        {" \x01 \xFF ", ""},
-    };
-    for (const auto& [text, shown] : rows) {
+    for (const std::string& text :
+         {std::string("\t Caf\xC3\xA9 \xE6\x95\xB0 \r\n"), std::string("\x1b]0;root\x07 \x01\x7F"),
+          std::string("csi \xC2\x9B"),
+          std::string("override \xE2\x80\xAE isolate \xE2\x81\xA7 mark \xE2\x80\x8F"),
+          std::string("line\nbreak \xE2\x80\xA8 \xE2\x80\xA9"),
+          std::string("private \xEE\x80\x80 none \xEF\xBF\xBF tag \xF3\xA0\x81\x81"),
+          std::string("bad \xFF \xC3( \xC0\x80 \xED\xA0\x80"), fill + "\xC3\xA9tail", fill + "x\xC3\xA9tail",
+          fill + " \xF0\x9F\x96\xA8", std::string(4000, '\x01') + "x", std::string(" \x01 \xFF ")}) {
         sysfs.addUsbSerial("ttyACM0", "1-3", text);
-        const std::string line = linesOf(findSerial(CFSTR("IOModemSerialStream"))).at(0);
-        EXPECT_EQ(line.substr(line.find("< ") + 2), shown.empty() ? "" : "Product Name=" + shown);
+        const std::string line = linesOf(findSerial(CFSTR("IOModemSerialStream"))).at(1);
+        transcript.add(line.substr(line.find("< ")));
     }
 }
 
@@ -276,21 +230,34 @@ TEST_F(Registry, KeepsItsSnapshotWhenTheDeviceIsPulledOut) {
 
 TEST_F(Registry, RefusesHandlesThatAreNone) {
     sysfs.addPciEthernet("eth0", "0000:03:00.0");
+    sysfs.addPciEthernet("eth1", "0000:04:00.0");
     const io_iterator_t iterator = findEthernet();
+    const io_object_t gone = IOIteratorNext(iterator);
+    EXPECT_EQ(IOObjectRelease(gone), KERN_SUCCESS);
     const io_object_t entry = IOIteratorNext(iterator);
-    IOObjectRelease(entry);
-
-    for (const io_object_t bad : {IO_OBJECT_NULL, entry, iterator, ~io_object_t{0}}) {
+    for (const io_object_t bad : {IO_OBJECT_NULL, gone, iterator, ~io_object_t{0}}) {
         SCOPED_TRACE(bad);
-        CFMutableDictionaryRef properties = nullptr;
-        io_registry_entry_t parent = 77;
+        EXPECT_NE(bad, entry) << "a handle is not given out again";
+        auto* properties = IOServiceMatching("none");
+        const auto owned = Owned<CFMutableDictionaryRef>::adopt(properties);
+        io_object_t output = 77;
         EXPECT_EQ(IORegistryEntryCreateCFProperties(bad, &properties, nullptr, 0), kIOReturnBadArgument);
-        EXPECT_EQ(IORegistryEntryGetParentEntry(bad, kIOServicePlane, &parent), kIOReturnBadArgument);
-        EXPECT_EQ(parent, IO_OBJECT_NULL);
+        EXPECT_EQ(properties, nullptr);
+        EXPECT_EQ(IORegistryEntryGetParentEntry(bad, kIOServicePlane, &output), kIOReturnBadArgument);
+        EXPECT_EQ(output, IO_OBJECT_NULL);
+        EXPECT_EQ(IOServiceGetMatchingServices(bad, IOServiceMatching("IOEthernetInterface"), &output),
+                  kIOReturnBadArgument);
     }
+    io_object_t parent = IO_OBJECT_NULL;
+    EXPECT_EQ(IORegistryEntryGetParentEntry(entry, "IOUSB", &parent), kIOReturnBadArgument);
+    EXPECT_EQ(IORegistryEntryGetParentEntry(entry, kIOServicePlane, &parent), KERN_SUCCESS);
+    EXPECT_TRUE(IOObjectConformsTo(entry, "IOEthernetInterface"));
+    EXPECT_FALSE(IOObjectConformsTo(parent, ""));
     EXPECT_EQ(IOIteratorNext(entry), IO_OBJECT_NULL);
-    EXPECT_EQ(IOObjectRelease(iterator), KERN_SUCCESS);
-    EXPECT_EQ(IOObjectRelease(iterator), kIOReturnBadArgument);
+    for (const io_object_t held : {parent, entry, iterator}) {
+        EXPECT_EQ(IOObjectRelease(held), KERN_SUCCESS);
+        EXPECT_EQ(IOObjectRelease(held), kIOReturnBadArgument);
+    }
 }
 
 }  // namespace

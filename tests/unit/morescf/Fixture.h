@@ -3,14 +3,11 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <cstdint>
 #include <fstream>
-#include <functional>
 #include <iterator>
 #include <memory>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -56,22 +53,22 @@ class Output {
     }
     operator Ref() const { return value_; }
     [[nodiscard]] std::string shown() const { return value_ == untouched() ? "untouched" : show(value_); }
-
-  private:
-    static Ref untouched() { return reinterpret_cast<Ref>(static_cast<std::uintptr_t>(16)); }
     void reset() {
         if (value_ != untouched()) {
             CFQRelease(value_);
         }
         value_ = untouched();
     }
+
+  private:
+    static Ref untouched() { return reinterpret_cast<Ref>(static_cast<std::uintptr_t>(16)); }
     Ref value_ = untouched();
 };
 
 inline CFDictionaryRef dictionary(const Value& value) {
     return static_cast<CFDictionaryRef>(value.get());
 }
-inline CFArrayRef array(const Value& value) {
+inline CFArrayRef arrayOf(const Value& value) {
     return static_cast<CFArrayRef>(value.get());
 }
 
@@ -113,25 +110,15 @@ class MoreSCFTest : public testing::Test {
     static std::string at(std::string_view path) {
         return show(SCPreferencesPathGetValue(MoreSCGetSCPreferencesRef(), Str(path)));
     }
-    // Which file it is: every commit that writes makes another one.
-    [[nodiscard]] std::string fileIdentity() const {
-        struct stat status {};
-        return stat(directory.at("store/preferences.plist").c_str(), &status) != 0
-                   ? "none"
-                   : std::to_string(status.st_ino) + "." + std::to_string(status.st_mtim.tv_nsec);
-    }
-
     // Location 1, current, with services 5 (on eth0) and 6; location 2, with service 6 under the ID 60.
-    static constexpr const char* twoSets =
-        "{Sets = {1 = {UserDefinedName = Home; Network = {Service = {5 = {__LINK__ = /NetworkServices/5}; 6 "
-        "= "
-        "{__LINK__ = /NetworkServices/6}}; Global = {IPv4 = {PPPOverridePrimary = #0; ServiceOrder = (6, "
-        "5)}; "
-        "NetInfo = {}}}}; 2 = {UserDefinedName = Away; Network = {Service = {60 = {__LINK__ = "
-        "/NetworkServices/6}}; Global = {IPv4 = {ServiceOrder = (60)}}}}}; NetworkServices = {5 = "
-        "{UserDefinedName = Wired; Interface = {DeviceName = eth0; Type = Ethernet}; IPv4 = {ConfigMethod = "
-        "DHCP}}; 6 = {UserDefinedName = Dial; Interface = {DeviceName = ttyS0; Type = PPP}; IPv4 = "
-        "{ConfigMethod = PPP}}}; CurrentSet = /Sets/1}";
+    static constexpr const char* twoSets = R"({
+        Sets = {1 = {UserDefinedName = Home; Network = {Global = {IPv4 = {PPPOverridePrimary = #0; ServiceOrder = (6, 5)};
+                         NetInfo = {}}; Service = {5 = {__LINK__ = /NetworkServices/5}; 6 = {__LINK__ = /NetworkServices/6}}}};
+                2 = {UserDefinedName = Away; Network = {Global = {IPv4 = {ServiceOrder = (60)}};
+                         Service = {60 = {__LINK__ = /NetworkServices/6}}}}};
+        NetworkServices = {5 = {UserDefinedName = Wired; Interface = {DeviceName = eth0; Type = Ethernet}; IPv4 = {ConfigMethod = DHCP}};
+                           6 = {UserDefinedName = Dial; Interface = {DeviceName = ttyS0; Type = PPP}; IPv4 = {ConfigMethod = PPP}}};
+        CurrentSet = /Sets/1})";
 
     testing_support::TemporaryDirectory directory;
     testing_support::SysfsTree sysfs;

@@ -1,5 +1,6 @@
 #include "morescf/MoreSCFCCLScanner.h"
 
+#include "platform/CoreServices.h"
 #include "tests/unit/morescf/Fixture.h"
 
 namespace morescf_test {
@@ -7,47 +8,45 @@ namespace {
 
 class ScannerTest : public MoreSCFTest {
   protected:
-    void script(const char* domain, const std::string& name) const {
-        (void)directory.write("scripts/" + std::string(domain) + "/" + name, "");
+    void add(const char* domain, const std::vector<std::string>& names) const {
+        for (const std::string& name : names) {
+            (void)directory.write("scripts/" + std::string(domain) + "/" + name, "");
+        }
     }
-    static std::string scan(CFIndex& index) {
+    // The index of the default one, and the list.
+    static std::string scan() {
         Output<CFArrayRef> scripts;
-        index = 77;
+        CFIndex index = 77;
         const OSStatus err = MoreSCCreateCCLArray(&scripts, &index);
-        return err == 0 ? scripts.shown() : std::to_string(err) + " " + scripts.shown();
+        return (err != 0 ? std::to_string(err) : std::to_string(index)) + " " + scripts.shown();
     }
-    CFIndex index = 0;
 };
 
 TEST_F(ScannerTest, SortsByNumberAndListsEachNameOnce) {
-    for (const char* name : {"Modem 10", "abc", ".hidden", "Zebra"}) {
-        script("user", name);
-    }
-    script("user", "folder/inside");
-    script("network", "ABC");
-    for (const char* name : {"Modem 9", "abc", "Modem 10"}) {
-        script("local", name);
-    }
-    script("system", "ABC");
-    EXPECT_EQ("(abc, ABC, Modem 9, Modem 10, Zebra)", scan(index));
-    EXPECT_EQ(0, index);
-    script("system", "Apple Internal 56K Modem (v.90)");
-    script("system", "Apple Internal 56K Modem");
+    add("user", {"Modem 10", "abc", ".hidden", "Zebra", "folder/inside"});
+    add("network", {"ABC"});
+    add("local", {"Modem 9", "abc", "Modem 10"});
+    add("system", {"ABC"});
+    EXPECT_EQ("0 (abc, ABC, Modem 9, Modem 10, Zebra)", scan());
+    add("system", {"Apple Internal 56K Modem (v.90)", "Apple Internal 56K Modem"});
     EXPECT_EQ(
-        "(abc, ABC, Apple Internal 56K Modem, Apple Internal 56K Modem (v.90), Modem 9, Modem 10, Zebra)",
-        scan(index));
-    EXPECT_EQ(3, index);
+        "3 (abc, ABC, Apple Internal 56K Modem, Apple Internal 56K Modem (v.90), Modem 9, Modem 10, Zebra)",
+        scan());
+    // A folder that cannot be read whole fails the listing.
+    for (int i = 0; i < 4097; ++i) {
+        add("local", {"Modem " + std::to_string(i)});
+    }
+    EXPECT_EQ(std::to_string(ioErr) + " null", scan());
 }
 
 TEST_F(ScannerTest, ReadsFoldersOfManyBatches) {
     for (const int count : {50, 51, 173}) {
         for (int i = 0; i < count; ++i) {
-            script("local", "Modem " + std::to_string(i));
+            add("local", {"Modem " + std::to_string(i)});
         }
         Output<CFArrayRef> scripts;
-        EXPECT_EQ(0, MoreSCCreateCCLArray(&scripts, &index));
+        EXPECT_EQ(0, MoreSCCreateCCLArray(&scripts, nullptr));
         ASSERT_EQ(count, CFArrayGetCount(scripts));
-        EXPECT_EQ("Modem " + std::to_string(count - 1), show(CFArrayGetValueAtIndex(scripts, count - 1)));
     }
 }
 

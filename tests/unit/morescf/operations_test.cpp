@@ -1,223 +1,215 @@
-// Every operation on locations, services and entities: what it returns, and the tree after it.
-#include "morescf/MoreSCFHelpers.h"
-#include "tests/unit/morescf/Fixture.h"
+// Every operation on locations, services and entities.
+#include "morescf/MoreSCFPortScanner.h"
+#include "tests/unit/morescf/Calls.h"
 
 namespace morescf_test {
 namespace {
 
-using OperationsTest = MoreSCFTest;
+class OperationsTest : public CallsTest {
+  protected:
+    ~OperationsTest() override { MoreSCFSetPortNameCallback(nullptr); }
+};
 
 // Location 1, current, lists service 5, which is off, and links 4; nobody lists 4 or 7.
-constexpr const char* oneSet =
-    "{Sets = {1 = {UserDefinedName = Home; Network = {Service = {5 = {__LINK__ = /NetworkServices/5}; 4 = "
-    "{__LINK__ = /NetworkServices/4}}; Global = {IPv4 = {ServiceOrder = (5)}}}}}; NetworkServices = {4 = {}; "
-    "5 = {UserDefinedName = Wired; __INACTIVE__ = #1; IPv4 = {ConfigMethod = DHCP}; DNS = {}}; 7 = {}}; "
-    "CurrentSet = /Sets/1}";
-constexpr const char* smallTree = "{Sets = {1 = {}}; CurrentSet = /Sets/1}";
-constexpr const char* noOrder =
-    "{Sets = {1 = {Network = {Service = {}; Global = {IPv4 = {}}}}}; NetworkServices = {5 = {}; 7 = {}}; "
-    "CurrentSet = /Sets/1}";
-// Service 5 is off and so is its AppleTalk; 6 has it on, 7 has none.
-constexpr const char* appleTalk =
-    "{Sets = {1 = {Network = {Service = {5 = {__LINK__ = /NetworkServices/5}; 6 = {__LINK__ = "
-    "/NetworkServices/6}; 7 "
-    "= {__LINK__ = /NetworkServices/7}}; Global = {IPv4 = {ServiceOrder = (5, 6, 7)}}}}}; NetworkServices = "
-    "{5 = "
-    "{__INACTIVE__ = #1; AppleTalk = {__INACTIVE__ = #1}}; 6 = {AppleTalk = {}}; 7 = {}}; CurrentSet = "
-    "/Sets/1}";
-constexpr const char* lostService =
-    "{Sets = {1 = {Network = {Service = {5 = {__LINK__ = /NetworkServices/5}; 4 = {__LINK__ = "
-    "/NetworkServices/4}"
-    "}; Global = {IPv4 = {ServiceOrder = (5, 4)}}}}}; NetworkServices = {5 = {}}; CurrentSet = /Sets/1}";
-
+constexpr const char* oneSet = R"({
+    Sets = {1 = {UserDefinedName = Home; Network = {Global = {IPv4 = {ServiceOrder = (5)}};
+                     Service = {5 = {__LINK__ = /NetworkServices/5}; 4 = {__LINK__ = /NetworkServices/4}}}}};
+    NetworkServices = {4 = {}; 5 = {UserDefinedName = Wired; __INACTIVE__ = #1; IPv4 = {ConfigMethod = DHCP}; DNS = {}}; 7 = {}};
+    CurrentSet = /Sets/1})";
+constexpr const char* lostService = R"({
+    Sets = {1 = {Network = {Global = {IPv4 = {ServiceOrder = (5, 4)}};
+                     Service = {5 = {__LINK__ = /NetworkServices/5}; 4 = {__LINK__ = /NetworkServices/4}}}}};
+    NetworkServices = {5 = {}}; CurrentSet = /Sets/1})";
+constexpr const char* noOrder = R"({
+    Sets = {1 = {Network = {Service = {}; Global = {IPv4 = {}}}}}; NetworkServices = {5 = {}; 7 = {}}; CurrentSet = /Sets/1})";
 // Nobody can tell what location 2 lists.
-constexpr const char* unknownOrder =
-    "{Sets = {1 = {Network = {Service = {5 = {__LINK__ = /NetworkServices/5}}; Global = {IPv4 = "
-    "{ServiceOrder = "
-    "(5)}}}}; 2 = {}; 3 = {}}; NetworkServices = {5 = {}; 7 = {}}; CurrentSet = /Sets/1}";
+constexpr const char* unknownOrder = R"({
+    Sets = {1 = {Network = {Global = {IPv4 = {ServiceOrder = (5)}}; Service = {5 = {__LINK__ = /NetworkServices/5}}}}; 2 = {};
+            3 = {}};
+    NetworkServices = {5 = {}; 7 = {}}; CurrentSet = /Sets/1})";
 
-// The text with "old -> new" edits made, one after the other, between which stands " | ".
-std::string edited(std::string text, std::string_view edits) {
-    while (!edits.empty()) {
-        const std::size_t end = std::min(edits.find(" | "), edits.size());
-        const std::string_view edit = edits.substr(0, end);
-        const std::size_t arrow = edit.find(" -> ");
-        const std::size_t at = text.find(edit.substr(0, arrow));
-        EXPECT_NE(std::string::npos, at) << edit;
-        text.replace(at, arrow, edit.substr(arrow + 4));
-        edits.remove_prefix(std::min(end + 3, edits.size()));
+TEST_F(OperationsTest, Locations) {
+    transcript = std::make_unique<testing_support::Transcript>("locations");
+    const Str s1("1"), s2("2"), s9("9"), name("New");
+    const Value tree = read("{8 = {}}");
+    on("oneSet", oneSet);
+    CALL(MoreSCSetSetsDict(dictionary(tree)));
+    CALL(MoreSCSetSetsDict(nullptr));
+    CALL(MoreSCSetCurrentSet(s9));
+    CALL(MoreSCSetCurrentSet(nullptr));
+    CALL(MoreSCCopyCurrentSet(&string));
+    CALL(MoreSCCopyUserVisibleNameOfSet(nullptr, &string));
+    CALL(MoreSCRenameSet(nullptr, name));
+    CALL(MoreSCRenameSet(s9, name));
+    CALL(MoreSCRenameSet(s1, nullptr));
+    CALL(MoreSCNewSet(name, &string));
+    CALL(MoreSCNewSet(nullptr, &string));
+    CALL(MoreSCDuplicateSet(s1, name, &string));
+    CALL(MoreSCDuplicateSet(nullptr, nullptr, nullptr));
+    CALL(MoreSCDeleteSet(s1));
+    CALL(MoreSCDeleteSet(nullptr));
+    CALL(MoreSCDeleteSet(s9));
+    on("twoSets", twoSets);
+    CALL(MoreSCCopySetIDs(&array, &index));
+    CALL(MoreSCSetCurrentSet(s2) + MoreSCCopySetIDs(&array, &index) + MoreSCDeleteSet(s1));
+    on("lostService", lostService);
+    CALL(MoreSCDuplicateSet(nullptr, nullptr, &string));
+    on("unknownOrder", unknownOrder);
+    CALL(MoreSCDeleteSet(Str("3")));
+
+    // One service for each port, in the ports' order.
+    sysfs.addPciEthernet("eth0", "0000:03:00.0");
+    sysfs.addPciWireless("wlan0", "0000:04:00.0");
+    sysfs.addUsbSerial("ttyACM0", "1-2", "Modem of 1994");
+    on("three ports", twoSets);
+    CALL(MoreSCNewSet(name, &string));
+    // A port that can be listed, but not be described: it has no type.
+    MoreSCFSetPortNameCallback(
+        [](io_object_t, CFMutableDictionaryRef port, CFStringRef proposed, CFStringRef* base) {
+            if (CFEqual(CFDictionaryGetValue(port, CFSTR("DeviceName")), CFSTR("wlan0"))) {
+                CFDictionaryRemoveValue(port, CFSTR("Type"));
+            }
+            *base = CFStringCreateCopy(nullptr, proposed);
+            return OSStatus{0};
+        });
+    CALL(MoreSCNewSet(name, &string));
+}
+
+TEST_F(OperationsTest, Services) {
+    transcript = std::make_unique<testing_support::Transcript>("services");
+    const Str s1("1"), s4("4"), s5("5"), s9("9"), name("New");
+    const Value values[] = {read("{8 = {__LINK__ = /x}}"), read("(8)")};
+    on("oneSet", oneSet);
+    CALL(MoreSCSetServicesDict(nullptr, dictionary(values[0]), nullptr));
+    CALL(MoreSCSetServicesDict(s1, nullptr, arrayOf(values[1])));
+    CALL(MoreSCCopyServicesDict(s1, &dict, &array));
+    CALL(MoreSCCopyServicesDict(s9, &dict, &array));
+    CALL(MoreSCCopyServicesDictMutable(s1, &mutableDict, &mutableArray));
+    CALL(MoreSCCopyUserVisibleNameOfService(s1, s5, &string));
+    CALL(MoreSCCopyBSDNameOfService(s1, s5, &string));
+    CALL(MoreSCIsServiceActive(s1, s5, &flag));
+    CALL(MoreSCIsServiceActive(s1, s4, &flag));
+    CALL(MoreSCSetServiceActive(s1, s5, true));
+    CALL(MoreSCSetServiceActive(s1, s4, 2));
+    CALL(MoreSCSetServiceActive(s1, s5, false));
+    CALL(MoreSCRenameService(nullptr, s5, name));
+    CALL(MoreSCDuplicateService(nullptr, s5, name, &string));
+    CALL(MoreSCDuplicateService(nullptr, s9, nullptr, &string));
+    CALL(MoreSCDuplicateService(nullptr, nullptr, nullptr, nullptr));
+    CALL(MoreSCDeleteService(nullptr, s5));
+    CALL(MoreSCDeleteService(nullptr, s4));
+    CALL(MoreSCDeleteService(s9, s5));
+    CALL(MoreSCDeleteService(nullptr, nullptr));
+    on("twoSets", twoSets);
+    CALL(MoreSCCopyServiceIDs(Str("2"), &array, &second));
+    CALL(MoreSCCopyBSDNameOfService(Str("2"), Str("60"), &string));
+    CALL(MoreSCDeleteService(s1, s5));
+    CALL(MoreSCDeleteService(s1, Str("6")));
+    on("noOrder", noOrder);
+    CALL(MoreSCDuplicateService(nullptr, s5, nullptr, nullptr));
+    CALL(MoreSCDeleteService(nullptr, s5));
+    on("lostService", lostService);
+    CALL(MoreSCCopyServiceIDs(s1, &array, nullptr));
+    CALL(MoreSCCopyServiceIDs(s1, &array, &second));
+    on("unknownOrder", unknownOrder);
+    CALL(MoreSCDeleteService(nullptr, s5));
+}
+
+TEST_F(OperationsTest, NewServices) {
+    transcript = std::make_unique<testing_support::Transcript>("new_services");
+    const auto make = [this](const char* port) {
+        const Value value = read(port);
+        run(port, [&] { return MoreSCNewService(nullptr, dictionary(value), &string); });
+    };
+    const char* card =
+        "{UserDefinedName = x; DeviceName = eth9; Hardware = Ethernet; Type = Ethernet; MACAddress = "
+        "00:0a:95:9d:68:16}";
+    const char* modem =
+        "{UserDefinedName = Fax; DeviceName = ttyS9; Hardware = Modem; Type = PPP; SubType = PPPSerial; "
+        "HardwareVariant = IrDA-IrCOMM}";
+    on("oneSet", oneSet);
+    CALL(MoreSCNewService(nullptr, nullptr, &string));
+    make("{a = b}");
+    make("{UserDefinedName = typeless; DeviceName = eth0; Hardware = Ethernet}");
+    make(
+        "{UserDefinedName = AirPort; DeviceName = wlan0; Hardware = AirPort; Type = Ethernet; SubType = "
+        "unused; MACAddress = "
+        "00:0A:95:9D:68:16}");
+    make(modem);
+    for (const char* script : {"Apple Internal 56K Modem (v.90)", "AAA"}) {
+        (void)directory.write("scripts/local/" + std::string(script), "");
     }
-    return text;
-}
-
-// clang-format off
-#define SWEPT "4 = {}; 5 -> 5 | ; 7 = {}}; C -> }; C"
-#define CHANGES(call) #call, [&]() -> OSStatus { return call; }
-
-TEST_F(OperationsTest, ChangeTheTreeAndMarkTheSession) {
-    const Str s5("5"), s1("1");
-    const Value values[] = {read("{8 = {__LINK__ = /x}}"), read("{a = b}"), read("(8)"), read("()"),
-                            read("(IPv6, DNS, DNS, UserDefinedName)"), read("({}, {a = b}, {}, {})"),
-                            read("{UserDefinedName = typeless; DeviceName = eth0; Hardware = Ethernet}")};
-    CFDictionaryRef links = dictionary(values[0]), ab = dictionary(values[1]), port = dictionary(values[6]);
-    CFArrayRef order = array(values[2]), none = array(values[3]), names = array(values[4]), four = array(values[5]);
-    enum Mark { marked, unmarked };
-    const struct { const char* tree; const char* call; std::function<OSStatus()> run; OSStatus err; Mark mark; const char* edits; } rows[] = {
-        {smallTree, CHANGES(MoreSCSetSetsDict(links)), 0, marked, "1 = {} -> 8 = {__LINK__ = /x}"},
-        {smallTree, CHANGES(MoreSCSetSetsDict(nullptr)), -50, unmarked, ""},
-        {smallTree, CHANGES(MoreSCSetCurrentSet(Str("9"))), 0, marked, "/Sets/1 -> /Sets/9"},
-        {oneSet, CHANGES(MoreSCSetCurrentSet(nullptr)), -50, unmarked, ""},
-        {oneSet, CHANGES(MoreSCRenameSet(nullptr, CFSTR("New"))), 0, marked, "Home -> New"},
-        {oneSet, CHANGES(MoreSCRenameSet(Str("9"), CFSTR("New"))), 1004, unmarked, ""},
-        {oneSet, CHANGES(MoreSCNewSet(CFSTR("New"), nullptr)), 0, marked,
-         "}; NetworkS -> ; 2 = {Network = {Service = {}; Global = {IPv4 = {PPPOverridePrimary = #0; ServiceOrder = ()}; "
-         "NetInfo = {}}}; UserDefinedName = New}}; NetworkS"},
-        {oneSet, CHANGES(MoreSCDuplicateSet(s1, CFSTR("New"), nullptr)), 0, marked,
-         "}; NetworkS -> ; 2 = {UserDefinedName = New; Network = {Service = {8 = {__LINK__ = /NetworkServices/8}}; Global = "
-         "{IPv4 = {ServiceOrder = (8)}}}}}; NetworkS | 7 = {} -> 7 = {}; 8 = {UserDefinedName = Wired; __INACTIVE__ = #1; "
-         "IPv4 = {ConfigMethod = DHCP}; DNS = {}}"},
-        // What it had made is gone again, through a deletion that marks.
-        {lostService, CHANGES(MoreSCDuplicateSet(nullptr, nullptr, nullptr)), 1004, marked, ""},
-        {oneSet, CHANGES(MoreSCDeleteSet(s1)), -50, unmarked, SWEPT},
-        {oneSet, CHANGES(MoreSCDeleteSet(nullptr)), -50, unmarked, ""},
-        {oneSet, CHANGES(MoreSCDeleteSet(Str("9"))), 1004, unmarked, SWEPT},
-        {twoSets, CHANGES(MoreSCSetCurrentSet(Str("2")) + MoreSCDeleteSet(s1)), 0, marked,
-         "1 = {UserDefinedName = Home; Network = {Service = {5 = {__LINK__ = /NetworkServices/5}; 6 = {__LINK__ = "
-         "/NetworkServices/6}}; Global = {IPv4 = {PPPOverridePrimary = #0; ServiceOrder = (6, 5)}; NetInfo = {}}}}; 2 -> 2 | "
-         "5 = {UserDefinedName = Wired; Interface = {DeviceName = eth0; Type = Ethernet}; IPv4 = {ConfigMethod = DHCP}}; 6 "
-         "-> 6 | t = /Sets/1 -> t = /Sets/2"},
-        {oneSet, CHANGES(MoreSCSetServicesDict(nullptr, links, nullptr)), 0, marked,
-         "{5 = {__LINK__ = /NetworkServices/5}; 4 = {__LINK__ = /NetworkServices/4}} -> {8 = {__LINK__ = /x}}"},
-        {oneSet, CHANGES(MoreSCSetServicesDict(s1, nullptr, order)), 0, marked, "(5) -> (8)"},
-        {oneSet, CHANGES(MoreSCSetServiceActive(s1, s5, true)), 0, marked, " __INACTIVE__ = #1; -> "},
-        {oneSet, CHANGES(MoreSCSetServiceActive(s1, s5, false)), 0, unmarked, ""},
-        {oneSet, CHANGES(MoreSCDuplicateService(nullptr, s5, CFSTR("New"), nullptr)), 0, marked,
-         "(5) -> (5, 8) | /NetworkServices/4} -> /NetworkServices/4}; 8 = {__LINK__ = /NetworkServices/8} | 7 = {} -> 7 = "
-         "{}; 8 = {UserDefinedName = New; __INACTIVE__ = #1; IPv4 = {ConfigMethod = DHCP}; DNS = {}}"},
-        {oneSet, CHANGES(MoreSCDuplicateService(nullptr, Str("7"), nullptr, nullptr)), 0, marked,
-         "(5) -> (5, 8) | /NetworkServices/4} -> /NetworkServices/4}; 8 = {__LINK__ = /NetworkServices/8} | 7 = {} -> 7 = "
-         "{}; 8 = {}"},
-        {oneSet, CHANGES(MoreSCDuplicateService(nullptr, Str("9"), nullptr, nullptr)), 1004, unmarked, SWEPT},
-        {oneSet, CHANGES(MoreSCDuplicateService(nullptr, nullptr, nullptr, nullptr)), -50, unmarked, ""},
-        {noOrder, CHANGES(MoreSCDuplicateService(nullptr, s5, nullptr, nullptr)), -4960, unmarked, "7 = {} -> 7 = {}; 8 = {}"},
-        {oneSet, CHANGES(MoreSCNewService(nullptr, ab, nullptr)), -50, marked, SWEPT},
-        {oneSet, CHANGES(MoreSCNewService(nullptr, port, nullptr)), -50, marked, SWEPT},
-        {oneSet, CHANGES(MoreSCDeleteService(nullptr, s5)), 0, marked,
-         "5 = {UserDefinedName = Wired; __INACTIVE__ = #1; IPv4 = {ConfigMethod = DHCP}; DNS = {}} ->  | "
-         "4 = {}; ; 7 = {} ->  | 5 = {__LINK__ = /NetworkServices/5}; 4 -> 4 | (5) -> ()"},
-        {twoSets, CHANGES(MoreSCDeleteService(s1, Str("6"))), 0, marked,
-         "; 6 = {__LINK__ = /NetworkServices/6} ->  | (6, 5) -> (5)"},
-        {oneSet, CHANGES(MoreSCDeleteService(nullptr, Str("4"))), 0, marked,
-         SWEPT " | ; 4 = {__LINK__ = /NetworkServices/4} -> "},
-        {oneSet, CHANGES(MoreSCDeleteService(nullptr, nullptr)), -50, unmarked, ""},
-        {noOrder, CHANGES(MoreSCDeleteService(nullptr, s5)), -4960, unmarked, ""},
-        // The removal of services fails behind the rest.
-        {unknownOrder, CHANGES(MoreSCDeleteService(nullptr, s5)), 1004, marked, "5 = {__LINK__ = /NetworkServices/5} ->  | (5) -> ()"},
-        {unknownOrder, CHANGES(MoreSCDeleteSet(Str("3"))), 1004, unmarked, "; 3 = {} -> "},
-        {oneSet, CHANGES(MoreSCRenameService(nullptr, s5, CFSTR("New"))), 0, marked, "Wired -> New"},
-        {oneSet, CHANGES(MoreSCSetEntitiesDict(s1, nullptr, ab)), 0, marked, "{IPv4 = {ServiceOrder = (5)}} -> {a = b}"},
-        {oneSet, CHANGES(MoreSCSetEntity(s1, s5, CFSTR("New"), ab)), 0, marked, "DNS = {} -> DNS = {}; New = {a = b}"},
-        {oneSet, CHANGES(MoreSCSetEntity(s1, s5, CFSTR("IPv4"), ab)), 0, marked, "{ConfigMethod = DHCP} -> {a = b}"},
-        {oneSet, CHANGES(MoreSCSetEntity(s1, s5, nullptr, ab)), -50, unmarked, ""},
-        // The first of two entities of one protocol counts, and none against a property.
-        {oneSet, CHANGES(MoreSCSetEntities(s1, s5, names, four)), 0, marked,
-         "IPv4 = {ConfigMethod = DHCP}; DNS = {} -> IPv6 = {}; DNS = {a = b}"},
-        {oneSet, CHANGES(MoreSCSetEntities(s1, s5, none, none)), 0, marked, "; IPv4 = {ConfigMethod = DHCP}; DNS = {} -> "},
-        {oneSet, CHANGES(MoreSCSetEntities(s1, s5, none, four)), -50, unmarked, ""},
-        {oneSet, CHANGES(MoreSCNewEntity(s1, s5, CFSTR("New"), ab)), 0, marked, "DNS = {} -> DNS = {}; New = {a = b}"},
-        {oneSet, CHANGES(MoreSCNewEntity(s1, s5, CFSTR("DNS"), ab)), -50, unmarked, ""},
-        {oneSet, CHANGES(MoreSCDeleteEntity(s1, s5, CFSTR("IPv4"))), 0, marked, "IPv4 = {ConfigMethod = DHCP}; DNS -> DNS"},
-        {oneSet, CHANGES(MoreSCDeleteEntity(s1, s5, CFSTR("New"))), 0, marked, ""},
-        {oneSet, CHANGES(MoreSCDeleteEntity(s1, s5, nullptr)), -50, unmarked, ""},
-        {oneSet, CHANGES(MoreSCSetEntityActive(s1, s5, CFSTR("DNS"), false)), 0, marked, "DNS = {} -> DNS = {__INACTIVE__ = #1}"},
-        {oneSet, CHANGES(MoreSCSetEntityActive(s1, s5, CFSTR("DNS"), true)), 0, unmarked, ""},
-        {oneSet, CHANGES(MoreSCSetEntityActive(s1, s5, CFSTR("New"), true)), 1004, unmarked, ""},
-        {appleTalk, CHANGES(MoreSCSetAppleTalkActive(nullptr, true)), 0, marked, "{__INACTIVE__ = #1} -> {}"},
-        {appleTalk, CHANGES(MoreSCSetAppleTalkActive(s1, false)), 0, marked, "AppleTalk = {}} -> AppleTalk = {__INACTIVE__ = #1}}"},
-        {oneSet, CHANGES(MoreSCSetAppleTalkActive(nullptr, true)), 0, unmarked, ""},
-    };
-    // clang-format on
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.call);
-        setTree(row.tree);
-        OSStatus err = MoreSCOpen(false, false);
-        EXPECT_EQ(row.err, row.run());
-        EXPECT_EQ(edited(row.tree, row.edits), at("/"));
-        // On disk only what a marked session commits.
-        SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), CFSTR("Added"), kCFBooleanTrue);
-        MoreSCClose(&err, false);
-        EXPECT_EQ(row.mark == marked, tree().ends_with("; Added = #true}"));
+    make(modem);
+    for (const std::optional<std::int32_t> version :
+         {std::optional<std::int32_t>(), std::optional(0x1012), std::optional(0x1013), std::optional(0x101F),
+          std::optional(0x1020)}) {
+        platform::Host old = host;
+        old.systemVersion = version;
+        const platform::HostOverride scope(old);
+        transcript->add("\n=== version " + std::to_string(version.value_or(0)));
+        make(card);
     }
 }
 
-// The status, unless it is 0, and the outputs.
-template <class Ref1, class Ref2 = CFArrayRef, class Operation>
-std::string got(Operation operation) {
-    Output<Ref1> first;
-    Output<Ref2> second;
-    const OSStatus err = operation(&first, &second);
-    return (err != 0 ? std::to_string(err) + " " : "") + first.shown() + " " + second.shown();
+TEST_F(OperationsTest, Entities) {
+    transcript = std::make_unique<testing_support::Transcript>("entities");
+    const Str s1("1"), s4("4"), s5("5"), s9("9"), none("New"), ipv4("IPv4"), dns("DNS");
+    const Value values[] = {read("{a = b}"), read("()"), read("(IPv6, DNS, DNS, UserDefinedName)"),
+                            read("({}, {a = b}, {}, {})")};
+    CFDictionaryRef ab = dictionary(values[0]);
+    CFArrayRef empty = arrayOf(values[1]), names = arrayOf(values[2]), four = arrayOf(values[3]);
+    on("oneSet", oneSet);
+    CALL(MoreSCCopyEntitiesDict(s1, nullptr, &dict));
+    CALL(MoreSCCopyEntitiesDict(s1, s9, &dict));
+    CALL(MoreSCCopyEntitiesDictMutable(s1, s4, &mutableDict));
+    CALL(MoreSCSetEntitiesDict(s1, nullptr, ab));
+    CALL(MoreSCCopyEntity(s1, s5, ipv4, &dict));
+    CALL(MoreSCCopyEntity(s1, s5, none, &dict));
+    CALL(MoreSCCopyEntityMutable(s1, nullptr, ipv4, &mutableDict));
+    CALL(MoreSCSetEntity(s1, s5, ipv4, ab));
+    CALL(MoreSCSetEntity(s1, s5, nullptr, ab));
+    CALL(MoreSCCopyEntities(s1, s5, &array, &second));
+    CALL(MoreSCCopyEntities(s1, s5, &array, nullptr));
+    CALL(MoreSCCopyEntities(s1, s5, nullptr, &second));
+    CALL(MoreSCCopyEntities(s1, s9, &array, &second));
+    CALL(MoreSCSetEntities(s1, s5, names, four));
+    CALL(MoreSCSetEntities(s1, s5, empty, empty));
+    CALL(MoreSCSetEntities(s1, s5, empty, four));
+    CALL(MoreSCNewEntity(s1, s5, none, ab));
+    CALL(MoreSCNewEntity(s1, s5, dns, ab));
+    CALL(MoreSCNewEntity(s1, s5, none, nullptr));
+    CALL(MoreSCDeleteEntity(s1, s5, ipv4));
+    CALL(MoreSCDeleteEntity(s1, s5, nullptr));
+    CALL(MoreSCIsEntityActive(s1, s5, dns, &flag));
+    CALL(MoreSCSetEntityActive(s1, s5, dns, false));
+    CALL(MoreSCSetEntityActive(s1, s5, dns, true));
 }
 
-// clang-format off
-#define READ(call) #call, [&]([[maybe_unused]] auto* out, [[maybe_unused]] auto* two) -> OSStatus { return call; }
-
-TEST_F(OperationsTest, Read) {
-    const Str s5("5"), s1("1"), s9("9"), s4("4"), s2("2"), s60("60");
-    Boolean flag = 0;
-    CFIndex index = 77;
-    const auto expect = [](const std::string& expected, const char* call, const std::string& result) {
-        EXPECT_EQ(expected, result) << call;
-    };
-    const auto string = [&](const char* expected, const char* call, auto run) { expect(expected, call, got<CFStringRef>(run)); };
-    const auto dict = [&](const char* expected, const char* call, auto run) { expect(expected, call, got<CFDictionaryRef>(run)); };
-    const auto mutableDict = [&](const char* expected, const char* call, auto run) {
-        expect(expected, call, got<CFMutableDictionaryRef, CFMutableArrayRef>(run));
-    };
-    const auto arrays = [&](const char* expected, const char* call, auto run) { expect(expected, call, got<CFArrayRef>(run)); };
-    const auto active = [&](int expected, OSStatus err) { EXPECT_EQ(expected, err != 0 ? err : flag); };
-    setTree(oneSet);
-    string("Home untouched", READ(MoreSCCopyUserVisibleNameOfSet(nullptr, out)));
-    string("1004 untouched untouched", READ(MoreSCCopyUserVisibleNameOfSet(s9, out)));
-    string("1 untouched", READ(MoreSCCopyCurrentSet(out)));
-    string("Wired untouched", READ(MoreSCCopyUserVisibleNameOfService(s1, s5, out)));
-    string("1004 untouched untouched", READ(MoreSCCopyBSDNameOfService(s1, s5, out)));
-    dict("{5 = {__LINK__ = /NetworkServices/5}; 4 = {__LINK__ = /NetworkServices/4}} (5)", READ(MoreSCCopyServicesDict(s1, out, two)));
-    dict("1004 null null", READ(MoreSCCopyServicesDict(s9, out, two)));
-    mutableDict("{5 = {__LINK__ = /NetworkServices/5}; 4 = {__LINK__ = /NetworkServices/4}} (5)", READ(MoreSCCopyServicesDictMutable(s1, out, two)));
-    mutableDict("1004 untouched untouched", READ(MoreSCCopyServicesDictMutable(s9, out, two)));
-    dict("{IPv4 = {ServiceOrder = (5)}} untouched", READ(MoreSCCopyEntitiesDict(s1, nullptr, out)));
-    dict("1004 null untouched", READ(MoreSCCopyEntitiesDict(s1, s9, out)));
-    mutableDict("{} untouched", READ(MoreSCCopyEntitiesDictMutable(s1, s4, out)));
-    mutableDict("1004 untouched untouched", READ(MoreSCCopyEntitiesDictMutable(s1, s9, out)));
-    dict("{ConfigMethod = DHCP} untouched", READ(MoreSCCopyEntity(s1, s5, CFSTR("IPv4"), out)));
-    dict("1004 null untouched", READ(MoreSCCopyEntity(s1, s5, CFSTR("New"), out)));
-    mutableDict("{ServiceOrder = (5)} untouched", READ(MoreSCCopyEntityMutable(s1, nullptr, CFSTR("IPv4"), out)));
-    mutableDict("1004 untouched untouched", READ(MoreSCCopyEntityMutable(s1, s5, CFSTR("New"), out)));
-    arrays("(IPv4, DNS) ({ConfigMethod = DHCP}, {})", READ(MoreSCCopyEntities(s1, s5, out, two)));
-    arrays("(IPv4, DNS) untouched", READ(MoreSCCopyEntities(s1, s5, out, nullptr)));
-    arrays("-50 untouched untouched", READ(MoreSCCopyEntities(s1, s5, nullptr, two)));
-    arrays("1004 untouched untouched", READ(MoreSCCopyEntities(s1, s9, out, two)));
-    active(0, MoreSCIsServiceActive(s1, s5, &flag));
-    active(1, MoreSCIsServiceActive(s1, s4, &flag));
-    active(1004, MoreSCIsServiceActive(s1, s9, &flag));
-    active(1, MoreSCIsEntityActive(s1, s5, CFSTR("DNS"), &flag));
-    active(1004, MoreSCIsEntityActive(s1, s5, CFSTR("New"), &flag));
-    setTree(twoSets);
-    arrays("(1, 2) untouched", READ(MoreSCCopySetIDs(out, &index)));
-    EXPECT_EQ(0, index);
-    arrays("1004 untouched untouched", READ(MoreSCCopyServiceIDs(s9, out, two)));
-    arrays("(60) (6)", READ(MoreSCCopyServiceIDs(s2, out, two)));
-    string("ttyS0 untouched", READ(MoreSCCopyBSDNameOfService(s2, s60, out)));
-    setTree("{Sets = {1 = {}}; CurrentSet = /Sets/9}");
-    dict("{1 = {}} untouched", READ(MoreSCCopySetsDict(out)));
-    arrays("(1) untouched", READ(MoreSCCopySetIDs(out, &(index = 77))));
-    EXPECT_EQ(77, index);
-    string("-4960 untouched untouched", READ(MoreSCCopyUserVisibleNameOfSet(s1, out)));
-    setTree("{Sets = {1 = {}}}");
-    arrays("1004 null untouched", READ(MoreSCCopySetIDs(out, &index)));
+// What somebody else may have written.
+TEST_F(OperationsTest, WrongTypes) {
+    transcript = std::make_unique<testing_support::Transcript>("wrong_types");
+    const Str s1("1");
+    for (const char* tree :
+         {"{Sets = {1 = {}}}", "{Sets = {1 = {}}; CurrentSet = /Sets/9}",
+          "{Sets = text; CurrentSet = /Sets/1}", "{Sets = {1 = text}; CurrentSet = /Sets/1}",
+          "{Sets = {1 = {Network = {Global = {IPv4 = {ServiceOrder = (#5)}}}}; 2 = {}}; CurrentSet = "
+          "/Sets/1}",
+          "{Sets = {1 = {Network = {Global = {IPv4 = {ServiceOrder = (5)}}; Service = {5 = {__LINK__ = "
+          "abc}}}}; 2 = {}}; CurrentSet "
+          "= /Sets/1}",
+          "{Sets = {1 = {Network = {Global = {IPv4 = {ServiceOrder = ()}}}}; 2 = {}}; NetworkServices = (); "
+          "CurrentSet = /Sets/1}",
+          "{Sets = {1 = {UserDefinedName = x; Network = {Global = {IPv4 = {ServiceOrder = ()}}}}; 2 = {}}; "
+          "NetworkServices = {}; "
+          "CurrentSet = #1}"}) {
+        on(tree, tree);
+        CALL(MoreSCCopySetsDict(&dict));
+        CALL(MoreSCCopySetIDs(&array, &index));
+        CALL(MoreSCCopyUserVisibleNameOfSet(s1, &string));
+        CALL(MoreSCCopyServiceIDs(s1, &array, &second));
+        CALL(MoreSCDeleteSet(Str("2")));
+    }
 }
-// clang-format on
 
 }  // namespace
 }  // namespace morescf_test
