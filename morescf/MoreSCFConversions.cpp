@@ -26,6 +26,7 @@ OSStatus MoreSCFCreateStringWithMacAddress(const UInt8 macAddr[6], CFStringRef* 
     for (int i = 0; i < 6; ++i, end += 3) {
         std::snprintf(end, 4, "%2.2x:", static_cast<unsigned int>(macAddr[i]));
     }
+    // The colon behind the last byte.
     text[17] = '\0';
     return CreateStringWithASCII(text, result);
 }
@@ -34,6 +35,7 @@ OSStatus MoreSCFStringToMacAddress(CFStringRef str, UInt8 macAddr[6]) {
     char text[18];
     unsigned int bytes[6];
     OSStatus err = ErrorIfNotGiven(str);
+    // Room for six bytes of two digits, five colons and the end: a longer text is refused here.
     if (err == 0 && !CFStringGetCString(str, text, sizeof(text), kCFStringEncodingASCII)) {
         err = coreFoundationUnknownErr;
     }
@@ -82,6 +84,7 @@ OSStatus MoreSCFCopyEncodedPPPPassword(CFStringRef password, CFDataRef* encodedP
     }
     if (err == 0) {
         CFStringGetCharacters(password, CFRangeMake(0, count), units);
+        // The higher byte first, whatever this machine does.
         for (CFIndex i = 0; i < count; ++i) {
             units[i] = htons(units[i]);
         }

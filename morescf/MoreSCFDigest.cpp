@@ -45,6 +45,7 @@ namespace {
 
 constexpr OSStatus kUnknownProtocolErr = -1;
 
+// Asked for again on every build of a PPP entity.
 Boolean gTenTwoOrLater = false;
 
 // An entity that is being built. After an error no key is written any more.

@@ -158,7 +158,8 @@ OSStatus MoreSCSetAppleTalkActive(CFStringRef setID, Boolean active) {
         err = ForEachService(setID, [setID, active, &madeChanges](CFStringRef serviceID) {
             OSStatus stepErr = 0;
             Boolean isActive = false;
-            // A service without AppleTalk is skipped.
+            // Services that are off are switched as well, so that they come back as wanted; one without
+            // AppleTalk is skipped.
             if (MoreSCIsEntityActive(setID, serviceID, kAppleTalkProtocol, &isActive) == 0 &&
                 (isActive != 0) != (active != 0)) {
                 stepErr = MoreSCSetEntityActive(setID, serviceID, kAppleTalkProtocol, active);

@@ -171,6 +171,7 @@ OSStatus MoreSCNewService(CFStringRef setID, CFDictionaryRef portDict, CFStringR
         const bool isEthernetLike = CFDictionaryContainsKey(portDict, kMACAddressKey);
         err = AddEntities({setID, serviceID, portDict, isEthernetLike, version});
     }
+    // Its link, its place in the order and, as nobody lists it any more, the service.
     if (err != 0 && serviceID != nullptr) {
         MoreSCDeleteService(setID, serviceID);
     }

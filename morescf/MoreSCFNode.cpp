@@ -39,6 +39,7 @@ OSStatus CopyNode(const Node& node, CFDictionaryRef* dict) {
     CFDictionaryRef found = nullptr;
     OSStatus err = InTurn(OpenSession, [&] { return CopyPath(node, &path); });
     if (err == 0) {
+        // Held on to, since what the store lends goes with the session.
         found = Retained(SCPreferencesPathGetValue(MoreSCGetSCPreferencesRef(), path));
         err = MoreSCError(found);
     }
@@ -93,6 +94,7 @@ OSStatus IsNodeActive(const Node& node, Boolean* active) {
 }
 
 OSStatus SetNodeActive(const Node& node, Boolean active) {
+    // One session around both halves: nobody else's commit comes between reading and storing.
     CFMutableDictionaryRef dict = nullptr;
     Boolean changed = false;
     OSStatus err = InTurn(

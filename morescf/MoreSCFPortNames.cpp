@@ -121,6 +121,7 @@ OSStatus CopyUserVisibleNameForEthernetPort(io_object_t entry, CFMutableDictiona
                [&] { return CopyRequiredString(entry, kBSDNameKey, &bsdName); });
     if (err == 0) {
         CFStringRef driverClass = GetStringValue(controllerProperties, CFSTR("IOClass"));
+        // The first interface is the built-in one, even if it is an AirPort.
         if (CFEqualString(bsdName, CFSTR("en0"))) {
             err = Propose(portDict, kSortBuiltInEthernet, CFSTR("Built-in Ethernet"), proposedName);
         } else if (driverClass != nullptr && CFStringHasPrefix(driverClass, kAirPortProtocol)) {
@@ -214,6 +215,7 @@ OSStatus SubstituteKeywordsInUserVisibleName(io_object_t /*entry*/, CFDictionary
     }
     const OSStatus err = text != nullptr ? 0 : kCannotDescribePortErr;
     if (err == 0) {
+        // In this order, each once: what replaced one keyword may hold a later one, and never an earlier.
         for (const auto& each : keywords) {
             const CFRange place = CFStringFind(text, each.keyword, 0);
             if (place.location != kCFNotFound) {

@@ -104,6 +104,7 @@ OSStatus AddMatchingDevicesToArray(mach_port_t masterPort, CFDictionaryRef match
     io_iterator_t iterator = IO_OBJECT_NULL;
     OSStatus err = InTurn([&] { return ErrorIfMissing(matchingDict); },
                           [&] { return IOServiceGetMatchingServices(masterPort, matchingDict, &iterator); });
+    // A port that cannot be described is not skipped: a location made from the rest would look complete.
     while (err == 0) {
         io_object_t entry = IOIteratorNext(iterator);
         if (entry == IO_OBJECT_NULL) {
@@ -135,6 +136,7 @@ SInt32 SortOrder(CFDictionaryRef portDict) {
                : static_cast<SInt32>(kSortUnknown);
 }
 
+// The order is what a new location starts from: its services are in it, and its first modem is the default.
 CFComparisonResult PortSorter(const void* lhs, const void* rhs, void* /*context*/) {
     auto* lhsDict = static_cast<CFDictionaryRef>(lhs);
     auto* rhsDict = static_cast<CFDictionaryRef>(rhs);

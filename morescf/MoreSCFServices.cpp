@@ -52,6 +52,7 @@ OSStatus MoreSCCopyServicesDict(CFStringRef setID, CFDictionaryRef* servicesDict
     return err;
 }
 
+// Both are read even when one is wanted: without an order there is nothing that may be done to the links.
 OSStatus MoreSCCopyServicesDictMutable(CFStringRef setID, CFMutableDictionaryRef* servicesDict,
                                        CFMutableArrayRef* serviceOrder) {
     CFDictionaryRef services = nullptr;
@@ -96,6 +97,7 @@ OSStatus MoreSCCopyServiceIDs(CFStringRef setID, CFArrayRef* localServiceIDs,
         [&] { return CFQArrayCreateMutable(&localIDs); },
         [&] { return CFQArrayCreateMutable(&resolvedIDs); });
     if (err == 0) {
+        // The order says which services there are; what is linked beside it does not count.
         err = ForEach<CFTypeRef>(order, [&](CFTypeRef entry) {
             CFStringRef resolvedID = nullptr;
             OSStatus entryErr = IsString(entry) ? 0 : coreFoundationUnknownErr;
@@ -149,6 +151,7 @@ OSStatus MoreSCDuplicateService(CFStringRef setID, CFStringRef serviceID, CFStri
     if (err == 0 && userVisibleName != nullptr) {
         err = MoreSCRenameService(setID, copyID, userVisibleName);
     }
+    // A copy that is not listed yet goes; one that only failed to be renamed stays.
     if (err != 0 && serviceID != nullptr) {
         DeleteUnreferencedServices();
     }
@@ -173,6 +176,7 @@ OSStatus MoreSCDeleteService(CFStringRef setID, CFStringRef serviceID) {
         }
         err = MoreSCSetServicesDict(setID, services, order);
     }
+    // After a failure too: what nobody lists is of no use to anybody. The first failure is the one to tell.
     if (serviceID != nullptr) {
         const OSStatus sweepErr = DeleteUnreferencedServices();
         err = err != 0 ? err : sweepErr;

@@ -36,6 +36,8 @@ void MoreSCClose(OSStatus* err, Boolean dirty) {
         return;
     }
 
+    // Even when this caller failed: an inner operation that succeeded has asked for it, and whoever must not
+    // leave half a change behind undoes it before closing.
     if (gPrefsDirty) {
         OSStatus err2 = MoreSCErrorBoolean(SCPreferencesCommitChanges(gPrefsRef));
         if (err2 == 0) {
@@ -44,6 +46,7 @@ void MoreSCClose(OSStatus* err, Boolean dirty) {
         if (*err == 0) {
             *err = err2;
         }
+        // After a failure too: the changes go with the session, and are not the next one's.
         gPrefsDirty = false;
     }
     if (gPrefsLocked) {

@@ -57,7 +57,8 @@ OSStatus CopyTopLevelDictionary(CFStringRef key, CFDictionaryRef* dict) {
     return err;
 }
 
-// Adds the resolved IDs of the location's services to the keys of the dictionary.
+// Services are shared under their resolved IDs, so these are what is marked and compared. Adds those of the
+// location's services to the keys of the dictionary.
 OSStatus MarkServicesOfSet(CFStringRef setID, CFMutableDictionaryRef marks) {
     CFArrayRef serviceIDs = nullptr;
     OSStatus err = MoreSCCopyServiceIDs(setID, nullptr, &serviceIDs);
@@ -206,6 +207,7 @@ OSStatus MoreSCNewSet(CFStringRef userVisibleName, CFStringRef* newSetID) {
         [&] { return AddGlobalEntityToSet(setID, kNetInfoProtocol, &digest); },
         [&] { return AddServiceForEachPort(setID); },
         [&] { return MoreSCRenameSet(setID, userVisibleName); });
+    // With the services that it got so far, which nobody lists any more.
     if (err != 0 && setID != nullptr) {
         MoreSCDeleteSet(setID);
     }
@@ -244,6 +246,7 @@ OSStatus MoreSCDeleteSet(CFStringRef setID) {
         OpenSession, [&] { return ErrorIfNotGiven(setID); }, [&] { return MoreSCCopyCurrentSet(&currentID); },
         [&] { return CFEqual(setID, currentID) ? OSStatus{paramErr} : OSStatus{0}; },
         [&] { return CreateSetPathWithSetID(setID, &setPath); }, [&] { return RemoveAtPath(setPath); });
+    // Also after the current location was refused, but then the sweep is not committed.
     if (setID != nullptr) {
         const OSStatus sweepErr = DeleteUnreferencedServices();
         err = err != 0 ? err : sweepErr;

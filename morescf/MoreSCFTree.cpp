@@ -78,7 +78,7 @@ OSStatus CreateServicePathWithServiceID(CFStringRef serviceID, CFStringRef* serv
 OSStatus CopySeIDFromSePath(CFStringRef sePath, CFStringRef* seID) {
     OSStatus err = 0;
     CFArrayRef components = CFStringCreateArrayBySeparatingStrings(kCFAllocatorDefault, sePath, CFSTR("/"));
-    // The first component is what stands before the leading slash.
+    // The first component is what stands before the leading slash, so the ID is the third.
     if (components == nullptr || CFArrayGetCount(components) < 3) {
         err = coreFoundationUnknownErr;
     }
@@ -147,6 +147,7 @@ OSStatus PreferencesPathSetProperty(CFStringRef path, CFStringRef key, CFPropert
     CFDictionaryRef dict = SCPreferencesPathGetValue(session, path);
     OSStatus err = MoreSCError(dict);
     if (err == 0) {
+        // What the store lends is not ours to change.
         copy = CFDictionaryCreateMutableCopy(kCFAllocatorDefault, 0, dict);
         err = ErrorIfMissing(copy);
     }

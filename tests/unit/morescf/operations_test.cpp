@@ -162,6 +162,7 @@ TEST_F(OperationsTest, Entities) {
     CALL(MoreSCCopyEntitiesDict(s1, nullptr, &dict));
     CALL(MoreSCCopyEntitiesDict(s1, s9, &dict));
     CALL(MoreSCCopyEntitiesDictMutable(s1, s4, &mutableDict));
+    CALL(MoreSCCopyEntitiesDictMutable(s1, s9, &mutableDict));
     CALL(MoreSCSetEntitiesDict(s1, nullptr, ab));
     CALL(MoreSCCopyEntity(s1, s5, ipv4, &dict));
     CALL(MoreSCCopyEntity(s1, s5, none, &dict));
@@ -207,6 +208,7 @@ TEST_F(OperationsTest, WrongTypes) {
         CALL(MoreSCCopySetIDs(&array, &index));
         CALL(MoreSCCopyUserVisibleNameOfSet(s1, &string));
         CALL(MoreSCCopyServiceIDs(s1, &array, &second));
+        CALL(MoreSCCopyServiceIDs(s1, &array, nullptr));
         CALL(MoreSCDeleteSet(Str("2")));
     }
 }
