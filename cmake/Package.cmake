@@ -43,6 +43,7 @@ set(CPACK_DEBIAN_LIBRARY_PACKAGE_NAME libmorescf${PROJECT_VERSION_MAJOR})
 set(CPACK_DEBIAN_LIBRARY_PACKAGE_SECTION libs)
 # For an address by DHCP without NetworkManager the library calls the program that the tool brings.
 set(CPACK_DEBIAN_LIBRARY_PACKAGE_RECOMMENDS "location-assistant (= ${PROJECT_VERSION})")
+set(CPACK_DEBIAN_LIBRARY_PACKAGE_CONTROL_EXTRA ${PROJECT_SOURCE_DIR}/packaging/triggers)
 set(CPACK_DEBIAN_LIBRARY_DESCRIPTION "network locations: shared library
 A location is a named, complete network configuration, one of which is
 current. This library reads, makes and changes locations, and makes one

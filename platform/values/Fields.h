@@ -102,8 +102,14 @@ class FieldReader {
     }
     template <class T>
     static bool decode(CFTypeRef value, std::optional<T>& result) {
-        result = value != nullptr ? std::optional<T>(std::in_place) : std::nullopt;
-        return value == nullptr || decode(value, *result);
+        if (value == nullptr) {
+            result.reset();
+            return true;
+        }
+        T read{};
+        const bool isGood = decode(value, read);
+        result = std::move(read);
+        return isGood;
     }
     template <class T>
     static bool decode(CFTypeRef value, std::vector<T>& list) {
