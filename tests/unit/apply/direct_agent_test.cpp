@@ -169,7 +169,7 @@ TEST_F(DirectAgentTest, AProcessThatEndsAnywhereLeavesTheWayBack) {
         bool isGoingOn;
     } rows[] = {{back.get(), there.get(), true},
                 {back.get(), there.get(), false},
-                {there.get(), elsewhere.get(), true},
+                {there.get(), elsewhere.get(), false},
                 {there.get(), back.get(), false}};
     for (const auto& row : rows) {
         run([&row, &back] {
