@@ -104,30 +104,6 @@ CFStringRef xmlString(std::string_view text) {
     return isGood ? OpaqueCFString::create(text, *traits) : nullptr;
 }
 
-const char* faultOf(Element leaf) {
-    switch (leaf) {
-        case Element::integer:
-            return "not an integer, or one that does not fit 64 bits";
-        case Element::real:
-            return "not a real, or one that is out of range";
-        case Element::trueValue:
-        case Element::falseValue:
-            return "a boolean with text in it";
-        case Element::data:
-            return "not data in base 64";
-        case Element::date:
-            return "not a date";
-        case Element::key:
-        case Element::string:
-        case Element::unknown:
-        case Element::plist:
-        case Element::dict:
-        case Element::array:
-            break;
-    }
-    return "text that XML cannot carry";
-}
-
 }  // namespace
 
 Element elementNamed(std::string_view name) noexcept {
@@ -188,13 +164,9 @@ const char* PropertyListBuilder::begin(Element element) {
 
 const char* PropertyListBuilder::end(std::string_view text) {
     if (isInLeaf()) {
-        Owned<CFTypeRef> value = leafOf(text);
-        if (!value) {
-            return faultOf(leaf_);
-        }
+        const char* const reason = endLeaf(text);
         leaf_ = Element::unknown;
-        values_.push_back(std::move(value));
-        return nullptr;
+        return reason;
     }
     if (levels_.back().element != Element::plist) {
         return endContainer();
@@ -230,40 +202,51 @@ const char* PropertyListBuilder::endContainer() {
     return nullptr;
 }
 
-// The value of the leaf that is open, or none when the text is no such value.
-Owned<CFTypeRef> PropertyListBuilder::leafOf(std::string_view text) {
-    const auto adopted = [](CFTypeRef value) { return Owned<CFTypeRef>::adopt(value); };
+const char* PropertyListBuilder::endLeaf(std::string_view text) {
+    const auto take = [this](CFTypeRef value, const char* reason) {
+        if (value != nullptr) {
+            values_.push_back(Owned<CFTypeRef>::adopt(value));
+        }
+        return value != nullptr ? nullptr : reason;
+    };
+    constexpr const char* notText = "text that XML cannot carry";
     switch (leaf_) {
         case Element::key: {
             if (const auto known = keys_.find(text); known != keys_.end()) {
-                return known->second;
+                values_.push_back(known->second);
+                return nullptr;
             }
-            const auto key = Owned<CFStringRef>::adopt(xmlString(text));
-            return key ? keys_.emplace(textOf(key.get()), Owned<CFTypeRef>::retained(key.get())).first->second
-                       : Owned<CFTypeRef>();
+            CFStringRef const key = xmlString(text);
+            if (key != nullptr) {
+                keys_.emplace(textOf(key), Owned<CFTypeRef>::retained(key));
+            }
+            return take(key, notText);
         }
         case Element::string:
-            return adopted(xmlString(text));
+            return take(xmlString(text), notText);
         case Element::integer: {
             const auto number = numberFrom<std::int64_t>(text);
-            return adopted(number ? makeNumber(*number).take() : nullptr);
+            return take(number ? makeNumber(*number).take() : nullptr,
+                        "not an integer, or one that does not fit 64 bits");
         }
         case Element::real: {
             const auto number = numberFrom<double>(text);
-            return adopted(number ? makeReal(*number).take() : nullptr);
+            return take(number ? makeReal(*number).take() : nullptr,
+                        "not a real, or one that is out of range");
         }
         case Element::trueValue:
         case Element::falseValue:
-            return Owned<CFTypeRef>::retained(!text.empty()                 ? nullptr
-                                              : leaf_ == Element::trueValue ? kCFBooleanTrue
-                                                                            : kCFBooleanFalse);
+            return text.empty()
+                       ? take(CFRetain(leaf_ == Element::trueValue ? kCFBooleanTrue : kCFBooleanFalse),
+                              nullptr)
+                       : "a boolean with text in it";
         case Element::data: {
             auto bytes = bytesFromBase64(text);
-            return adopted(bytes ? new OpaqueCFData(std::move(*bytes)) : nullptr);
+            return take(bytes ? new OpaqueCFData(std::move(*bytes)) : nullptr, "not data in base 64");
         }
         case Element::date: {
             const auto seconds = secondsFrom(text);
-            return adopted(seconds ? makeDate(*seconds).take() : nullptr);
+            return take(seconds ? makeDate(*seconds).take() : nullptr, "not a date");
         }
         case Element::unknown:
         case Element::plist:
@@ -271,7 +254,7 @@ Owned<CFTypeRef> PropertyListBuilder::leafOf(std::string_view text) {
         case Element::array:
             break;
     }
-    return {};
+    return notText;
 }
 
 }  // namespace platform::values

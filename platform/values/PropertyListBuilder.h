@@ -57,7 +57,7 @@ class PropertyListBuilder {
     };
 
     [[nodiscard]] const char* endContainer();
-    [[nodiscard]] Owned<CFTypeRef> leafOf(std::string_view text);
+    [[nodiscard]] const char* endLeaf(std::string_view text);
     // Whether the next thing in the innermost dictionary must be a key.
     [[nodiscard]] bool wantsKey() const { return (values_.size() - levels_.back().firstValue) % 2 == 0; }
 

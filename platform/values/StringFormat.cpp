@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <cstdarg>
 #include <cstdio>
 #include <optional>
@@ -47,30 +48,15 @@ class Arguments {
 
 // Takes one directive from the front of the format, its '%' included.
 std::optional<Conversion> takeConversion(std::string_view& format) {
-    Conversion conversion;
-    const auto take = [&] {
-        const char next = format.empty() ? '\0' : format.front();
-        if (!format.empty()) {
-            format.remove_prefix(1);
-        }
-        return next;
-    };
-    char next = take();
-    conversion.directive.push_back(next);
     constexpr std::string_view flagsAndSizes = "-+ #.0123456789";
-    for (next = take(); next != '\0' && flagsAndSizes.find(next) != std::string_view::npos; next = take()) {
-        conversion.directive.push_back(next);
-    }
-    if (next == 'l') {
-        conversion.isLong = true;
-        conversion.directive.push_back(next);
-        next = take();
-    }
-    if (next == '\0') {
+    std::size_t size = std::min(format.find_first_not_of(flagsAndSizes, 1), format.size());
+    const bool isLong = size < format.size() && format[size] == 'l';
+    size += isLong ? 2 : 1;
+    if (size > format.size()) {
         return std::nullopt;
     }
-    conversion.directive.push_back(next);
-    conversion.kind = next;
+    Conversion conversion{std::string(format.substr(0, size)), isLong, format[size - 1]};
+    format.remove_prefix(size);
     return conversion;
 }
 

@@ -104,20 +104,22 @@ TEST_F(Folders, TellsWhatEachItemIsAndPassesOverNamesThatCannotBeDelivered) {
 }
 
 TEST_F(Folders, GiveNoPartOfAList) {
-    FSRef folder{};
-    FSIterator iterator = nullptr;
-    UInt32 count = 0;
+    for (int i = 0; i < 4096; ++i) {
+        directory.write("local/" + std::to_string(i), "");
+    }
     for (const OSErr expected : {errFSNoMoreItems, ioErr}) {
-        for (int i = 0; i < 4096 + (expected == ioErr ? 1 : 0); ++i) {
-            directory.write("local/" + std::to_string(i), "");
-        }
+        FSRef folder{};
+        FSIterator iterator = nullptr;
+        UInt32 count = 0;
         ASSERT_EQ(FSFindFolder(kLocalDomain, kModemScriptsFolderType, false, &folder), noErr);
         ASSERT_EQ(FSOpenIterator(&folder, kFSIterateFlat, &iterator), noErr);
         EXPECT_EQ(FSGetCatalogInfoBulk(iterator, 5000, &count, nullptr, kFSCatInfoNone, nullptr, nullptr,
                                        nullptr, nullptr),
                   expected);
         EXPECT_EQ(count, 4096U);
-        FSCloseIterator(iterator);
+        EXPECT_EQ(FSCloseIterator(iterator), noErr);
+        EXPECT_EQ(FSCloseIterator(iterator), paramErr);
+        directory.write("local/one more", "");
     }
 }
 
