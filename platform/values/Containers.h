@@ -83,7 +83,6 @@ class Storage {
     std::vector<CFTypeRef> slots_;
     std::size_t live_ = 0;
     std::unique_ptr<Index> index_;
-    Storage* nextDoomed_ = nullptr;
 };
 
 // What the two kinds of handles have in common.

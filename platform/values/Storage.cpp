@@ -12,7 +12,8 @@ constexpr std::size_t linearLimit = 16;
 // Destroying a value nested in a value nested in a value ... recurses only so deep; the rest waits in a list.
 constexpr int deepestDestruction = 128;
 thread_local int destructionDepth = 0;
-constinit thread_local Storage* doomed = nullptr;
+// The list of the outermost destruction.
+constinit thread_local std::vector<Storage*>* waiting = nullptr;
 
 }  // namespace
 
@@ -32,18 +33,23 @@ void Storage::release() noexcept {
         return;
     }
     if (destructionDepth >= deepestDestruction) {
-        nextDoomed_ = doomed;
-        doomed = this;
+        waiting->push_back(this);
         return;
+    }
+    std::vector<Storage*> own;
+    if (destructionDepth == 0) {
+        waiting = &own;
     }
     ++destructionDepth;
     delete this;
-    while (destructionDepth == 1 && doomed != nullptr) {
-        Storage* const next = doomed;
-        doomed = next->nextDoomed_;
+    while (!own.empty()) {
+        Storage* const next = own.back();
+        own.pop_back();
         delete next;
     }
-    --destructionDepth;
+    if (--destructionDepth == 0) {
+        waiting = nullptr;
+    }
 }
 
 // Nothing of a hole.
