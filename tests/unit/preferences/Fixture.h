@@ -67,6 +67,7 @@ class StoreTest : public testing::Test {
     [[nodiscard]] static platform::Host hostIn(const std::string& directory) {
         platform::Host host;
         host.preferencesDirectory = directory + "/store";
+        host.runtimeDirectory = directory + "/run";
         return host;
     }
     static SessionRef open() {
