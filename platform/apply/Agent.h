@@ -19,14 +19,14 @@ using Clock = std::chrono::steady_clock;
 // How an interface was before this system first changed it, in a form that only its agent reads: a property
 // list, since it outlives the process. It is on disk before the first change and is dropped after the way
 // back.
-struct Captured {
+struct Snapshot {
     std::string interface;
     values::Owned<CFDictionaryRef> state;
 };
 
 // An interface that is to become what a plan says, or to be given back, and what came of it.
 struct Task {
-    const Captured* before = nullptr;
+    const Snapshot* before = nullptr;
     const InterfacePlan* plan = nullptr;  // null: it is given back
 
     // Filled in by the agent. The machine (the kernel, a daemon, the disk) did not take the settings.
@@ -48,8 +48,8 @@ class Agent {
     // How those of these interfaces are now that this agent leads, in the order in which they have to be
     // given back. One that it leads and may not touch, since it is somebody else's work, stands in leftAlone
     // instead. Changes nothing.
-    virtual Outcome capture(std::span<const std::string> interfaces, std::vector<Captured>& captured,
-                            std::vector<Trouble>& leftAlone) = 0;
+    virtual Outcome takeSnapshots(std::span<const std::string> interfaces, std::vector<Snapshot>& snapshots,
+                                  std::vector<Trouble>& leftAlone) = 0;
 
     // Begins. An interface that already is what its plan says is not changed. Giving back restores what was
     // captured and compares; nothing is changed when the interface is gone or nothing is left to undo, and

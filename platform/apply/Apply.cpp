@@ -102,7 +102,7 @@ class Run {
         const bool hasAgents = plan_.empty() || failures_.note(findAgents(agents_));
         known_ = agents_;
         giveBack(begin + returningBound, isShorter);
-        if (hasAgents && !plan_.empty() && capture()) {
+        if (hasAgents && !plan_.empty() && takeSnapshots()) {
             takeOver(begin + (activates_ ? goingBound : finishingBound));
         }
     }
@@ -130,16 +130,16 @@ class Run {
         std::vector<std::string> names;
         for (const RecordEntry& entry : record_.entries) {
             if (agents_.size() > 1 && entry.agent == agents_.back()->name()) {
-                names.push_back(entry.captured.interface);
+                names.push_back(entry.snapshot.interface);
             }
         }
-        std::vector<Captured> captured;
+        std::vector<Snapshot> snapshots;
         std::vector<Trouble> leftAlone;
-        if (names.empty() || !agents_.front()->capture(names, captured, leftAlone).ok()) {
+        if (names.empty() || !agents_.front()->takeSnapshots(names, snapshots, leftAlone).ok()) {
             return {};
         }
         names.clear();
-        for (const Captured& one : captured) {
+        for (const Snapshot& one : snapshots) {
             names.push_back(one.interface);
         }
         return names;
@@ -149,7 +149,7 @@ class Run {
         const std::vector<std::string> changing = changingHands();
         Crew crew;
         for (RecordEntry& entry : record_.entries) {
-            const std::string& interface = entry.captured.interface;
+            const std::string& interface = entry.snapshot.interface;
             if (wanted(interface) != nullptr && std::ranges::count(changing, interface) == 0) {
                 continue;
             }
@@ -157,7 +157,7 @@ class Run {
             entry.completed = false;
             std::shared_ptr<Agent> agent;
             if (failures_.note(agentOf(entry.agent, agent), interface)) {
-                crew.add(agent, {&entry.captured, nullptr, {}, {}});
+                crew.add(agent, {&entry.snapshot, nullptr, {}, {}});
             }
         }
         if (!isChanged) {
@@ -174,7 +174,7 @@ class Run {
             }
         });
         std::erase_if(record_.entries, [&given](const RecordEntry& entry) {
-            return std::ranges::count(given, entry.captured.interface) != 0;
+            return std::ranges::count(given, entry.snapshot.interface) != 0;
         });
         failures_.note(writeRecord(record_));
     }
@@ -188,7 +188,7 @@ class Run {
     }
 
     // Puts on the disk how the interfaces are that are new to the record, and what all of them are to become.
-    bool capture() {
+    bool takeSnapshots() {
         std::vector<std::string> names;
         for (const InterfacePlan& plan : plan_) {
             if (record_.find(plan.name) == nullptr) {
@@ -197,13 +197,13 @@ class Run {
         }
         bool isWhole = true;
         for (const std::shared_ptr<Agent>& agent : agents_) {
-            std::vector<Captured> captured;
+            std::vector<Snapshot> snapshots;
             std::vector<Trouble> leftAlone;
             if (names.empty() || !isWhole) {
                 break;
             }
-            isWhole = failures_.note(agent->capture(names, captured, leftAlone));
-            for (Captured& one : captured) {
+            isWhole = failures_.note(agent->takeSnapshots(names, snapshots, leftAlone));
+            for (Snapshot& one : snapshots) {
                 std::erase(names, one.interface);
                 record_.entries.push_back({std::string(agent->name()), std::move(one), {}, false});
             }
@@ -247,7 +247,7 @@ class Run {
             std::shared_ptr<Agent> agent;
             if (entry != nullptr && !entry->isLeftAlone() &&
                 failures_.note(agentOf(entry->agent, agent), plan.name)) {
-                crew.add(agent, {&entry->captured, &plan, {}, {}});
+                crew.add(agent, {&entry->snapshot, &plan, {}, {}});
             }
         }
         crew.run(deadline);

@@ -23,7 +23,7 @@ RecordEntry* Record::find(const std::string& interface) noexcept {
 
 const RecordEntry* Record::find(const std::string& interface) const noexcept {
     const auto found = std::ranges::find(
-        entries, interface, [](const RecordEntry& entry) -> const auto& { return entry.captured.interface; });
+        entries, interface, [](const RecordEntry& entry) -> const auto& { return entry.snapshot.interface; });
     return found == entries.end() ? nullptr : &*found;
 }
 
@@ -46,7 +46,7 @@ Outcome readRecord(Record& record) {
     }
     std::set<std::string> names;
     for (const RecordEntry& entry : file->entries) {
-        if (entry.captured.interface.empty() || !names.insert(entry.captured.interface).second) {
+        if (entry.snapshot.interface.empty() || !names.insert(entry.snapshot.interface).second) {
             return {kSCStatusFailed, recordPath() + " is not what this system wrote"};
         }
     }

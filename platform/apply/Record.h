@@ -19,7 +19,7 @@ struct RecordEntry {
     // The name of the agent that captured the interface; empty for one that is left alone, because it did not
     // exist or is somebody else's: nothing was changed and nothing is to be undone.
     std::string agent;
-    Captured captured;
+    Snapshot snapshot;
     std::optional<InterfacePlan> plan;  // what the interface was last to become, without its key
     bool completed = false;             // and whether the machine took it
 
@@ -27,9 +27,9 @@ struct RecordEntry {
 
     template <class Self, class Fields>
     static void listFields(Self& self, Fields& fields) {
-        fields("Interface", self.captured.interface);
+        fields("Interface", self.snapshot.interface);
         fields("Agent", self.agent);
-        fields("Before", self.captured.state);
+        fields("Before", self.snapshot.state);
         fields("Plan", self.plan);
         fields("Completed", self.completed);
     }

@@ -64,8 +64,8 @@ class Progress {
         return interface_.giveBack(*before_, join_);
     }
 
-    [[nodiscard]] std::optional<Snapshot> snapshot() const {
-        Snapshot before;
+    [[nodiscard]] std::optional<LinkSnapshot> snapshot() const {
+        LinkSnapshot before;
         return values::fromPropertyList(task_->before->state.get(), before) ? std::optional(before)
                                                                             : std::nullopt;
     }
@@ -198,7 +198,7 @@ class Progress {
     bool waitsForCarrier_ = false;
     bool waitsForLease_ = false;
     // Giving back: how it was, and the others who led it.
-    std::optional<Snapshot> before_;
+    std::optional<LinkSnapshot> before_;
     bool isResumed_ = false;
     Clock::time_point resumedAt_;
     bool waitsForOthers_ = false;
@@ -210,17 +210,17 @@ class DirectAgent final : public Agent {
   public:
     [[nodiscard]] std::string_view name() const noexcept override { return "direct"; }
 
-    Outcome capture(std::span<const std::string> interfaces, std::vector<Captured>& captured,
-                    std::vector<Trouble>& leftAlone) override {
-        captured.clear();
+    Outcome takeSnapshots(std::span<const std::string> interfaces, std::vector<Snapshot>& snapshots,
+                          std::vector<Trouble>& leftAlone) override {
+        snapshots.clear();
         leftAlone.clear();
         for (const std::string& name : interfaces) {
             DirectInterface interface(name);
             RETURN_IF_FAILED(interface.open());
             if (interface.link()) {
-                Snapshot snapshot;
+                LinkSnapshot snapshot;
                 RETURN_IF_FAILED(interface.takeSnapshot(snapshot));
-                captured.push_back({name, values::toPropertyList(snapshot)});
+                snapshots.push_back({name, values::toPropertyList(snapshot)});
             }
         }
         return {};

@@ -80,7 +80,7 @@ Outcome DirectInterface::open() {
     return refresh();
 }
 
-Outcome DirectInterface::takeSnapshot(Snapshot& snapshot) {
+Outcome DirectInterface::takeSnapshot(LinkSnapshot& snapshot) {
     snapshot = {};
     snapshot.up = link_->up;
     snapshot.ipv6Disabled = isIPv6Disabled(interface_);
@@ -96,14 +96,15 @@ Outcome DirectInterface::takeSnapshot(Snapshot& snapshot) {
     return snapshot.networks ? Outcome() : readWirelessState(interface_, snapshot.wireless);
 }
 
-Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Snapshot>& before,
+Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<LinkSnapshot>& before,
                                std::unique_ptr<WirelessJoin>& join, std::string& trouble) {
-    std::optional<Notes> found;
-    RETURN_IF_FAILED(readNotes(interface_, found));
-    const Notes earlier = found.value_or(Notes{});
-    const bool mayStay = joinsNetwork(plan) && earlier.joined && earlier.phase == Notes::Phase::applied &&
+    std::optional<AppliedLink> found;
+    RETURN_IF_FAILED(readApplied(interface_, found));
+    const AppliedLink earlier = found.value_or(AppliedLink{});
+    const bool mayStay = joinsNetwork(plan) && earlier.joined &&
+                         earlier.phase == AppliedLink::Phase::applied &&
                          isSameNetwork(*earlier.joined, *plan.wireless);
-    Notes applied{Notes::Phase::applied, isOff(plan), {}, {}};
+    AppliedLink applied{AppliedLink::Phase::applied, isOff(plan), {}, {}};
     if (!isOff(plan)) {
         applied.addresses = manualAddresses(plan);
     }
@@ -111,15 +112,15 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Sn
         applied.joined = mayStay ? earlier.joined : makeJoinedNetwork(*plan.wireless);
     }
     // On the way everything counts as ours that is to be, or that an earlier run may have left.
-    Notes applying = applied;
-    applying.phase = Notes::Phase::applying;
+    AppliedLink applying = applied;
+    applying.phase = AppliedLink::Phase::applying;
     applying.joined = applied.joined ? applied.joined : earlier.joined;
     for (const Address& address : earlier.addresses) {
         if (!contains(applying.addresses, address)) {
             applying.addresses.push_back(address);
         }
     }
-    RETURN_IF_FAILED(writeNotes(interface_, applying));
+    RETURN_IF_FAILED(writeApplied(interface_, applying));
     if (before) {
         suspendOtherDaemons(interface_, link_->index, before->others);
     }
@@ -132,7 +133,7 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Sn
     }
     if (earlier.joined && !joinsNetwork(plan)) {
         std::unique_ptr<WirelessJoin> ignored;
-        RETURN_IF_FAILED(leaveNetwork(before.value_or(Snapshot()), ignored));
+        RETURN_IF_FAILED(leaveNetwork(before.value_or(LinkSnapshot()), ignored));
     }
     if (isOff(plan)) {
         RETURN_IF_FAILED(switchOff(trouble));
@@ -141,7 +142,7 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Sn
         RETURN_IF_FAILED(switchRadioOn(plan, isUsable));
         if (!isUsable) {
             trouble = "the radio is switched off";
-            return writeNotes(interface_, applied);
+            return writeApplied(interface_, applied);
         }
         RETURN_IF_FAILED(switchOn(plan, trouble));
         RETURN_IF_FAILED(startJoin(plan, mayStay, join, trouble));
@@ -149,7 +150,7 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Sn
             RETURN_IF_FAILED(startClient(plan, trouble));
         }
     }
-    return writeNotes(interface_, applied);
+    return writeApplied(interface_, applied);
 }
 
 Outcome DirectInterface::switchOff(std::string& trouble) {
@@ -215,7 +216,7 @@ Outcome DirectInterface::startJoin(const InterfacePlan& plan, bool mayStay,
     return {};
 }
 
-Outcome DirectInterface::leaveNetwork(const Snapshot& before, std::unique_ptr<WirelessJoin>& join) {
+Outcome DirectInterface::leaveNetwork(const LinkSnapshot& before, std::unique_ptr<WirelessJoin>& join) {
     RETURN_IF_FAILED(leaveBySupplicant(interface_, before.networks, join));
     return before.networks ? Outcome() : leaveByKernel(interface_, before.wireless, join);
 }
@@ -250,10 +251,10 @@ void DirectInterface::noteJoined() {
     }
 }
 
-Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join) {
-    std::optional<Notes> notes;
-    RETURN_IF_FAILED(readNotes(interface_, notes));
-    if (!notes) {
+Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<WirelessJoin>& join) {
+    std::optional<AppliedLink> applied;
+    RETURN_IF_FAILED(readApplied(interface_, applied));
+    if (!applied) {
         return {};
     }
     Steps steps;
@@ -262,23 +263,23 @@ Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<Wirele
     std::string notBack;
     steps.take(setInterfaceNameServers(interface_, 0, {}, notBack));
     steps.take(notBack.empty() ? Outcome() : Outcome(kSCStatusFailed, notBack));
-    if (notes->joined) {
+    if (applied->joined) {
         steps.take(leaveNetwork(before, join));
     }
     if (link_) {
         bool taken = false;
-        if (!steps.take(isTakenOver(*notes, before, taken))) {
+        if (!steps.take(isTakenOver(*applied, before, taken))) {
             return steps.first();
         }
         if (taken) {
             logLine(LogLevel::notice,
                     interface_ + ": configured by somebody else meanwhile, and left to them");
-            steps.take(removeOurs(*notes, before));
+            steps.take(removeOurs(*applied, before));
             join.reset();
         } else {
-            notes->phase = Notes::Phase::restoring;
+            applied->phase = AppliedLink::Phase::restoring;
             // For a run that is ended half-way. A runtime directory that is full does not stop the way back.
-            if (const Outcome noted = writeNotes(interface_, *notes); !noted.ok()) {
+            if (const Outcome noted = writeApplied(interface_, *applied); !noted.ok()) {
                 logLine(LogLevel::warning, interface_ + ": " + noted.reason());
             }
             steps.take(restore(before));
@@ -290,9 +291,9 @@ Outcome DirectInterface::giveBack(const Snapshot& before, std::unique_ptr<Wirele
     return steps.first();
 }
 
-Outcome DirectInterface::letOthersIn(const Snapshot& before, bool isBack) {
+Outcome DirectInterface::letOthersIn(const LinkSnapshot& before, bool isBack) {
     RETURN_IF_FAILED(resumeOtherDaemons(interface_, before.others));
-    return isBack ? removeNotes(interface_) : Outcome();
+    return isBack ? removeApplied(interface_) : Outcome();
 }
 
 Outcome DirectInterface::hasAddress(bool& has) {
@@ -304,21 +305,21 @@ Outcome DirectInterface::hasAddress(bool& has) {
     return {};
 }
 
-Outcome DirectInterface::isTakenOver(const Notes& notes, const Snapshot& before, bool& taken) {
+Outcome DirectInterface::isTakenOver(const AppliedLink& applied, const LinkSnapshot& before, bool& taken) {
     InterfaceState now;
     RETURN_IF_FAILED(kernel_.read(*link_, now));
     const bool isForeign = std::ranges::any_of(now.addresses, [&](const Address& address) {
         // Link-local ones are taken by daemons that watch for cards without an address, and stand for nobody.
         return address.family() == AF_INET && address.scope() < RT_SCOPE_LINK &&
-               !contains(notes.addresses, address) && !contains(before.state.addresses, address);
+               !contains(applied.addresses, address) && !contains(before.state.addresses, address);
     });
     // Half-way there or back it may be on by our own doing.
-    const bool isOn = notes.phase == Notes::Phase::applied && notes.off && link_->up;
+    const bool isOn = applied.phase == AppliedLink::Phase::applied && applied.off && link_->up;
     taken = isForeign || isOn;
     return {};
 }
 
-Outcome DirectInterface::removeOurs(const Notes& notes, const Snapshot& before) {
+Outcome DirectInterface::removeOurs(const AppliedLink& applied, const LinkSnapshot& before) {
     InterfaceState now;
     Steps steps;
     if (steps.take(kernel_.read(*link_, now))) {
@@ -328,7 +329,7 @@ Outcome DirectInterface::removeOurs(const Notes& notes, const Snapshot& before) 
             }
         }
         for (const Address& address : now.addresses) {
-            if (contains(notes.addresses, address) && !contains(before.state.addresses, address)) {
+            if (contains(applied.addresses, address) && !contains(before.state.addresses, address)) {
                 steps.take(kernel_.removeAddress(*link_, address));
             }
         }
@@ -337,7 +338,7 @@ Outcome DirectInterface::removeOurs(const Notes& notes, const Snapshot& before) 
     return steps.first();
 }
 
-Outcome DirectInterface::restore(const Snapshot& before) {
+Outcome DirectInterface::restore(const LinkSnapshot& before) {
     std::vector<Address> addresses = before.state.addresses;
     const std::int64_t elapsed = std::max<std::int64_t>(secondsSinceStart() - before.takenAt, 0);
     for (Address& address : addresses) {
@@ -357,7 +358,7 @@ Outcome DirectInterface::restore(const Snapshot& before) {
     return compare(before);
 }
 
-Outcome DirectInterface::compare(const Snapshot& before) {
+Outcome DirectInterface::compare(const LinkSnapshot& before) {
     RETURN_IF_FAILED(refresh());
     if (!link_) {
         return {};

@@ -9,8 +9,8 @@
 
 #include "platform/apply/Plan.h"
 #include "platform/apply/direct/Kernel.h"
+#include "platform/apply/direct/LinkSnapshot.h"
 #include "platform/apply/direct/NameServers.h"
-#include "platform/apply/direct/Snapshot.h"
 #include "platform/apply/direct/WirelessJoin.h"
 #include "platform/base/Outcome.h"
 
@@ -29,16 +29,16 @@ class DirectInterface {
     [[nodiscard]] const std::optional<Link>& link() const noexcept { return link_; }
     Outcome refresh() { return kernel_.findLink(interface_, link_); }
 
-    Outcome takeSnapshot(Snapshot& snapshot);
+    Outcome takeSnapshot(LinkSnapshot& snapshot);
     // Makes it what the plan says, whatever it is. `join` is the network on its way, null when there is none
     // to wait for. trouble is told when settings stand that help nothing.
-    Outcome apply(const InterfacePlan& plan, const std::optional<Snapshot>& before,
+    Outcome apply(const InterfacePlan& plan, const std::optional<LinkSnapshot>& before,
                   std::unique_ptr<WirelessJoin>& join, std::string& trouble);
     // Makes it as it was, and compares. The same for `join`. Once this was begun, letOthersIn ends it, also
     // after a failure.
-    Outcome giveBack(const Snapshot& before, std::unique_ptr<WirelessJoin>& join);
+    Outcome giveBack(const LinkSnapshot& before, std::unique_ptr<WirelessJoin>& join);
     // Lets those lead it again who did before. With isBack, nothing is left to be given back.
-    Outcome letOthersIn(const Snapshot& before, bool isBack);
+    Outcome letOthersIn(const LinkSnapshot& before, bool isBack);
     // Whether it has an IPv4 address that reaches further than its link.
     Outcome hasAddress(bool& has);
 
@@ -53,13 +53,13 @@ class DirectInterface {
     Outcome startClient(const InterfacePlan& plan, std::string& trouble);
     Outcome startJoin(const InterfacePlan& plan, bool mayStay, std::unique_ptr<WirelessJoin>& join,
                       std::string& trouble);
-    Outcome leaveNetwork(const Snapshot& before, std::unique_ptr<WirelessJoin>& join);
+    Outcome leaveNetwork(const LinkSnapshot& before, std::unique_ptr<WirelessJoin>& join);
     // Whether somebody else has configured the interface since: it has addresses that it neither had nor got
     // from here, or was switched off here and is on.
-    Outcome isTakenOver(const Notes& notes, const Snapshot& before, bool& taken);
-    Outcome removeOurs(const Notes& notes, const Snapshot& before);
-    Outcome restore(const Snapshot& before);
-    Outcome compare(const Snapshot& before);
+    Outcome isTakenOver(const AppliedLink& applied, const LinkSnapshot& before, bool& taken);
+    Outcome removeOurs(const AppliedLink& applied, const LinkSnapshot& before);
+    Outcome restore(const LinkSnapshot& before);
+    Outcome compare(const LinkSnapshot& before);
     Outcome setUp(bool up);
     Outcome setIPv6Disabled(std::optional<bool> disabled);
 

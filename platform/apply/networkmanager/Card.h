@@ -15,9 +15,9 @@
 
 namespace platform::apply {
 
-// A card as it was captured.
-struct EarlierCard {
-    ProfileNote note;
+// A card as it was when this system found it.
+struct CardSnapshot {
+    ProfileSnapshot profile;
     bool wasUp = false;  // the profile was complete, with its addresses
     // The card's own switch, which the daemon sees only where there is a device manager; nothing without one.
     std::optional<bool> radioOff = {};
@@ -25,9 +25,9 @@ struct EarlierCard {
 
     template <class Self, class Fields>
     static void listFields(Self& self, Fields& fields) {
-        fields("UUID", self.note.earlier);
-        fields("Autoconnect", self.note.autoconnect);
-        fields("Radio", self.note.radio);
+        fields("UUID", self.profile.uuid);
+        fields("Autoconnect", self.profile.autoconnect);
+        fields("Radio", self.profile.radio);
         fields("WasUp", self.wasUp);
         fields("RadioOff", self.radioOff);
         fields("IwdAutoconnect", self.iwdAutoconnect);
@@ -83,9 +83,9 @@ class Card {
 };
 
 [[nodiscard]] std::unique_ptr<Card> makeConfiguringCard(Daemon& daemon, Task& task,
-                                                        const EarlierCard& earlier,
+                                                        const CardSnapshot& earlier,
                                                         Clock::time_point deadline);
-[[nodiscard]] std::unique_ptr<Card> makeRestoringCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+[[nodiscard]] std::unique_ptr<Card> makeRestoringCard(Daemon& daemon, Task& task, const CardSnapshot& earlier,
                                                       std::shared_ptr<Place> place,
                                                       Clock::time_point deadline);
 

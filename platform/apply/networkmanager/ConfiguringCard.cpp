@@ -14,8 +14,8 @@ constexpr std::chrono::seconds scanAgain{3};
 
 class ConfiguringCard final : public Card {
   public:
-    ConfiguringCard(Daemon& daemon, Task& task, EarlierCard earlier, Clock::time_point deadline)
-        : Card(daemon, task, deadline), plan_(*task.plan), earlier_(std::move(earlier)) {}
+    ConfiguringCard(Daemon& daemon, Task& task, CardSnapshot earlier, Clock::time_point deadline)
+        : Card(daemon, task, deadline), plan_(*task.plan), before_(std::move(earlier)) {}
 
   private:
     enum class Stage {
@@ -192,7 +192,7 @@ class ConfiguringCard final : public Card {
         }
         link_->choice = *decision.choice;
         // Or it would turn to another one as soon as this one goes away.
-        RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(earlier_.iwdAutoconnect, network()));
+        RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(before_.iwdAutoconnect, network()));
         stage_ = Stage::store;
         if (!link_->choice->isHeard && isReady_ && active_ && !isOurProfileActive()) {
             stage_ = Stage::leaveOther;
@@ -219,7 +219,8 @@ class ConfiguringCard final : public Card {
 
     // Puts the profile into the daemon and asks for it to be activated, unless it is already.
     Outcome store() {
-        const Sections sections = makeProfile(plan_, isWireless() ? &link_.value() : nullptr, earlier_.note);
+        const Sections sections =
+            makeProfile(plan_, isWireless() ? &link_.value() : nullptr, before_.profile);
         const std::string secret = key().value_or("");
         std::optional<Profile> known;
         bool isForeign = false;
@@ -321,8 +322,8 @@ class ConfiguringCard final : public Card {
         RETURN_IF_FAILED(daemon_.disconnect(device_));
         RETURN_IF_FAILED(removeProfile());
         std::string path;
-        RETURN_IF_FAILED(daemon_.addProfile(makeProfile(plan_, &link_.value(), earlier_.note), Adding::atOnce,
-                                            key().value_or(""), path));
+        RETURN_IF_FAILED(daemon_.addProfile(makeProfile(plan_, &link_.value(), before_.profile),
+                                            Adding::atOnce, key().value_or(""), path));
         return daemon_.setAutoconnect(device_, true);
     }
 
@@ -366,7 +367,7 @@ class ConfiguringCard final : public Card {
     }
 
     const InterfacePlan& plan_;
-    const EarlierCard earlier_;
+    const CardSnapshot before_;
     Stage stage_ = Stage::begin;
     Device device_;
     bool isReady_ = false;
@@ -383,7 +384,7 @@ class ConfiguringCard final : public Card {
 
 }  // namespace
 
-std::unique_ptr<Card> makeConfiguringCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+std::unique_ptr<Card> makeConfiguringCard(Daemon& daemon, Task& task, const CardSnapshot& earlier,
                                           Clock::time_point deadline) {
     return std::make_unique<ConfiguringCard>(daemon, task, earlier, deadline);
 }

@@ -3,7 +3,7 @@
 // Neither checkpoints nor volatile profiles, which look made for this: a checkpoint is lost when the daemon
 // restarts and takes back what the user changed meanwhile; a volatile profile is dropped with the first
 // pulled cable, and the daemon then brings the best profile instead of the one before. An ordinary profile in
-// memory, and a note of what was active, survive all of that.
+// memory, and what was active before, survive all of that.
 #include <algorithm>
 #include <map>
 #include <memory>
@@ -22,14 +22,14 @@ constexpr std::chrono::seconds makeWayBound{2};
 class NetworkManagerAgent final : public Agent {
   public:
     [[nodiscard]] std::string_view name() const noexcept override { return "networkmanager"; }
-    Outcome capture(std::span<const std::string> interfaces, std::vector<Captured>& captured,
-                    std::vector<Trouble>& leftAlone) override;
+    Outcome takeSnapshots(std::span<const std::string> interfaces, std::vector<Snapshot>& snapshots,
+                          std::vector<Trouble>& leftAlone) override;
     void start(std::span<Task> tasks, Clock::time_point deadline) override;
     bool settle(Clock::time_point until) override;
 
   private:
     // Why the card is left alone goes into reason; empty for one that this agent leads.
-    Outcome captureCard(const Device& device, const std::string& interface, EarlierCard& earlier,
+    Outcome captureCard(const Device& device, const std::string& interface, CardSnapshot& earlier,
                         std::string& reason);
     Outcome prepare(std::span<Task> tasks, std::vector<std::shared_ptr<Place>>& places);
     Outcome makeWay(std::span<Task> tasks);
@@ -39,7 +39,7 @@ class NetworkManagerAgent final : public Agent {
 };
 
 Outcome NetworkManagerAgent::captureCard(const Device& device, const std::string& interface,
-                                         EarlierCard& earlier, std::string& reason) {
+                                         CardSnapshot& earlier, std::string& reason) {
     std::optional<Active> active;
     RETURN_IF_FAILED(daemon_.findActive(device, active));
     bool isVolatile = false;
@@ -60,25 +60,26 @@ Outcome NetworkManagerAgent::captureCard(const Device& device, const std::string
     if (radio) {
         earlier.radioOff = radio->isOff;
     }
-    if (earlier.note.earlier == profileUUID(interface)) {
+    if (earlier.profile.uuid == profileUUID(interface)) {
         // The record of how it was is lost, but not the profile.
         std::optional<Profile> profile;
         RETURN_IF_FAILED(daemon_.findProfile(profileUUID(interface), profile));
         const bool isKnown = profile && isOurs(profile->sections);
-        earlier = {isKnown ? noteOf(profile->sections) : ProfileNote(), true, {}};
+        earlier = {isKnown ? snapshotIn(profile->sections) : ProfileSnapshot(), true, {}};
     }
     return device.kind == Device::Kind::wireless ? daemon_.iwd().readAutoconnect(earlier.iwdAutoconnect)
                                                  : Outcome();
 }
 
-Outcome NetworkManagerAgent::capture(std::span<const std::string> interfaces, std::vector<Captured>& captured,
-                                     std::vector<Trouble>& leftAlone) {
-    captured.clear();
+Outcome NetworkManagerAgent::takeSnapshots(std::span<const std::string> interfaces,
+                                           std::vector<Snapshot>& snapshots,
+                                           std::vector<Trouble>& leftAlone) {
+    snapshots.clear();
     leftAlone.clear();
     RETURN_IF_FAILED(daemon_.connect());
     struct Ranked {
         std::uint32_t metric;
-        Captured captured;
+        Snapshot snapshot;
     };
     std::vector<Ranked> ranked;
     for (const std::string& interface : interfaces) {
@@ -88,7 +89,7 @@ Outcome NetworkManagerAgent::capture(std::span<const std::string> interfaces, st
         if (!device || !device->managed) {
             continue;
         }
-        EarlierCard earlier;
+        CardSnapshot earlier;
         std::string reason;
         RETURN_IF_FAILED(captureCard(*device, interface, earlier, reason));
         if (!reason.empty()) {
@@ -103,7 +104,7 @@ Outcome NetworkManagerAgent::capture(std::span<const std::string> interfaces, st
     // comes first; before all, the ones that have none, which are to leave theirs free.
     std::ranges::stable_sort(ranked, {}, &Ranked::metric);
     for (Ranked& one : ranked) {
-        captured.push_back(std::move(one.captured));
+        snapshots.push_back(std::move(one.snapshot));
     }
     return {};
 }
@@ -114,11 +115,11 @@ void NetworkManagerAgent::start(std::span<Task> tasks, Clock::time_point deadlin
     const Outcome prepared = prepare(tasks, places);
     for (std::size_t i = 0; i < tasks.size(); ++i) {
         Task& task = tasks[i];
-        EarlierCard earlier;
+        CardSnapshot earlier;
         if (!prepared.ok()) {
             task.refusal = prepared;
         } else if (!values::fromPropertyList(task.before->state.get(), earlier)) {
-            task.refusal = {kSCStatusFailed, "the note of how the interface was cannot be read"};
+            task.refusal = {kSCStatusFailed, "what the record says of the time before cannot be understood"};
         } else {
             cards_.push_back(task.plan != nullptr
                                  ? makeConfiguringCard(daemon_, task, earlier, deadline)
@@ -151,11 +152,11 @@ Outcome NetworkManagerAgent::makeWay(std::span<Task> tasks) {
     bool isAnyAway = false;
     std::vector<Device> making;
     for (const Task& task : tasks) {
-        EarlierCard earlier;
+        CardSnapshot earlier;
         std::optional<Device> device;
         std::optional<Active> active;
         if (task.plan != nullptr || !values::fromPropertyList(task.before->state.get(), earlier) ||
-            earlier.note.earlier.empty()) {
+            earlier.profile.uuid.empty()) {
             continue;
         }
         RETURN_IF_FAILED(daemon_.findDevice(task.before->interface, device));
@@ -163,7 +164,7 @@ Outcome NetworkManagerAgent::makeWay(std::span<Task> tasks) {
             continue;
         }
         RETURN_IF_FAILED(daemon_.findActive(*device, active));
-        const bool isBack = active && active->uuid == earlier.note.earlier;
+        const bool isBack = active && active->uuid == earlier.profile.uuid;
         if (isBack && isAnyAway) {
             RETURN_IF_FAILED(daemon_.disconnect(*device));
             making.push_back(*device);

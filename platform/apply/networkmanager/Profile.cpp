@@ -178,7 +178,7 @@ bool isOurs(const Sections& profile) {
     return data != nullptr && data->find(tagKey) != data->end();
 }
 
-ProfileNote noteOf(const Sections& profile) {
+ProfileSnapshot snapshotIn(const Sections& profile) {
     const TextMap* const data = userData(profile);
     const auto text = [data](const char* key) {
         const auto found = data == nullptr ? TextMap::const_iterator() : data->find(key);
@@ -207,7 +207,7 @@ std::string networkOf(const Sections& profile) {
     return ssid ? std::string(ssid->begin(), ssid->end()) : std::string();
 }
 
-Sections makeProfile(const InterfacePlan& plan, const WirelessLink* link, const ProfileNote& note) {
+Sections makeProfile(const InterfacePlan& plan, const WirelessLink* link, const ProfileSnapshot& before) {
     Sections profile;
     if (link != nullptr) {
         setWireless(plan.wireless.value_or(WirelessSettings()), *link, profile);
@@ -228,9 +228,9 @@ Sections makeProfile(const InterfacePlan& plan, const WirelessLink* link, const 
     profile["ipv6"] = {{"method", {std::string("disabled")}}, {"route-metric", {metricOf(plan)}}};
     profile["user"] = {{"data",
                         {TextMap{{tagKey, plan.name},
-                                 {earlierKey, note.earlier.empty() ? none : note.earlier},
-                                 {autoconnectKey, note.autoconnect ? "yes" : "no"},
-                                 {radioKey, note.radio ? "yes" : "no"}}}}};
+                                 {earlierKey, before.uuid.empty() ? none : before.uuid},
+                                 {autoconnectKey, before.autoconnect ? "yes" : "no"},
+                                 {radioKey, before.radio ? "yes" : "no"}}}}};
     return profile;
 }
 

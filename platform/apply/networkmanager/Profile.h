@@ -22,11 +22,11 @@ using bus::valueOf;
 
 // What was there before the profile, kept in the profile itself too: whoever finds the profile finds the way
 // back.
-struct ProfileNote {
-    std::string earlier;  // the UUID of the profile that was active; empty for none
+struct ProfileSnapshot {
+    std::string uuid;  // the UUID of the profile that was active; empty for none
     bool autoconnect = true;
     bool radio = true;
-    bool operator==(const ProfileNote&) const = default;
+    bool operator==(const ProfileSnapshot&) const = default;
 };
 
 // The wireless link of a profile.
@@ -42,8 +42,8 @@ struct WirelessLink {
 [[nodiscard]] std::string profileUUID(const std::string& interface);
 // Decides what is ours: a name or an UUID can be anybody's.
 [[nodiscard]] bool isOurs(const Sections& profile);
-// The note in one of our profiles.
-[[nodiscard]] ProfileNote noteOf(const Sections& profile);
+// What one of our profiles keeps of the time before.
+[[nodiscard]] ProfileSnapshot snapshotIn(const Sections& profile);
 // The sections about the wireless link, without what the daemon only remembers.
 [[nodiscard]] Sections wirelessSections(const Sections& profile);
 // The bytes of the network's name in a profile; empty when it has none.
@@ -51,6 +51,6 @@ struct WirelessLink {
 
 // The profile for an active interface; link is null for a wired card.
 [[nodiscard]] Sections makeProfile(const InterfacePlan& plan, const WirelessLink* link,
-                                   const ProfileNote& note);
+                                   const ProfileSnapshot& before);
 
 }  // namespace platform::apply

@@ -10,9 +10,9 @@ namespace {
 
 class RestoringCard final : public Card {
   public:
-    RestoringCard(Daemon& daemon, Task& task, EarlierCard earlier, std::shared_ptr<Place> place,
+    RestoringCard(Daemon& daemon, Task& task, CardSnapshot earlier, std::shared_ptr<Place> place,
                   Clock::time_point deadline)
-        : Card(daemon, task, deadline), earlier_(std::move(earlier)), place_(std::move(place)) {}
+        : Card(daemon, task, deadline), before_(std::move(earlier)), place_(std::move(place)) {}
     RestoringCard(const RestoringCard&) = delete;
     RestoringCard& operator=(const RestoringCard&) = delete;
     ~RestoringCard() override { place_->isTaken = true; }
@@ -40,10 +40,10 @@ class RestoringCard final : public Card {
         return {};
     }
 
-    [[nodiscard]] const ProfileNote& note() const { return earlier_.note; }
+    [[nodiscard]] const ProfileSnapshot& before() const { return before_.profile; }
 
     Outcome begin() {
-        RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(earlier_.iwdAutoconnect, std::nullopt));
+        RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(before_.iwdAutoconnect, std::nullopt));
         std::optional<Device> device;
         RETURN_IF_FAILED(findCard(device));
         if (!device) {
@@ -52,7 +52,7 @@ class RestoringCard final : public Card {
         }
         device_ = std::move(*device);
         RETURN_IF_FAILED(daemon_.findActive(device_, active_));
-        if (active_ && active_->uuid != note().earlier && active_->uuid != profileUUID(interface_)) {
+        if (active_ && active_->uuid != before().uuid && active_->uuid != profileUUID(interface_)) {
             logLine(LogLevel::notice,
                     interface_ + ": somebody else has taken it over, and it is left to them");
             settle();
@@ -74,7 +74,7 @@ class RestoringCard final : public Card {
             waitUntil(readyDeadline_);
             return {};
         }
-        if (note().earlier.empty()) {
+        if (before().uuid.empty()) {
             stage_ = Stage::comeToRest;
             return daemon_.disconnect(device_);
         }
@@ -96,7 +96,7 @@ class RestoringCard final : public Card {
 
     Outcome activateEarlier(bool isReady) {
         std::optional<Profile> profile;
-        RETURN_IF_FAILED(daemon_.findProfile(note().earlier, profile));
+        RETURN_IF_FAILED(daemon_.findProfile(before().uuid, profile));
         if (!profile || !isReady) {
             // What is active next is up to the daemon, as if this system had never been there.
             task_.trouble = profile ? "no profile can be active on it now"
@@ -111,13 +111,13 @@ class RestoringCard final : public Card {
     }
 
     Outcome awaitPlace() {
-        const bool isBack = active_ && active_->uuid == note().earlier;
+        const bool isBack = active_ && active_->uuid == before().uuid;
         if (!isBack && place_->before && !place_->before->isTaken && Clock::now() < placeDeadline_) {
             waitUntil(placeDeadline_);
             return {};
         }
         if (!isBack) {
-            active_.emplace().uuid = note().earlier;
+            active_.emplace().uuid = before().uuid;
             RETURN_IF_FAILED(daemon_.activate(profile_, device_, active_->path));
         }
         placeDeadline_ = Clock::now() + placeBound;
@@ -133,8 +133,8 @@ class RestoringCard final : public Card {
         place_->isTaken =
             place_->isTaken || (cardState >= deviceGetsAddresses && cardState <= deviceActivated);
         // What was not up before is asked for, and waited for only as long as its place is at stake.
-        const bool isEnough = !earlier_.wasUp && (place_->isTaken || device_.kind == Device::Kind::wireless ||
-                                                  Clock::now() >= placeDeadline_);
+        const bool isEnough = !before_.wasUp && (place_->isTaken || device_.kind == Device::Kind::wireless ||
+                                                 Clock::now() >= placeDeadline_);
         if (state == activeActivated || isEnough) {
             stage_ = Stage::finish;
         } else if (state == activeDeactivated) {
@@ -144,7 +144,7 @@ class RestoringCard final : public Card {
             task_.trouble = "the profile that was active before is not up yet; NetworkManager goes on";
             stage_ = Stage::finish;
         } else {
-            waitUntil(earlier_.wasUp ? deadline_ : placeDeadline_);
+            waitUntil(before_.wasUp ? deadline_ : placeDeadline_);
         }
         return {};
     }
@@ -166,12 +166,12 @@ class RestoringCard final : public Card {
         // Behind that, or the daemon would activate our profile again.
         std::optional<Device> device;
         RETURN_IF_FAILED(findCard(device));
-        if (device && device->autoconnect != note().autoconnect) {
-            RETURN_IF_FAILED(daemon_.setAutoconnect(*device, note().autoconnect));
+        if (device && device->autoconnect != before().autoconnect) {
+            RETURN_IF_FAILED(daemon_.setAutoconnect(*device, before().autoconnect));
         }
-        if (earlier_.radioOff.value_or(false)) {
+        if (before_.radioOff.value_or(false)) {
             RETURN_IF_FAILED(switchRadio(interface_, false));
-        } else if (!earlier_.radioOff && !note().radio && daemon_.isRadioOn()) {
+        } else if (!before_.radioOff && !before().radio && daemon_.isRadioOn()) {
             RETURN_IF_FAILED(daemon_.setRadio(false));
         }
         settle();
@@ -186,12 +186,12 @@ class RestoringCard final : public Card {
             return {};
         }
         RETURN_IF_FAILED(daemon_.findActive(*device, active));
-        const bool isSame = (active ? active->uuid : "") == note().earlier && device->managed &&
-                            device->autoconnect == note().autoconnect;
+        const bool isSame = (active ? active->uuid : "") == before().uuid && device->managed &&
+                            device->autoconnect == before().autoconnect;
         return isSame ? Outcome() : Outcome(kSCStatusFailed, "it is not as it was before");
     }
 
-    const EarlierCard earlier_;
+    const CardSnapshot before_;
     const std::shared_ptr<Place> place_;
     std::string profile_;  // the path of the earlier profile
     Clock::time_point placeDeadline_;
@@ -204,7 +204,7 @@ class RestoringCard final : public Card {
 
 }  // namespace
 
-std::unique_ptr<Card> makeRestoringCard(Daemon& daemon, Task& task, const EarlierCard& earlier,
+std::unique_ptr<Card> makeRestoringCard(Daemon& daemon, Task& task, const CardSnapshot& earlier,
                                         std::shared_ptr<Place> place, Clock::time_point deadline) {
     return std::make_unique<RestoringCard>(daemon, task, earlier, std::move(place), deadline);
 }

@@ -59,15 +59,16 @@ class NetworkManager : public ::testing::Test {
     void card(const char* property, Value value) {
         daemon_.objects[StandInDaemon::card][property] = std::move(value);
     }
-    Captured capture() {
-        std::vector<Captured> captured;
+    Snapshot takeSnapshots() {
+        std::vector<Snapshot> snapshots;
         leftAlone_.clear();
-        const Outcome outcome = agent_->capture(std::vector<std::string>{"wlan0"}, captured, leftAlone_);
+        const Outcome outcome =
+            agent_->takeSnapshots(std::vector<std::string>{"wlan0"}, snapshots, leftAlone_);
         EXPECT_TRUE(outcome.ok()) << outcome.reason();
-        return captured.empty() ? Captured() : captured[0];
+        return snapshots.empty() ? Snapshot() : snapshots[0];
     }
     // What was changed, and what stood against it; the status of a refusal goes before its reason.
-    Lines takeOver(const InterfacePlan* plan, const Captured& before, double seconds = 10) {
+    Lines takeOver(const InterfacePlan* plan, const Snapshot& before, double seconds = 10) {
         std::vector<Task> tasks{{&before, plan, {}, {}}};
         const auto bound = std::chrono::duration<double>(seconds);
         const Clock::time_point deadline = Clock::now() + std::chrono::duration_cast<Clock::duration>(bound);
@@ -82,10 +83,10 @@ class NetworkManager : public ::testing::Test {
         }
         return lines;
     }
-    Lines takeOver(const InterfacePlan& plan, const Captured& before, double seconds = 10) {
+    Lines takeOver(const InterfacePlan& plan, const Snapshot& before, double seconds = 10) {
         return takeOver(&plan, before, seconds);
     }
-    Lines giveBack(const Captured& before) { return takeOver(nullptr, before); }
+    Lines giveBack(const Snapshot& before) { return takeOver(nullptr, before); }
     Sections ours() {
         for (const auto& [path, sections] : daemon_.profiles) {
             if (valueOf<std::string>(sections.at("connection"), "uuid") == profileUUID("wlan0")) {
@@ -116,7 +117,7 @@ TEST_F(NetworkManager, ReadsWhatIsOnTheAir) {
         {infrastructure, 1, 0x400, "infrastructure sae"},
         {infrastructure, 1, 0x200, " "},
     };
-    const Captured before = capture();
+    const Snapshot before = takeSnapshots();
     for (const auto& row : rows) {
         const std::string name = row.made;
         daemon_.offer(name, row.mode, row.privacy, row.protection);
@@ -132,7 +133,7 @@ TEST_F(NetworkManager, ReadsWhatIsOnTheAir) {
 TEST_F(NetworkManager, GoesAndComesBack) {
     joinHome();
     daemon_.offer("Printer", infrastructure, 0, 0);
-    const Captured before = capture();
+    const Snapshot before = takeSnapshots();
     EXPECT_EQ(going, takeOver(printer_, before));
     // The same again changes nothing; another rank does.
     EXPECT_EQ(Lines{"Update2"}, takeOver(printer_, before));
@@ -140,7 +141,7 @@ TEST_F(NetworkManager, GoesAndComesBack) {
     other.rank = 1;
     EXPECT_EQ((Lines{"Update2", activated}), takeOver(other, before));
     // The record of how it was may be lost: the profile has it too.
-    const Captured again = capture();
+    const Snapshot again = takeSnapshots();
     EXPECT_EQ(returning, giveBack(again));
     EXPECT_EQ(Lines{}, giveBack(again));
 
@@ -161,7 +162,7 @@ TEST_F(NetworkManager, GoesAndComesBack) {
 TEST_F(NetworkManager, WaitsForACellThatIsNotHeardYet) {
     joinHome();
     daemon_.offer("Printer", adHoc, 0, 0, true);
-    const Captured before = capture();
+    const Snapshot before = takeSnapshots();
     EXPECT_EQ((Lines{"Disconnect", added, activated}), takeOver(printer_, before))
         << "it does not stay at home";
     EXPECT_EQ(returning, giveBack(before));
@@ -183,13 +184,13 @@ TEST_F(NetworkManager, WaitsForACellThatIsNotHeardYet) {
 
 TEST_F(NetworkManager, KeepsTheNetworkOfTheCard) {
     EXPECT_EQ(Lines{"no network is named and the card is on none, so it joins none"},
-              takeOver(plan({}), capture()));
+              takeOver(plan({}), takeSnapshots()));
     joinHome();
-    EXPECT_EQ(going, takeOver(plan({}), capture()));
+    EXPECT_EQ(going, takeOver(plan({}), takeSnapshots()));
     EXPECT_EQ("Home", networkOf(ours()));
     EXPECT_EQ(canary, valueOf<std::string>(ours()["802-11-wireless-security"], "psk"));
     // With a key it is joined anew.
-    (void)takeOver(plan("Home", "another key"), capture());
+    (void)takeOver(plan("Home", "another key"), takeSnapshots());
     EXPECT_EQ("another key", valueOf<std::string>(ours()["802-11-wireless-security"], "psk"));
 }
 
@@ -197,7 +198,7 @@ TEST_F(NetworkManager, Radio) {
     daemon_.objects[daemon_.manager]["WirelessEnabled"] = {false};
     card("State", {20U});
     daemon_.offer("Printer", infrastructure, 0, 0);
-    const Captured before = capture();
+    const Snapshot before = takeSnapshots();
     EXPECT_EQ((Lines{"WirelessEnabled on", added, activated}), takeOver(printer_, before));
     EXPECT_EQ((Lines{"Disconnect", "Delete", "Autoconnect on", "WirelessEnabled off"}), giveBack(before));
 
@@ -213,7 +214,7 @@ TEST_F(NetworkManager, Failures) {
     joinHome();
     daemon_.offer("Office", infrastructure, 1, sharedKey);
     daemon_.offer("Users", infrastructure, 1, 0x200);
-    const Captured before = capture();
+    const Snapshot before = takeSnapshots();
     const InterfacePlan office = plan("Office", canary);
     EXPECT_EQ((Lines{"Autoconnect off", "Disconnect",
                      "the network asks each user for a name and a password, which a location does not hold"}),
@@ -252,7 +253,7 @@ TEST_F(NetworkManager, BelievesNoSignalFromSomebodyElse) {
     daemon_.hangs = true;
     daemon_.offer("Printer", infrastructure, 0, 0);
     sd_bus* const forger = bus_.connect();
-    const Captured before = capture();
+    const Snapshot before = takeSnapshots();
     std::thread forging([forger] {
         for (int i = 0; i < 40; ++i) {
             for (const char* number : {"1", "2", "3", "4"}) {
@@ -283,19 +284,19 @@ TEST_F(NetworkManager, LeavesAloneWhatIsNotItsOwn) {
     for (const auto& row : rows) {
         const Dictionary before = daemon_.objects[row.object];
         daemon_.objects[row.object][row.property] = {row.flags};
-        capture();
+        takeSnapshots();
         ASSERT_EQ(1U, leftAlone_.size());
         EXPECT_EQ(row.reason, leftAlone_[0].reason);
         daemon_.objects[row.object] = before;
     }
     card("Managed", {false});
-    EXPECT_EQ("", capture().interface);
+    EXPECT_EQ("", takeSnapshots().interface);
     EXPECT_TRUE(leftAlone_.empty()) << "it may have another agent";
 }
 
 TEST_F(NetworkManager, CardWithoutCarrier) {
     joinHome();
-    const Captured before = capture();
+    const Snapshot before = takeSnapshots();
     card("State", {20U});
     card("ActiveConnection", {std::string("/")});
     EXPECT_EQ(Lines{"no profile can be active on it now"}, giveBack(before));

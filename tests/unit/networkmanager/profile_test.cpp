@@ -34,8 +34,9 @@ InterfacePlan wireless(std::optional<std::string> network, std::optional<std::st
     return plan;
 }
 
-Sections made(const InterfacePlan& plan, const WirelessLink* link = nullptr, const ProfileNote& note = {}) {
-    Sections profile = makeProfile(plan, link, note);
+Sections made(const InterfacePlan& plan, const WirelessLink* link = nullptr,
+              const ProfileSnapshot& before = {}) {
+    Sections profile = makeProfile(plan, link, before);
     if (const char* const socket = std::getenv("LA_NETWORKMANAGER_BUS"); socket != nullptr) {
         Host host;
         host.systemBusSocket = socket;
@@ -85,11 +86,12 @@ TEST(Profile, HoldsTheAddresses) {
 
 TEST(Profile, IsFoundAgain) {
     EXPECT_NE(profileUUID("eth0"), profileUUID("eth1"));
-    for (const ProfileNote& note :
-         {ProfileNote{"11111111-2222-4333-8444-555555555555", false, true}, ProfileNote{"", true, false}}) {
-        Sections profile = made(wired(), nullptr, note);
+    for (const ProfileSnapshot& before :
+         {ProfileSnapshot{"11111111-2222-4333-8444-555555555555", false, true},
+          ProfileSnapshot{"", true, false}}) {
+        Sections profile = made(wired(), nullptr, before);
         EXPECT_TRUE(isOurs(profile));
-        EXPECT_EQ(noteOf(profile), note);
+        EXPECT_EQ(snapshotIn(profile), before);
         EXPECT_EQ(profile["connection"]["uuid"], Value{profileUUID("eth0")});
         EXPECT_EQ(profile["connection"]["autoconnect-priority"], Value{999});
         profile.erase("user");

@@ -33,9 +33,9 @@ class RecordingAgent : public platform::apply::Agent {
 
     [[nodiscard]] std::string_view name() const noexcept override { return name_; }
 
-    platform::Outcome capture(std::span<const std::string> interfaces,
-                              std::vector<platform::apply::Captured>& captured,
-                              std::vector<platform::apply::Trouble>& leftAlone) override {
+    platform::Outcome takeSnapshots(std::span<const std::string> interfaces,
+                                    std::vector<platform::apply::Snapshot>& snapshots,
+                                    std::vector<platform::apply::Trouble>& leftAlone) override {
         std::string call = "capture";
         for (const std::string& interface : interfaces) {
             call += " " + interface;
@@ -43,7 +43,7 @@ class RecordingAgent : public platform::apply::Agent {
                 leftAlone.push_back({interface, "it is somebody else's"});
             } else if (machine.contains(interface)) {
                 platform::apply::DictionaryBuilder state;
-                captured.push_back({interface, state.setText(CFSTR("State"), machine[interface]).take()});
+                snapshots.push_back({interface, state.setText(CFSTR("State"), machine[interface]).take()});
             }
         }
         return begin(call);

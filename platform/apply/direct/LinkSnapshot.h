@@ -17,7 +17,7 @@
 
 namespace platform::apply {
 
-struct Snapshot {
+struct LinkSnapshot {
     bool up = false;
     std::optional<bool> ipv6Disabled;  // nothing when the kernel has no IPv6
     InterfaceState state;
@@ -65,7 +65,7 @@ struct JoinedNetwork {
 
 // What the direct agent has done with an interface; no notes means nothing that would have to be undone. They
 // are on disk before the first change and are removed behind the last one of the way back.
-struct Notes {
+struct AppliedLink {
     enum class Phase { applying, applied, restoring, last = restoring };
     Phase phase = Phase::applying;
     bool off = false;                // the interface was switched off
@@ -81,8 +81,8 @@ struct Notes {
     }
 };
 
-Outcome readNotes(const std::string& interface, std::optional<Notes>& notes);
-Outcome writeNotes(const std::string& interface, const Notes& notes);
-Outcome removeNotes(const std::string& interface);
+Outcome readApplied(const std::string& interface, std::optional<AppliedLink>& applied);
+Outcome writeApplied(const std::string& interface, const AppliedLink& applied);
+Outcome removeApplied(const std::string& interface);
 
 }  // namespace platform::apply

@@ -1,4 +1,4 @@
-#include "platform/apply/direct/Snapshot.h"
+#include "platform/apply/direct/LinkSnapshot.h"
 
 #include <fcntl.h>
 #include <sys/random.h>
@@ -14,7 +14,7 @@
 namespace platform::apply {
 namespace {
 
-std::string notesPath(const std::string& interface) {
+std::string appliedPath(const std::string& interface) {
     return runtimePath("direct-" + interface + ".plist");
 }
 
@@ -29,13 +29,13 @@ std::uint32_t checkOf(const WirelessSettings& settings, const Salt& salt) {
 
 }  // namespace
 
-bool Snapshot::hasLedAddress() const {
+bool LinkSnapshot::hasLedAddress() const {
     return (others.networkd || !others.dhcpClients.empty()) &&
            std::ranges::any_of(state.addresses,
                                [](const Address& address) { return address.family() == AF_INET; });
 }
 
-bool Snapshot::hasLeaseEnded() const {
+bool LinkSnapshot::hasLeaseEnded() const {
     const std::int64_t elapsed = secondsSinceStart() - takenAt;
     return std::ranges::any_of(state.addresses, [elapsed](const Address& address) {
         return address.family() == AF_INET && address.valid != forever && address.valid <= elapsed;
@@ -71,16 +71,16 @@ Outcome disableIPv6(const std::string& interface, bool disabled) {
     return {};
 }
 
-Outcome readNotes(const std::string& interface, std::optional<Notes>& notes) {
-    return readState(notesPath(interface), notes);
+Outcome readApplied(const std::string& interface, std::optional<AppliedLink>& applied) {
+    return readState(appliedPath(interface), applied);
 }
 
-Outcome writeNotes(const std::string& interface, const Notes& notes) {
-    return writeState(notesPath(interface), notes);
+Outcome writeApplied(const std::string& interface, const AppliedLink& applied) {
+    return writeState(appliedPath(interface), applied);
 }
 
-Outcome removeNotes(const std::string& interface) {
-    return removeFile(notesPath(interface));
+Outcome removeApplied(const std::string& interface) {
+    return removeFile(appliedPath(interface));
 }
 
 }  // namespace platform::apply
