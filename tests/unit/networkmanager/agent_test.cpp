@@ -149,6 +149,8 @@ TEST_F(NetworkManager, GoesAndComesBack) {
     off.name = "wlan0";
     EXPECT_EQ((Lines{"Disconnect", "Managed off"}), takeOver(off, before));
     EXPECT_EQ(Lines{}, takeOver(off, before));
+    EXPECT_EQ((Lines{"Managed on", added, activated}), takeOver(printer_, before));
+    EXPECT_EQ((Lines{"Disconnect", "Managed off", "Delete"}), takeOver(off, before));
     EXPECT_EQ((Lines{"Managed on", "Activate Home"}), giveBack(before));
 
     // Somebody's own profile under our UUID is nobody's to change.
@@ -157,6 +159,12 @@ TEST_F(NetworkManager, GoesAndComesBack) {
               takeOver(printer_, before));
     EXPECT_EQ(Lines{}, giveBack(before));
     EXPECT_TRUE(daemon_.profiles.contains("/theirs"));
+    daemon_.profiles.erase("/theirs");
+    // Somebody else activated another profile meanwhile.
+    EXPECT_EQ(going, takeOver(printer_, before));
+    daemon_.objects["/other"] = {{"Uuid", {std::string("other")}}, {"State", {2U}}};
+    card("ActiveConnection", {std::string("/other")});
+    EXPECT_EQ(Lines{"Delete"}, giveBack(before));
 }
 
 TEST_F(NetworkManager, WaitsForACellThatIsNotHeardYet) {
