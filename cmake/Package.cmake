@@ -2,6 +2,8 @@
 # the shared library and neither headers nor the tool, which does without it.
 set(CPACK_GENERATOR DEB)
 set(CPACK_PACKAGE_NAME location-assistant)
+# Each package has its own.
+set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "")
 set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
 set(CPACK_PACKAGE_DIRECTORY ${PROJECT_BINARY_DIR}/packages)
 set(CPACK_PACKAGE_CHECKSUM SHA256)
@@ -15,7 +17,7 @@ set(CPACK_LA_PACKAGING ${PROJECT_SOURCE_DIR}/packaging)
 # As Debian's own tools take it from whoever builds.
 set(maintainer "$ENV{DEBFULLNAME} <$ENV{DEBEMAIL}>")
 if(maintainer STREQUAL " <>")
-    set(maintainer "Location Assistant developers <developers@location-assistant.net>")
+    set(maintainer "Location Assistant developers <developers@location-assistant.example>")
 endif()
 set(CPACK_PACKAGE_CONTACT "${maintainer}")
 set(CPACK_DEBIAN_PACKAGE_MAINTAINER "${maintainer}")
