@@ -106,7 +106,9 @@ TEST(Dictionary, BehavesAsAModelThroughRandomChanges) {
 TEST(Array, ChangesCopiesApartAndFindsByContent) {
     const auto array = arrayOf("(a, b, c, b)");
     const auto copy = Owned<CFMutableArrayRef>::adopt(CFArrayCreateMutableCopy(nullptr, 0, array.get()));
+    const void* const removed = CFArrayGetValueAtIndex(array.get(), 1);
     CFArrayRemoveValueAtIndex(copy.get(), 1);
+    EXPECT_EQ(CFGetRetainCount(removed), 1);
     CFArrayRemoveValueAtIndex(copy.get(), 3);
     CFArrayAppendValue(copy.get(), CFSTR("d"));
     EXPECT_EQ(text(array.get()), "(a, b, c, b)");

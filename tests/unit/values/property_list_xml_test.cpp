@@ -88,7 +88,7 @@ TEST(PropertyListXML, RefusesWhatIsNoPropertyList) {
         "<string><true/></string>", "<true>x</true>", "<set/>", "<dict id=\"1\"/>", "<integer/>",
         "<integer>9223372036854775808</integer>", "<integer>+-1</integer>", "<integer>0x10</integer>",
         "<real>1e999</real>", "<date>2004-02-30T00:00:00Z</date>", "<date>2004-02-28T24:00:00Z</date>",
-        "<date>2004-02-28T00:00:00</date>", "<data>AAA=AAAA</data>", "<data>AA*=</data>",
+        "<date>2004-02-28T00:00:00</date>", "<data>AAA=AAAA</data>", "<data>AA*=</data>", "<data>AAAAAA</data>",
         "<string>&#1;</string>", "<string>\x80</string>", "<string>\xED\xA0\x80</string>",
         "<string>\xEF\xBF\xBF</string>"}) {
         // clang-format on

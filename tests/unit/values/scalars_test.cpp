@@ -59,6 +59,8 @@ TEST(URL, HasASchemeAndNothingToEscape) {
                             "http://\xC3\xA4/", "http://a/\n", "x:a[b]"}) {
         EXPECT_EQ(CFURLCreateWithString(nullptr, str(bad).get(), nullptr), nullptr) << bad;
     }
+    EXPECT_EQ(CFURLCreateWithString(nullptr, str(std::string_view("http://a/\0b", 11)).get(), nullptr),
+              nullptr);
 }
 
 }  // namespace
