@@ -97,7 +97,7 @@ class NetworkManager : public ::testing::Test {
     }
 
     const InterfacePlan printer_ = plan("Printer");
-    const testing_support::PrivateBus bus_;
+    const testing_support::PrivateBus bus_{};
     StandInDaemon daemon_{bus_};
     const HostOverride override_{host(bus_.socket())};
     const std::shared_ptr<Agent> agent_ = makeNetworkManagerAgent();
