@@ -338,6 +338,17 @@ Outcome DirectInterface::removeOurs(const AppliedLink& applied, const LinkSnapsh
     return steps.first();
 }
 
+// Without its radio a card cannot be switched on, and no route goes through it.
+Outcome DirectInterface::checkRadio(const LinkSnapshot& before) {
+    std::optional<Radio> radio;
+    RETURN_IF_FAILED(readRadio(interface_, radio));
+    const bool isOff = radio && (radio->isOff || radio->isBlocked);
+    return before.up && isOff ? Outcome(kSCStatusFailed,
+                                        "its radio was switched off meanwhile: the next run gives it back "
+                                        "when it is on again")
+                              : Outcome();
+}
+
 Outcome DirectInterface::restore(const LinkSnapshot& before) {
     std::vector<Address> addresses = before.state.addresses;
     const std::int64_t elapsed = std::max<std::int64_t>(secondsSinceStart() - before.takenAt, 0);
@@ -352,6 +363,7 @@ Outcome DirectInterface::restore(const LinkSnapshot& before) {
     }
     // IPv6 before the link, so that the kernel makes its own addresses when the link comes up.
     RETURN_IF_FAILED(setIPv6Disabled(before.ipv6Disabled));
+    RETURN_IF_FAILED(checkRadio(before));
     RETURN_IF_FAILED(setUp(before.up));
     RETURN_IF_FAILED(kernel_.makeAddresses(*link_, addresses));
     RETURN_IF_FAILED(kernel_.makeRoutes(*link_, before.state.routes, false));

@@ -57,6 +57,7 @@ class DirectInterface {
     // Whether somebody else has configured the interface since: it has addresses that it neither had nor got
     // from here, or was switched off here and is on.
     Outcome isTakenOver(const AppliedLink& applied, const LinkSnapshot& before, bool& taken);
+    Outcome checkRadio(const LinkSnapshot& before);
     Outcome removeOurs(const AppliedLink& applied, const LinkSnapshot& before);
     Outcome restore(const LinkSnapshot& before);
     Outcome compare(const LinkSnapshot& before);

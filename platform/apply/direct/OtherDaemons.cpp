@@ -52,9 +52,10 @@ bool hasLetGo(int index) {
     return networkdValue(index, "ADMIN_STATE") == "unmanaged";
 }
 
-// Before any that an administrator writes: the first that matches counts.
+// The first name in the order of its letters that matches counts, and administrators begin theirs with two
+// digits.
 std::string networkdFile(const std::string& interface) {
-    return currentHost().networkdDirectory + "/00-location-assistant-" + interface + ".network";
+    return currentHost().networkdDirectory + "/0-0-location-assistant-" + interface + ".network";
 }
 
 Outcome reloadNetworkd(bool& isRunning) {
@@ -120,11 +121,14 @@ bool isClientOf(const std::string& interface, pid_t number) {
         return false;
     }
     const std::vector<std::string> arguments = argumentsOf(number);
-    if (std::ranges::count(arguments, interface) == 0) {
+    const bool isNamed = std::ranges::count(arguments, interface) != 0;
+    const bool namesOther = std::ranges::any_of(
+        arguments, [&](const std::string& word) { return word != interface && isInterface(word); });
+    if (!isNamed && namesOther) {
         return false;
     }
-    const bool isShared = std::ranges::any_of(
-        arguments, [&](const std::string& word) { return word != interface && isInterface(word); });
+    // One that names none serves all of them.
+    const bool isShared = !isNamed || namesOther;
     if (isShared) {
         logLine(LogLevel::notice, interface + ": its DHCP client (process " + std::to_string(number) +
                                       ") serves other interfaces too, and goes on");

@@ -43,20 +43,19 @@ class RestoringCard final : public Card {
     [[nodiscard]] const ProfileSnapshot& before() const { return before_.profile; }
 
     Outcome begin() {
-        RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(before_.iwdAutoconnect, std::nullopt));
+        // The card comes back also where iwd does not answer, which the next run asks again.
+        iwdOutcome_ = daemon_.iwd().limitAutoconnect(before_.iwdAutoconnect, std::nullopt);
         std::optional<Device> device;
         RETURN_IF_FAILED(findCard(device));
         if (!device) {
-            settle();
-            return removeProfile();
+            return leave();
         }
         device_ = std::move(*device);
         RETURN_IF_FAILED(daemon_.findActive(device_, active_));
         if (active_ && active_->uuid != before().uuid && active_->uuid != profileUUID(interface_)) {
             logLine(LogLevel::notice,
                     interface_ + ": somebody else has taken it over, and it is left to them");
-            settle();
-            return removeProfile();
+            return leave();
         }
         readyDeadline_ = Clock::now();
         if (!device_.managed) {
@@ -65,6 +64,12 @@ class RestoringCard final : public Card {
         }
         stage_ = Stage::becomeReady;
         return {};
+    }
+
+    Outcome leave() {
+        settle();
+        RETURN_IF_FAILED(removeProfile());
+        return iwdOutcome_;
     }
 
     Outcome becomeReady() {
@@ -175,6 +180,7 @@ class RestoringCard final : public Card {
             RETURN_IF_FAILED(daemon_.setRadio(false));
         }
         settle();
+        RETURN_IF_FAILED(iwdOutcome_);
         return task_.trouble.empty() ? compare() : Outcome();
     }
 
@@ -196,6 +202,7 @@ class RestoringCard final : public Card {
     std::string profile_;  // the path of the earlier profile
     Clock::time_point placeDeadline_;
     Stage stage_ = Stage::begin;
+    Outcome iwdOutcome_;
     Device device_;
     Clock::time_point readyDeadline_;
     Clock::time_point reasonDeadline_;

@@ -244,6 +244,19 @@ def radio_switched_off(visit):
     visit.there_and_back()
 
 
+@row("supplicant")
+def radio_switched_off_at_the_printer(visit):
+    visit.offer()
+    visit.remember()
+    visit.create()
+    visit.page()
+    visit.host.switch(True)
+    visit.host.tool("remove")
+    visit.told("radio was switched off meanwhile")
+    visit.host.switch(False)
+    visit.back(within=AGAIN)
+
+
 @row("networkmanager", "networkmanager-iwd", "supplicant")
 def home_is_gone(visit):
     visit.offer()

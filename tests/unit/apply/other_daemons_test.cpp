@@ -82,7 +82,7 @@ TEST_F(OtherDaemonsTest, ClientStandsStill) {
 
 TEST_F(OtherDaemonsTest, NetworkdIsAskedByAFile) {
     run([](const std::string& folder) {
-        const std::string file = "/run/systemd/network/00-location-assistant-card0.network";
+        const std::string file = "/run/systemd/network/0-0-location-assistant-card0.network";
         const std::string link = folder + "/" + std::to_string(index);
         const auto isFound = [&link](const char* text) {
             std::ofstream(link) << text;
