@@ -245,7 +245,7 @@ def radio_switched_off(visit):
 
 
 @row("supplicant")
-def radio_switched_off_at_the_printer(visit):
+def switched_off_at_the_printer(visit):
     visit.offer()
     visit.remember()
     visit.create()
