@@ -47,6 +47,8 @@ def play(host, *chosen):
                 if not (result := folder / f"{name}.result").exists() or result.read_text() != "held"]
         tries = tries - 1 if todo else 0
         if tries:
+            for log in filter(Path.exists, (folder / f"{name}.log" for name in todo)):
+                shutil.copy(log, log.with_suffix(".first.log"))
             print(f"{host}: once more: {' '.join(todo)}", flush=True)
     sys.exit(0 if status == 0 else 1)
 
@@ -58,8 +60,11 @@ def judge(host, name):
     result = folder / f"{name}.result"
     if not result.exists():
         sys.exit(f"{name} did not run: see the test that boots the machine")
+    held = result.read_text() == "held"
     print((folder / f"{name}.log").read_text())
-    sys.exit(0 if result.read_text() == "held" else 1)
+    if (first := folder / f"{name}.first.log").exists():
+        print(f"{'held' if held else 'failed'} at the second try; the log of the first:\n{first.read_text()}")
+    sys.exit(0 if held else 1)
 
 
 def main():

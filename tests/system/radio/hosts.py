@@ -1,9 +1,11 @@
 """Who runs the network inside the machine: nobody, a supplicant, NetworkManager with either of its supplicants."""
 import json
 import os
+import plistlib
 import re
 import runpy
 import shlex
+import signal
 import socket
 import struct
 import subprocess
@@ -54,6 +56,7 @@ network={{
 class Host:
     """The machine with nobody who runs its network, and what every machine has: the tool and the system log."""
     has_home = False
+    not_there = "no network of that name was heard"  # what the log says of a name that nobody offers
 
     def __init__(self):
         self.syslog = []
@@ -100,11 +103,20 @@ class Host:
             air.end(daemon)
         self.daemons.clear()
         self.switch(False)
+        self._end_dhcp_client()
         sh(f"rm -rf {STORE} {RUNTIME} /tmp/set.orig /tmp/zat.orig; echo nameserver 203.0.113.53 >/etc/resolv.conf")
         for command in (f"iw dev {CARD} disconnect", f"iw dev {CARD} ibss leave", f"ip link set {CARD} down",
-                        f"iw dev {CARD} set type managed", f"ip addr flush dev {CARD}", "pkill -f udhcpc"):
+                        f"iw dev {CARD} set type managed", f"ip addr flush dev {CARD}"):
             subprocess.run(command.split(), capture_output=True, check=False)
         self.begin()
+
+    @staticmethod
+    def _end_dhcp_client():
+        """Ends the tool's own, which a row that failed may have left."""
+        note = RUNTIME / f"dhcp-{CARD}.plist"
+        number = plistlib.loads(note.read_bytes())["Client"]["Number"] if note.exists() else None
+        if number and (words := Path(f"/proc/{number}/cmdline")).exists() and b"udhcpc" in words.read_bytes():
+            os.kill(number, signal.SIGTERM)
 
     def tool(self, *words, seconds=300, **options):
         """Runs the tool; returns its trace and the seconds that it took."""
@@ -174,6 +186,8 @@ class Host:
 class Supplicant(Host):
     """A wpa_supplicant for the one card, with a network of its own; the address is the administrator's."""
     has_home = True
+    not_there = "the network was not found"
+    wrong_key = "the network refused the key"
 
     def start(self):
         path = Path("/etc/wpa_supplicant/lab.conf")
@@ -200,6 +214,8 @@ class Supplicant(Host):
 class NetworkManager(Host):
     """The desktop: NetworkManager on its bus, home by a profile that is on disk."""
     has_home = True
+    not_there = "the network was not found"
+    wrong_key = "the network's key is wrong or missing"
     backend = "wpa_supplicant"
 
     def start(self):

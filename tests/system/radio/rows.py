@@ -160,7 +160,7 @@ def wpa2_wrong_key_then_right(visit):
     visit.remember()
     visit.create("battery staple")
     visit.on_no_network()
-    visit.told("wlan0")
+    visit.told("wlan0", visit.host.wrong_key)
     visit.create("correct horse")
     visit.page()
     visit.back()
@@ -199,7 +199,7 @@ def name_that_nobody_offers(visit):
     visit.remember()
     visit.create()
     visit.on_no_network()
-    visit.told("wlan0")
+    visit.told("wlan0", visit.host.not_there)
     visit.back()
 
 
