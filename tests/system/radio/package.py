@@ -1,5 +1,6 @@
 """The Debian packages, which lie in /report, on a whole Debian with NetworkManager: installed, used, removed."""
 import os
+import subprocess
 import sys
 from pathlib import Path
 
@@ -9,14 +10,15 @@ import rows
 from air import sh
 
 TOOL = "/usr/sbin/location-assistant"
-# What running daemons and the package manager write by themselves.
-OTHERS = ("/run/systemd", "/run/udev", "/run/user", "/run/dbus", "/run/NetworkManager", "/run/wpa_supplicant", "/run/air",
+# What running daemons and the package manager write by themselves; but systemd-networkd is told by files in NETWORKD.
+NETWORKD = "/run/systemd/network"
+OTHERS = ("/run/systemd/*", "/run/udev", "/run/user", "/run/dbus", "/run/NetworkManager", "/run/wpa_supplicant", "/run/air",
           "/run/netns", "/var/lib/NetworkManager", "/var/lib/dpkg", "/var/lib/systemd", "/var/log", "/var/cache", "/tmp/systemd*")
 
 
 def files():
     skipped = " -o ".join(f"-path '{path}'" for path in OTHERS)
-    return set(sh(rf"find / /run /tmp -xdev \( {skipped} \) -prune -o -print").splitlines())
+    return set(sh(rf"find / /run /tmp -xdev \( {skipped} \) ! -path '{NETWORKD}*' -prune -o -print").splitlines())
 
 
 def installed_used_and_removed(visit):
@@ -28,6 +30,15 @@ def installed_used_and_removed(visit):
     os.environ["LA_BINARY"] = TOOL
     visit.offer()
     visit.there_and_back()
+    # From a location that is kept only "restoreZAT" leads back, so the tool has to stay.
+    visit.tool("saveZAT")
+    visit.create()
+    visit.tool("save")
+    removal = subprocess.run(["dpkg", "-r", "location-assistant"], capture_output=True, text=True, check=False)
+    assert removal.returncode != 0 and "restoreZAT" in removal.stderr, removal
+    visit.page()
+    visit.tool("restoreZAT", limit=rows.BACK)
+    visit.as_before()
     assert visit.host.tool("create", "from_intro", visit.name)
     visit.page()
     # Removed at the printer, it leads back first.
