@@ -326,7 +326,7 @@ TEST_F(DirectAgentTest, FollowsItsDhcpClient) {
         EXPECT_EQ("", log());
 
         // The location's own name servers; a client that does not end.
-        offer("export ip=10.50.0.10 dns=10.50.0.53; $hook bound; trap \"\" TERM");
+        offer("trap \"\" TERM; export ip=10.50.0.10 dns=10.50.0.53; $hook bound");
         EXPECT_EQ("", activate(dhcpTree("ServerAddresses = (10.0.0.53)").get()));
         EXPECT_EQ("nameserver 10.0.0.53\n", shell("grep -v '^#' /etc/resolv.conf"));
         EXPECT_EQ("", activate(makeTree({}).get()));
