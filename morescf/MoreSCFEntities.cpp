@@ -61,10 +61,10 @@ OSStatus MoreSCCopyEntities(CFStringRef setID, CFStringRef serviceID, CFArrayRef
     CFDictionaryRef service = nullptr;
     CFMutableArrayRef protocols = nullptr;
     CFMutableArrayRef entities = nullptr;
-    OSStatus err = InTurn([&] { return entityValues != nullptr ? ErrorIfNotGiven(entityProtocols) : 0; },
-                          [&] { return CopyNode(ServiceNode(setID, serviceID), &service); },
-                          [&] { return CFQArrayCreateMutable(&protocols); },
-                          [&] { return CFQArrayCreateMutable(&entities); });
+    OSStatus err = InTurn(
+        OpenSession, [&] { return entityValues != nullptr ? ErrorIfNotGiven(entityProtocols) : 0; },
+        [&] { return CopyNode(ServiceNode(setID, serviceID), &service); },
+        [&] { return CFQArrayCreateMutable(&protocols); }, [&] { return CFQArrayCreateMutable(&entities); });
     if (err == 0) {
         err = ForEachEntity(service, [&](CFTypeRef protocol, CFTypeRef entity) {
             CFArrayAppendValue(protocols, protocol);
@@ -72,6 +72,7 @@ OSStatus MoreSCCopyEntities(CFStringRef setID, CFStringRef serviceID, CFArrayRef
         });
     }
     CFQRelease(service);
+    MoreSCClose(&err, false);
     HandOver<CFArrayRef>(err, protocols, entityProtocols);
     HandOver<CFArrayRef>(err, entities, entityValues);
     return err;
