@@ -305,7 +305,9 @@ void CFQPropertyListShallowApplyFunction(CFPropertyListRef propList,
             const auto index = static_cast<SInt32>(i);
             CFTypeRef value = CFQRetain(CFArrayGetValueAtIndex(array, i));
             CFNumberRef number = CFNumberCreate(kCFAllocatorDefault, kCFNumberLongType, &index);
-            func(number, value, context);
+            if (number != nullptr) {
+                func(number, value, context);
+            }
             CFQRelease(number);
             CFQRelease(value);
         }

@@ -74,10 +74,12 @@ OSStatus AppendServiceIDForEachDHCPDynamicStoreKey(SCDynamicStoreRef store, CFAr
 OSStatus CopyDefaultModemPortBSDName(CFStringRef* bsdName) {
     CFArrayRef ports = nullptr;
     CFStringRef found = nullptr;
+    bool isFound = false;
     OSStatus err = MoreSCCreatePortArray(&ports);
     if (err == 0) {
-        err = ForEach<CFDictionaryRef>(ports, [&found](CFDictionaryRef port) {
-            if (found == nullptr && HasStringValue(port, kHardwareKey, kModemProtocol)) {
+        err = ForEach<CFDictionaryRef>(ports, [&](CFDictionaryRef port) {
+            if (!isFound && HasStringValue(port, kHardwareKey, kModemProtocol)) {
+                isFound = true;
                 found = Retained(GetStringValue(port, kDeviceNameKey));
             }
             return OSStatus{0};
@@ -188,7 +190,8 @@ OSStatus MoreSCCreateActiveDHCPServicesArray(CFArrayRef* activeDHCP) {
         err = MoreSCError(keys);
     }
     if (err == 0) {
-        err = CFQArrayCreateMutable(&serviceIDs);
+        serviceIDs = CFArrayCreateMutable(kCFAllocatorDefault, CFArrayGetCount(keys), &kCFTypeArrayCallBacks);
+        err = ErrorIfMissing(serviceIDs);
     }
     if (err == 0) {
         err = AppendServiceIDForEachDHCPDynamicStoreKey(store, keys, serviceIDs);

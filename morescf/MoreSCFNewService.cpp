@@ -119,6 +119,10 @@ OSStatus AddModemEntity(const NewService& service) {
     if (err == 0) {
         err = AddEntity(service, kModemProtocol, [script](MoreSCDigest* digest) {
             digest->modem = kMoreSCModemDigestDefault;
+            // On for a new service, whatever the defaults say.
+            digest->modem.dataCompressionErrorCorrection = true;
+            digest->modem.speaker = true;
+            digest->modem.waitForDialTone = true;
             digest->modem.connectionScript = script;
         });
     }
