@@ -22,13 +22,13 @@ OSStatus CopyPath(const Node& node, CFStringRef* path) {
 
 // Writes one way or the other, to the path of a node.
 template <class Write>
-OSStatus WriteNode(const Node& node, const void* value, Write write) {
+OSStatus WriteNode(const Node& node, const void* value, Write write, Boolean dirty = true) {
     CFStringRef path = nullptr;
     OSStatus err = InTurn(
         OpenSession, [&] { return ErrorIfNotGiven(value); }, [&] { return CopyPath(node, &path); },
         [&] { return write(path); });
     CFQRelease(path);
-    MoreSCClose(&err, true);
+    MoreSCClose(&err, dirty);
     return err;
 }
 
@@ -72,10 +72,11 @@ OSStatus CopyNodeString(const Node& node, CFStringRef key, CFStringRef* value) {
     return err;
 }
 
-OSStatus StoreNode(const Node& node, CFDictionaryRef dict) {
-    return WriteNode(node, dict, [dict](CFStringRef path) {
+OSStatus StoreNode(const Node& node, CFDictionaryRef dict, Boolean dirty) {
+    const auto write = [dict](CFStringRef path) {
         return MoreSCErrorBoolean(SCPreferencesPathSetValue(MoreSCGetSCPreferencesRef(), path, dict));
-    });
+    };
+    return WriteNode(node, dict, write, dirty);
 }
 
 OSStatus SetNodeProperty(const Node& node, CFStringRef key, CFPropertyListRef value) {

@@ -40,8 +40,9 @@ OSStatus CopyNode(const Node& node, CFDictionaryRef* dict);
 OSStatus CopyNodeMutable(const Node& node, CFMutableDictionaryRef* dict);
 // A string of it; -4960 when there is none under the key.
 OSStatus CopyNodeString(const Node& node, CFStringRef key, CFStringRef* value);
-// Puts the dictionary in the node's place; -50 for null.
-OSStatus StoreNode(const Node& node, CFDictionaryRef dict);
+// Puts the dictionary in the node's place; -50 for null. Not dirty: a step of an operation that marks the
+// session itself, when all of its steps have succeeded.
+OSStatus StoreNode(const Node& node, CFDictionaryRef dict, Boolean dirty = true);
 // Sets one key of a dictionary that is there; -50 for a null value.
 OSStatus SetNodeProperty(const Node& node, CFStringRef key, CFPropertyListRef value);
 

@@ -65,11 +65,17 @@ void RecordSlotName(io_object_t bus, CFMutableDictionaryRef portDict) {
     CFQRelease(rest);
 }
 
-// The registry counts a card's ports from 0, its user from 1.
-void RecordPortNumber(SInt32 index, CFMutableDictionaryRef portDict) {
-    RecordKeyword(
-        portDict, kChildIndexKey,
-        CFStringCreateWithFormat(kCFAllocatorDefault, nullptr, CFSTR("%ld"), static_cast<long>(index) + 1));
+// The registry counts a card's ports from 0, its user from 1. A card that is gone by now has no number.
+void RecordPortNumber(io_object_t bus, CFMutableDictionaryRef portDict) {
+    SInt32 index = 0;
+    CFTypeRef number = CopyProperty(bus, kChildIndexKey, CFNumberGetTypeID());
+    CFStringRef text = nullptr;
+    if (ReadInteger(number, &index)) {
+        text = CFStringCreateWithFormat(kCFAllocatorDefault, nullptr, CFSTR("%ld"),
+                                        static_cast<long>(index) + 1);
+    }
+    RecordKeyword(portDict, kChildIndexKey, text);
+    CFQRelease(number);
 }
 
 OSStatus CopyNameForPCIPort(io_object_t bus, CFDictionaryRef busProperties, CFMutableDictionaryRef portDict,
@@ -78,7 +84,7 @@ OSStatus CopyNameForPCIPort(io_object_t bus, CFDictionaryRef busProperties, CFMu
     CFStringRef name = CFSTR("PCI Ethernet Slot %2$@");
     RecordSlotName(bus, portDict);
     if (ReadInteger(CFDictionaryGetValue(busProperties, kChildIndexKey), &index)) {
-        RecordPortNumber(index, portDict);
+        RecordPortNumber(bus, portDict);
         name = CFSTR("PCI Ethernet Slot %2$@, Port %3$@");
     }
     return Propose(portDict, kSortPCIEthernet, name, proposedName);
@@ -141,11 +147,11 @@ OSStatus CopyUserVisibleNameForEthernetPort(io_object_t entry, CFMutableDictiona
 OSStatus CopyNameForUSBModem(io_object_t entry, CFMutableDictionaryRef portDict, CFStringRef* proposedName) {
     io_object_t device = IO_OBJECT_NULL;
     CFStringRef product = nullptr;
-    OSStatus err = GetParent(entry, &device);
+    OSStatus err = InTurn([&] { return CFQDictionarySetNumber(portDict, kSortOrderKey, kSortUSBModem); },
+                          [&] { return GetParent(entry, &device); });
     if (err == 0) {
         product = CopyStringProperty(device, CFSTR("Product Name"));
-        err =
-            Propose(portDict, kSortUSBModem, product != nullptr ? product : CFSTR("USB Modem"), proposedName);
+        *proposedName = Retained(product != nullptr ? product : CFSTR("USB Modem"));
     }
     CFQRelease(product);
     ReleaseEntry(device);
@@ -191,7 +197,9 @@ OSStatus CopyUserVisibleNameForModemOrSerialPort(io_object_t entry, CFMutableDic
         } else if (CFEqualString(baseName, CFSTR("usbmodem"))) {
             err = CopyNameForUSBModem(entry, portDict, proposedName);
         } else if (*proposedName == nullptr) {
-            RecordKeyword(portDict, kBaseNameKey, CreateLowerCase(baseName));
+            CFStringRef again = CopyStringProperty(entry, kBaseNameKey);
+            RecordKeyword(portDict, kBaseNameKey, again != nullptr ? CreateLowerCase(again) : nullptr);
+            CFQRelease(again);
             *proposedName = Retained(CFSTR("%4$@-port"));
         }
     }

@@ -41,8 +41,10 @@ OSStatus EthernetDeviceToDictProc(void* /*context*/, io_object_t entry, CFMutabl
                           [&] { return CopyRequiredString(entry, kBSDNameKey, &bsdName); });
     if (err == 0) {
         CFDictionarySetValue(portDict, kDeviceNameKey, bsdName);
-        CFDictionarySetValue(portDict, kHardwareKey, kEthernetProtocol);
-        CFDictionarySetValue(portDict, kTypeKey, kEthernetProtocol);
+    }
+    CFDictionarySetValue(portDict, kHardwareKey, kEthernetProtocol);
+    CFDictionarySetValue(portDict, kTypeKey, kEthernetProtocol);
+    if (err == 0) {
         err = GetParent(entry, &controller);
     }
     if (err == 0) {

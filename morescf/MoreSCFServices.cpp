@@ -78,7 +78,7 @@ OSStatus MoreSCCopyServicesDictMutable(CFStringRef setID, CFMutableDictionaryRef
 OSStatus MoreSCSetServicesDict(CFStringRef setID, CFDictionaryRef servicesDict, CFArrayRef serviceOrder) {
     OSStatus err = OpenSession();
     if (err == 0 && servicesDict != nullptr) {
-        err = StoreNode(LinksNode(setID), servicesDict);
+        err = StoreNode(LinksNode(setID), servicesDict, false);
     }
     if (err == 0 && serviceOrder != nullptr) {
         err = SetNodeProperty(OrderNode(setID), kServiceOrderKey, serviceOrder);

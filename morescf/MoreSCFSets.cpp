@@ -15,8 +15,8 @@ namespace {
 OSStatus MakeEmptySetContent(CFStringRef setID) {
     CFMutableDictionaryRef empty = nullptr;
     const OSStatus err = InTurn([&] { return CFQDictionaryCreateMutable(&empty); },
-                                [&] { return StoreNode(LinksNode(setID), empty); },
-                                [&] { return StoreNode(ServiceNode(setID, nullptr), empty); });
+                                [&] { return StoreNode(LinksNode(setID), empty, false); },
+                                [&] { return StoreNode(ServiceNode(setID, nullptr), empty, false); });
     CFQRelease(empty);
     return err;
 }
