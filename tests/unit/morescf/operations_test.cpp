@@ -82,6 +82,7 @@ TEST_F(OperationsTest, Services) {
     on("oneSet", oneSet);
     CALL(MoreSCSetServicesDict(nullptr, dictionary(values[0]), nullptr));
     CALL(MoreSCSetServicesDict(s1, nullptr, arrayOf(values[1])));
+    CALL(MoreSCSetServicesDict(Str("nowhere"), dictionary(values[0]), arrayOf(values[1])));
     CALL(MoreSCCopyServicesDict(s1, &dict, &array));
     CALL(MoreSCCopyServicesDict(s9, &dict, &array));
     CALL(MoreSCCopyServicesDictMutable(s1, &mutableDict, &mutableArray));
