@@ -76,8 +76,10 @@ exec switch_root /new {init}
 """
 
 
-# A booted distribution plays the command in a unit of its own; nobody logs in on its console.
+# A booted distribution plays the command in a unit of its own; nobody logs in on its console, and what the distribution
+# does every night (back up its package lists, say) is not done in the midst of a row.
 UNIT = """
+rm -f /new/etc/systemd/system/timers.target.wants/*
 cat >/new/etc/systemd/system/laboratory.service <<'END'
 [Unit]
 After=multi-user.target
