@@ -11,6 +11,9 @@ namespace {
 // Between two looks at what is on the air when nothing tells of a change.
 constexpr std::chrono::seconds lookAgain{2};
 constexpr std::chrono::seconds scanAgain{3};
+// A supplicant that was looking for the network itself is on it this soon after it was heard. One that waits for
+// the daemon's own look to end would look once more for itself, which takes seconds, unless it is asked anew.
+constexpr std::chrono::milliseconds joinsAtOnce{250};
 
 class ConfiguringCard final : public Card {
   public:
@@ -23,7 +26,6 @@ class ConfiguringCard final : public Card {
         comeToRest,
         becomeReady,
         chooseLink,
-        leaveOther,
         store,
         comeUp,
         search,
@@ -40,8 +42,6 @@ class ConfiguringCard final : public Card {
                 return becomeReady();
             case Stage::chooseLink:
                 return chooseLink();
-            case Stage::leaveOther:
-                return leaveOther();
             case Stage::store:
                 return store();
             case Stage::comeUp:
@@ -183,9 +183,14 @@ class ConfiguringCard final : public Card {
             !link_ || !link_->choice ||
             (decision.choice->isHeard && (isSearching_ || !decision.choice->isSameJoin(*link_->choice)));
         if (!isNew) {
+            if (decision.choice->isHeard && !link_->choice->isHeard) {
+                link_->choice = *decision.choice;
+                askAgainAt_ = Clock::now() + joinsAtOnce;
+            }
             stage_ = isSearching_ ? Stage::search : Stage::comeUp;
             return {};
         }
+        askAgainAt_.reset();
         isSearching_ = false;
         if (!link_) {
             link_.emplace();
@@ -193,26 +198,6 @@ class ConfiguringCard final : public Card {
         link_->choice = *decision.choice;
         // Or it would turn to another one as soon as this one goes away.
         RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(before_.iwdAutoconnect, network()));
-        stage_ = Stage::store;
-        if (!link_->choice->isHeard && isReady_ && active_ && !isOurProfileActive()) {
-            stage_ = Stage::leaveOther;
-            return daemon_.disconnect(device_);
-        }
-        return {};
-    }
-
-    [[nodiscard]] bool isOurProfileActive() const { return active_->uuid == profileUUID(interface_); }
-
-    // A network that is not on the air may have to be waited for. The daemon turns to none of its own accord
-    // from which it was told to disconnect.
-    Outcome leaveOther() {
-        std::uint32_t state = 0;
-        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
-        if (state > deviceDisconnected && !isLate()) {
-            waitUntil(deadline_);
-            return {};
-        }
-        active_.reset();
         stage_ = Stage::store;
         return {};
     }
@@ -292,11 +277,18 @@ class ConfiguringCard final : public Card {
             reasonDeadline_ = Clock::now() + reasonBound;
         } else if (isLate()) {
             return giveUp();
+        } else if (askAgainAt_ && Clock::now() >= *askAgainAt_) {
+            askAgainAt_.reset();
+            RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
+            if (state < deviceGetsAddresses) {
+                active_.reset();
+                stage_ = Stage::store;
+            }
         } else if (link_ && link_->choice &&
                    (changesOnAir_ != daemon_.changesOnAir() || Clock::now() >= lookAgainAt_)) {
             stage_ = Stage::chooseLink;
         } else {
-            waitUntil(link_ && link_->choice ? lookAgainAt_ : deadline_);
+            waitUntil(askAgainAt_.value_or(link_ && link_->choice ? lookAgainAt_ : deadline_));
         }
         return {};
     }
@@ -349,7 +341,8 @@ class ConfiguringCard final : public Card {
             isSearching_ = true;
             active_.reset();
             stage_ = Stage::search;
-            return {};
+            // Or it would turn to another one of its own accord.
+            return daemon_.disconnect(device_);
         }
         const std::uint32_t reason = daemon_.failureOf(device_.path);
         if (reason == 0 && Clock::now() < reasonDeadline_) {
@@ -375,6 +368,7 @@ class ConfiguringCard final : public Card {
     Clock::time_point reasonDeadline_;
     Clock::time_point lookAgainAt_;
     Clock::time_point scanAgainAt_;
+    std::optional<Clock::time_point> askAgainAt_;
     unsigned changesOnAir_ = 0;
     bool isSearching_ = false;
     std::optional<Active> active_;
