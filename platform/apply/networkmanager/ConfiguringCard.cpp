@@ -11,8 +11,8 @@ namespace {
 // Between two looks at what is on the air when nothing tells of a change.
 constexpr std::chrono::seconds lookAgain{2};
 constexpr std::chrono::seconds scanAgain{3};
-// A supplicant that was looking for the network itself is on it this soon after it was heard. One that waits for
-// the daemon's own look to end would look once more for itself, which takes seconds, unless it is asked anew.
+// A supplicant that was looking for the network itself is on it this soon after it was heard. One that
+// waited for the daemon's own look to end would look once more, which takes seconds, unless asked anew.
 constexpr std::chrono::milliseconds joinsAtOnce{250};
 
 class ConfiguringCard final : public Card {
@@ -21,16 +21,7 @@ class ConfiguringCard final : public Card {
         : Card(daemon, task, deadline), plan_(*task.plan), before_(std::move(earlier)) {}
 
   private:
-    enum class Stage {
-        begin,
-        comeToRest,
-        becomeReady,
-        chooseLink,
-        store,
-        comeUp,
-        search,
-        tellFailure
-    };
+    enum class Stage { begin, comeToRest, becomeReady, chooseLink, store, comeUp, search, tellFailure };
 
     Outcome advance() override {
         switch (stage_) {
@@ -243,6 +234,11 @@ class ConfiguringCard final : public Card {
             RETURN_IF_FAILED(daemon_.addProfile(sections, Adding::heldBack, secret, path));
         }
         if (isChanged || !active_ || active_->profile != path) {
+            if (isWireless() && active_ && active_->uuid != profileUUID(interface_)) {
+                // The daemon turns to none of its own accord from which it was told to disconnect, however
+                // long the wanted network stays away.
+                RETURN_IF_FAILED(daemon_.disconnect(device_));
+            }
             active_.emplace().profile = path;
             active_->uuid = profileUUID(interface_);
             RETURN_IF_FAILED(daemon_.activate(path, device_, active_->path));

@@ -13,7 +13,8 @@ TOOL = "/usr/sbin/location-assistant"
 # What running daemons and the package manager write by themselves; but systemd-networkd is told by files in NETWORKD.
 NETWORKD = "/run/systemd/network"
 OTHERS = ("/run/systemd/*", "/run/udev", "/run/user", "/run/dbus", "/run/NetworkManager", "/run/wpa_supplicant", "/run/air",
-          "/run/netns", "/var/lib/NetworkManager", "/var/lib/dpkg", "/var/lib/systemd", "/var/log", "/var/cache", "/tmp/systemd*")
+          "/run/netns", "/var/lib/NetworkManager", "/var/lib/dpkg", "/var/lib/systemd", "/var/log", "/var/cache", "/var/backups",
+          "/tmp/systemd*", "/var/tmp/systemd*")
 
 
 def files():

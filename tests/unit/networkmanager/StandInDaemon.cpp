@@ -193,6 +193,7 @@ void StandInDaemon::activate(const std::string& profile, sd_bus_message* reply) 
     objects[card]["ActiveConnection"] = {path};
     objects[card]["Autoconnect"] = {true};
     sd_bus_message_append(reply, "o", path.c_str());
+    const bool isLooking = !quietPoints_.empty();
     for (const std::string& point : std::exchange(quietPoints_, {})) {
         points_.push_back(point);
     }
@@ -203,7 +204,7 @@ void StandInDaemon::activate(const std::string& profile, sd_bus_message* reply) 
         moveCard(deviceFailed, failure);
         objects[card].erase("ActiveConnection");
         moveCard(deviceDisconnected);
-    } else {
+    } else if (!isLooking) {
         moveCard(deviceGetsAddresses);
         if (!hangs) {
             moveCard(deviceActivated);

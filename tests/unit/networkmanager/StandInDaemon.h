@@ -43,7 +43,8 @@ class StandInDaemon {
     // The properties of each object, of all its interfaces together.
     std::map<std::string, platform::apply::Dictionary> objects;
     std::map<std::string, platform::apply::Sections> profiles;  // by path, with secrets
-    // A network on the air; one that keeps quiet is told of once a profile was activated.
+    // A network on the air; one that keeps quiet is told of once a profile was activated, and joined when
+    // asked again.
     void offer(const std::string& network, std::uint32_t mode, std::uint32_t privacy,
                std::uint32_t protection, bool isQuiet = false);
     // What the next requests meet. Set these between requests.
