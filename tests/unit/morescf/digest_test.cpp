@@ -4,7 +4,8 @@
 
 #include <cstring>
 
-#include "tests/unit/morescf/Calls.h"
+#include "tests/unit/morescf/Fixture.h"
+#include "tests/unit/support/Transcript.h"
 
 // NOLINTNEXTLINE(bugprone-macro-parentheses): an initializer.
 #define BUILD(protocol, member, ...)                  \
@@ -76,34 +77,6 @@ TEST_F(DigestTest, EveryMemberHasItsKeyAndPlace) {
     record("unknown", MoreSCCreateEntity, CFSTR("NetInfo"), &zeros);
     record("null", MoreSCCreateEntity, nullptr, &zeros);
     record("null global", MoreSCCreateGlobalEntity, nullptr, &globalZeros);
-}
-
-TEST(DigestConversions, MacAddressesAndPasswords) {
-    const struct {
-        const char* text;
-        OSStatus err;
-        const char* again;
-    } addresses[] = {
-        {"00:0A:95:9d:68:16", 0, "00:0a:95:9d:68:16"},
-        {"0:a:95:9D:68:ff", 0, "00:0a:95:9d:68:ff"},
-        {"00:0a:95:9d:68:16 ", -4960, nullptr},
-        {"00:0a:95:9d:68", -1, nullptr},
-        {"00:0a:95:9d:6é", -4960, nullptr},
-        {"", -1, nullptr},
-    };
-    for (const auto& row : addresses) {
-        UInt8 bytes[6] = {1, 2, 3, 4, 5, 6};
-        EXPECT_EQ(row.err, MoreSCFStringToMacAddress(Str(row.text), bytes)) << row.text;
-        Output<CFStringRef> again;
-        EXPECT_EQ(0, MoreSCFCreateStringWithMacAddress(bytes, &again));
-        EXPECT_EQ(row.err == 0 ? row.again : "01:02:03:04:05:06", again.shown());
-    }
-    for (const auto& [password, stored] :
-         {std::pair("", "<>"), {"x", "<0078>"}, {"\U0001F512", "<d83ddd12>"}}) {
-        Output<CFDataRef> data;
-        EXPECT_EQ(0, MoreSCFCopyEncodedPPPPassword(Str(password), &data));
-        EXPECT_EQ(stored, data.shown());
-    }
 }
 
 }  // namespace

@@ -4,6 +4,7 @@
 #include <chrono>
 #include <thread>
 
+#include "morescf/MoreSCFHelpers.h"
 #include "platform/base/FileDescriptor.h"
 #include "tests/unit/morescf/Fixture.h"
 
@@ -113,6 +114,17 @@ TEST_F(SessionTest, LocksForAsLongAsTheOutermostUse) {
     MoreSCClose(&err, false);
     EXPECT_TRUE(isFree());
     CFRelease(session);
+}
+
+TEST_F(SessionTest, ReleaseIsTwoCommitsAndTwoApplies) {
+    EXPECT_EQ(0, MoreSCDHCPRelease(Str("5")));
+    EXPECT_EQ((std::vector<std::string>{"eth0: idle -> ours: none 0", "eth0: ours: none 0 -> ours: dhcp 0"}),
+              agent->changes);
+    EXPECT_EQ(std::string::npos, tree().find("__INACTIVE__"));
+    agent->failing.insert("takeOver eth0");
+    EXPECT_EQ(kSCStatusFailed, MoreSCDHCPRelease(Str("5")));
+    EXPECT_NE(std::string::npos, tree().find("__INACTIVE__")) << "not switched on again after a failure";
+    EXPECT_EQ(-50, MoreSCDHCPRelease(nullptr));
 }
 
 }  // namespace

@@ -75,6 +75,28 @@ class Transcript {
         }
     }
 
+    // A whole file of steps: each line behind "$ " is played, and what that returns stands behind it. A line
+    // that begins with more blanks goes on with the one above. Comments and blank lines stay.
+    void playItself(const std::function<std::string(const std::string&)>& play) {
+        std::istringstream lines(expected_);
+        Inputs steps, shown;
+        for (std::string line; std::getline(lines, line);) {
+            if (line.starts_with("$  ") && !steps.empty()) {
+                steps.back() += line.substr(2);
+                shown.back() += "\n" + line;
+            } else if (line.empty() || line[0] == '#' || line[0] == '$') {
+                steps.push_back(line);
+                shown.push_back(line);
+            }
+        }
+        EXPECT_FALSE(steps.empty()) << path_ << " has nothing to play";
+        for (std::size_t i = 0; i < steps.size(); ++i) {
+            add(shown[i]);
+            const std::string outcome = steps[i].starts_with("$ ") ? play(steps[i].substr(2)) : "";
+            text_ += outcome.empty() ? "" : outcome + "\n";
+        }
+    }
+
   private:
     static Inputs inputsIn(std::string_view line) {
         const std::size_t end = line.find(" | ");
