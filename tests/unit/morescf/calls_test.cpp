@@ -162,10 +162,7 @@ class Calls : public MoreSCFTest, public testing::WithParamInterface<const char*
     // What holds for all calls to come.
     const std::map<std::string, std::function<void(const std::string&)>> arrangements = {
         {"tree", [this](const std::string& notation) { tree_ = notation; }},
-        {"card", [this](const std::string& name) { sysfs.addPciEthernet(name, "0000:03:00.0"); }},
-        {"wireless-card", [this](const std::string& name) { sysfs.addPciWireless(name, "0000:04:00.0"); }},
-        {"serial-port", [this](const std::string& name) { sysfs.addSerial(name); }},
-        {"usb-modem", [this](const std::string& name) { sysfs.addUsbSerial(name, "1-2", ""); }},
+        {"sysfs", [this](const std::string& line) { sysfs.make(line); }},
         {"hook", [](const std::string&) { MoreSCFSetPortNameCallback(TakeTypeOfWirelessPort); }},
         {"script", [this](const std::string& path) { (void)directory.write("scripts/" + path, ""); }},
         {"scripts",

@@ -71,7 +71,12 @@ class Transcript {
         std::getline(lines, line);
         for (add(line); std::getline(lines, line) && !line.starts_with("=== ");) {
             const std::string input = line.substr(0, line.find(" => "));
-            add(line.empty() || line[0] == '#' ? line : input + " => " + outcomeOf(inputsIn(input)));
+            if (line.empty() || line[0] == '#') {
+                add(line);
+            } else if (line[0] != '\t') {
+                const std::string outcome = outcomeOf(inputsIn(input));
+                add(outcome.empty() ? line : input + " => " + outcome);
+            }
         }
     }
 
