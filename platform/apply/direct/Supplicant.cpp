@@ -206,15 +206,22 @@ class SupplicantJoin final : public WirelessJoin {
     steady_clock::time_point nextScan_ = steady_clock::now() + scanAgain;
 };
 
-// The card goes back to one of its own networks by itself.
+// The card goes back to one of its own networks by itself, unless a scan hears none.
 class SupplicantReturn final : public WirelessJoin {
   public:
     explicit SupplicantReturn(SupplicantSocket socket) : socket_(std::move(socket)) {}
 
+    Outcome start() { return socket_.order("ATTACH", "tell what happens"); }
+
     Outcome poll(State& state, std::string& reason) override {
-        state = State::waiting;
+        std::vector<std::string> notices;
+        RETURN_IF_FAILED(socket_.takeNotices(notices));
+        const bool isAnyThere = std::ranges::none_of(notices, [](const std::string& notice) {
+            return notice.find("CTRL-EVENT-NETWORK-NOT-FOUND") != std::string::npos;
+        });
+        state = isAnyThere ? State::waiting : State::givenUp;
         reason = "the wireless network of before is not there now, and is joined when it comes";
-        if (steady_clock::now() < nextLook_) {
+        if (!isAnyThere || steady_clock::now() < nextLook_) {
             return {};
         }
         nextLook_ = steady_clock::now() + lookAgain;
@@ -310,7 +317,9 @@ Outcome leaveBySupplicant(const std::string& interface, const std::optional<Know
         RETURN_IF_FAILED(supplicant.removeNetwork(network.number));
     }
     if (before && before->isOnOne) {
-        join = std::make_unique<SupplicantReturn>(std::move(supplicant));
+        auto started = std::make_unique<SupplicantReturn>(std::move(supplicant));
+        RETURN_IF_FAILED(started->start());
+        join = std::move(started);
     }
     return {};
 }

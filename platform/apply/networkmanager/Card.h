@@ -98,5 +98,8 @@ inline constexpr std::chrono::seconds radioBound{5};
 inline constexpr std::chrono::seconds placeBound{4};
 // What a card says about its failure comes right after what its profile says.
 inline constexpr std::chrono::milliseconds reasonBound{250};
+// A supplicant that was looking for the network itself is on it this soon after it was heard. One that
+// waited for the daemon's own look to end would look once more, which takes seconds, unless asked anew.
+inline constexpr std::chrono::milliseconds joinsAtOnce{250};
 
 }  // namespace platform::apply

@@ -11,9 +11,6 @@ namespace {
 // Between two looks at what is on the air when nothing tells of a change.
 constexpr std::chrono::seconds lookAgain{2};
 constexpr std::chrono::seconds scanAgain{3};
-// A supplicant that was looking for the network itself is on it this soon after it was heard. One that
-// waited for the daemon's own look to end would look once more, which takes seconds, unless asked anew.
-constexpr std::chrono::milliseconds joinsAtOnce{250};
 
 class ConfiguringCard final : public Card {
   public:
@@ -174,13 +171,17 @@ class ConfiguringCard final : public Card {
             !link_ || !link_->choice ||
             (decision.choice->isHeard && (isSearching_ || !decision.choice->isSameJoin(*link_->choice)));
         if (!isNew) {
-            if (decision.choice->isHeard && !link_->choice->isHeard) {
+            std::int64_t lastScan = 0;
+            RETURN_IF_FAILED(daemon_.readLastScan(device_, lastScan));
+            if (decision.choice->isHeard && lastScan != lastScan_ && !isAskedAgain_) {
                 link_->choice = *decision.choice;
+                isAskedAgain_ = true;
                 askAgainAt_ = Clock::now() + joinsAtOnce;
             }
             stage_ = isSearching_ ? Stage::search : Stage::comeUp;
             return {};
         }
+        isAskedAgain_ = false;
         askAgainAt_.reset();
         isSearching_ = false;
         if (!link_) {
@@ -241,6 +242,9 @@ class ConfiguringCard final : public Card {
             }
             active_.emplace().profile = path;
             active_->uuid = profileUUID(interface_);
+            if (isWireless()) {
+                RETURN_IF_FAILED(daemon_.readLastScan(device_, lastScan_));
+            }
             RETURN_IF_FAILED(daemon_.activate(path, device_, active_->path));
         }
         stage_ = Stage::comeUp;
@@ -364,6 +368,8 @@ class ConfiguringCard final : public Card {
     Clock::time_point reasonDeadline_;
     Clock::time_point lookAgainAt_;
     Clock::time_point scanAgainAt_;
+    std::int64_t lastScan_ = 0;  // when it was asked to join
+    bool isAskedAgain_ = false;
     std::optional<Clock::time_point> askAgainAt_;
     unsigned changesOnAir_ = 0;
     bool isSearching_ = false;

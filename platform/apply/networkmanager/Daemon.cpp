@@ -382,6 +382,13 @@ Outcome Daemon::readHeard(const Device& device, const std::string& network,
     return {};
 }
 
+Outcome Daemon::readLastScan(const Device& device, std::int64_t& time) {
+    Dictionary card;
+    RETURN_IF_FAILED(bus_.readProperties(device.path, wirelessInterface, card));
+    time = valueOf<std::int64_t>(card, "LastScan").value_or(-1);
+    return {};
+}
+
 Outcome Daemon::scanFor(const Device& device, const std::string& network) {
     const auto byName = [&network](sd_bus_message* m) {
         int result = sd_bus_message_open_container(m, 'a', "{sv}");

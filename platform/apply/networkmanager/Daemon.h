@@ -111,6 +111,8 @@ class Daemon {
     Outcome setRadio(bool on);
     // The networks of this name that the card hears, with their ages.
     Outcome readHeard(const Device& device, const std::string& network, std::vector<HeardNetwork>& heard);
+    // When the card's last scan ended, in ms since the computer's start; -1 when it has made none.
+    Outcome readLastScan(const Device& device, std::int64_t& time);
     // Has the card look for the network by its name, which one that does not announce itself answers to.
     // Success when the daemon does not look now.
     Outcome scanFor(const Device& device, const std::string& network);

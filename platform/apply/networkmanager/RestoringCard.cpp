@@ -110,6 +110,7 @@ class RestoringCard final : public Card {
             return {};
         }
         profile_ = profile->path;
+        network_ = networkOf(profile->sections);
         placeDeadline_ = Clock::now() + placeBound;
         stage_ = Stage::awaitPlace;
         return {};
@@ -120,6 +121,11 @@ class RestoringCard final : public Card {
         if (!isBack && place_->before && !place_->before->isTaken && Clock::now() < placeDeadline_) {
             waitUntil(placeDeadline_);
             return {};
+        }
+        askedAt_ = Clock::now();
+        changesOnAir_ = daemon_.changesOnAir();
+        if (!network_.empty()) {
+            RETURN_IF_FAILED(daemon_.readLastScan(device_, lastScan_));
         }
         if (!isBack) {
             active_.emplace().uuid = before().uuid;
@@ -148,8 +154,38 @@ class RestoringCard final : public Card {
         } else if (isLate()) {
             task_.trouble = "the profile that was active before is not up yet; NetworkManager goes on";
             stage_ = Stage::finish;
+        } else if (before_.wasUp && !network_.empty() && !askAgainAt_ && cardState < deviceGetsAddresses &&
+                   changesOnAir_ != daemon_.changesOnAir()) {
+            return lookAgain();
+        } else if (!isAskedAgain_ && askAgainAt_ && Clock::now() >= *askAgainAt_) {
+            isAskedAgain_ = true;
+            if (cardState < deviceGetsAddresses) {
+                return daemon_.activate(profile_, device_, active_->path);
+            }
         } else {
-            waitUntil(before_.wasUp ? deadline_ : placeDeadline_);
+            waitUntil(askAgainAt_ && !isAskedAgain_ ? *askAgainAt_
+                      : before_.wasUp               ? deadline_
+                                                    : placeDeadline_);
+        }
+        return {};
+    }
+
+    // What a whole scan does not hear is not waited for.
+    Outcome lookAgain() {
+        changesOnAir_ = daemon_.changesOnAir();
+        std::int64_t lastScan = 0;
+        std::vector<HeardNetwork> heard;
+        RETURN_IF_FAILED(daemon_.readLastScan(device_, lastScan));
+        RETURN_IF_FAILED(daemon_.readHeard(device_, network_, heard));
+        if (std::exchange(lastScan_, lastScan) == lastScan) {
+            return {};
+        }
+        const auto sinceThen = Clock::now() - askedAt_ + std::chrono::seconds(1);
+        if (std::ranges::any_of(heard, [&](const HeardNetwork& one) { return one.age <= sinceThen; })) {
+            askAgainAt_ = Clock::now() + joinsAtOnce;
+        } else {
+            task_.trouble = "the network of before is not there now, and is joined when it comes";
+            stage_ = Stage::finish;
         }
         return {};
     }
@@ -207,6 +243,12 @@ class RestoringCard final : public Card {
     Clock::time_point readyDeadline_;
     Clock::time_point reasonDeadline_;
     std::optional<Active> active_;
+    std::string network_;  // of the earlier profile; empty for a wired card
+    Clock::time_point askedAt_;
+    std::int64_t lastScan_ = 0;
+    unsigned changesOnAir_ = 0;
+    std::optional<Clock::time_point> askAgainAt_;
+    bool isAskedAgain_ = false;
 };
 
 }  // namespace

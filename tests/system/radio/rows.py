@@ -264,7 +264,8 @@ def home_is_gone(visit):
     visit.create()
     visit.page()
     visit.host.home.stop()
-    visit.tool("remove", limit=BACK)
+    # Time for a scan or two; a home network that is to be waited for has longer.
+    visit.tool("remove", limit=10)
     visit.on_no_network()
     visit.host.home.start()
     visit.as_before(within=AGAIN)

@@ -196,6 +196,11 @@ void StandInDaemon::activate(const std::string& profile, sd_bus_message* reply) 
     const bool isLooking = !quietPoints_.empty();
     for (const std::string& point : std::exchange(quietPoints_, {})) {
         points_.push_back(point);
+        objects[card]["LastScan"] = {std::int64_t{++next_}};
+        sd_bus_message* made = nullptr;
+        sd_bus_message_new_signal(bus_, &made, card.c_str(), (prefix + ".Device.Wireless").c_str(),
+                                  "AccessPointAdded");
+        signals_.emplace_back(made);
     }
     moveCard(40);
     moveActive(path, 1);
