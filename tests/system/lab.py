@@ -357,7 +357,8 @@ class Lab:
         for key in ("addresses", "routes"):
             state[key].sort()
         if self.by_daemon:
-            fields = "GENERAL.DEVICE,GENERAL.STATE,GENERAL.CONNECTION,GENERAL.AUTOCONNECT,GENERAL.NM-MANAGED"
+            fields = ",".join("GENERAL." + each for each in
+                              ("DEVICE", "STATE", "CONNECTION", "CON-UUID", "AUTOCONNECT", "NM-MANAGED"))
             state["devices"] = [self.nmcli(f"-f {fields} device show {card}") for card in self.cards]
             state["profiles"] = [line for line in self.nmcli("-f NAME,UUID,AUTOCONNECT,DEVICE,FILENAME connection")
                                  .splitlines() if not line.startswith("lo:")]

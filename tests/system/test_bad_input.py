@@ -101,7 +101,8 @@ class Canary(lab.LabTest):
             if mode != "auto":
                 self.assertIn(forms[1], b"".join(each.get("AirPort", {}).get("AuthPassword", b"")
                                                  for each in self.lab.store()["NetworkServices"].values()))
-            self.assertNotIn(forms[0], out + seen + "".join(self.lab.syslog).encode())
+            logs = "".join(self.lab.syslog) + self.lab.file("networkmanager.log")
+            self.assertNotIn(forms[0], out + seen + logs.encode())
             # A checkout that lies under one of the folders names the password itself.
             passed_over = {lab.STORE, lab.LAB, Path("/run/netns"), lab.PROJECT, lab.BINARY.parent}
             for folder in "/tmp", "/run", "/var/lib", "/etc":
@@ -109,6 +110,10 @@ class Canary(lab.LabTest):
                     if path.is_file() and os.access(path, os.R_OK) and not passed_over & {path, *path.parents}:
                         content = path.read_bytes()
                         self.assertFalse(any(form in content for form in forms), path)
+
+
+class CanaryOfTheDaemon(Canary):
+    options = Canary.options | {"daemon": True}
 
 
 if __name__ == "__main__":
