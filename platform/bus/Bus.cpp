@@ -201,7 +201,7 @@ Outcome Bus::readProperties(const std::string& path, const std::string& interfac
     if (!outcome.ok()) {
         return outcome;
     }
-    const int result = readDictionary(reply.get(), properties);
+    const int result = readValue(reply.get(), properties);
     return result < 0 ? fromBus("the properties of " + path, result) : Outcome();
 }
 
@@ -214,7 +214,7 @@ Outcome Bus::setProperty(const std::string& path, const std::string& interface, 
                             [&](sd_bus_message* m) {
                                 const int result =
                                     sd_bus_message_append(m, "ss", interface.c_str(), property);
-                                return result < 0 ? result : appendVariant(m, value);
+                                return result < 0 ? result : appendValue(m, value);
                             },
                             {}},
                            reply);

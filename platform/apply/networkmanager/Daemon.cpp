@@ -193,7 +193,7 @@ Outcome Daemon::readProfile(const std::string& path, std::optional<Profile>& pro
     }
     if (outcome.ok()) {
         profile.emplace().path = path;
-        if (readSections(reply.get(), profile->sections) < 0) {
+        if (readValue(reply.get(), profile->sections) < 0) {
             return unreadable("GetSettings");
         }
     }
@@ -239,7 +239,7 @@ Outcome Daemon::readSecrets(const std::string& profile, Sections& sections) {
         if (!outcome.ok()) {
             return outcome;
         }
-        if (readSections(reply.get(), secrets) < 0) {
+        if (readValue(reply.get(), secrets) < 0) {
             return unreadable("GetSecrets");
         }
         if (const auto found = secrets.find(name); found != secrets.end()) {
@@ -257,7 +257,7 @@ Outcome Daemon::addProfile(const Sections& sections, Adding adding, std::string_
     RETURN_IF_FAILED(call(
         settingsPath, settingsInterface, "AddConnection2",
         [&sections, flags](sd_bus_message* message) {
-            const int result = appendSections(message, sections);
+            const int result = appendValue(message, sections);
             return result < 0 ? result : sd_bus_message_append(message, "ua{sv}", flags, 0);
         },
         reply, nullptr, secret));
@@ -269,7 +269,7 @@ Outcome Daemon::updateProfile(const std::string& path, const Sections& sections,
     return call(
         path, profileInterface, "Update2",
         [&sections](sd_bus_message* message) {
-            const int result = appendSections(message, sections);
+            const int result = appendValue(message, sections);
             return result < 0 ? result
                               : sd_bus_message_append(message, "ua{sv}", inMemory | blockAutoconnect, 0);
         },
@@ -352,7 +352,7 @@ Outcome Daemon::readHeard(const Device& device, const std::string& network,
     Message reply;
     RETURN_IF_FAILED(call(device.path, wirelessInterface, "GetAllAccessPoints", {}, reply));
     Texts paths;
-    if (readTexts(reply.get(), paths) < 0) {
+    if (readValue(reply.get(), paths) < 0) {
         return unreadable("GetAllAccessPoints");
     }
     paths.resize(std::min(paths.size(), mostAccessPoints));
@@ -390,25 +390,18 @@ Outcome Daemon::readLastScan(const Device& device, std::int64_t& time) {
 }
 
 Outcome Daemon::scanFor(const Device& device, const std::string& network) {
-    const auto byName = [&network](sd_bus_message* m) {
-        int result = sd_bus_message_open_container(m, 'a', "{sv}");
-        result = result < 0 ? result : sd_bus_message_open_container(m, 'e', "sv");
-        result = result < 0 ? result : sd_bus_message_append(m, "s", "ssids");
-        result = result < 0 ? result : sd_bus_message_open_container(m, 'v', "aay");
-        result = result < 0 ? result : sd_bus_message_open_container(m, 'a', "ay");
-        result = result < 0 ? result : sd_bus_message_append_array(m, 'y', network.data(), network.size());
-        for (int depth = 0; depth < 4; ++depth) {
-            result = result < 0 ? result : sd_bus_message_close_container(m);
-        }
-        return result;
-    };
-    const auto byNoName = [](sd_bus_message* m) { return sd_bus_message_append(m, "a{sv}", 0); };
+    const Dictionary byName{{"ssids", {std::vector<Bytes>{Bytes(network.begin(), network.end())}}}};
     Message reply;
     std::string error;
-    Outcome outcome = call(device.path, wirelessInterface, "RequestScan", byName, reply, &error);
-    if (!error.empty()) {
-        // Not every daemon below it can call out for a name.
-        outcome = call(device.path, wirelessInterface, "RequestScan", byNoName, reply, &error);
+    Outcome outcome;
+    // Not every daemon below it can call out for a name.
+    for (const Dictionary& options : {byName, Dictionary()}) {
+        outcome = call(
+            device.path, wirelessInterface, "RequestScan",
+            [&options](sd_bus_message* message) { return appendValue(message, options); }, reply, &error);
+        if (error.empty()) {
+            break;
+        }
     }
     // It has just looked, or is busy with joining, for which it looks by itself.
     return error.empty() ? outcome : Outcome();

@@ -22,7 +22,7 @@ using bus::Bus;
 using bus::Clock;
 using bus::Dictionary;
 using bus::Message;
-using bus::readTexts;
+using bus::readValue;
 using bus::Sections;
 using bus::Texts;
 using bus::Value;

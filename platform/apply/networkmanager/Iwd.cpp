@@ -30,21 +30,17 @@ Outcome Iwd::readKnown(std::vector<KnownNetwork>& known) {
     bus::Message reply;
     RETURN_IF_FAILED(
         bus_.call({"/", "org.freedesktop.DBus.ObjectManager", "GetManagedObjects", {}, {}}, reply));
-    sd_bus_message* const objects = reply.get();
-    int result = sd_bus_message_enter_container(objects, 'a', "{oa{sa{sv}}}");
-    while (result >= 0 && (result = sd_bus_message_enter_container(objects, 'e', "oa{sa{sv}}")) > 0) {
-        const char* path = nullptr;
-        bus::Sections interfaces;
-        result = sd_bus_message_read_basic(objects, 'o', &path);
-        result = result < 0 ? result : readSections(objects, interfaces);
-        if (const auto found = interfaces.find(knownNetworkInterface);
-            result >= 0 && found != interfaces.end()) {
+    bus::Objects objects;
+    if (bus::readValue(reply.get(), objects) < 0) {
+        return {kSCStatusFailed, "the networks that iwd knows cannot be read"};
+    }
+    for (const auto& [path, interfaces] : objects) {
+        if (const auto found = interfaces.find(knownNetworkInterface); found != interfaces.end()) {
             known.push_back({path, bus::valueOf<std::string>(found->second, "Name").value_or(""),
                              bus::valueOf<bool>(found->second, autoconnectProperty).value_or(false)});
         }
-        result = result < 0 ? result : sd_bus_message_exit_container(objects);
     }
-    return result < 0 ? Outcome(kSCStatusFailed, "the networks that iwd knows cannot be read") : Outcome();
+    return {};
 }
 
 Outcome Iwd::readAutoconnect(std::vector<std::string>& networks) {

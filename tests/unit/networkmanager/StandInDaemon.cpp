@@ -111,7 +111,7 @@ std::string StandInDaemon::answer(sd_bus_message* call, sd_bus_message* reply) {
     const std::string path = sd_bus_message_get_path(call);
     const std::string member = sd_bus_message_get_member(call);
     if (member == "GetAll" && objects.contains(path)) {
-        appendDictionary(reply, objects[path]);
+        appendValue(reply, objects[path]);
     } else if (member == "GetDeviceByIpIface") {
         if (readText(call) != "wlan0") {
             return ".UnknownDevice";
@@ -126,7 +126,7 @@ std::string StandInDaemon::answer(sd_bus_message* call, sd_bus_message* reply) {
         }
         sd_bus_message_append(reply, "o", found->first.c_str());
     } else if (profiles.contains(path) && (member == "GetSettings" || member == "GetSecrets")) {
-        appendSections(reply, pick(profiles[path], member == "GetSecrets"));
+        appendValue(reply, pick(profiles[path], member == "GetSecrets"));
     } else if (member == "GetAllAccessPoints") {
         sd_bus_message_open_container(reply, 'a', "o");
         for (const std::string& point : points_) {
@@ -156,13 +156,13 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
         std::uint32_t flags = 0;
         const std::string added = manager + "/Settings/" + std::to_string(++next_);
         objects[added];
-        readSections(call, profiles[added]);
+        readValue(call, profiles[added]);
         sd_bus_message_read(call, "u", &flags);
         changes.back() += (flags & 0x20U) != 0 ? " held back" : "";
         sd_bus_message_append(reply, "oa{sv}", added.c_str(), 0);
     } else if (member == "Update2") {
         profiles[path].clear();
-        readSections(call, profiles[path]);
+        readValue(call, profiles[path]);
         sd_bus_message_append(reply, "a{sv}", 0);
     } else if (member == "Delete") {
         profiles.erase(path);
