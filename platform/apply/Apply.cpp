@@ -11,6 +11,7 @@
 #include "platform/apply/StateFile.h"
 #include "platform/base/FileLock.h"
 #include "platform/base/Log.h"
+#include "platform/values/Fields.h"
 
 namespace platform::apply {
 namespace {
@@ -235,7 +236,7 @@ class Run {
             logFor(LogLevel::warning, interface, reason);
         }
         record_.entries.push_back({"",
-                                   {interface, DictionaryBuilder().take()},
+                                   {interface, values::FieldWriter().take()},
                                    withoutKey(*wanted(interface), record_.salt),
                                    true});
     }

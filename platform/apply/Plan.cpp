@@ -35,8 +35,8 @@ CFDictionaryRef memberAtPath(CFDictionaryRef root, const std::string& path, cons
     if (path.compare(0, prefix.size(), prefix) != 0 || path.find('/', prefix.size()) != std::string::npos) {
         return nullptr;
     }
-    const auto topKey = makeString(top);
-    const auto key = makeString(path.substr(prefix.size()));
+    const auto topKey = values::makeString(top);
+    const auto key = values::makeString(path.substr(prefix.size()));
     return topKey && key ? dictionaryIn(dictionaryIn(root, topKey.get()), key.get()) : nullptr;
 }
 
@@ -78,93 +78,62 @@ unsigned classPrefix(IPv4Address address) {
     return number < 0x80000000U ? 8 : number < 0xC0000000U ? 16 : 24;
 }
 
-void appendUTF8(std::string& text, std::uint32_t c) {
-    if (c < 0x80) {
-        text += static_cast<char>(c);
-    } else if (c < 0x800) {
-        text += static_cast<char>(0xC0U | (c >> 6U));
-        text += static_cast<char>(0x80U | (c & 0x3FU));
-    } else if (c < 0x10000) {
-        text += static_cast<char>(0xE0U | (c >> 12U));
-        text += static_cast<char>(0x80U | ((c >> 6U) & 0x3FU));
-        text += static_cast<char>(0x80U | (c & 0x3FU));
-    } else {
-        text += static_cast<char>(0xF0U | (c >> 18U));
-        text += static_cast<char>(0x80U | ((c >> 12U) & 0x3FU));
-        text += static_cast<char>(0x80U | ((c >> 6U) & 0x3FU));
-        text += static_cast<char>(0x80U | (c & 0x3FU));
-    }
-}
-
 // The stored form of a password: UTF-16 units, the high byte first.
-std::optional<std::string> decodeKey(std::span<const std::byte> data) {
-    if (data.size() % 2 != 0 || data.size() > longestKey) {
+std::optional<std::string> decodeKey(CFDataRef data) {
+    const auto size = data == nullptr ? 1 : static_cast<std::size_t>(CFDataGetLength(data));
+    if (size % 2 != 0 || size > longestKey) {
         return std::nullopt;
     }
-    std::string text;
-    std::uint32_t high = 0;
-    for (std::size_t i = 0; i < data.size(); i += 2) {
-        const std::uint32_t unit =
-            (std::to_integer<std::uint32_t>(data[i]) << 8U) | std::to_integer<std::uint32_t>(data[i + 1]);
-        const bool isLow = unit >= 0xDC00 && unit < 0xE000;
-        if (isLow != (high != 0)) {
-            return std::nullopt;
-        }
-        if (unit >= 0xD800 && unit < 0xDC00) {
-            high = unit;
-            continue;
-        }
-        appendUTF8(text, high == 0 ? unit : 0x10000U + ((high - 0xD800U) << 10U) + (unit - 0xDC00U));
-        high = 0;
+    const UInt8* const bytes = CFDataGetBytePtr(data);
+    std::vector<UniChar> units;
+    for (std::size_t i = 0; i < size; i += 2) {
+        units.push_back(static_cast<UniChar>((bytes[i] << 8U) | bytes[i + 1]));
     }
-    return high == 0 ? std::optional(text) : std::nullopt;
+    const auto text = values::Owned<CFStringRef>::adopt(
+        CFStringCreateWithCharacters(nullptr, units.data(), static_cast<CFIndex>(units.size())));
+    return asText(text.get());
 }
 
-bool canBeDomain(const std::string& name) {
-    return !name.empty() && name.size() <= 253 && std::all_of(name.begin(), name.end(), [](unsigned char c) {
-        return std::isalnum(c) != 0 || c == '.' || c == '-' || c == '_';
-    });
+std::optional<std::string> parseDomain(CFTypeRef value) {
+    std::optional<std::string> name = asText(value);
+    const bool isUsable =
+        name && !name->empty() && name->size() <= 253 && std::ranges::all_of(*name, [](unsigned char c) {
+            return std::isalnum(c) != 0 || c == '.' || c == '-' || c == '_';
+        });
+    return isUsable ? name : std::nullopt;
 }
 
-// Walks an array that may be absent; anything else than an array of a bearable size fails.
-template <class Each>
-bool forEach(CFDictionaryRef entity, CFStringRef key, const Each& each) {
-    if (valueIn(entity, key) == nullptr) {
-        return true;
-    }
-    CFArrayRef const array = arrayIn(entity, key);
+// Reads an array that may be absent. False for anything else, for one of an unbearable size, and when one of
+// its values cannot be read.
+template <class T>
+bool readList(CFDictionaryRef entity, CFStringRef key, std::optional<T> (*parse)(CFTypeRef),
+              std::vector<T>& list) {
+    const auto array = values::as<CFArrayRef>(valueIn(entity, key));
     if (array == nullptr || CFArrayGetCount(array) > mostAddresses) {
-        return false;
+        return valueIn(entity, key) == nullptr;
     }
-    for (CFIndex i = 0; i < CFArrayGetCount(array); ++i) {
-        if (!each(CFArrayGetValueAtIndex(array, i))) {
-            return false;
+    return std::ranges::all_of(values::itemsOf(array), [&](CFTypeRef item) {
+        std::optional<T> value = parse(item);
+        if (value) {
+            list.push_back(std::move(*value));
         }
-    }
-    return true;
+        return value.has_value();
+    });
 }
 
 // Each of these fills its part of the plan, and returns what is wrong with the entity, or null.
 
 const char* readManual(CFDictionaryRef entity, InterfacePlan& plan) {
-    if (!forEach(entity, CFSTR("Addresses"), [&plan](CFTypeRef value) {
-            const std::optional<IPv4Address> address = parseHostAddress(value);
-            if (address) {
-                plan.addresses.push_back({*address, classPrefix(*address)});
-            }
-            return address.has_value();
-        })) {
+    std::vector<IPv4Address> addresses;
+    std::vector<unsigned> lengths;
+    if (!readList(entity, CFSTR("Addresses"), parseHostAddress, addresses)) {
         return "an entry of \"Addresses\" is not an address of a machine";
     }
-    std::size_t next = 0;
-    if (!forEach(entity, CFSTR("SubnetMasks"), [&plan, &next](CFTypeRef value) {
-            const std::optional<unsigned> length = parseMask(value);
-            if (length && next < plan.addresses.size()) {
-                plan.addresses[next++].prefixLength = *length;
-            }
-            return length.has_value();
-        })) {
+    if (!readList(entity, CFSTR("SubnetMasks"), parseMask, lengths)) {
         return "an entry of \"SubnetMasks\" is not a subnet mask";
+    }
+    for (std::size_t i = 0; i < addresses.size(); ++i) {
+        plan.addresses.push_back({addresses[i], i < lengths.size() ? lengths[i] : classPrefix(addresses[i])});
     }
     const CFTypeRef router = valueIn(entity, CFSTR("Router"));
     const std::optional<IPv4Address> address = parseHostAddress(router);
@@ -200,23 +169,10 @@ const char* readIPv4(CFDictionaryRef entity, InterfacePlan& plan) {
 }
 
 const char* readDNS(CFDictionaryRef entity, InterfacePlan& plan) {
-    if (!forEach(entity, CFSTR("ServerAddresses"), [&plan](CFTypeRef value) {
-            const std::optional<IPv4Address> address = parseHostAddress(value);
-            if (address) {
-                plan.nameServers.push_back(*address);
-            }
-            return address.has_value();
-        })) {
+    if (!readList(entity, CFSTR("ServerAddresses"), parseHostAddress, plan.nameServers)) {
         return "an entry of \"ServerAddresses\" is not an address of a machine";
     }
-    if (!forEach(entity, CFSTR("SearchDomains"), [&plan](CFTypeRef value) {
-            const std::optional<std::string> domain = asText(value);
-            const bool usable = domain && canBeDomain(*domain);
-            if (usable) {
-                plan.searchDomains.push_back(*domain);
-            }
-            return usable;
-        })) {
+    if (!readList(entity, CFSTR("SearchDomains"), parseDomain, plan.searchDomains)) {
         return "an entry of \"SearchDomains\" is not a domain name";
     }
     return nullptr;
@@ -227,12 +183,16 @@ const char* readAirPort(CFDictionaryRef entity, InterfacePlan& plan) {
         return nullptr;
     }
     WirelessSettings& settings = plan.wireless.emplace();
-    if (valueIn(entity, CFSTR("PowerEnabled")) != nullptr) {
-        settings.powerEnabled = booleanIn(entity, CFSTR("PowerEnabled"));
-        if (const auto number = integerIn(entity, CFSTR("PowerEnabled"))) {
-            settings.powerEnabled = *number != 0;
-        }
-        if (!settings.powerEnabled) {
+    if (const CFTypeRef power = valueIn(entity, CFSTR("PowerEnabled"))) {
+        const auto flag = values::as<CFBooleanRef>(power);
+        const auto number = values::as<CFNumberRef>(power);
+        std::int64_t on = 0;
+        if (flag != nullptr) {
+            settings.powerEnabled = CFBooleanGetValue(flag) != 0;
+        } else if (number != nullptr && CFNumberIsFloatType(number) == 0 &&
+                   CFNumberGetValue(number, kCFNumberSInt64Type, &on) != 0) {
+            settings.powerEnabled = on != 0;
+        } else {
             return "\"PowerEnabled\" is neither a boolean nor a number";
         }
     }
@@ -242,9 +202,8 @@ const char* readAirPort(CFDictionaryRef entity, InterfacePlan& plan) {
             return "\"PreferredNetwork\" is not a network name, which has 1 to 32 bytes";
         }
     }
-    if (valueIn(entity, CFSTR("AuthPassword")) != nullptr) {
-        const auto data = dataIn(entity, CFSTR("AuthPassword"));
-        settings.key = data ? decodeKey(*data) : std::nullopt;
+    if (const CFTypeRef password = valueIn(entity, CFSTR("AuthPassword"))) {
+        settings.key = decodeKey(values::as<CFDataRef>(password));
         if (!settings.key) {
             return "\"AuthPassword\" is not a password in its stored form";
         }
@@ -289,8 +248,8 @@ Plan makePlan(CFDictionaryRef root, std::vector<Trouble>& troubles) {
     }
     CFDictionaryRef const network = dictionaryIn(location, CFSTR("Network"));
     CFDictionaryRef const links = dictionaryIn(network, CFSTR("Service"));
-    CFArrayRef const order =
-        arrayIn(dictionaryIn(dictionaryIn(network, CFSTR("Global")), CFSTR("IPv4")), CFSTR("ServiceOrder"));
+    const auto order = values::as<CFArrayRef>(
+        valueIn(dictionaryIn(dictionaryIn(network, CFSTR("Global")), CFSTR("IPv4")), CFSTR("ServiceOrder")));
 
     const auto reject = [&troubles](const std::string& name, const char* wrong) {
         troubles.push_back(

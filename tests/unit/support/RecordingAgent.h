@@ -14,6 +14,7 @@
 
 #include "platform/apply/Agent.h"
 #include "platform/apply/Properties.h"
+#include "platform/values/Fields.h"
 
 namespace testing_support {
 
@@ -42,8 +43,9 @@ class RecordingAgent : public platform::apply::Agent {
             if (foreign.contains(interface)) {
                 leftAlone.push_back({interface, "it is somebody else's"});
             } else if (machine.contains(interface)) {
-                platform::apply::DictionaryBuilder state;
-                snapshots.push_back({interface, state.setText(CFSTR("State"), machine[interface]).take()});
+                platform::values::FieldWriter state;
+                state("State", machine[interface]);
+                snapshots.push_back({interface, state.take()});
             }
         }
         return begin(call);
