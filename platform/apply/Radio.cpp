@@ -42,18 +42,13 @@ Outcome readFlag(const std::filesystem::path& path, bool& flag) {
 
 }  // namespace
 
-Outcome readRadio(const std::string& interface, std::optional<Radio>& radio) {
-    radio.reset();
+std::optional<Radio> readRadio(const std::string& interface) {
     std::uint32_t number = 0;
     const std::filesystem::path folder = findSwitch(interface, number);
-    if (folder.empty()) {
-        return {};
-    }
     Radio found;
-    if (readFlag(folder / "soft", found.isOff).ok() && readFlag(folder / "hard", found.isBlocked).ok()) {
-        radio = found;
-    }
-    return {};
+    const bool isThere = !folder.empty() && readFlag(folder / "soft", found.isOff).ok() &&
+                         readFlag(folder / "hard", found.isBlocked).ok();
+    return isThere ? std::optional(found) : std::nullopt;
 }
 
 Outcome switchRadio(const std::string& interface, bool on) {

@@ -13,8 +13,8 @@ struct Radio {
     bool isBlocked = false;  // by a switch on the computer, which no program can change
 };
 
-// Nothing, and success, for a card without such a switch.
-Outcome readRadio(const std::string& interface, std::optional<Radio>& radio);
+// Nothing for a card without such a switch.
+[[nodiscard]] std::optional<Radio> readRadio(const std::string& interface);
 // Success for a card without one.
 Outcome switchRadio(const std::string& interface, bool on);
 

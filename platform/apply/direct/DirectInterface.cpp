@@ -87,9 +87,7 @@ Outcome DirectInterface::takeSnapshot(LinkSnapshot& snapshot) {
     snapshot.takenAt = secondsSinceStart();
     snapshot.others = findOtherDaemons(interface_, link_->index);
     RETURN_IF_FAILED(kernel_.read(*link_, snapshot.state));
-    std::optional<Radio> radio;
-    RETURN_IF_FAILED(readRadio(interface_, radio));
-    if (radio) {
+    if (const std::optional<Radio> radio = readRadio(interface_)) {
         snapshot.radioOff = radio->isOff;
     }
     RETURN_IF_FAILED(readKnownNetworks(interface_, snapshot.networks));
@@ -190,8 +188,7 @@ Outcome DirectInterface::switchOn(const InterfacePlan& plan, std::string& troubl
 
 // A card whose radio is off cannot even be switched on.
 Outcome DirectInterface::switchRadioOn(const InterfacePlan& plan, bool& isUsable) {
-    std::optional<Radio> radio;
-    RETURN_IF_FAILED(readRadio(interface_, radio));
+    std::optional<Radio> radio = readRadio(interface_);
     const bool isWanted = plan.wireless && plan.wireless->powerEnabled.value_or(false);
     if (radio && radio->isOff && isWanted) {
         RETURN_IF_FAILED(switchRadio(interface_, true));
@@ -340,8 +337,7 @@ Outcome DirectInterface::removeOurs(const AppliedLink& applied, const LinkSnapsh
 
 // Without its radio a card cannot be switched on, and no route goes through it.
 Outcome DirectInterface::checkRadio(const LinkSnapshot& before) {
-    std::optional<Radio> radio;
-    RETURN_IF_FAILED(readRadio(interface_, radio));
+    const std::optional<Radio> radio = readRadio(interface_);
     const bool isOff = radio && (radio->isOff || radio->isBlocked);
     return before.up && isOff ? Outcome(kSCStatusFailed,
                                         "its radio was switched off meanwhile: the next run gives it back "

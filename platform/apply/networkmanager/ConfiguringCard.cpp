@@ -18,29 +18,10 @@ class ConfiguringCard final : public Card {
         : Card(daemon, task, deadline), plan_(*task.plan), before_(std::move(earlier)) {}
 
   private:
-    enum class Stage { begin, comeToRest, becomeReady, chooseLink, store, comeUp, search, tellFailure };
+    // One of the steps below; each names the one that comes next.
+    using Stage = Outcome (ConfiguringCard::*)();
 
-    Outcome advance() override {
-        switch (stage_) {
-            case Stage::begin:
-                return begin();
-            case Stage::comeToRest:
-                return comeToRest();
-            case Stage::becomeReady:
-                return becomeReady();
-            case Stage::chooseLink:
-                return chooseLink();
-            case Stage::store:
-                return store();
-            case Stage::comeUp:
-                return comeUp();
-            case Stage::search:
-                return search();
-            case Stage::tellFailure:
-                return tellFailure();
-        }
-        return {};
-    }
+    Outcome advance() override { return (this->*stage_)(); }
 
     [[nodiscard]] std::optional<std::string> network() const {
         return plan_.wireless ? plan_.wireless->network : std::nullopt;
@@ -59,7 +40,7 @@ class ConfiguringCard final : public Card {
         }
         device_ = std::move(*device);
         if (!plan_.active) {
-            stage_ = Stage::comeToRest;
+            stage_ = &ConfiguringCard::comeToRest;
             return daemon_.disconnect(device_);
         }
         if (!isWireless() && network()) {
@@ -72,7 +53,7 @@ class ConfiguringCard final : public Card {
         if (isWireless()) {
             RETURN_IF_FAILED(switchRadioOn());
         }
-        stage_ = Stage::becomeReady;
+        stage_ = &ConfiguringCard::becomeReady;
         return {};
     }
 
@@ -81,8 +62,7 @@ class ConfiguringCard final : public Card {
         if (!isWanted) {
             return {};
         }
-        std::optional<Radio> radio;
-        RETURN_IF_FAILED(readRadio(interface_, radio));
+        const std::optional<Radio> radio = readRadio(interface_);
         // The card's own switch, when it has one: the daemon switches all cards, and follows this one.
         if (radio && radio->isOff) {
             RETURN_IF_FAILED(switchRadio(interface_, true));
@@ -127,7 +107,7 @@ class ConfiguringCard final : public Card {
             return {};
         }
         RETURN_IF_FAILED(daemon_.findActive(device_, active_));
-        stage_ = isWireless() ? Stage::chooseLink : Stage::store;
+        stage_ = isWireless() ? &ConfiguringCard::chooseLink : &ConfiguringCard::store;
         return {};
     }
 
@@ -150,7 +130,7 @@ class ConfiguringCard final : public Card {
                 settle("no network is named and the card is on none, so it joins none");
                 return {};
             }
-            stage_ = Stage::store;
+            stage_ = &ConfiguringCard::store;
             return {};
         }
         std::vector<HeardNetwork> heard;
@@ -178,7 +158,7 @@ class ConfiguringCard final : public Card {
                 isAskedAgain_ = true;
                 askAgainAt_ = Clock::now() + joinsAtOnce;
             }
-            stage_ = isSearching_ ? Stage::search : Stage::comeUp;
+            stage_ = isSearching_ ? &ConfiguringCard::search : &ConfiguringCard::comeUp;
             return {};
         }
         isAskedAgain_ = false;
@@ -190,7 +170,7 @@ class ConfiguringCard final : public Card {
         link_->choice = *decision.choice;
         // Or it would turn to another one as soon as this one goes away.
         RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(before_.iwdAutoconnect, network()));
-        stage_ = Stage::store;
+        stage_ = &ConfiguringCard::store;
         return {};
     }
 
@@ -247,7 +227,7 @@ class ConfiguringCard final : public Card {
             }
             RETURN_IF_FAILED(daemon_.activate(path, device_, active_->path));
         }
-        stage_ = Stage::comeUp;
+        stage_ = &ConfiguringCard::comeUp;
         return {};
     }
 
@@ -273,7 +253,7 @@ class ConfiguringCard final : public Card {
         if (state == activeActivated) {
             settle();
         } else if (state == activeDeactivated) {
-            stage_ = Stage::tellFailure;
+            stage_ = &ConfiguringCard::tellFailure;
             reasonDeadline_ = Clock::now() + reasonBound;
         } else if (isLate()) {
             return giveUp();
@@ -282,11 +262,11 @@ class ConfiguringCard final : public Card {
             RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
             if (state < deviceGetsAddresses) {
                 active_.reset();
-                stage_ = Stage::store;
+                stage_ = &ConfiguringCard::store;
             }
         } else if (link_ && link_->choice &&
                    (changesOnAir_ != daemon_.changesOnAir() || Clock::now() >= lookAgainAt_)) {
-            stage_ = Stage::chooseLink;
+            stage_ = &ConfiguringCard::chooseLink;
         } else {
             waitUntil(askAgainAt_.value_or(link_ && link_->choice ? lookAgainAt_ : deadline_));
         }
@@ -331,7 +311,7 @@ class ConfiguringCard final : public Card {
         if (changesOnAir_ == daemon_.changesOnAir() && Clock::now() < lookAgainAt_) {
             waitUntil(std::min(lookAgainAt_, scanAgainAt_));
         } else {
-            stage_ = Stage::chooseLink;
+            stage_ = &ConfiguringCard::chooseLink;
         }
         return {};
     }
@@ -340,7 +320,7 @@ class ConfiguringCard final : public Card {
         if (link_ && link_->choice && !link_->choice->isHeard) {
             isSearching_ = true;
             active_.reset();
-            stage_ = Stage::search;
+            stage_ = &ConfiguringCard::search;
             // Or it would turn to another one of its own accord.
             return daemon_.disconnect(device_);
         }
@@ -361,7 +341,7 @@ class ConfiguringCard final : public Card {
 
     const InterfacePlan& plan_;
     const CardSnapshot before_;
-    Stage stage_ = Stage::begin;
+    Stage stage_ = &ConfiguringCard::begin;
     Device device_;
     bool isReady_ = false;
     Clock::time_point readyDeadline_;

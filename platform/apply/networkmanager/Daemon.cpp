@@ -127,93 +127,86 @@ Outcome Daemon::awaitStartup() {
     return {};
 }
 
-Outcome Daemon::findDevice(const std::string& interface, std::optional<Device>& device) {
-    device.reset();
-    Message reply;
+Outcome Daemon::readObject(const std::string& path, const char* interface,
+                           std::optional<Dictionary>& properties) {
     std::string error;
-    Outcome outcome =
-        call(managerPath, managerInterface, "GetDeviceByIpIface", textArgument(interface), reply, &error);
-    if (error == "org.freedesktop.NetworkManager.UnknownDevice") {
+    Outcome outcome = bus_.readProperties(path, interface, properties.emplace(), &error);
+    if (isGone(error)) {
+        properties.reset();
         return {};
     }
-    Device found;
-    if (outcome.ok()) {
-        outcome = readPath("GetDeviceByIpIface", reply, found.path);
-    }
-    Dictionary properties;
-    if (outcome.ok()) {
-        outcome = bus_.readProperties(found.path, deviceInterface, properties, &error);
-        if (isGone(error)) {
-            return {};
-        }
-    }
-    if (outcome.ok()) {
-        const std::uint32_t type = numberIn(properties, "DeviceType");
-        if (type == typeEthernet || type == typeVirtualEthernet) {
-            found.kind = Device::Kind::wired;
-        } else if (type == typeWireless) {
-            found.kind = Device::Kind::wireless;
-        }
-        found.state = devices_[found.path] = numberIn(properties, "State");
-        found.managed = valueOf<bool>(properties, "Managed").value_or(false);
-        found.autoconnect = valueOf<bool>(properties, "Autoconnect").value_or(false);
-        found.active = pathIn(properties, "ActiveConnection");
-        found.addresses = pathIn(properties, "Ip4Config");
-        device = std::move(found);
-    }
     return outcome;
+}
+
+Outcome Daemon::findPath(const std::string& object, const char* interface, const char* member,
+                         const std::string& name, std::string_view unknown, std::string& path) {
+    path.clear();
+    Message reply;
+    std::string error;
+    Outcome outcome = call(object, interface, member, textArgument(name), reply, &error);
+    return error == unknown ? Outcome() : outcome.ok() ? readPath(member, reply, path) : outcome;
+}
+
+Outcome Daemon::findDevice(const std::string& interface, std::optional<Device>& device) {
+    device.reset();
+    Device found;
+    std::optional<Dictionary> properties;
+    RETURN_IF_FAILED(findPath(managerPath, managerInterface, "GetDeviceByIpIface", interface,
+                              "org.freedesktop.NetworkManager.UnknownDevice", found.path));
+    if (!found.path.empty()) {
+        RETURN_IF_FAILED(readObject(found.path, deviceInterface, properties));
+    }
+    if (!properties) {
+        return {};
+    }
+    const std::uint32_t type = numberIn(*properties, "DeviceType");
+    if (type == typeEthernet || type == typeVirtualEthernet) {
+        found.kind = Device::Kind::wired;
+    } else if (type == typeWireless) {
+        found.kind = Device::Kind::wireless;
+    }
+    found.state = devices_[found.path] = numberIn(*properties, "State");
+    found.managed = valueOf<bool>(*properties, "Managed").value_or(false);
+    found.autoconnect = valueOf<bool>(*properties, "Autoconnect").value_or(false);
+    found.active = pathIn(*properties, "ActiveConnection");
+    found.addresses = pathIn(*properties, "Ip4Config");
+    device = std::move(found);
+    return {};
 }
 
 Outcome Daemon::findActive(const Device& device, std::optional<Active>& active) {
     active.reset();
-    if (device.active.empty()) {
-        return {};
+    std::optional<Dictionary> properties;
+    if (!device.active.empty()) {
+        RETURN_IF_FAILED(readObject(device.active, activeInterface, properties));
     }
-    Dictionary properties;
-    std::string error;
-    Outcome outcome = bus_.readProperties(device.active, activeInterface, properties, &error);
-    const std::uint32_t state = numberIn(properties, "State");
-    if (isGone(error) || (outcome.ok() && state > activeActivated)) {
-        return {};
+    if (properties && numberIn(*properties, "State") <= activeActivated) {
+        active = {device.active, pathIn(*properties, "Connection"),
+                  valueOf<std::string>(*properties, "Uuid").value_or(""),
+                  numberIn(*properties, "State") == activeActivated,
+                  (numberIn(*properties, "StateFlags") & activeIsExternal) != 0};
     }
-    if (outcome.ok()) {
-        active = {device.active, pathIn(properties, "Connection"),
-                  valueOf<std::string>(properties, "Uuid").value_or(""), state == activeActivated,
-                  (numberIn(properties, "StateFlags") & activeIsExternal) != 0};
-    }
-    return outcome;
+    return {};
 }
 
-Outcome Daemon::readProfile(const std::string& path, std::optional<Profile>& profile) {
+Outcome Daemon::findProfile(const std::string& uuid, std::optional<Profile>& profile) {
+    profile.reset();
+    std::string path;
+    RETURN_IF_FAILED(findPath(settingsPath, settingsInterface, "GetConnectionByUuid", uuid,
+                              "org.freedesktop.NetworkManager.Settings.InvalidConnection", path));
+    if (path.empty()) {
+        return {};
+    }
     Message reply;
     std::string error;
     Outcome outcome = call(path, profileInterface, "GetSettings", {}, reply, &error);
-    if (isGone(error)) {
-        return {};
-    }
     if (outcome.ok()) {
         profile.emplace().path = path;
         if (readValue(reply.get(), profile->sections) < 0) {
             return unreadable("GetSettings");
         }
     }
-    return outcome;
-}
-
-Outcome Daemon::findProfile(const std::string& uuid, std::optional<Profile>& profile) {
-    profile.reset();
-    Message reply;
-    std::string error;
-    Outcome outcome =
-        call(settingsPath, settingsInterface, "GetConnectionByUuid", textArgument(uuid), reply, &error);
-    if (error == "org.freedesktop.NetworkManager.Settings.InvalidConnection") {
-        return {};
-    }
-    std::string path;
-    if (outcome.ok()) {
-        outcome = readPath("GetConnectionByUuid", reply, path);
-    }
-    return outcome.ok() ? readProfile(path, profile) : outcome;
+    return isGone(error) ? Outcome() : outcome;
 }
 
 Outcome Daemon::isVolatile(const std::string& profile, bool& result) {
@@ -318,13 +311,11 @@ Outcome Daemon::setAutoconnect(const Device& device, bool autoconnect) {
 
 Outcome Daemon::readMetric(const Device& device, std::uint32_t& metric) {
     metric = 0;
-    Dictionary properties;
-    std::string error;
-    if (device.addresses.empty()) {
-        return {};
+    std::optional<Dictionary> properties;
+    if (!device.addresses.empty()) {
+        RETURN_IF_FAILED(readObject(device.addresses, addressesInterface, properties));
     }
-    Outcome outcome = bus_.readProperties(device.addresses, addressesInterface, properties, &error);
-    const auto routes = valueOf<std::vector<Dictionary>>(properties, "RouteData");
+    const auto routes = valueOf<std::vector<Dictionary>>(properties.value_or(Dictionary()), "RouteData");
     bool hasDefault = false;
     for (const Dictionary& route : routes.value_or(std::vector<Dictionary>())) {
         const std::uint32_t own = numberIn(route, "metric");
@@ -335,7 +326,7 @@ Outcome Daemon::readMetric(const Device& device, std::uint32_t& metric) {
         }
         hasDefault = hasDefault || isDefault;
     }
-    return isGone(error) ? Outcome() : outcome;
+    return {};
 }
 
 Outcome Daemon::setRadio(bool on) {
@@ -359,15 +350,9 @@ Outcome Daemon::readHeard(const Device& device, const std::string& network,
     timespec now{};
     ::clock_gettime(CLOCK_BOOTTIME, &now);
     for (const std::string& path : paths) {
-        Dictionary point;
-        std::string error;
-        Outcome read = bus_.readProperties(path, accessPointInterface, point, &error);
-        if (isGone(error)) {
-            continue;
-        }
-        if (!read.ok()) {
-            return read;
-        }
+        std::optional<Dictionary> found;
+        RETURN_IF_FAILED(readObject(path, accessPointInterface, found));
+        const Dictionary point = found.value_or(Dictionary());
         // One that was never heard is the daemon's own note of a network that it is to join.
         const std::int32_t lastHeard = valueOf<std::int32_t>(point, "LastSeen").value_or(-1);
         if (valueOf<Bytes>(point, "Ssid") != Bytes(network.begin(), network.end()) || lastHeard < 0) {
@@ -451,27 +436,22 @@ void Daemon::noteDevice(const char* path, std::uint32_t state, std::uint32_t rea
 }
 
 Outcome Daemon::deviceState(const std::string& path, std::uint32_t& state) {
-    if (const auto known = devices_.find(path); known != devices_.end()) {
-        state = known->second;
-        return {};
-    }
-    Dictionary properties;
-    std::string error;
-    Outcome outcome = bus_.readProperties(path, deviceInterface, properties, &error);
-    state = devices_[path] = numberIn(properties, "State");
-    return isGone(error) ? Outcome() : outcome;
+    return readState(devices_, path, deviceInterface, 0, state);
 }
 
 Outcome Daemon::activeState(const std::string& path, std::uint32_t& state) {
-    if (const auto known = actives_.find(path); known != actives_.end()) {
-        state = known->second;
-        return {};
+    return readState(actives_, path, activeInterface, activeDeactivated, state);
+}
+
+Outcome Daemon::readState(States& known, const std::string& path, const char* interface, std::uint32_t gone,
+                          std::uint32_t& state) {
+    if (!known.contains(path)) {
+        std::optional<Dictionary> properties;
+        RETURN_IF_FAILED(readObject(path, interface, properties));
+        known[path] = properties ? numberIn(*properties, "State") : gone;
     }
-    Dictionary properties;
-    std::string error;
-    Outcome outcome = bus_.readProperties(path, activeInterface, properties, &error);
-    state = actives_[path] = isGone(error) ? activeDeactivated : numberIn(properties, "State");
-    return isGone(error) ? Outcome() : outcome;
+    state = known[path];
+    return {};
 }
 
 std::uint32_t Daemon::failureOf(const std::string& device) const {

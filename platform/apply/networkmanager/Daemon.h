@@ -138,7 +138,15 @@ class Daemon {
                  Message& reply, std::string* error = nullptr, std::string_view secret = {});
     Outcome readManager();
     Outcome awaitStartup();
-    Outcome readProfile(const std::string& path, std::optional<Profile>& profile);
+    // Nothing, and success, when the object is gone.
+    Outcome readObject(const std::string& path, const char* interface, std::optional<Dictionary>& properties);
+    // The path that a look-up by name gives; empty, and success, when it ends in the error `unknown`.
+    Outcome findPath(const std::string& object, const char* interface, const char* member,
+                     const std::string& name, std::string_view unknown, std::string& path);
+    using States = std::map<std::string, std::uint32_t, std::less<>>;
+    // `gone` is the state of an object that is not there.
+    Outcome readState(States& known, const std::string& path, const char* interface, std::uint32_t gone,
+                      std::uint32_t& state);
     void noteDevice(const char* path, std::uint32_t state, std::uint32_t reason);
 
     Bus bus_;
@@ -150,9 +158,9 @@ class Daemon {
     bool radioHardware_ = true;
     bool managerChanged_ = false;
     unsigned changesOnAir_ = 0;
-    std::map<std::string, std::uint32_t, std::less<>> devices_;
-    std::map<std::string, std::uint32_t, std::less<>> actives_;
-    std::map<std::string, std::uint32_t, std::less<>> failures_;
+    States devices_;
+    States actives_;
+    States failures_;
 };
 
 // What a card's reason for failing means to a person.

@@ -55,9 +55,7 @@ Outcome NetworkManagerAgent::captureCard(const Device& device, const std::string
     earlier = {{active ? active->uuid : "", device.autoconnect, daemon_.isRadioOn()},
                active && active->complete,
                {}};
-    std::optional<Radio> radio;
-    RETURN_IF_FAILED(readRadio(interface, radio));
-    if (radio) {
+    if (const std::optional<Radio> radio = readRadio(interface)) {
         earlier.radioOff = radio->isOff;
     }
     if (earlier.profile.uuid == profileUUID(interface)) {

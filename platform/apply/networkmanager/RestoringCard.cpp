@@ -18,27 +18,10 @@ class RestoringCard final : public Card {
     ~RestoringCard() override { place_->isTaken = true; }
 
   private:
-    enum class Stage { begin, becomeReady, comeToRest, awaitPlace, comeUp, tellFailure, finish };
+    // One of the steps below; each names the one that comes next.
+    using Stage = Outcome (RestoringCard::*)();
 
-    Outcome advance() override {
-        switch (stage_) {
-            case Stage::begin:
-                return begin();
-            case Stage::becomeReady:
-                return becomeReady();
-            case Stage::comeToRest:
-                return comeToRest();
-            case Stage::awaitPlace:
-                return awaitPlace();
-            case Stage::comeUp:
-                return comeUp();
-            case Stage::tellFailure:
-                return tellFailure();
-            case Stage::finish:
-                return finish();
-        }
-        return {};
-    }
+    Outcome advance() override { return (this->*stage_)(); }
 
     [[nodiscard]] const ProfileSnapshot& before() const { return before_.profile; }
 
@@ -62,7 +45,7 @@ class RestoringCard final : public Card {
             RETURN_IF_FAILED(daemon_.setManaged(device_, true));
             readyDeadline_ += readyBound;
         }
-        stage_ = Stage::becomeReady;
+        stage_ = &RestoringCard::becomeReady;
         return {};
     }
 
@@ -80,7 +63,7 @@ class RestoringCard final : public Card {
             return {};
         }
         if (before().uuid.empty()) {
-            stage_ = Stage::comeToRest;
+            stage_ = &RestoringCard::comeToRest;
             return daemon_.disconnect(device_);
         }
         return activateEarlier(state >= deviceDisconnected);
@@ -90,7 +73,7 @@ class RestoringCard final : public Card {
         std::uint32_t state = 0;
         RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
         if (state <= deviceDisconnected) {
-            stage_ = Stage::finish;
+            stage_ = &RestoringCard::finish;
         } else if (isLate()) {
             return {kSCStatusFailed, "NetworkManager did not switch the card off in time"};
         } else {
@@ -106,13 +89,13 @@ class RestoringCard final : public Card {
             // What is active next is up to the daemon, as if this system had never been there.
             task_.trouble = profile ? "no profile can be active on it now"
                                     : "the profile that was active on it is deleted";
-            stage_ = Stage::finish;
+            stage_ = &RestoringCard::finish;
             return {};
         }
         profile_ = profile->path;
         network_ = networkOf(profile->sections);
         placeDeadline_ = Clock::now() + placeBound;
-        stage_ = Stage::awaitPlace;
+        stage_ = &RestoringCard::awaitPlace;
         return {};
     }
 
@@ -132,7 +115,7 @@ class RestoringCard final : public Card {
             RETURN_IF_FAILED(daemon_.activate(profile_, device_, active_->path));
         }
         placeDeadline_ = Clock::now() + placeBound;
-        stage_ = Stage::comeUp;
+        stage_ = &RestoringCard::comeUp;
         return {};
     }
 
@@ -147,13 +130,13 @@ class RestoringCard final : public Card {
         const bool isEnough = !before_.wasUp && (place_->isTaken || device_.kind == Device::Kind::wireless ||
                                                  Clock::now() >= placeDeadline_);
         if (state == activeActivated || isEnough) {
-            stage_ = Stage::finish;
+            stage_ = &RestoringCard::finish;
         } else if (state == activeDeactivated) {
-            stage_ = Stage::tellFailure;
+            stage_ = &RestoringCard::tellFailure;
             reasonDeadline_ = Clock::now() + reasonBound;
         } else if (isLate()) {
             task_.trouble = "the profile that was active before is not up yet; NetworkManager goes on";
-            stage_ = Stage::finish;
+            stage_ = &RestoringCard::finish;
         } else if (before_.wasUp && !network_.empty() && !askAgainAt_ && cardState < deviceGetsAddresses &&
                    changesOnAir_ != daemon_.changesOnAir()) {
             return lookAgain();
@@ -185,7 +168,7 @@ class RestoringCard final : public Card {
             askAgainAt_ = Clock::now() + joinsAtOnce;
         } else {
             task_.trouble = "the network of before is not there now, and is joined when it comes";
-            stage_ = Stage::finish;
+            stage_ = &RestoringCard::finish;
         }
         return {};
     }
@@ -197,7 +180,7 @@ class RestoringCard final : public Card {
             return {};
         }
         task_.trouble = "the profile that was active before does not come up: " + describeFailure(reason);
-        stage_ = Stage::finish;
+        stage_ = &RestoringCard::finish;
         return {};
     }
 
@@ -237,7 +220,7 @@ class RestoringCard final : public Card {
     const std::shared_ptr<Place> place_;
     std::string profile_;  // the path of the earlier profile
     Clock::time_point placeDeadline_;
-    Stage stage_ = Stage::begin;
+    Stage stage_ = &RestoringCard::begin;
     Outcome iwdOutcome_;
     Device device_;
     Clock::time_point readyDeadline_;
