@@ -61,12 +61,4 @@ inline std::string quad(IPv4Address address) {
     return text;
 }
 
-inline std::string quads(const char* prefix, const std::vector<IPv4Address>& addresses) {
-    std::string text;
-    for (const IPv4Address one : addresses) {
-        text += prefix + quad(one);
-    }
-    return text;
-}
-
 }  // namespace platform::apply
