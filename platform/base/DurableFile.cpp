@@ -6,15 +6,19 @@
 #include <algorithm>
 #include <cerrno>
 
-#include "platform/base/FileDescriptor.h"
-#include "platform/base/FileOperations.h"
+#include "platform/base/Host.h"
 
 namespace platform {
 namespace {
 
+bool unlinkFile(const std::string& path) {
+    return isStepAllowed("unlink", path) && ::unlink(path.c_str()) == 0;
+}
+
 Outcome writeAll(int descriptor, std::string_view content, const std::string& path) {
     while (!content.empty()) {
-        const ssize_t written = fileOperations().write(descriptor, content);
+        const ssize_t written =
+            isStepAllowed("write", path) ? ::write(descriptor, content.data(), content.size()) : -1;
         if (written < 0 && errno == EINTR) {
             continue;
         }
@@ -26,14 +30,19 @@ Outcome writeAll(int descriptor, std::string_view content, const std::string& pa
     return {};
 }
 
+Outcome sync(int descriptor, const std::string& path) {
+    return isStepAllowed("fsync", path) && ::fsync(descriptor) == 0
+               ? Outcome()
+               : Outcome::fromErrno("cannot put " + path + " on the disk");
+}
+
 Outcome overwrite(const std::string& path, std::string_view content) {
-    const FileDescriptor file(fileOperations().open(path, O_WRONLY | O_TRUNC, 0));
+    const FileDescriptor file = openFile(path, O_WRONLY | O_TRUNC);
     if (!file.isOpen()) {
         return Outcome::fromErrno("cannot open " + path);
     }
     RETURN_IF_FAILED(writeAll(file.get(), content, path));
-    return fileOperations().sync(file.get()) == 0 ? Outcome()
-                                                  : Outcome::fromErrno("cannot put " + path + " on the disk");
+    return sync(file.get(), path);
 }
 
 Outcome fill(int descriptor, std::string_view content, const FileOwnership& ownership,
@@ -43,17 +52,16 @@ Outcome fill(int descriptor, std::string_view content, const FileOwnership& owne
         ::fchmod(descriptor, ownership.mode) != 0) {
         return Outcome::fromErrno("cannot give " + path + " its owner and mode");
     }
-    return fileOperations().sync(descriptor) == 0 ? Outcome()
-                                                  : Outcome::fromErrno("cannot put " + path + " on the disk");
+    return sync(descriptor, path);
 }
 
 Outcome writeTemporary(const std::string& path, std::string_view content, const FileOwnership& ownership,
                        struct stat* written) {
     // Nobody but the lock's holder makes this file, so one that is there was left behind by a crash.
-    if (fileOperations().remove(path) != 0 && errno != ENOENT) {
+    if (!unlinkFile(path) && errno != ENOENT) {
         return Outcome::fromErrno("cannot remove " + path);
     }
-    FileDescriptor file(fileOperations().open(path, O_WRONLY | O_CREAT | O_EXCL, 0600));
+    FileDescriptor file = openFile(path, O_WRONLY | O_CREAT | O_EXCL);
     if (!file.isOpen()) {
         return Outcome::fromErrno("cannot make " + path);
     }
@@ -61,7 +69,8 @@ Outcome writeTemporary(const std::string& path, std::string_view content, const 
     if (done.ok() && written != nullptr && ::fstat(file.get(), written) != 0) {
         done = Outcome::fromErrno("cannot look at " + path);
     }
-    if (fileOperations().close(file.release()) != 0 && done.ok()) {
+    const bool mayClose = isStepAllowed("close", path);
+    if ((::close(file.release()) != 0 || !mayClose) && done.ok()) {
         done = Outcome::fromErrno("cannot close " + path);
     }
     return done;
@@ -71,18 +80,28 @@ Outcome replace(const std::string& path, std::string_view content, const FileOwn
                 struct stat* written, bool& isMount) {
     const std::string temporary = temporaryFor(path);
     Outcome done = writeTemporary(temporary, content, ownership, written);
-    if (done.ok() && fileOperations().rename(temporary, path) != 0) {
+    if (done.ok() && (!isStepAllowed("rename", path) || ::rename(temporary.c_str(), path.c_str()) != 0)) {
         isMount = errno == EBUSY;
         done = Outcome::fromErrno("cannot replace " + path);
     }
     if (!done.ok()) {
-        (void)fileOperations().remove(temporary);
+        (void)unlinkFile(temporary);
         return done;
     }
     return syncDirectory(parentOf(path));
 }
 
 }  // namespace
+
+bool isStepAllowed(const char* step, const std::string& path) {
+    return !currentHost().fileStep || currentHost().fileStep(step, path);
+}
+
+FileDescriptor openFile(const std::string& path, int flags) {
+    return FileDescriptor(isStepAllowed("open", path)
+                              ? ::open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600)
+                              : -1);
+}
 
 std::string parentOf(const std::string& path) {
     const std::size_t slash = path.find_last_of('/');
@@ -152,19 +171,17 @@ Outcome replaceFileOrMount(const std::string& path, std::string_view content,
 }
 
 Outcome removeFile(const std::string& path) {
-    (void)fileOperations().remove(temporaryFor(path));
-    if (fileOperations().remove(path) != 0) {
+    (void)unlinkFile(temporaryFor(path));
+    if (!unlinkFile(path)) {
         return errno == ENOENT ? Outcome() : Outcome::fromErrno("cannot remove " + path);
     }
     return syncDirectory(parentOf(path));
 }
 
 Outcome syncDirectory(const std::string& path) {
-    const FileDescriptor directory(fileOperations().open(path + "/.", O_RDONLY | O_DIRECTORY, 0));
-    if (!directory.isOpen() || fileOperations().sync(directory.get()) != 0) {
-        return Outcome::fromErrno("cannot put " + path + " on the disk");
-    }
-    return {};
+    const FileDescriptor directory = openFile(path + "/.", O_RDONLY | O_DIRECTORY);
+    return directory.isOpen() ? sync(directory.get(), path)
+                              : Outcome::fromErrno("cannot put " + path + " on the disk");
 }
 
 }  // namespace platform

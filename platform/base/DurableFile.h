@@ -7,6 +7,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/base/FileDescriptor.h"
 #include "platform/base/Outcome.h"
 
 namespace platform {
@@ -19,6 +20,11 @@ struct FileOwnership {
 
 // "/" for "/etc", "." for a name without a slash.
 [[nodiscard]] std::string parentOf(const std::string& path);
+
+// Whether the host lets a step be taken by which a file changes on disk; errno says why not.
+[[nodiscard]] bool isStepAllowed(const char* step, const std::string& path);
+// Never through a link, never waiting; a file that is made has mode 0600. Not open, and errno, on failure.
+[[nodiscard]] FileDescriptor openFile(const std::string& path, int flags);
 
 // Fails for a symbolic link and for everything else that is not a regular file.
 Outcome checkRegular(const struct stat& status, const std::string& path);

@@ -9,7 +9,6 @@
 #include <utility>
 
 #include "platform/base/DurableFile.h"
-#include "platform/base/FileOperations.h"
 
 namespace platform {
 namespace {
@@ -20,7 +19,7 @@ constexpr std::chrono::milliseconds pauseBetweenTries{5};
 
 Outcome takeFileLock(const std::string& path, std::chrono::milliseconds wait, FileDescriptor& lock,
                      int busy) {
-    FileDescriptor file(fileOperations().open(path, O_RDWR | O_CREAT, 0600));
+    FileDescriptor file = openFile(path, O_RDWR | O_CREAT);
     struct stat status {};
     if (!file.isOpen() || ::fstat(file.get(), &status) != 0) {
         return Outcome::fromErrno("cannot open " + path);

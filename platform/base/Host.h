@@ -6,6 +6,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -14,7 +15,6 @@
 
 namespace platform {
 
-class FileOperations;
 namespace apply {
 class Agent;
 }
@@ -59,8 +59,10 @@ struct Host {
 
     // In the order in which they are asked who leads an interface; none: the platform's own.
     std::vector<std::shared_ptr<apply::Agent>> agents;
+    // Told of each step by which a file is about to change on disk ("mkdir", "open", "write", "fsync",
+    // "close", "rename", "unlink"); false, with errno set, fails the step. Null: nothing but the system can.
+    std::function<bool(const char* step, const std::string& path)> fileStep;
     // Null: the platform's own, chosen at the call.
-    std::shared_ptr<FileOperations> files;
     std::shared_ptr<services::Downloader> downloader;
     std::shared_ptr<services::Opener> opener;
     std::shared_ptr<live::NetworkState> networkState;

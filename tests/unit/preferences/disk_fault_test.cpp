@@ -1,150 +1,100 @@
-#include <fcntl.h>
-#include <unistd.h>
+#include <sys/resource.h>
 
 #include <cerrno>
+#include <csignal>
 #include <filesystem>
-#include <map>
 #include <set>
 
 #include "platform/base/DurableFile.h"
-#include "platform/base/FileOperations.h"
 #include "platform/preferences/Session.h"
 #include "tests/unit/preferences/Fixture.h"
 
 namespace preferences_test {
 namespace {
 
-using platform::FileOperations;
-using platform::Outcome;
 using platform::preferences::Session;
 
 struct Crash {};
 
 // Fails one step, or stops before it and loses what was written and not synced, as a power cut may.
-class FaultyOperations : public FileOperations {
-  public:
-    void begin() {
-        failAt = crashAt = -1;
-        steps = syncs = 0;
-        failed.clear();
-        unsynced_.clear();
-    }
-
-    int failAt = -1;
-    int crashAt = -1;
-    int error = EIO;
-    int steps = 0;
-    int syncs = 0;
-    std::string failed;
-
-    int makeDirectory(const std::string& path, mode_t mode) override {
-        return fails("mkdir") ? -1 : FileOperations::makeDirectory(path, mode);
-    }
-    int open(const std::string& path, int flags, mode_t mode) override {
-        if (fails("open")) {
-            return -1;
-        }
-        const int descriptor = FileOperations::open(path, flags, mode);
-        names_[descriptor] = path;
-        return descriptor;
-    }
-    ssize_t write(int descriptor, std::string_view bytes) override {
-        if (fails("write")) {
-            return -1;
-        }
-        unsynced_.insert(names_[descriptor]);
-        return FileOperations::write(descriptor, bytes.substr(0, std::max(bytes.size() / 2, std::size_t{7})));
-    }
-    int sync(int descriptor) override {
-        if (fails("fsync")) {
-            return -1;
-        }
-        ++syncs;
-        unsynced_.erase(names_[descriptor]);
-        return FileOperations::sync(descriptor);
-    }
-    int close(int descriptor) override {
-        const bool failing = fails("close");
-        const int result = FileOperations::close(descriptor);
-        return failing ? -1 : result;
-    }
-    int rename(const std::string& from, const std::string& to) override {
-        if (fails("rename")) {
-            return -1;
-        }
-        if (unsynced_.erase(from) != 0) {
-            unsynced_.insert(to);
-        }
-        return FileOperations::rename(from, to);
-    }
-    int remove(const std::string& path) override {
-        return fails("unlink") ? -1 : FileOperations::remove(path);
-    }
-
-  private:
-    bool fails(const char* what) {
-        const int step = steps++;
-        if (step == crashAt) {
-            for (const std::string& path : unsynced_) {
-                std::filesystem::resize_file(path, 0);
-            }
-            throw Crash();
-        }
-        if (step == failAt) {
-            failed = what;
-            errno = error;
-            return true;
-        }
-        return false;
-    }
-
-    std::map<int, std::string> names_;
-    std::set<std::string> unsynced_;
-};
-
 class DiskFaultTest : public StoreTest {
   protected:
-    DiskFaultTest() : override_(hostWith(operations)) {}
+    DiskFaultTest()
+        : override_(
+              hostWith([this](const char* step, const std::string& path) { return isAllowed(step, path); })) {
+    }
 
     // A store with one location, and a session that changes its name.
-    SessionRef begin(bool withStore) {
-        operations->begin();
+    SessionRef begin(bool withStore, int failingStep, int lastStep) {
+        failAt = crashAt = -1;
         std::filesystem::remove_all(store);
         if (withStore) {
             makeStore();
         }
         SessionRef session = open();
         EXPECT_TRUE(set(session, "/Sets/1", "new"));
-        operations->steps = 0;
+        steps_ = syncs = 0;
+        failed.clear();
+        unsynced_.clear();
+        failAt = failingStep;
+        crashAt = lastStep;
         return session;
     }
     [[nodiscard]] bool leftovers() const { return std::filesystem::exists(platform::temporaryFor(file)); }
 
-    std::shared_ptr<FaultyOperations> operations = std::make_shared<FaultyOperations>();
+    int failAt = -1;
+    int crashAt = -1;
+    int error = EIO;
+    int syncs = 0;
+    std::string failed;
 
   private:
-    static platform::Host hostWith(const std::shared_ptr<FaultyOperations>& operations) {
+    static platform::Host hostWith(std::function<bool(const char*, const std::string&)> step) {
         platform::Host host = platform::currentHost();
-        host.files = operations;
+        host.fileStep = std::move(step);
         return host;
     }
+    bool isAllowed(const std::string& step, const std::string& path) {
+        if (steps_ == crashAt) {
+            for (const std::string& each : unsynced_) {
+                std::filesystem::resize_file(each, 0);
+            }
+            throw Crash();
+        }
+        if (steps_++ == failAt) {
+            failed = step;
+            errno = error;
+            return false;
+        }
+        if (step == "write") {
+            unsynced_.insert(path);
+        } else if (step == "fsync") {
+            ++syncs;
+            unsynced_.erase(path);
+        } else if (step == "rename" && unsynced_.erase(platform::temporaryFor(path)) != 0) {
+            unsynced_.insert(path);
+        }
+        return true;
+    }
+
+    int steps_ = 0;
+    std::set<std::string> unsynced_;
     platform::HostOverride override_;
 };
 
 TEST_F(DiskFaultTest, AfterAnyFailingStepTheFileIsTheOldOneOrTheNewOne) {
     for (const bool withStore : {true, false}) {
-        for (const int error : {EIO, EROFS}) {
-            std::set<std::string> failed;
+        for (const int reason : {EIO, EROFS}) {
+            std::set<std::string> all;
             bool done = false;
             for (int step = 0; !done; ++step) {
-                const SessionRef session = begin(withStore);
-                operations->failAt = step;
-                operations->error = error;
+                error = reason;
+                const SessionRef session = begin(withStore, step, -1);
                 done = commit(session);
-                SCOPED_TRACE(operations->failed + " at step " + std::to_string(step));
-                failed.insert(operations->failed);
+                SCOPED_TRACE(failed + " at step " + std::to_string(step));
+                all.insert(failed);
                 if (!done) {
-                    EXPECT_EQ(SCError(), error == EROFS ? 1003 : 1001);
+                    EXPECT_EQ(SCError(), reason == EROFS ? 1003 : 1001);
                     EXPECT_FALSE(log.empty());
                     EXPECT_FALSE(leftovers());
                     EXPECT_EQ(nameAt(session, "/Sets/1"), "new");
@@ -155,12 +105,12 @@ TEST_F(DiskFaultTest, AfterAnyFailingStepTheFileIsTheOldOneOrTheNewOne) {
                 EXPECT_FALSE(leftovers());
                 EXPECT_EQ(nameAt(open(), "/Sets/1"), "new");
             }
-            failed.erase("");
+            all.erase("");
             std::set<std::string> expected = {"open", "write", "fsync", "close", "rename", "unlink"};
             if (!withStore) {
                 expected.insert("mkdir");
             }
-            EXPECT_EQ(failed, expected);
+            EXPECT_EQ(all, expected);
         }
     }
 }
@@ -169,16 +119,15 @@ TEST_F(DiskFaultTest, AfterAPowerCutAtAnyStepTheFileIsTheOldOneOrTheNewOne) {
     for (const bool withStore : {true, false}) {
         int crashes = 0;
         for (bool done = false; !done; ++crashes) {
-            SessionRef session = begin(withStore);
-            operations->crashAt = crashes;
+            SessionRef session = begin(withStore, -1, crashes);
             try {
                 // Not through the faces, which end the process at an exception.
                 done = Session::from(session.get())->commit(std::chrono::milliseconds(0)).ok();
             } catch (const Crash&) {
             }
-            operations->crashAt = -1;
+            crashAt = -1;
             // The file, its folder, and the folder of a new one.
-            EXPECT_TRUE(!done || operations->syncs == (withStore ? 2 : 3));
+            EXPECT_TRUE(!done || syncs == (withStore ? 2 : 3));
             SCOPED_TRACE("step " + std::to_string(crashes));
             session = open();
             ASSERT_TRUE(session);
@@ -190,6 +139,20 @@ TEST_F(DiskFaultTest, AfterAPowerCutAtAnyStepTheFileIsTheOldOneOrTheNewOne) {
         }
         EXPECT_GT(crashes, 9);
     }
+}
+
+// A write may take less than it was given, as here the first 100 bytes.
+TEST_F(DiskFaultTest, AFileThatWasWrittenInPartIsNotTaken) {
+    rlimit limit{};
+    const SessionRef session = begin(true, -1, -1);
+    ASSERT_EQ(getrlimit(RLIMIT_FSIZE, &limit), 0);
+    const rlimit small{100, limit.rlim_max};
+    const auto before = std::signal(SIGXFSZ, SIG_IGN);
+    setrlimit(RLIMIT_FSIZE, &small);
+    EXPECT_FALSE(commit(session));
+    setrlimit(RLIMIT_FSIZE, &limit);
+    static_cast<void>(std::signal(SIGXFSZ, before));
+    EXPECT_EQ(contentOf(file), smallTree);
 }
 
 }  // namespace

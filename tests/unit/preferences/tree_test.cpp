@@ -2,6 +2,7 @@
 
 #include "platform/values/PropertyListXML.h"
 #include "tests/unit/preferences/Fixture.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace preferences_test {
 namespace {
@@ -20,43 +21,26 @@ class TreeTest : public StoreTest {
 };
 
 TEST_F(TreeTest, PathsThatLeadNowhereSayWhyAndChangeNothing) {
-    const struct {
-        std::string_view path;
-        int get, set, remove, link;
-    } rows[] = {
-        {"/Sets/1", 0, 0, 0, 1004},
-        {"/Sets/9", 1004, 0, 1004, 1004},
-        {"/New/a/b", 1004, 0, 1004, 1004},
-        {"/Sets/2", 1001, 0, 0, 1001},          // there, but no dictionary
-        {"/Sets/2/x", 1001, 1001, 1001, 1001},  // the same on the way
-        {"/Link", 0, 0, 0, 0},
-        {"/BadLink", 0, 0, 0, 1001},
-        {"/Link/Name", 1004, 0, 1004, 1004},  // links are not followed
-        {"/", 0, 0, 1002, 1004},
-        {"", 1002, 1002, 1002, 1002},
-        {"Sets/1", 1002, 1002, 1002, 1002},
-        {"/Sets//1", 1002, 1002, 1002, 1002},
-        {"/Sets/1/", 1002, 1002, 1002, 1002},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.path);
-        const auto path = text(row.path);
+    testing_support::Transcript transcript("paths");
+    transcript.replay("what a path leads to", [this](const std::vector<std::string>& inputs) {
+        const auto path = text(inputs[0]);
         session = open();
         const std::string before = shown(session);
-        EXPECT_EQ(SCPreferencesPathGetValue(session.get(), path.get()) != nullptr, row.get == 0);
-        EXPECT_EQ(SCError(), row.get);
-        CFStringRef const target = SCPreferencesPathGetLink(session.get(), path.get());
-        EXPECT_EQ(SCError(), row.link);
-        EXPECT_EQ(show(target), row.link == 0 ? "/Sets/1" : "null");
-        EXPECT_EQ(set(session, row.path, "new"), row.set == 0);
-        EXPECT_EQ(SCError(), row.set);
-        EXPECT_EQ(row.set == 0 ? nameAt(session, row.path) : "new", "new");
-        EXPECT_EQ(shown(session) == before, row.set != 0);
-        session = open();
-        EXPECT_EQ(SCPreferencesPathRemoveValue(session.get(), path.get()), row.remove == 0);
-        EXPECT_EQ(SCError(), row.remove);
-        EXPECT_EQ(shown(session) == before, row.remove != 0);
-    }
+        std::string told = "get " + show(SCPreferencesPathGetValue(session.get(), path.get()));
+        told += " " + std::to_string(SCError());
+        told += ", link " + show(SCPreferencesPathGetLink(session.get(), path.get()));
+        told += " " + std::to_string(SCError());
+        for (const char* change : {", set ", ", remove "}) {
+            session = open();
+            const bool done = change == std::string(", set ")
+                                  ? set(session, inputs[0], "new")
+                                  : SCPreferencesPathRemoveValue(session.get(), path.get()) != 0;
+            EXPECT_EQ(done, SCError() == 0);
+            told += change + std::to_string(SCError());
+            told += shown(session) != before ? " " + shown(session) : "";
+        }
+        return told;
+    });
 }
 
 TEST_F(TreeTest, TopLevelValuesMayBeOfAnyPropertyListType) {
