@@ -1,17 +1,20 @@
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
-#include <filesystem>
-#include <map>
+#include <cstdlib>
+#include <set>
 #include <string>
 #include <vector>
 
 #include "platform/CoreServices.h"
 #include "platform/base/Host.h"
+#include "platform/values/Values.h"
 #include "tests/unit/support/TemporaryDirectory.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace {
 
+using platform::values::descriptionOf;
+using platform::values::Owned;
 using testing_support::TemporaryDirectory;
 
 class Folders : public testing::Test {
@@ -32,17 +35,18 @@ class Folders : public testing::Test {
     platform::HostOverride host_;
 };
 
-// The flags of each item by its name, read 50 at a time.
-std::map<std::u16string, UInt32> itemsIn(SInt16 domain) {
-    std::map<std::u16string, UInt32> items;
+// The items of a folder, read 50 at a time, in the order of their names: "name=flags".
+std::string itemsIn(SInt16 domain) {
     FSRef folder{};
     FSIterator iterator = nullptr;
-    EXPECT_EQ(FSFindFolder(domain, kModemScriptsFolderType, false, &folder), noErr);
+    if (const OSErr err = FSFindFolder(domain, kModemScriptsFolderType, false, &folder); err != noErr) {
+        return std::to_string(err);
+    }
     EXPECT_EQ(FSOpenIterator(&folder, kFSIterateFlat, &iterator), noErr);
+    std::set<std::string> items;
     std::vector<FSRef> references(50);
     std::vector<HFSUniStr255> names(50);
-    OSErr err = noErr;
-    while (err == noErr) {
+    for (OSErr err = noErr; err == noErr;) {
         UInt32 count = 99;
         err = FSGetCatalogInfoBulk(iterator, 50, &count, nullptr, kFSCatInfoNone, nullptr, references.data(),
                                    nullptr, names.data());
@@ -50,57 +54,32 @@ std::map<std::u16string, UInt32> itemsIn(SInt16 domain) {
         for (UInt32 i = 0; i < count; ++i) {
             LSItemInfoRecord info{0xFFFF};
             EXPECT_EQ(LSCopyItemInfoForRef(&references[i], kLSRequestBasicFlagsOnly, &info), noErr);
-            EXPECT_TRUE(
-                items
-                    .emplace(std::u16string(names[i].unicode, names[i].unicode + names[i].length), info.flags)
-                    .second);
+            const auto name = Owned<CFStringRef>::adopt(
+                CFStringCreateWithCharacters(nullptr, names[i].unicode, names[i].length));
+            items.insert(descriptionOf(name.get()) + "=" + std::to_string(info.flags));
         }
     }
     EXPECT_EQ(FSCloseIterator(iterator), noErr);
-    return items;
+    std::string told;
+    for (const std::string& item : items) {
+        told += (told.empty() ? "" : ", ") + item;
+    }
+    return told;
 }
 
-TEST_F(Folders, FindsTheFolderOfEachDomainOnlyWhenItIsThere) {
-    directory.write("local/only here", "");
-    directory.write("network", "a file");
-    std::filesystem::create_symlink("local", directory.at("user"));
-    FSRef folder{};
-    EXPECT_EQ(FSFindFolder(kNetworkDomain, kModemScriptsFolderType, false, &folder), fnfErr);
-    EXPECT_EQ(FSFindFolder(kSystemDomain, kModemScriptsFolderType, false, &folder), fnfErr);
-    EXPECT_EQ(itemsIn(kLocalDomain).count(u"only here"), 1U);
-    EXPECT_EQ(itemsIn(kUserDomain).count(u"only here"), 1U);
-}
-
-TEST_F(Folders, TellsWhatEachItemIsAndPassesOverNamesThatCannotBeDelivered) {
-    std::map<std::u16string, UInt32> expected = {
-        {u"plain", kLSItemInfoIsPlainFile},
-        {u".hidden", kLSItemInfoIsPlainFile | kLSItemInfoIsInvisible},
-        {u"Caf\u00E9 \U0001F600", kLSItemInfoIsPlainFile},
-        {u"folder", kLSItemInfoIsContainer},
-        {u"to plain", kLSItemInfoIsPlainFile},
-        {u"to folder", kLSItemInfoIsContainer},
-        {u"dangling", 0},
-        {u"round", 0},
-        {u"fifo", 0},
-    };
-    for (const char* file :
-         {"plain", ".hidden", "Caf\xC3\xA9 \xF0\x9F\x98\x80", "bad\xFF", "bell\x07",
-          "longer than the 64 bytes that a name may have so that it can be shown \xF0\x9F\x98\x80",
-          "folder/inner"}) {
-        directory.write("system/" + std::string(file), "");
-    }
-    for (int i = 0; i < 110; ++i) {
-        const std::string name = std::to_string(i);
-        directory.write("system/" + name, "");
-        expected[std::u16string(name.begin(), name.end())] = kLSItemInfoIsPlainFile;
-    }
-    const std::pair<const char*, const char*> links[] = {
-        {"to plain", "plain"}, {"to folder", "folder"}, {"dangling", "nowhere"}, {"round", "round"}};
-    for (const auto& [name, target] : links) {
-        std::filesystem::create_symlink(target, directory.at("system") + "/" + name);
-    }
-    ASSERT_EQ(mkfifo(directory.at("system/fifo").c_str(), 0600), 0);
-    EXPECT_EQ(itemsIn(kSystemDomain), expected);
+// Each line is a command line, in the folder that holds those of the domains.
+TEST_F(Folders, TellWhatTheirItemsAre) {
+    testing_support::Transcript transcript("folders");
+    transcript.replay(
+        "what the user, the network, the machine and the system have",
+        [this](const std::vector<std::string>& inputs) {
+            EXPECT_EQ(std::system(("cd " + directory.path().string() + " && " + inputs[0]).c_str()), 0);
+            std::string told;
+            for (const SInt16 domain : {kUserDomain, kNetworkDomain, kLocalDomain, kSystemDomain}) {
+                told += "\n\t" + itemsIn(domain);
+            }
+            return told;
+        });
 }
 
 TEST_F(Folders, GiveNoPartOfAList) {
