@@ -1,11 +1,13 @@
 // The live state on a real kernel, in a network namespace of the test's own.
 #include <unistd.h>
 
-#include <filesystem>
+#include <array>
+#include <cstdio>
 #include <fstream>
 
 #include "tests/unit/live/Fixture.h"
 #include "tests/unit/support/PrivateNetwork.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace live_test {
 namespace {
@@ -41,68 +43,21 @@ class KernelNetworkTest : public testing_support::PrivateNetworkTest {
     }
 };
 
-std::string overCard(const std::string& card, const std::string& router = "") {
-    return "{PrimaryInterface = card" + card + (router.empty() ? "" : "; Router = " + router) + "}";
-}
-
+// Each line is a command line, and whether it changes the state; the outcome is the state behind it.
 TEST_F(KernelNetworkTest, TheGlobalStateFollowsTheDefaultRoute) {
     run([] {
-        const struct {
-            const char* command;
-            std::string state;
-        } steps[] = {
-            {"true", "status 1004"},
-            {"ip route add default via 10.0.1.1 dev card1 metric 200", overCard("1", "10.0.1.1")},
-            {"ip route add default dev card0 metric 100", overCard("0")},
-            {"ip route add default via 10.0.1.7 metric 300", overCard("0")},
-            {"ip route add default via 10.0.1.9 table 99", overCard("0")},
-            {"ip route add default via 10.0.1.9 tos 0x10 metric 1", overCard("0")},
-            {"ip route add default metric 50 nexthop via 10.0.0.5 dev card0 nexthop via 10.0.1.5 dev card1",
-             overCard("0", "10.0.0.5")},
-            {"ip link set other0 down", overCard("1", "10.0.1.5")},
-            {"ip link set other0 up", overCard("0", "10.0.0.5")},
-            {"ip route del default metric 50", overCard("0")},
-            {"ip link set other0 down", overCard("1", "10.0.1.1")},
-            {"ip link set other0 up", overCard("0")},
-            {"ip link set card0 down", overCard("1", "10.0.1.1")},
-            {"ip link set card1 name card5", overCard("5", "10.0.1.1")},
-            {"ip route add blackhole default metric 7", "status 1004"},
-            {"ip route del blackhole default metric 7", overCard("5", "10.0.1.1")},
-            {"ip link del card5", "status 1004"},
-        };
+        testing_support::Transcript transcript("default_route");
         Watcher watcher(onlyGlobal);
-        std::string before = "status 1004";
-        for (const auto& step : steps) {
-            SCOPED_TRACE(step.command);
+        transcript.replay("the route that counts", [&watcher](const std::vector<std::string>& inputs) {
+            const bool isChange = inputs.size() > 1;
             watcher.notices.clear();
-            shell(step.command);
-            watcher.waitFor(before == step.state ? 0 : 1);
-            EXPECT_EQ(valueAt(openStore().get(), globalKey), step.state);
-            EXPECT_EQ(watcher.notices.empty() ? "" : watcher.notices.back(),
-                      before == step.state ? "" : global + step.state);
-            before = step.state;
-        }
-    });
-}
-
-TEST_F(KernelNetworkTest, ARouteThatGoesWithSomethingElseIsNoticed) {
-    run([] {
-        const struct {
-            const char* come;
-            const char* go;
-        } rows[] = {
-            {"ip address add 10.0.0.50/32 dev card0 && ip route add default dev card0 src 10.0.0.50",
-             "ip address del 10.0.0.50/32 dev card0"},
-            {"ip nexthop add id 7 via 10.0.0.1 dev card0 && ip route add default nhid 7",
-             "ip nexthop del id 7"},
-        };
-        for (const auto& row : rows) {
-            shell(row.come);
-            Watcher watcher(onlyGlobal);
-            shell(row.go);
-            watcher.waitFor(1);
-            EXPECT_EQ(watcher.notices, std::vector<std::string>{global + "status 1004"}) << row.go;
-        }
+            shell(inputs[0]);
+            watcher.waitFor(isChange ? 1 : 0);
+            const std::string state = valueAt(openStore().get(), globalKey);
+            EXPECT_EQ(watcher.notices.empty() ? "" : watcher.notices.back(), isChange ? global + state : "")
+                << inputs[0];
+            return state;
+        });
     });
 }
 
@@ -133,54 +88,34 @@ TEST_F(KernelNetworkTest, TenThousandChangesUnreadAreSurvived) {
         EXPECT_GT(droppedNotices(), 0U) << "the socket was not overrun, so this shows nothing";
         watcher.waitFor(1);
         EXPECT_EQ(watcher.calls, 1U);
-        EXPECT_EQ(watcher.notices, std::vector<std::string>{global + overCard("1", "10.0.1.1")});
+        EXPECT_EQ(watcher.notices,
+                  std::vector<std::string>{global + "{PrimaryInterface = card1; Router = 10.0.1.1}"});
         shell("ip route del default");
         watcher.waitFor(2);
         EXPECT_EQ(watcher.notices.back(), global + "status 1004");
     });
 }
 
+// A line is a command line, one to wait for until it prints something, or an address whose flags are asked
+// for.
 TEST_F(KernelNetworkTest, ReachabilityIsTheKernelsAnswer) {
     run([] {
-        shell(
-            "ip route add 172.16.0.0/24 via 10.0.0.1 && ip route add unreachable 172.16.1.0/24 && "
-            "ip address add fd00::2/64 dev card0 nodad && ip -6 route add fd01::/64 via fd00::1 && "
-            "ip -6 route add unreachable fd02::/64 && ip address add fd03::2/64 dev card1 nodad && "
-            "ip route add 172.16.2.0/24 nexthop via 10.0.1.1 dev card1 nexthop via 10.0.0.1 dev card0");
-        waitForOutput("ip -6 route show table local fd00::2");
-        using Flags = std::vector<std::pair<const char*, SCNetworkConnectionFlags>>;
-        const auto expect = [](const char* when, const Flags& rows) {
-            for (const auto& [name, expected] : rows) {
-                SCNetworkConnectionFlags flags = 77;
-                EXPECT_TRUE(SCNetworkCheckReachabilityByName(name, &flags)) << name << when;
-                EXPECT_EQ(flags, expected) << name << when;
+        testing_support::Transcript transcript("reachability");
+        transcript.replay("what an address is reached by", [](const std::vector<std::string>& inputs) {
+            const std::string& line = inputs[0];
+            if (line.starts_with("ip ")) {
+                return shell(line);
             }
-        };
-        expect("", {{"10.0.0.1", 0x20002},
-                    {"10.0.0.2", 0x30002},
-                    {"127.0.0.1", 0x30002},
-                    {"172.16.0.9", 2},
-                    {"172.16.1.9", 0},
-                    {"192.0.2.1", 0},
-                    {"10.0.0.255", 0},
-                    {"224.0.0.1", 0},
-                    {"fd00::1", 0x20002},
-                    {"fd00::2", 0x30002},
-                    {"::1", 0x30002},
-                    {"fd01::1", 2},
-                    {"fd02::1", 0},
-                    {"2001:db8::1", 0},
-                    {"10.0.1.1", 0x20002},
-                    {"172.16.2.9", 2},
-                    {"fd03::1", 0x20002},
-                    {"fe80::1%card0", 0x20002}});
-        shell("ip link set other1 down");
-        waitForOutput("ip route show dev card1 | grep linkdown || true");
-        waitForOutput("ip -6 route show dev card1 | grep linkdown || true");
-        expect(" without a carrier",
-               {{"10.0.1.1", 0}, {"fd03::1", 0}, {"10.0.1.2", 0x30002}, {"172.16.2.9", 2}});
-        shell("ip link set card1 down");
-        expect(" with the link down", {{"10.0.1.1", 0}, {"fd03::1", 0}});
+            if (line.starts_with("until ")) {
+                waitForOutput(line.substr(6));
+                return std::string();
+            }
+            SCNetworkConnectionFlags flags = 77;
+            EXPECT_TRUE(SCNetworkCheckReachabilityByName(line.c_str(), &flags)) << line;
+            std::array<char, 16> text{};
+            std::snprintf(text.data(), text.size(), "%#x", flags);
+            return std::string(text.data());
+        });
     });
 }
 

@@ -1,9 +1,9 @@
 #include <arpa/inet.h>
-#include <netinet/in.h>
 
 #include <cstring>
 
 #include "tests/unit/live/Fixture.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace live_test {
 namespace {
@@ -29,6 +29,8 @@ constexpr std::string_view preferences =
     "                                   12 = /NetworkServices/5}}};"
     "        2 = {Network = {Service = {20 = {__LINK__ = /NetworkServices/20}}}}}}";
 
+using Inputs = testing_support::Transcript::Inputs;
+
 class LiveViewTest : public LiveTest {
   protected:
     LiveViewTest() { writePreferences(preferences); }
@@ -42,68 +44,15 @@ class LiveViewTest : public LiveTest {
     StoreRef store = openStore();
 };
 
-TEST_F(LiveViewTest, KeysAreWhatIsSwitchedOnInTheCurrentLocationAndMatchesAsAWhole) {
-    network->primary = routeOver("eth0");
-    const struct {
-        std::string_view pattern;
-        std::string_view keys;
-    } rows[] = {
-        {".*",
-         "(Setup:/Network/Global/IPv4, Setup:/Network/Service/5/DNS, Setup:/Network/Service/5/IPv4, "
-         "Setup:/Network/Service/5/Interface, Setup:/Network/Service/9/Interface, "
-         "Setup:/Network/Service/local/IPv4, Setup:/Network/Service/local/Interface, "
-         "State:/Network/Global/IPv4)"},
-        {"Setup:/Network/Service/[^/]+/IPv4",
-         "(Setup:/Network/Service/5/IPv4, Setup:/Network/Service/local/IPv4)"},
-        {"State:/Network/Global/IPv", "()"},
-        {"tate:/Network/Global/IPv4", "()"},
-        {"State:/Network|State:/Network/Global/IPv4", "(State:/Network/Global/IPv4)"},
-        {"State:/Network/(Glob)?.*/IPv[0-9]{1}", "(State:/Network/Global/IPv4)"},
-        {"", "()"},
-        {"(", "status 1002"},
-    };
-    for (const auto& row : rows) {
-        EXPECT_EQ(keys(row.pattern), row.keys) << row.pattern;
-    }
-}
-
-TEST_F(LiveViewTest, SetupValuesAreTheStoredEntities) {
-    const struct {
-        std::string_view key;
-        std::string_view value;
-    } rows[] = {
-        {"Setup:/Network/Service/5/IPv4", "{ConfigMethod = DHCP}"},
-        {"Setup:/Network/Service/local/IPv4", "{ConfigMethod = Manual}"},
-        {"Setup:/Network/Service/6/IPv4", "status 1004"},   // another name for it
-        {"Setup:/Network/Service/5/PPP", "status 1004"},    // switched off
-        {"Setup:/Network/Service/7/IPv4", "status 1004"},   // its service is switched off
-        {"Setup:/Network/Service/10/IPv4", "status 1004"},  // its link leads nowhere
-        {"Setup:/Network/Service/20/IPv4", "status 1004"},  // of the other location
-        {"Setup:/Network/Service/5", "status 1004"},
-        {"Setup:/Network/Global/IPv4", "{ServiceOrder = (3, 9, 5)}"},
-        {"State:/Network/Global/IPv4", "status 1004"},
-    };
-    for (const auto& row : rows) {
-        EXPECT_EQ(valueAt(store.get(), row.key), row.value) << row.key;
-    }
-}
-
-TEST_F(LiveViewTest, ThePrimaryServiceIsTheFirstInOrderThatNamesTheInterface) {
-    const struct {
-        PrimaryRoute route;
-        std::string_view value;
-    } rows[] = {
-        {routeOver("eth0", 0xC00000C0),
-         "{PrimaryInterface = eth0; Router = 192.0.0.192; PrimaryService = 9}"},
-        {routeOver("wlan0"), "{PrimaryInterface = wlan0; PrimaryService = local}"},
-        {routeOver("eth1", 0x0A000001), "{PrimaryInterface = eth1; Router = 10.0.0.1}"},  // switched off
-        {routeOver("ppp0"), "{PrimaryInterface = ppp0}"},
-        {routeOver("ppp\x1b[1m"), "{PrimaryInterface = ppp?[1m}"},
-    };
-    for (const auto& row : rows) {
-        network->primary = row.route;
-        EXPECT_EQ(valueAt(store.get(), globalKey), row.value);
-    }
+TEST_F(LiveViewTest, ShowsWhatIsSwitchedOnInTheCurrentLocation) {
+    testing_support::Transcript transcript("live_view");
+    transcript.replay("stored entities", [this](const Inputs& key) { return valueAt(store.get(), key[0]); });
+    transcript.replay("primary interfaces and routers", [this](const Inputs& route) {
+        network->primary = routeOver(route[0], route.size() > 1 ? ntohl(inet_addr(route[1].c_str())) : 0);
+        return valueAt(store.get(), globalKey);
+    });
+    transcript.replay("keys that match a pattern as a whole",
+                      [this](const Inputs& pattern) { return keys(pattern[0]); });
 }
 
 TEST_F(LiveViewTest, PreferencesThatAreNoneHideTheSetupKeysOnly) {
