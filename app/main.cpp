@@ -11,7 +11,9 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <functional>
 #include <string>
+#include <utility>
 
 #include "app/ArvAssistant.h"
 #include "app/Turn.h"
@@ -97,13 +99,11 @@ OSStatus SaveZAT() {
     return 0;
 }
 
-bool IsCommandWord(const char* word) {
-    for (const char* known : {"create", "remove", "save", "saveZAT", "restoreZAT", "test"}) {
-        if (IsWord(word, known)) {
-            return true;
-        }
-    }
-    return false;
+// A mode that is none counts as no word at all, and so do those behind it.
+OSStatus CreateTemporaryOfWords(char* mode, char* networkName, char* password) {
+    const bool isMode = mode != nullptr &&
+                        (IsWord(mode, "auto") || IsWord(mode, "wirelessAuto") || IsWord(mode, "from_intro"));
+    return isMode ? CreateTemporary(mode, networkName, password) : CreateTemporary(nullptr, nullptr, nullptr);
 }
 
 // 1 when the first word is a known one, else 0. argv holds argc words, the program's name first.
@@ -111,34 +111,25 @@ int ProcessArguments(int argc, const char** argv) {
     const auto word = [argc, argv](int index) {
         return index < argc ? const_cast<char*>(argv[index]) : nullptr;
     };
-    const char* command = word(1);
-    if (!IsCommandWord(command)) {
-        return 0;
-    }
-    const Turn turn;
-    if (turn.IsTaken()) {
-        FinishEarlierRun();
-    }
-    if (IsWord(command, "create")) {
-        char* mode = word(2);
-        if (mode != nullptr &&
-            (IsWord(mode, "auto") || IsWord(mode, "wirelessAuto") || IsWord(mode, "from_intro"))) {
-            CreateTemporary(mode, word(3), word(kPasswordIndex));
-        } else {
-            CreateTemporary(nullptr, nullptr, nullptr);
+    const std::pair<const char*, std::function<OSStatus()>> commands[] = {
+        {"create", [&] { return CreateTemporaryOfWords(word(2), word(3), word(kPasswordIndex)); }},
+        {"remove", RemoveTemporary},
+        {"save", SaveTemporary},
+        {"saveZAT", SaveZAT},
+        {"restoreZAT", RemoveTemporary2},
+        {"test", [] { return assistant.Run(); }},
+    };
+    for (const auto& [known, run] : commands) {
+        if (IsWord(word(1), known)) {
+            const Turn turn;
+            if (turn.IsTaken()) {
+                FinishEarlierRun();
+            }
+            static_cast<void>(run());
+            return 1;
         }
-    } else if (IsWord(command, "remove")) {
-        RemoveTemporary();
-    } else if (IsWord(command, "save")) {
-        SaveTemporary();
-    } else if (IsWord(command, "saveZAT")) {
-        SaveZAT();
-    } else if (IsWord(command, "restoreZAT")) {
-        RemoveTemporary2();
-    } else {
-        assistant.Run();
     }
-    return 1;
+    return 0;
 }
 
 // A descriptor that the caller closed would be given to the next file that is opened, and the trace or a

@@ -52,16 +52,17 @@ CFArrayRef CreateArrayOfKeysForWalk(CFDictionaryRef dict) {
     return keys;
 }
 
-// The path's keys as a vector, to be freed; they stay borrowed from the array.
-OSStatus PathArrayHelper(CFArrayRef path, const void*** elements) {
+// Takes the step with the path's keys as a vector, borrowed from the array, and their number.
+template <class Step>
+OSStatus PathArrayHelper(CFArrayRef path, Step step) {
     const CFIndex count = CFArrayGetCount(path);
-    OSStatus err = AllocateSlots(count, elements);
-    if (err == 0 && *elements == nullptr) {
-        err = paramErr;
-    }
+    const void** elements = nullptr;
+    OSStatus err = count > 0 ? AllocateSlots(count, &elements) : static_cast<OSStatus>(paramErr);
     if (err == 0) {
-        CFArrayGetValues(path, CFRangeMake(0, count), *elements);
+        CFArrayGetValues(path, CFRangeMake(0, count), elements);
+        err = step(elements, count);
     }
+    std::free(elements);
     return err;
 }
 
@@ -203,13 +204,9 @@ OSStatus CFQDictionaryGetValueAtPath(CFDictionaryRef dict, const CFTypeRef* path
 }
 
 OSStatus CFQDictionaryGetValueAtPathArray(CFDictionaryRef dict, CFArrayRef path, CFTypeRef* result) {
-    const void** elements = nullptr;
-    OSStatus err = PathArrayHelper(path, &elements);
-    if (err == 0) {
-        err = CFQDictionaryGetValueAtPath(dict, elements, CFArrayGetCount(path), result);
-    }
-    std::free(elements);
-    return err;
+    return PathArrayHelper(path, [=](const CFTypeRef* keys, CFIndex count) {
+        return CFQDictionaryGetValueAtPath(dict, keys, count, result);
+    });
 }
 
 OSStatus CFQDictionarySetValueAtPath(CFMutableDictionaryRef dict, const CFTypeRef* path, CFIndex count,
@@ -226,13 +223,9 @@ OSStatus CFQDictionarySetValueAtPath(CFMutableDictionaryRef dict, const CFTypeRe
 }
 
 OSStatus CFQDictionarySetValueAtPathArray(CFMutableDictionaryRef dict, CFArrayRef path, CFTypeRef value) {
-    const void** elements = nullptr;
-    OSStatus err = PathArrayHelper(path, &elements);
-    if (err == 0) {
-        err = CFQDictionarySetValueAtPath(dict, elements, CFArrayGetCount(path), value);
-    }
-    std::free(elements);
-    return err;
+    return PathArrayHelper(path, [=](const CFTypeRef* keys, CFIndex count) {
+        return CFQDictionarySetValueAtPath(dict, keys, count, value);
+    });
 }
 
 OSStatus CFQDictionaryRemoveValueAtPath(CFMutableDictionaryRef dict, const CFTypeRef* path, CFIndex count) {
@@ -248,13 +241,9 @@ OSStatus CFQDictionaryRemoveValueAtPath(CFMutableDictionaryRef dict, const CFTyp
 }
 
 OSStatus CFQDictionaryRemoveValueAtPathArray(CFMutableDictionaryRef dict, CFArrayRef path) {
-    const void** elements = nullptr;
-    OSStatus err = PathArrayHelper(path, &elements);
-    if (err == 0) {
-        err = CFQDictionaryRemoveValueAtPath(dict, elements, CFArrayGetCount(path));
-    }
-    std::free(elements);
-    return err;
+    return PathArrayHelper(path, [=](const CFTypeRef* keys, CFIndex count) {
+        return CFQDictionaryRemoveValueAtPath(dict, keys, count);
+    });
 }
 
 void CFQPropertyListDeepApplyFunction(CFPropertyListRef propList, CFQPropertyListDeepApplierFunction func,

@@ -154,10 +154,9 @@ OSStatus MoreSCIsAppleTalkActive(CFStringRef setID, Boolean* active) {
 }
 
 OSStatus MoreSCSetAppleTalkActive(CFStringRef setID, Boolean active) {
-    bool madeChanges = false;
     OSStatus err = OpenSession();
     if (err == 0) {
-        err = ForEachService(setID, [setID, active, &madeChanges](CFStringRef serviceID) {
+        err = ForEachService(setID, [setID, active](CFStringRef serviceID) {
             OSStatus stepErr = 0;
             Boolean isActive = false;
             // Services that are off are switched as well, so that they come back as wanted; one without
@@ -165,12 +164,12 @@ OSStatus MoreSCSetAppleTalkActive(CFStringRef setID, Boolean active) {
             if (MoreSCIsEntityActive(setID, serviceID, kAppleTalkProtocol, &isActive) == 0 &&
                 (isActive != 0) != (active != 0)) {
                 stepErr = MoreSCSetEntityActive(setID, serviceID, kAppleTalkProtocol, active);
-                madeChanges = madeChanges || stepErr == 0;
             }
             return stepErr;
         });
     }
-    MoreSCClose(&err, madeChanges);
+    // Whatever was switched has marked the session.
+    MoreSCClose(&err, false);
     return err;
 }
 

@@ -34,6 +34,26 @@ OSStatus CopyPathInSet(CFStringRef setID, CFStringRef format, CFStringRef last, 
     return err;
 }
 
+// Stores at one path the copy that is made of the dictionary at the other: what the store lends is not ours
+// to change.
+template <class Copy>
+OSStatus StoreCopy(CFStringRef path, CFStringRef newPath, Copy makeCopy) {
+    SCPreferencesRef session = MoreSCGetSCPreferencesRef();
+    CFTypeRef copy = nullptr;
+    CFDictionaryRef dict = SCPreferencesPathGetValue(session, path);
+    OSStatus err = MoreSCError(dict);
+    if (err == 0) {
+        copy = makeCopy(dict);
+        err = ErrorIfMissing(copy);
+    }
+    if (err == 0) {
+        err = MoreSCErrorBoolean(
+            SCPreferencesPathSetValue(session, newPath, static_cast<CFDictionaryRef>(copy)));
+    }
+    CFQRelease(copy);
+    return err;
+}
+
 // The number that a key is, when it counts (MoreSCFTree.h).
 bool ReadDecimalKey(CFTypeRef key, SInt32* number) {
     char text[16];
@@ -142,38 +162,20 @@ OSStatus CopyEntityPath(CFStringRef setID, CFStringRef serviceID, CFStringRef pr
 }
 
 OSStatus PreferencesPathSetProperty(CFStringRef path, CFStringRef key, CFPropertyListRef value) {
-    SCPreferencesRef session = MoreSCGetSCPreferencesRef();
-    CFMutableDictionaryRef copy = nullptr;
-    CFDictionaryRef dict = SCPreferencesPathGetValue(session, path);
-    OSStatus err = MoreSCError(dict);
-    if (err == 0) {
-        // What the store lends is not ours to change.
-        copy = CFDictionaryCreateMutableCopy(kCFAllocatorDefault, 0, dict);
-        err = ErrorIfMissing(copy);
-    }
-    if (err == 0) {
-        CFDictionarySetValue(copy, key, value);
-        err = MoreSCErrorBoolean(SCPreferencesPathSetValue(session, path, copy));
-    }
-    CFQRelease(copy);
-    return err;
+    return StoreCopy(path, path, [key, value](CFDictionaryRef dict) {
+        CFMutableDictionaryRef copy = CFDictionaryCreateMutableCopy(kCFAllocatorDefault, 0, dict);
+        if (copy != nullptr) {
+            CFDictionarySetValue(copy, key, value);
+        }
+        return copy;
+    });
 }
 
 OSStatus PreferencesPathDuplicate(CFStringRef path, CFStringRef newPath) {
-    SCPreferencesRef session = MoreSCGetSCPreferencesRef();
-    CFDictionaryRef copy = nullptr;
-    CFDictionaryRef dict = SCPreferencesPathGetValue(session, path);
-    OSStatus err = MoreSCError(dict);
-    if (err == 0) {
-        copy = static_cast<CFDictionaryRef>(CFPropertyListCreateDeepCopy(
-            kCFAllocatorDefault, dict, kCFPropertyListMutableContainersAndLeaves));
-        err = ErrorIfMissing(copy);
-    }
-    if (err == 0) {
-        err = MoreSCErrorBoolean(SCPreferencesPathSetValue(session, newPath, copy));
-    }
-    CFQRelease(copy);
-    return err;
+    return StoreCopy(path, newPath, [](CFDictionaryRef dict) {
+        return CFPropertyListCreateDeepCopy(kCFAllocatorDefault, dict,
+                                            kCFPropertyListMutableContainersAndLeaves);
+    });
 }
 
 CFStringRef MySCPreferencesPathCreateUniqueChild(SCPreferencesRef session, CFStringRef prefix) {
