@@ -85,13 +85,5 @@ class Misbehaving(lab.LabTest):
         self.lab.tool("remove")
 
 
-class WithoutCard(lab.LabTest):
-    options = {"cards": ["eth0"]}
-
-    def test_no_airport_card(self):
-        self.lab.tool("test", stdin=subprocess.DEVNULL)
-        self.assert_golden("test_no_airport_card")
-
-
 if __name__ == "__main__":
     lab.main()

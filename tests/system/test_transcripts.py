@@ -141,6 +141,9 @@ class WithoutCard(lab.LabTest):
         self.assertEqual(before, self.lab.network())
         self.assertEqual(({"0": "Automatic"}, "0"), self.set_names())
         self.assertEqual(1, len(self.lab.store()["NetworkServices"]))
+        self.lab.transcript = ""
+        self.lab.tool("test")
+        self.assert_golden("test_no_airport_card")
 
 
 if __name__ == "__main__":

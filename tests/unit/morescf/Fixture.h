@@ -65,9 +65,6 @@ class Output {
     Ref value_ = untouched();
 };
 
-inline CFDictionaryRef dictionary(const Value& value) {
-    return static_cast<CFDictionaryRef>(value.get());
-}
 inline CFArrayRef arrayOf(const Value& value) {
     return static_cast<CFArrayRef>(value.get());
 }
@@ -105,10 +102,6 @@ class MoreSCFTest : public testing::Test {
         const std::string content{std::istreambuf_iterator<char>(file), {}};
         platform::values::ParseError error;
         return show(platform::values::parsePropertyListXML(content, error).get());
-    }
-    // What the open session holds at a path.
-    static std::string at(std::string_view path) {
-        return show(SCPreferencesPathGetValue(MoreSCGetSCPreferencesRef(), Str(path)));
     }
     // Location 1, current, with services 5 (on eth0) and 6; location 2, with service 6 under the ID 60.
     static constexpr const char* twoSets = R"({
