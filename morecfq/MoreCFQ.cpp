@@ -52,18 +52,24 @@ CFArrayRef CreateArrayOfKeysForWalk(CFDictionaryRef dict) {
     return keys;
 }
 
-// Takes the step with the path's keys as a vector, borrowed from the array, and their number.
+// Takes the step with the array's items as a vector, borrowed from the array, and their number.
+template <class Step>
+OSStatus WithItems(CFArrayRef array, Step step) {
+    const CFIndex count = CFArrayGetCount(array);
+    const void** items = nullptr;
+    OSStatus err = AllocateSlots(count, &items);
+    if (err == 0) {
+        CFArrayGetValues(array, CFRangeMake(0, count), items);
+        err = step(items, count);
+    }
+    std::free(items);
+    return err;
+}
+
+// The same with the keys of a path, which has one at least.
 template <class Step>
 OSStatus PathArrayHelper(CFArrayRef path, Step step) {
-    const CFIndex count = CFArrayGetCount(path);
-    const void** elements = nullptr;
-    OSStatus err = count > 0 ? AllocateSlots(count, &elements) : static_cast<OSStatus>(paramErr);
-    if (err == 0) {
-        CFArrayGetValues(path, CFRangeMake(0, count), elements);
-        err = step(elements, count);
-    }
-    std::free(elements);
-    return err;
+    return CFArrayGetCount(path) > 0 ? WithItems(path, step) : static_cast<OSStatus>(paramErr);
 }
 
 // The dictionary under a key that is not the path's last one.
@@ -145,30 +151,19 @@ OSStatus CFQArrayCreateWithDictionaryValues(CFDictionaryRef dict, CFArrayRef* re
 
 OSStatus CFQDictionaryCreateWithArrayOfKeysAndValues(CFArrayRef keys, CFArrayRef values,
                                                      CFDictionaryRef* result) {
-    OSStatus err = 0;
-    const void** keySlots = nullptr;
-    const void** valueSlots = nullptr;
-    const CFIndex count = CFArrayGetCount(keys);
-    if (CFArrayGetCount(values) != count) {
-        err = paramErr;
-    }
-    if (err == 0) {
-        err = AllocateSlots(count, &keySlots);
-    }
-    if (err == 0) {
-        err = AllocateSlots(count, &valueSlots);
-    }
-    if (err == 0) {
-        CFArrayGetValues(keys, CFRangeMake(0, count), keySlots);
-        CFArrayGetValues(values, CFRangeMake(0, count), valueSlots);
+    const auto create = [&](const void** keySlots, const void** valueSlots, CFIndex count) {
         *result = CFDictionaryCreate(kCFAllocatorDefault, keySlots, valueSlots, count,
                                      &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
-        if (*result == nullptr) {
-            err = coreFoundationUnknownErr;
-        }
+        return *result != nullptr ? OSStatus{0} : OSStatus{coreFoundationUnknownErr};
+    };
+    OSStatus err = CFArrayGetCount(values) == CFArrayGetCount(keys) ? 0 : paramErr;
+    if (err == 0) {
+        err = WithItems(keys, [&](const void** keySlots, CFIndex count) {
+            return WithItems(values, [&](const void** valueSlots, CFIndex) {
+                return create(keySlots, valueSlots, count);
+            });
+        });
     }
-    std::free(keySlots);
-    std::free(valueSlots);
     return err;
 }
 

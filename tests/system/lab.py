@@ -346,7 +346,7 @@ class Lab:
         """All that has to be the same before and after: link states, addresses, routes, name servers; with the daemon
         its devices, its profiles and their files."""
         volatile = ("valid_life_time", "preferred_life_time", "tentative")
-        state = {"resolv.conf": self.file("/etc/resolv.conf"), "links": {}, "addresses": []}
+        state = {"resolv.conf": self.file("/etc/resolv.conf").splitlines(), "links": {}, "addresses": []}
         for link in json.loads(ip("-j addr")):
             if link["ifname"] in self.cards:
                 state["links"][link["ifname"]] = "UP" in link["flags"], link["address"], link["mtu"]

@@ -114,6 +114,12 @@ OSStatus NewSet(CFStringRef* id, CFStringRef* path) {
     return MakeNewSeAndCopyIDAndPath(CFSTR("Sets"), id, path);
 }
 
+// Whether that changes anything is not asked.
+OSStatus SwitchOff(CFDictionaryRef dict, CFMutableDictionaryRef* off) {
+    *off = CFDictionaryCreateMutableCopy(nullptr, 0, dict);
+    return SetDictionaryActive(*off, false, nullptr);
+}
+
 const std::map<std::string, Call> operations = tableOf(
     OPERATION(CopyEntityPath), OPERATION(CopyResolvedServicePath), OPERATION(CopySeIDFromSePath),
     OPERATION(CopySetPath), OPERATION(MacAddress), OPERATION(MoreSCCopyBSDNameOfService),
@@ -132,7 +138,7 @@ const std::map<std::string, Call> operations = tableOf(
     OPERATION(MoreSCSetAppleTalkActive), OPERATION(MoreSCSetCurrentSet), OPERATION(MoreSCSetEntities),
     OPERATION(MoreSCSetEntitiesDict), OPERATION(MoreSCSetEntity), OPERATION(MoreSCSetEntityActive),
     OPERATION(MoreSCSetServiceActive), OPERATION(MoreSCSetServicesDict), OPERATION(MoreSCSetSetsDict),
-    OPERATION(NewSet));
+    OPERATION(NewSet), OPERATION(SwitchOff));
 
 // A port that can be listed, but not be described: it has no type.
 OSStatus TakeTypeOfWirelessPort(io_object_t, CFMutableDictionaryRef port, CFStringRef proposed,
