@@ -99,14 +99,14 @@ TEST(Profile, KeepsTheNetworkOfTheCard) {
           {"hidden", {true}},
           {"seen-bssids", {Texts{"00:11:22:33:44:55"}}}}},
         {"802-11-wireless-security",
-         {{"key-mgmt", {std::string("wpa-psk")}}, {"psk", {std::string("secret")}}, {"psk-flags", {1U}}}},
+         {{"key-mgmt", {std::string("wpa-psk")}}, {"psk", {std::string("a secret")}}, {"psk-flags", {1U}}}},
         {"connection", {{"id", {std::string("Home")}}}},
     };
     const WirelessLink link{{}, wirelessSections(home)};
     const Sections profile = made(planOf("AirPort = {}"), &link);
     EXPECT_EQ(
         "{802-11-wireless = {hidden = #true; ssid = <home>}; 802-11-wireless-security = {key-mgmt = "
-        "wpa-psk; psk = secret}}",
+        "wpa-psk; psk = a secret}}",
         showValue(wirelessSections(profile)));
     EXPECT_EQ(Value{std::string("location-assistant eth0")}, profile.at("connection").at("id"));
 }
