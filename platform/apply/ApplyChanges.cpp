@@ -5,6 +5,7 @@
 #include "platform/apply/Apply.h"
 #include "platform/preferences/Session.h"
 #include "platform/preferences/Status.h"
+#include "platform/preferences/Store.h"
 
 namespace {
 
@@ -27,7 +28,7 @@ Boolean SCPreferencesApplyChanges(SCPreferencesRef session) noexcept {
     int status = kSCStatusOK;
     for (int i = 0; i < mostApplies; ++i) {
         Owned<CFDictionaryRef> committed;
-        const Outcome loaded = self->loadCommitted(committed);
+        const Outcome loaded = platform::preferences::loadCommittedTree(committed);
         if (!loaded.ok()) {
             return static_cast<Boolean>(setStatus(loaded, self->name()));
         }

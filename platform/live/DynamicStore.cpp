@@ -36,36 +36,27 @@ using platform::values::Object;
 using platform::values::Owned;
 using platform::values::textOf;
 
-// A POSIX extended regular expression that a whole key has to match.
-class KeyPattern {
-  public:
-    explicit KeyPattern(const std::string& expression) : compiled_(std::make_unique<Compiled>(expression)) {}
-
-    [[nodiscard]] bool isValid() const noexcept { return compiled_->isValid; }
-    // Of the leftmost matches POSIX gives the longest, so a shorter one never hides a match of the whole.
-    [[nodiscard]] bool matches(const std::string& key) const {
-        regmatch_t match{};
-        return ::regexec(&compiled_->expression, key.c_str(), 1, &match, 0) == 0 && match.rm_so == 0 &&
-               static_cast<std::size_t>(match.rm_eo) == key.size();
+struct PatternFreer {
+    void operator()(regex_t* compiled) const noexcept {
+        ::regfree(compiled);
+        delete compiled;
     }
-
-  private:
-    struct Compiled {
-        explicit Compiled(const std::string& text)
-            : isValid(::regcomp(&expression, text.c_str(), REG_EXTENDED) == 0) {}
-        ~Compiled() {
-            if (isValid) {
-                ::regfree(&expression);
-            }
-        }
-        Compiled(const Compiled&) = delete;
-        Compiled& operator=(const Compiled&) = delete;
-
-        regex_t expression{};
-        const bool isValid;
-    };
-    std::unique_ptr<Compiled> compiled_;
 };
+// A POSIX extended regular expression that a whole key has to match; null for what is none.
+using KeyPattern = std::unique_ptr<regex_t, PatternFreer>;
+
+KeyPattern compile(const std::string& expression) {
+    auto compiled = std::make_unique<regex_t>();
+    const bool isGood = ::regcomp(compiled.get(), expression.c_str(), REG_EXTENDED) == 0;
+    return KeyPattern(isGood ? compiled.release() : nullptr);
+}
+
+// Of the leftmost matches POSIX gives the longest, so a shorter one never hides a match of the whole.
+bool matches(const KeyPattern& pattern, const std::string& key) {
+    regmatch_t match{};
+    return ::regexec(pattern.get(), key.c_str(), 1, &match, 0) == 0 && match.rm_so == 0 &&
+           static_cast<std::size_t>(match.rm_eo) == key.size();
+}
 
 Owned<CFArrayRef> arrayOf(const std::vector<std::string>& texts) {
     CFMutableArrayRef const array = CFArrayCreateMutable(kCFAllocatorDefault, 0, &kCFTypeArrayCallBacks);
@@ -177,7 +168,7 @@ class DynamicStore final : public Object {
             RETURN_IF_FAILED(view.keys(all));
         }
         std::ranges::copy_if(all, std::back_inserter(keys), [&](const std::string& key) {
-            return std::ranges::any_of(patterns, [&](const KeyPattern& each) { return each.matches(key); });
+            return std::ranges::any_of(patterns, [&](const KeyPattern& each) { return matches(each, key); });
         });
         for (const std::string& key : keys) {
             Value value;
@@ -258,8 +249,8 @@ CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef patter
         setStatus(self == nullptr ? kSCStatusNoStoreSession : kSCStatusInvalidArgument);
         return nullptr;
     }
-    const KeyPattern compiled{std::string(textOf(pattern))};
-    if (!compiled.isValid()) {
+    const KeyPattern compiled = compile(std::string(textOf(pattern)));
+    if (!compiled) {
         setStatus(kSCStatusInvalidArgument);
         return nullptr;
     }
@@ -267,7 +258,7 @@ CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef patter
     if (!setStatus(LiveView(self->state()).keys(keys), self->name())) {
         return nullptr;
     }
-    std::erase_if(keys, [&compiled](const std::string& key) { return !compiled.matches(key); });
+    std::erase_if(keys, [&compiled](const std::string& key) { return !matches(compiled, key); });
     return arrayOf(keys).take();
 }
 
@@ -294,9 +285,9 @@ Boolean SCDynamicStoreSetNotificationKeys(SCDynamicStoreRef store, CFArrayRef ke
     const std::optional<std::vector<std::string>> patternTexts = textsIn(patterns);
     std::vector<KeyPattern> compiled;
     for (const std::string& text : patternTexts.value_or(std::vector<std::string>())) {
-        compiled.emplace_back(text);
+        compiled.push_back(compile(text));
     }
-    if (!keyTexts || !patternTexts || !std::ranges::all_of(compiled, &KeyPattern::isValid)) {
+    if (!keyTexts || !patternTexts || std::count(compiled.begin(), compiled.end(), nullptr) != 0) {
         return static_cast<Boolean>(setStatus(kSCStatusInvalidArgument));
     }
     return static_cast<Boolean>(

@@ -16,14 +16,13 @@ namespace {
 using values::as;
 using values::entriesOf;
 using values::textOf;
+using values::valueIn;
 
 constexpr std::string_view globalPrefix = "Setup:/Network/Global/";
 constexpr std::string_view servicePrefix = "Setup:/Network/Service/";
 constexpr std::string_view globalIPv4Key = "State:/Network/Global/IPv4";
 
-CFDictionaryRef dictionaryIn(CFDictionaryRef dictionary, CFTypeRef key) {
-    return dictionary != nullptr ? as<CFDictionaryRef>(CFDictionaryGetValue(dictionary, key)) : nullptr;
-}
+constexpr auto dictionaryIn = values::valueIn<CFDictionaryRef>;
 
 bool isActive(CFDictionaryRef dictionary) {
     return CFDictionaryContainsKey(dictionary, CFSTR("__INACTIVE__")) == 0;
@@ -63,26 +62,20 @@ LiveView::LiveView(NetworkState& state) : state_(&state) {
     tree_ = preferences::Tree(std::move(root));
 }
 
+CFDictionaryRef LiveView::dictionaryAt(CFStringRef path) const {
+    CFPropertyListRef value = nullptr;
+    const bool isThere = path != nullptr && tree_.find(textOf(path), value) == kSCStatusOK;
+    return isThere ? as<CFDictionaryRef>(value) : nullptr;
+}
+
 CFDictionaryRef LiveView::network() const {
-    CFPropertyListRef location = nullptr;
-    const auto path =
-        loaded_.ok() ? as<CFStringRef>(tree_.topValue(CFSTR("CurrentSet"))) : CFStringRef(nullptr);
-    if (path == nullptr || tree_.find(textOf(path), location) != kSCStatusOK) {
-        return nullptr;
-    }
-    return dictionaryIn(as<CFDictionaryRef>(location), CFSTR("Network"));
+    const auto path = valueIn<CFStringRef>(tree_.root().get(), CFSTR("CurrentSet"));
+    return dictionaryIn(dictionaryAt(path), CFSTR("Network"));
 }
 
 CFDictionaryRef LiveView::serviceBehind(CFTypeRef link) const {
-    const auto dictionary = as<CFDictionaryRef>(link);
-    const auto path = dictionary != nullptr
-                          ? as<CFStringRef>(CFDictionaryGetValue(dictionary, CFSTR("__LINK__")))
-                          : CFStringRef(nullptr);
-    CFPropertyListRef service = nullptr;
-    if (path == nullptr || tree_.find(textOf(path), service) != kSCStatusOK) {
-        return nullptr;
-    }
-    const auto content = as<CFDictionaryRef>(service);
+    const auto path = valueIn<CFStringRef>(as<CFDictionaryRef>(link), CFSTR("__LINK__"));
+    CFDictionaryRef const content = dictionaryAt(path);
     return content != nullptr && isActive(content) ? content : nullptr;
 }
 
@@ -98,36 +91,22 @@ std::vector<LiveView::Service> LiveView::services() const {
     return services;
 }
 
-std::vector<std::string> LiveView::serviceOrder() const {
-    std::vector<std::string> order;
-    CFDictionaryRef const global = dictionaryIn(dictionaryIn(network(), CFSTR("Global")), CFSTR("IPv4"));
-    const auto ids = global != nullptr ? as<CFArrayRef>(CFDictionaryGetValue(global, CFSTR("ServiceOrder")))
-                                       : CFArrayRef(nullptr);
-    if (ids != nullptr) {
-        for (const CFTypeRef id : values::itemsOf(ids)) {
-            if (const auto text = as<CFStringRef>(id)) {
-                order.emplace_back(textOf(text));
-            }
-        }
-    }
-    return order;
-}
-
 std::string LiveView::serviceNaming(const std::string& interface) const {
     std::vector<std::string> found;
     for (const Service& service : services()) {
-        CFDictionaryRef const entity = entityIn(service.content, "Interface");
-        const auto name = entity != nullptr
-                              ? as<CFStringRef>(CFDictionaryGetValue(entity, CFSTR("DeviceName")))
-                              : CFStringRef(nullptr);
+        const auto name = valueIn<CFStringRef>(entityIn(service.content, "Interface"), CFSTR("DeviceName"));
         if (name != nullptr && textOf(name) == interface) {
             found.push_back(service.id);
         }
     }
-    if (found.size() > 1) {
-        const std::vector<std::string> order = serviceOrder();
-        const auto first = std::ranges::find_first_of(order, found);
-        return first != order.end() ? *first : found.front();
+    CFDictionaryRef const global = dictionaryIn(dictionaryIn(network(), CFSTR("Global")), CFSTR("IPv4"));
+    if (const auto order = valueIn<CFArrayRef>(global, CFSTR("ServiceOrder"))) {
+        for (const CFTypeRef id : values::itemsOf(order)) {
+            const auto text = as<CFStringRef>(id);
+            if (text != nullptr && std::ranges::count(found, textOf(text)) != 0) {
+                return std::string(textOf(text));
+            }
+        }
     }
     return found.empty() ? std::string() : found.front();
 }

@@ -42,10 +42,10 @@ class LiveView {
         std::string id;
         CFDictionaryRef content;
     };
+    [[nodiscard]] CFDictionaryRef dictionaryAt(CFStringRef path) const;
     [[nodiscard]] CFDictionaryRef network() const;
     [[nodiscard]] std::vector<Service> services() const;
     [[nodiscard]] CFDictionaryRef serviceBehind(CFTypeRef link) const;
-    [[nodiscard]] std::vector<std::string> serviceOrder() const;
     [[nodiscard]] std::string serviceNaming(const std::string& interface) const;
     Outcome globalIPv4(Value& value) const;
 

@@ -1,58 +1,44 @@
 #include "platform/preferences/FirstRunTree.h"
 
-#include <initializer_list>
-#include <utility>
-
+#include "platform/values/PropertyListXML.h"
 #include "platform/values/Values.h"
 
 namespace platform::preferences {
 namespace {
 
-using Value = values::Owned<CFTypeRef>;
-
-Value makeDictionary(std::initializer_list<std::pair<CFStringRef, Value>> entries) {
-    CFMutableDictionaryRef const dictionary = CFDictionaryCreateMutable(
-        kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
-    for (const auto& [key, value] : entries) {
-        CFDictionarySetValue(dictionary, key, value.get());
-    }
-    return Value::adopt(dictionary);
-}
-
-Value text(CFStringRef constant) {
-    return Value::retained(constant);
-}
-
-Value number(std::int64_t value) {
-    return Value::adopt(values::makeNumber(value).take());
-}
-
-Value arrayOf(const void* item) {
-    return Value::adopt(CFArrayCreate(kCFAllocatorDefault, &item, 1, &kCFTypeArrayCallBacks));
-}
+constexpr std::string_view document = R"(<plist version="1.0"><dict>
+    <key>CurrentSet</key><string>/Sets/0</string>
+    <key>NetworkServices</key><dict><key>0</key><dict>
+        <key>UserDefinedName</key><string>Managed by the system</string>
+        <key>Interface</key><dict>
+            <key>DeviceName</key><string>*</string>
+            <key>Hardware</key><string>System</string>
+            <key>Type</key><string>System</string>
+        </dict>
+    </dict></dict>
+    <key>Sets</key><dict><key>0</key><dict>
+        <key>UserDefinedName</key><string>Automatic</string>
+        <key>Network</key><dict>
+            <key>Global</key><dict>
+                <key>IPv4</key><dict>
+                    <key>PPPOverridePrimary</key><integer>0</integer>
+                    <key>ServiceOrder</key><array><string>0</string></array>
+                </dict>
+                <key>NetInfo</key><dict/>
+            </dict>
+            <key>Service</key><dict>
+                <key>0</key><dict><key>__LINK__</key><string>/NetworkServices/0</string></dict>
+            </dict>
+        </dict>
+    </dict></dict>
+</dict></plist>)";
 
 }  // namespace
 
 values::Owned<CFDictionaryRef> makeFirstRunTree() {
-    const Value interface = makeDictionary({{CFSTR("DeviceName"), text(CFSTR("*"))},
-                                            {CFSTR("Hardware"), text(CFSTR("System"))},
-                                            {CFSTR("Type"), text(CFSTR("System"))}});
-    const Value service = makeDictionary(
-        {{CFSTR("UserDefinedName"), text(CFSTR("Managed by the system"))}, {CFSTR("Interface"), interface}});
-    const Value link = makeDictionary({{CFSTR("__LINK__"), text(CFSTR("/NetworkServices/0"))}});
-    const Value globals =
-        makeDictionary({{CFSTR("IPv4"), makeDictionary({{CFSTR("PPPOverridePrimary"), number(0)},
-                                                        {CFSTR("ServiceOrder"), arrayOf(CFSTR("0"))}})},
-                        {CFSTR("NetInfo"), makeDictionary({})}});
-    const Value network = makeDictionary(
-        {{CFSTR("Global"), globals}, {CFSTR("Service"), makeDictionary({{CFSTR("0"), link}})}});
-    const Value location =
-        makeDictionary({{CFSTR("UserDefinedName"), text(CFSTR("Automatic"))}, {CFSTR("Network"), network}});
-    const Value root = makeDictionary({{CFSTR("CurrentSet"), text(CFSTR("/Sets/0"))},
-                                       {CFSTR("NetworkServices"), makeDictionary({{CFSTR("0"), service}})},
-                                       {CFSTR("Sets"), makeDictionary({{CFSTR("0"), location}})}});
-    return values::Owned<CFDictionaryRef>::adopt(
-        static_cast<CFDictionaryRef>(values::frozen(root.get()).take()));
+    values::ParseError error;
+    return values::Owned<CFDictionaryRef>::retained(
+        values::as<CFDictionaryRef>(values::parsePropertyListXML(document, error).get()));
 }
 
 }  // namespace platform::preferences

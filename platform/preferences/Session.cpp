@@ -105,11 +105,4 @@ Outcome Session::makeDurable(std::chrono::milliseconds wait) {
     return done;
 }
 
-Outcome Session::loadCommitted(values::Owned<CFDictionaryRef>& tree) const {
-    Snapshot snapshot;
-    Outcome done = load(file_, snapshot);
-    tree = std::move(snapshot.tree);
-    return done;
-}
-
 }  // namespace platform::preferences

@@ -39,8 +39,6 @@ class Session final : public values::Object {
     // Writes the tree unless it equals what the file holds. On failure the tree stays as it is, and unless
     // the reason is that the new file could not be made durable, so does the file.
     Outcome commit(std::chrono::milliseconds wait = commitWait);
-    // The tree on disk now, whoever put it there.
-    Outcome loadCommitted(values::Owned<CFDictionaryRef>& tree) const;
     // The tree that the commits of this session took the place of, since it was last asked for: the same as
     // the committed one when they changed nothing, null when there was none.
     [[nodiscard]] values::Owned<CFDictionaryRef> takeReplaced() noexcept { return std::move(replaced_); }

@@ -109,27 +109,6 @@ CFIndex CFStringGetLength(CFStringRef string) noexcept {
     return static_cast<CFIndex>(string->isAscii() ? text.size() : unitCount(text));
 }
 
-void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) noexcept {
-    const std::string_view text = string->text();
-    const CFIndex end = range.location + range.length;
-    CFIndex unit = 0;
-    const auto put = [&](char32_t value) {
-        if (unit >= range.location && unit < end) {
-            *buffer++ = static_cast<UniChar>(value);
-        }
-        ++unit;
-    };
-    for (std::size_t position = 0; position < text.size() && unit < end;) {
-        const char32_t codePoint = nextCodePoint(text, position);
-        if (codePoint < 0x10000) {
-            put(codePoint);
-        } else {
-            put(0xD800 + ((codePoint - 0x10000) >> 10));
-            put(0xDC00 + (codePoint & 0x3FF));
-        }
-    }
-}
-
 Boolean CFStringHasPrefix(CFStringRef string, CFStringRef prefix) noexcept {
     return static_cast<Boolean>(string->text().starts_with(prefix->text()));
 }

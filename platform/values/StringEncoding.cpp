@@ -1,6 +1,8 @@
 // Text from and to the encodings of the faces.
 #include <unicode/ucnv.h>
+#include <unicode/ustring.h>
 
+#include <algorithm>
 #include <cstring>
 #include <memory>
 #include <vector>
@@ -75,21 +77,30 @@ CFStringRef CFStringCreateWithBytes(CFAllocatorRef, const UInt8* bytes, CFIndex 
 }
 
 CFStringRef CFStringCreateWithCharacters(CFAllocatorRef, const UniChar* characters, CFIndex count) noexcept {
-    std::string text;
-    text.reserve(static_cast<std::size_t>(count));
-    for (CFIndex i = 0; i < count; ++i) {
-        char32_t codePoint = characters[i];
-        if ((codePoint & 0xF800) == 0xD800) {
-            const bool isPair =
-                codePoint < 0xDC00 && i + 1 < count && (characters[i + 1] & 0xFC00U) == 0xDC00;
-            if (!isPair) {
-                return nullptr;
-            }
-            codePoint = 0x10000 + ((codePoint & 0x3FF) << 10) + (characters[++i] & 0x3FFU);
-        }
-        appendCodePoint(text, codePoint);
+    // No unit needs more than three bytes.
+    if (count > static_cast<CFIndex>(OpaqueCFString::longestText / 3)) {
+        return nullptr;
     }
-    return makeString(text).take();
+    std::string text(static_cast<std::size_t>(count) * 3, '\0');
+    std::int32_t size = 0;
+    UErrorCode status = U_ZERO_ERROR;
+    u_strToUTF8(text.data(), static_cast<std::int32_t>(text.size()), &size,
+                reinterpret_cast<const UChar*>(characters), static_cast<std::int32_t>(count), &status);
+    return succeeded(status)
+               ? makeString(std::string_view(text).substr(0, static_cast<std::size_t>(size))).take()
+               : nullptr;
+}
+
+void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) noexcept {
+    const std::string_view text = string->text();
+    std::vector<UChar> units(static_cast<std::size_t>(CFStringGetLength(string)));
+    UErrorCode status = U_ZERO_ERROR;
+    u_strFromUTF8(units.data(), static_cast<std::int32_t>(units.size()), nullptr, text.data(),
+                  static_cast<std::int32_t>(text.size()), &status);
+    const auto end = std::min(units.size(), static_cast<std::size_t>(range.location + range.length));
+    for (auto unit = static_cast<std::size_t>(range.location); unit < end; ++unit) {
+        *buffer++ = units[unit];
+    }
 }
 
 Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,

@@ -54,19 +54,6 @@ std::optional<TextTraits> scanText(std::string_view bytes) noexcept {
     return traits;
 }
 
-char32_t nextCodePoint(std::string_view text, std::size_t& position) noexcept {
-    UChar32 codePoint = 0;
-    U8_NEXT_UNSAFE(text.data(), position, codePoint);
-    return static_cast<char32_t>(codePoint);
-}
-
-void appendCodePoint(std::string& text, char32_t codePoint) {
-    char bytes[U8_MAX_LENGTH];
-    std::size_t size = 0;
-    U8_APPEND_UNSAFE(bytes, size, codePoint);
-    text.append(bytes, size);
-}
-
 std::size_t unitCount(std::string_view text) noexcept {
     std::size_t count = 0;
     for (const char character : text) {
@@ -80,7 +67,9 @@ std::optional<std::size_t> byteOfUnit(std::string_view text, std::size_t unit) n
     std::size_t position = 0;
     std::size_t units = 0;
     while (units < unit && position < text.size()) {
-        units += nextCodePoint(text, position) >= 0x10000 ? 2U : 1U;
+        UChar32 codePoint = 0;
+        U8_NEXT_UNSAFE(text.data(), position, codePoint);
+        units += codePoint >= 0x10000 ? 2U : 1U;
     }
     return units == unit ? std::optional(position) : std::nullopt;
 }

@@ -20,9 +20,6 @@ inline constexpr TextTraits textBeyondXml = 4;    // holds a character that no X
 
 // The functions below take well-formed UTF-8.
 
-// The code point at the position, which moves behind it.
-[[nodiscard]] char32_t nextCodePoint(std::string_view text, std::size_t& position) noexcept;
-void appendCodePoint(std::string& text, char32_t codePoint);
 [[nodiscard]] std::size_t unitCount(std::string_view text) noexcept;
 // The byte at which the unit begins, or nothing inside a character of two units or beyond the end.
 [[nodiscard]] std::optional<std::size_t> byteOfUnit(std::string_view text, std::size_t unit) noexcept;

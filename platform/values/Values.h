@@ -37,6 +37,12 @@ template <class Ref>
     return matches ? static_cast<Ref>(value) : nullptr;
 }
 
+// The value under a key, as this type; null when there is none. A null dictionary holds nothing. Borrowed.
+template <class Ref>
+[[nodiscard]] Ref valueIn(CFDictionaryRef dictionary, CFTypeRef key) noexcept {
+    return dictionary == nullptr ? nullptr : as<Ref>(CFDictionaryGetValue(dictionary, key));
+}
+
 // Null when the bytes are not well-formed UTF-8.
 [[nodiscard]] Owned<CFStringRef> makeString(std::string_view text);
 // The string's bytes, NUL-terminated, borrowed until it is changed or released.
