@@ -9,22 +9,6 @@ namespace {
 using ChangeNoticeTest = LiveTest;
 using Notices = std::vector<std::string>;
 
-TEST_F(ChangeNoticeTest, AWatchedValueIsReportedWhenItChanged) {
-    writePreferences("{}");
-    network->primary = routeOver("eth0");
-    Watcher watcher("(State:/Network/Global/IPv4, State:/Network/Other)");
-    watcher.waitFor(1, 0.05);
-    EXPECT_TRUE(watcher.notices.empty()) << "nothing changed since it began to watch";
-    network->change(routeOver("eth1", 0x0A000001));
-    watcher.waitFor(1);
-    network->change(network->primary);
-    watcher.waitFor(2, 0.05);
-    network->change(std::nullopt);
-    watcher.waitFor(2);
-    EXPECT_EQ(watcher.notices,
-              (Notices{global + "{PrimaryInterface = eth1; Router = 10.0.0.1}", global + "status 1004"}));
-}
-
 TEST_F(ChangeNoticeTest, NewsThatComeFastCostFewLooks) {
     Watcher watcher(onlyGlobal);
     network->looks = 0;
