@@ -231,14 +231,15 @@ int Bus::forwardSignal(sd_bus_message* message, void* watch, sd_bus_error* /*err
     return 0;
 }
 
-Outcome Bus::watch(const std::string& interface, const std::string& member, Handler handler) {
+Outcome Bus::watch(const std::string& interface, const std::string& member, Handler handler,
+                   const std::string& about) {
     watches_.push_back(std::make_unique<Watch>(Watch{this, std::move(handler), nullptr}));
     Watch& made = *watches_.back();
     sd_bus_slot* slot = nullptr;
     // Not waited for: the bus takes requests in order, and this one comes before any call made later.
-    const int result =
-        sd_bus_match_signal_async(bus_.get(), &slot, service_.c_str(), nullptr, interface.c_str(),
-                                  member.c_str(), forwardSignal, nullptr, &made);
+    const std::string rule = "type='signal',sender='" + service_ + "',interface='" + interface +
+                             "',member='" + member + "'" + (about.empty() ? "" : ",arg0='" + about + "'");
+    const int result = sd_bus_add_match_async(bus_.get(), &slot, rule.c_str(), forwardSignal, nullptr, &made);
     made.slot.reset(slot);
     return result < 0 ? fromBus("listening to " + member, result) : Outcome();
 }

@@ -61,9 +61,11 @@ class Bus {
 
     // Hands the service's signals of this name to the function as long as the bus is open. The message is
     // read from its start. What is sent after a call that is made later is not missed. A signal counts only
-    // when the owner of the service's name sent it: anybody can send one under the name itself.
+    // when the owner of the service's name sent it: anybody can send one under the name itself. With `about`
+    // only those whose first argument it is: the others do not even wake this program.
     using Handler = std::function<void(const char* path, sd_bus_message* message)>;
-    Outcome watch(const std::string& interface, const std::string& member, Handler handler);
+    Outcome watch(const std::string& interface, const std::string& member, Handler handler,
+                  const std::string& about = "");
 
     // Handles the signals that have come; when there are none, waits for one until the time. Fails when the
     // service left the bus.

@@ -151,14 +151,23 @@ Outcome Daemon::findDevice(const std::string& interface, std::optional<Device>& 
     device.reset();
     Device found;
     std::optional<Dictionary> properties;
-    RETURN_IF_FAILED(findPath(managerPath, managerInterface, "GetDeviceByIpIface", interface,
-                              "org.freedesktop.NetworkManager.UnknownDevice", found.path));
-    if (!found.path.empty()) {
+    // Where it was the last time: another card of this name would be another object.
+    if (const auto known = paths_.find(interface); known != paths_.end()) {
+        found.path = known->second;
         RETURN_IF_FAILED(readObject(found.path, deviceInterface, properties));
+    }
+    if (!properties || valueOf<std::string>(*properties, "Interface").value_or(interface) != interface) {
+        RETURN_IF_FAILED(findPath(managerPath, managerInterface, "GetDeviceByIpIface", interface,
+                                  "org.freedesktop.NetworkManager.UnknownDevice", found.path));
+        properties.reset();
+        if (!found.path.empty()) {
+            RETURN_IF_FAILED(readObject(found.path, deviceInterface, properties));
+        }
     }
     if (!properties) {
         return {};
     }
+    paths_[interface] = found.path;
     const std::uint32_t type = numberIn(*properties, "DeviceType");
     if (type == typeEthernet || type == typeVirtualEthernet) {
         found.kind = Device::Kind::wired;
@@ -412,17 +421,12 @@ Outcome Daemon::listen() {
             }
         }));
     RETURN_IF_FAILED(bus_.watch(
-        propertiesInterface, "PropertiesChanged", [this](const char* path, sd_bus_message* message) {
-            const char* interface = "";
-            (void)sd_bus_message_read(message, "s", &interface);
-            const std::string_view changed = interface;
-            managerChanged_ = managerChanged_ || std::string_view(path) == managerPath;
-            if (changed == wirelessInterface || changed == accessPointInterface) {
-                ++changesOnAir_;
-            }
-        }));
-    return bus_.watch(wirelessInterface, "AccessPointAdded",
-                      [this](const char* /*path*/, sd_bus_message* /*message*/) { ++changesOnAir_; });
+        propertiesInterface, "PropertiesChanged",
+        [this](const char* /*path*/, sd_bus_message* /*message*/) { managerChanged_ = true; },
+        managerInterface));
+    const auto noteAir = [this](const char* /*path*/, sd_bus_message* /*message*/) { ++changesOnAir_; };
+    RETURN_IF_FAILED(bus_.watch(propertiesInterface, "PropertiesChanged", noteAir, wirelessInterface));
+    return bus_.watch(wirelessInterface, "AccessPointAdded", noteAir);
 }
 
 void Daemon::noteDevice(const char* path, std::uint32_t state, std::uint32_t reason) {

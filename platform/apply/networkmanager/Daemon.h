@@ -158,6 +158,7 @@ class Daemon {
     bool radioHardware_ = true;
     bool managerChanged_ = false;
     unsigned changesOnAir_ = 0;
+    std::map<std::string, std::string> paths_;  // of the cards, by interface
     States devices_;
     States actives_;
     States failures_;

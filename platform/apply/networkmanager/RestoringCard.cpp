@@ -137,38 +137,37 @@ class RestoringCard final : public Card {
         } else if (isLate()) {
             task_.trouble = "the profile that was active before is not up yet; NetworkManager goes on";
             stage_ = &RestoringCard::finish;
-        } else if (before_.wasUp && !network_.empty() && !askAgainAt_ && cardState < deviceGetsAddresses &&
-                   changesOnAir_ != daemon_.changesOnAir()) {
+        } else if (before_.wasUp && !network_.empty() && changesOnAir_ != daemon_.changesOnAir()) {
             return lookAgain();
-        } else if (!isAskedAgain_ && askAgainAt_ && Clock::now() >= *askAgainAt_) {
-            isAskedAgain_ = true;
-            if (cardState < deviceGetsAddresses) {
-                return daemon_.activate(profile_, device_, active_->path);
-            }
+        } else if (decideAt_ && Clock::now() >= *decideAt_) {
+            decideAt_.reset();
+            return cardState < deviceGetsAddresses ? decide() : Outcome();
         } else {
-            waitUntil(askAgainAt_ && !isAskedAgain_ ? *askAgainAt_
-                      : before_.wasUp               ? deadline_
-                                                    : placeDeadline_);
+            waitUntil(decideAt_.value_or(before_.wasUp ? deadline_ : placeDeadline_));
         }
         return {};
     }
 
-    // What a whole scan does not hear is not waited for.
     Outcome lookAgain() {
         changesOnAir_ = daemon_.changesOnAir();
         std::int64_t lastScan = 0;
-        std::vector<HeardNetwork> heard;
         RETURN_IF_FAILED(daemon_.readLastScan(device_, lastScan));
-        RETURN_IF_FAILED(daemon_.readHeard(device_, network_, heard));
-        if (std::exchange(lastScan_, lastScan) == lastScan) {
-            return {};
+        if (std::exchange(lastScan_, lastScan) != lastScan) {
+            decideAt_ = Clock::now() + joinsAtOnce;
         }
+        return {};
+    }
+
+    // What a whole scan did not hear is not waited for.
+    Outcome decide() {
+        std::vector<HeardNetwork> heard;
+        RETURN_IF_FAILED(daemon_.readHeard(device_, network_, heard));
         const auto sinceThen = Clock::now() - askedAt_ + std::chrono::seconds(1);
-        if (std::ranges::any_of(heard, [&](const HeardNetwork& one) { return one.age <= sinceThen; })) {
-            askAgainAt_ = Clock::now() + joinsAtOnce;
-        } else {
+        if (std::ranges::none_of(heard, [&](const HeardNetwork& one) { return one.age <= sinceThen; })) {
             task_.trouble = "the network of before is not there now, and is joined when it comes";
             stage_ = &RestoringCard::finish;
+        } else if (!std::exchange(isAskedAgain_, true)) {
+            return daemon_.activate(profile_, device_, active_->path);
         }
         return {};
     }
@@ -230,7 +229,7 @@ class RestoringCard final : public Card {
     Clock::time_point askedAt_;
     std::int64_t lastScan_ = 0;
     unsigned changesOnAir_ = 0;
-    std::optional<Clock::time_point> askAgainAt_;
+    std::optional<Clock::time_point> decideAt_;
     bool isAskedAgain_ = false;
 };
 
