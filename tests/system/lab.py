@@ -219,7 +219,9 @@ class Lab:
             self.start_bus()
             self.start_network_manager()
         if {"eth0", "wlan0"} & set(cards):
-            wait_until(lambda: all("LOWER_UP" in link["flags"] for link in self.links() if link["ifname"] in ("eth0", "wlan0")))
+            # A link that is up gets an address of its own a moment later.
+            wait_until(lambda: all("LOWER_UP" in link["flags"] and (daemon or "fe80:" in ip("-6 addr show " + link["ifname"]))
+                                   for link in self.links() if link["ifname"] in ("eth0", "wlan0")))
 
     def close(self):
         for process in Path("/proc").glob("[0-9]*"):
