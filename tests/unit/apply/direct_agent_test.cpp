@@ -13,12 +13,14 @@
 #include "tests/unit/apply/StandInSupplicant.h"
 #include "tests/unit/support/Interrupted.h"
 #include "tests/unit/support/PrivateNetwork.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace platform::apply {
 namespace {
 
 using testing_support::PrivateNetwork;
 using testing_support::shell;
+using Inputs = testing_support::Transcript::Inputs;
 
 // Everything that ip tells of the interfaces, but what counts or comes by itself: lifetimes, carriers,
 // link-local and router-advertised things; and what stands under the name of the name servers' file.
@@ -83,6 +85,20 @@ class DirectAgentTest : public testing_support::PrivateNetworkTest {
             body();
         });
     }
+    // What the body gives back, which is all that comes out of there.
+    static std::string seen(const std::function<std::string()>& body) {
+        FILE* const file = tmpfile();
+        run([&] {
+            const std::string text = body();
+            EXPECT_EQ(text.size(), fwrite(text.data(), 1, text.size(), file));
+        });
+        rewind(file);
+        std::string text(4096, '\0');
+        text.resize(fread(text.data(), 1, text.size(), file));
+        fclose(file);
+        std::ranges::replace(text, '\n', ';');
+        return text;
+    }
     static std::string log() { return shell("cat /run/log 2>/dev/null; rm -f /run/log"); }
 };
 
@@ -93,50 +109,9 @@ values::Owned<CFDictionaryRef> thereTree(const std::string& address = "192.0.0.1
 }
 
 TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
-    static const struct {
-        const char* name;
-        const char* commands;
-    } rows[] = {
-        {"idle", "true"},
-        {"several addresses, secondary ones, labels and scopes",
-         "ip addr add 10.1.0.5/24 brd + dev card0; ip addr add 10.1.0.6/24 dev card0 label card0:x;"
-         "ip addr add 10.2.0.1/16 dev card0; ip addr add 10.3.0.1 peer 10.3.0.2 dev card0;"
-         "ip addr add 169.254.7.7/16 scope link dev card0; ip link set card0 up; ln -s ../run/stub "
-         "/etc/resolv.conf"},
-        {"addresses with metrics, flags and lifetimes",
-         "ip link set card0 up; echo nameserver 9.9.9.9 >/etc/resolv.conf; chmod 640 /etc/resolv.conf;"
-         "ip addr add 10.1.0.5/24 dev card0 metric 1024 valid_lft 4000 preferred_lft 3000;"
-         "ip addr add 10.4.0.5/24 dev card0 noprefixroute; ip addr add 10.5.0.5/24 dev card0 preferred_lft 0;"
-         "ip -6 addr add 2001:db8::5/64 dev card0 nodad metric 1025 preferred_lft 0"},
-        {"a source that the network has to confirm",
-         "ip link set card0 up; ip -6 addr add 2001:db8::5/64 dev card0; sleep 2.5;"
-         "ip -6 route add 2001:db8:9::/48 via 2001:db8::1 src 2001:db8::5"},
-        {"IPv6 off, and the other card on",
-         "echo 1 > /proc/sys/net/ipv6/conf/card0/disable_ipv6; ip link set card0 up; ip link set card1 up"},
-        {"routes with metrics, tables, sources and types",
-         "ip addr add 10.1.0.5/24 dev card0; ip addr add 10.1.0.6/24 dev card0; ip link set card0 up;"
-         "ip -6 addr add 2001:db8::5/64 dev card0 nodad; ip -6 route add default via 2001:db8::1 dev card0 "
-         "metric 77;"
-         "ip route add default via 10.1.0.1 dev card0 metric 100;"
-         "ip route add default via 10.1.0.2 dev card0 metric 200;"
-         "ip route add 10.9.0.0/16 via 10.1.0.3 src 10.1.0.6 mtu 1300;"
-         "ip route add 10.46.0.0/16 via 10.1.0.2 realm 3 mtu lock 1200 congctl reno quickack 1 tos 0x10;"
-         "ip route add 10.45.0.0/16 nexthop via 10.1.0.2 weight 2 nexthop via 10.1.0.3 onlink dev card0;"
-         "ip route add 10.44.0.0/16 via inet6 fe80::1 dev card0;"
-         "ip route add 10.43.0.0/16 encap ip id 5 dst 1.2.3.4 dev card0;"
-         "ip -6 route add 2001:db8:7::/48 dev card0 metric 9 pref high;"
-         "ip route add 10.8.0.0/16 dev card0 scope link table 42; ip route add 10.7.0.0/16 via 10.5.5.5 dev "
-         "card0 onlink"},
-        {"a connected route that was taken away",
-         "ip addr add 10.1.0.5/24 dev card0; ip link set card0 up; ip route del 10.1.0.0/24 dev card0"},
-        {"default routes of the same metric, this card's last",
-         "ip addr add 10.1.0.5/24 dev card0; ip addr add 10.2.0.5/24 dev card1; ip link set card0 up;"
-         "ip link set card1 up; ip route add default via 10.2.0.1; ip route append default via 10.1.0.1"},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.name);
-        run([&row] {
-            shell(row.commands);
+    testing_support::Transcript("earlier_states").replay("the machine's commands", [](const Inputs& inputs) {
+        run([&inputs] {
+            shell(inputs[0]);
             const std::string before = machineState();
             const auto there = thereTree();
             EXPECT_EQ("", activate(there.get()));
@@ -155,7 +130,8 @@ TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
             EXPECT_EQ(before, machineState());
             EXPECT_EQ("", log());
         });
-    }
+        return HasFailure() ? "not given back" : "given back";
+    });
 }
 
 // The process ends before every single step of going there, elsewhere and back; the next run goes on, or
@@ -201,55 +177,29 @@ TEST_F(DirectAgentTest, AProcessThatEndsAnywhereLeavesTheWayBack) {
     }
 }
 
-// What somebody does meanwhile, and what the interfaces are after the way back; null: the same location is
-// made so again.
+// What somebody does meanwhile, and what the interfaces are when the same location is made so again, or after
+// the way back.
 TEST_F(DirectAgentTest, LooksAtTheMachineAgain) {
-    static const struct {
-        const char* theirs;
-        const char* addresses;
-        const char* routes;
-    } rows[] = {
-        {"ip addr flush dev card0", nullptr, nullptr},
-        {"ip link set card0 down", nullptr, nullptr},
-        {"ip route flush dev card0", nullptr, nullptr},
-        {"ip addr add 10.9.9.9/8 dev card0", nullptr, nullptr},
-        {"ip link set card1 up; ip addr add 10.8.8.8/8 dev card1", nullptr, nullptr},
-        {"ip addr flush dev card0; ip addr add 10.7.0.1/24 dev card0; ip route add default via 10.7.0.9",
-         "10.7.0.1/24 \n", "default via 10.7.0.9 dev card0 \n"},
-        {"ip addr add 10.7.0.1/24 dev card0", "10.7.0.1/24 \n", ""},
-        // A daemon that watches for cards without an address stands for nobody.
-        {"ip addr add 169.254.7.7/16 scope link dev card0", "10.1.0.5/24 \n",
-         "default via 10.1.0.1 dev card0 \n"},
-        {"ip link del card0; ip link add dummy0 type veth; ip link add card0 type veth peer name far0",
-         "10.1.0.5/24 \n", "default via 10.1.0.1 dev card0 \n"},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.theirs);
-        run([&row] {
-            shell(
-                "ip addr add 10.1.0.5/24 dev card0; ip link set card0 up; ip route add default via 10.1.0.1");
-            const auto there = thereTree();
-            EXPECT_EQ("", activate(there.get()));
-            const std::string made = machineState();
-            shell(row.theirs);
-            ASSERT_NE(made, machineState());
-            if (row.addresses == nullptr) {
+    testing_support::Transcript transcript("meanwhile");
+    for (const bool isAgain : {true, false}) {
+        transcript.replay(isAgain ? "made so again" : "given back", [isAgain](const Inputs& inputs) {
+            return seen([&] {
+                shell(
+                    "ip addr add 10.1.0.5/24 dev card0; ip link set card0 up;"
+                    "ip route add default via 10.1.0.1");
+                const auto there = thereTree();
                 EXPECT_EQ("", activate(there.get()));
-                EXPECT_EQ(made, machineState());
-                return;
-            }
-            EXPECT_EQ("", activate(makeTree({}).get()));
-            EXPECT_EQ(row.addresses, addressesOf("card0"));
-            EXPECT_EQ(row.routes, defaultRoutes());
-            EXPECT_EQ("", kept());
+                const std::string made = machineState();
+                shell(inputs[0]);
+                EXPECT_NE(made, machineState());
+                EXPECT_EQ("", activate(isAgain ? there.get() : makeTree({}).get()));
+                EXPECT_EQ(made == machineState(), isAgain);
+                EXPECT_TRUE(isAgain || kept().empty());
+                return shell("ip -br link show up dev card1 | cut -d' ' -f1") + addressesOf("card0") +
+                       defaultRoutes();
+            });
         });
     }
-    run([] {
-        EXPECT_EQ("", activate(thereTree().get()));
-        shell("ip link set card1 up");
-        EXPECT_EQ("", activate(makeTree({}).get()));
-        EXPECT_NE("", shell("ip -br link show up dev card1")) << "somebody has switched it on";
-    });
 }
 
 TEST_F(DirectAgentTest, KeepsWhatAWayBackNeedsUntilItIsBack) {
@@ -279,72 +229,40 @@ while :; do
 done
 )";
 
-void offer(const std::string& commands) {
-    shell("printf '%s' '" + commands + "' >/run/new; mv /run/new /run/offer");
-}
-
-values::Owned<CFDictionaryRef> dhcpTree(const std::string& dns = "") {
+values::Owned<CFDictionaryRef> dhcpTree(const std::string& dns) {
     return makeTree({{"card0", "IPv4 = {ConfigMethod = DHCP; DHCPClientID = me}; DNS = {" + dns + "};"}});
 }
 
+// Steps: a shell's commands behind "sh", the client's next ones behind "offer", "there" with an entity for
+// the name servers, and "back", after which the machine has to be as it was.
 TEST_F(DirectAgentTest, FollowsItsDhcpClient) {
-    static const struct {
-        const char* offer;
-        const char* addresses;
-        const char* routes;
-        const char* servers;
-    } rows[] = {
-        {"export ip=10.50.0.10 mask=24 router=10.50.0.1 dns=10.50.0.53 domain=x lease=600; $hook bound",
-         "10.50.0.10/24 \n", "default via 10.50.0.1 dev card0 proto 76 \n",
-         "search own.example\nnameserver 10.50.0.53\n"},
-        {"export router=10.50.0.2 dns=10.50.0.54; $hook renew", "10.50.0.10/24 \n",
-         "default via 10.50.0.2 dev card0 proto 76 \n", "search own.example\nnameserver 10.50.0.54\n"},
-        {"$hook nak; export ip=10.51.0.7 mask=16 router= dns=; $hook bound", "10.51.0.7/16 \n", "",
-         "search own.example\n"},
-        {"export mask=0; $hook bound", "10.51.0.7/16 \n", "", "search own.example\n"},
-    };
     run([] {
-        shell("ip link set card0 up; echo nameserver 9.9.9.9 >/run/real; ln -s /run/real /etc/resolv.conf");
         std::ofstream("/run/client") << client;
         chmod("/run/client", 0700);
+        shell("ip link set card0 up; echo nameserver 9.9.9.9 >/run/real; ln -s /run/real /etc/resolv.conf");
         const std::string before = machineState();
-        const auto there = dhcpTree("SearchDomains = (own.example)");
-        for (const auto& row : rows) {
-            SCOPED_TRACE(row.offer);
-            offer(row.offer);
-            EXPECT_EQ("", activate(there.get()));
-            shell("while [ -e /run/offer ] || [ -e /run/taken ]; do sleep 0.02; done");
-            EXPECT_EQ(row.addresses, addressesOf("card0"));
-            EXPECT_EQ(row.routes, defaultRoutes());
-            EXPECT_EQ(row.servers, shell("grep -v '^#' /etc/resolv.conf"));
-        }
-        EXPECT_EQ("-x 0x3d:006d65\n", shell("grep -o -e '-x .*' /run/arguments"));
-        EXPECT_EQ("", activate(makeTree({}).get()));
-        EXPECT_EQ(before, machineState());
-        EXPECT_EQ("/run/real\n", shell("readlink /etc/resolv.conf"));
-        EXPECT_EQ("", kept());
-        EXPECT_EQ("", log());
-
-        // The location's own name servers; a client that does not end.
-        offer("trap \"\" TERM; export ip=10.50.0.10 dns=10.50.0.53; $hook bound");
-        EXPECT_EQ("", activate(dhcpTree("ServerAddresses = (10.0.0.53)").get()));
-        EXPECT_EQ("nameserver 10.0.0.53\n", shell("grep -v '^#' /etc/resolv.conf"));
-        EXPECT_EQ("", activate(makeTree({}).get()));
-        EXPECT_EQ("card0: the DHCP client does not end by itself and is ended\n", log());
-        EXPECT_EQ(before + kept(), machineState());
-
-        // What no machine can have; a client that dies, and the one after it.
-        offer("export ip=127.0.0.1; $hook bound");
-        EXPECT_EQ("", activate(there.get()));
-        EXPECT_EQ("card0: the DHCP server offered no address that a machine can have\n", log());
-        EXPECT_EQ("", activate(makeTree({}).get()));
-        offer("exit 1");
-        EXPECT_EQ("the DHCP client ended before it had a lease", activate(there.get()));
-        offer("export ip=10.50.0.10; $hook bound");
-        EXPECT_EQ("", activate(there.get()));
-        EXPECT_EQ("10.50.0.10/8 \n", addressesOf("card0"));
-        EXPECT_EQ("", activate(makeTree({}).get()));
-        EXPECT_EQ(before, machineState());
+        testing_support::Transcript("dhcp").playItself([&before](const std::string& step) {
+            const std::string name = step.substr(0, step.find(' '));
+            const std::string rest = step.substr(std::min(name.size() + 1, step.size()));
+            std::string seen;
+            if (name == "sh") {
+                seen = shell(rest);
+            } else if (name == "offer") {
+                shell("printf '%s' '" + rest + "' >/run/new; mv /run/new /run/offer");
+            } else if (name == "there") {
+                // A client that dies leaves its steps behind.
+                seen = activate(dhcpTree(rest).get());
+                shell(seen.empty() ? "while [ -e /run/offer ] || [ -e /run/taken ]; do sleep 0.02; done"
+                                   : "rm -f /run/taken");
+                seen += (seen.empty() ? "" : "\n") + addressesOf("card0") + defaultRoutes() +
+                        shell("grep -v '^#' /etc/resolv.conf") + log();
+            } else {
+                seen = activate(makeTree({}).get());
+                EXPECT_EQ(before + kept(), machineState());
+                seen += log();
+            }
+            return seen.substr(0, seen.find_last_not_of('\n') + 1);
+        });
     });
 }
 
