@@ -34,12 +34,31 @@ CFStringRef CopyText(CFTypeRef value) {
                                                      : CFCopyDescription(value);
 }
 
-void TracePair(CFTypeRef key, CFTypeRef value, void* /*context*/) {
+void TracePair(CFTypeRef key, CFTypeRef value) {
     const CFStringRef keyText = CopyText(key);
     const CFStringRef valueText = CopyText(value);
     TRACE("key=\"%s\", value=\"%s\"\n", SystemText(keyText).c_str(), SystemText(valueText).c_str());
     CFQRelease(keyText);
     CFQRelease(valueText);
+}
+
+OSStatus TraceDictionary(CFDictionaryRef dictionary) {
+    CFArrayRef keys = nullptr;
+    CFArrayRef values = nullptr;
+    OSStatus err = CFQArrayCreateWithDictionaryKeys(dictionary, &keys);
+    if (err == 0) {
+        err = CFQArrayCreateWithDictionaryValues(dictionary, &values);
+    }
+    if (err == 0) {
+        TRACE("Main Key Dict:\n");
+        const CFIndex count = CFArrayGetCount(keys);
+        for (CFIndex i = 0; i < count; ++i) {
+            TracePair(CFArrayGetValueAtIndex(keys, i), CFArrayGetValueAtIndex(values, i));
+        }
+    }
+    CFQRelease(keys);
+    CFQRelease(values);
+    return err;
 }
 
 }  // namespace
@@ -65,8 +84,7 @@ void networkChanged(SCDynamicStoreRef session, CFArrayRef changedKeys, void* /*i
         }
         setNetworkReady(err == 0);
         if (err == 0) {
-            TRACE("Main Key Dict:\n");
-            CFQPropertyListShallowApplyFunction(dictionary, TracePair, nullptr);
+            err = TraceDictionary(dictionary);
         }
         CFQRelease(dictionary);
     }

@@ -52,24 +52,17 @@ CFArrayRef CreateArrayOfKeysForWalk(CFDictionaryRef dict) {
     return keys;
 }
 
-// Takes the step with the array's items as a vector, borrowed from the array, and their number.
-template <class Step>
-OSStatus WithItems(CFArrayRef array, Step step) {
-    const CFIndex count = CFArrayGetCount(array);
-    const void** items = nullptr;
-    OSStatus err = AllocateSlots(count, &items);
-    if (err == 0) {
-        CFArrayGetValues(array, CFRangeMake(0, count), items);
-        err = step(items, count);
+// The path's keys as a vector, to be freed; they stay borrowed from the array.
+OSStatus PathArrayHelper(CFArrayRef path, const void*** elements) {
+    const CFIndex count = CFArrayGetCount(path);
+    OSStatus err = AllocateSlots(count, elements);
+    if (err == 0 && *elements == nullptr) {
+        err = paramErr;
     }
-    std::free(items);
+    if (err == 0) {
+        CFArrayGetValues(path, CFRangeMake(0, count), *elements);
+    }
     return err;
-}
-
-// The same with the keys of a path, which has one at least.
-template <class Step>
-OSStatus PathArrayHelper(CFArrayRef path, Step step) {
-    return CFArrayGetCount(path) > 0 ? WithItems(path, step) : static_cast<OSStatus>(paramErr);
 }
 
 // The dictionary under a key that is not the path's last one.
@@ -151,19 +144,30 @@ OSStatus CFQArrayCreateWithDictionaryValues(CFDictionaryRef dict, CFArrayRef* re
 
 OSStatus CFQDictionaryCreateWithArrayOfKeysAndValues(CFArrayRef keys, CFArrayRef values,
                                                      CFDictionaryRef* result) {
-    const auto create = [&](const void** keySlots, const void** valueSlots, CFIndex count) {
+    OSStatus err = 0;
+    const void** keySlots = nullptr;
+    const void** valueSlots = nullptr;
+    const CFIndex count = CFArrayGetCount(keys);
+    if (CFArrayGetCount(values) != count) {
+        err = paramErr;
+    }
+    if (err == 0) {
+        err = AllocateSlots(count, &keySlots);
+    }
+    if (err == 0) {
+        err = AllocateSlots(count, &valueSlots);
+    }
+    if (err == 0) {
+        CFArrayGetValues(keys, CFRangeMake(0, count), keySlots);
+        CFArrayGetValues(values, CFRangeMake(0, count), valueSlots);
         *result = CFDictionaryCreate(kCFAllocatorDefault, keySlots, valueSlots, count,
                                      &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
-        return *result != nullptr ? OSStatus{0} : OSStatus{coreFoundationUnknownErr};
-    };
-    OSStatus err = CFArrayGetCount(values) == CFArrayGetCount(keys) ? 0 : paramErr;
-    if (err == 0) {
-        err = WithItems(keys, [&](const void** keySlots, CFIndex count) {
-            return WithItems(values, [&](const void** valueSlots, CFIndex) {
-                return create(keySlots, valueSlots, count);
-            });
-        });
+        if (*result == nullptr) {
+            err = coreFoundationUnknownErr;
+        }
     }
+    std::free(keySlots);
+    std::free(valueSlots);
     return err;
 }
 
@@ -199,9 +203,13 @@ OSStatus CFQDictionaryGetValueAtPath(CFDictionaryRef dict, const CFTypeRef* path
 }
 
 OSStatus CFQDictionaryGetValueAtPathArray(CFDictionaryRef dict, CFArrayRef path, CFTypeRef* result) {
-    return PathArrayHelper(path, [=](const CFTypeRef* keys, CFIndex count) {
-        return CFQDictionaryGetValueAtPath(dict, keys, count, result);
-    });
+    const void** elements = nullptr;
+    OSStatus err = PathArrayHelper(path, &elements);
+    if (err == 0) {
+        err = CFQDictionaryGetValueAtPath(dict, elements, CFArrayGetCount(path), result);
+    }
+    std::free(elements);
+    return err;
 }
 
 OSStatus CFQDictionarySetValueAtPath(CFMutableDictionaryRef dict, const CFTypeRef* path, CFIndex count,
@@ -218,9 +226,13 @@ OSStatus CFQDictionarySetValueAtPath(CFMutableDictionaryRef dict, const CFTypeRe
 }
 
 OSStatus CFQDictionarySetValueAtPathArray(CFMutableDictionaryRef dict, CFArrayRef path, CFTypeRef value) {
-    return PathArrayHelper(path, [=](const CFTypeRef* keys, CFIndex count) {
-        return CFQDictionarySetValueAtPath(dict, keys, count, value);
-    });
+    const void** elements = nullptr;
+    OSStatus err = PathArrayHelper(path, &elements);
+    if (err == 0) {
+        err = CFQDictionarySetValueAtPath(dict, elements, CFArrayGetCount(path), value);
+    }
+    std::free(elements);
+    return err;
 }
 
 OSStatus CFQDictionaryRemoveValueAtPath(CFMutableDictionaryRef dict, const CFTypeRef* path, CFIndex count) {
@@ -236,9 +248,13 @@ OSStatus CFQDictionaryRemoveValueAtPath(CFMutableDictionaryRef dict, const CFTyp
 }
 
 OSStatus CFQDictionaryRemoveValueAtPathArray(CFMutableDictionaryRef dict, CFArrayRef path) {
-    return PathArrayHelper(path, [=](const CFTypeRef* keys, CFIndex count) {
-        return CFQDictionaryRemoveValueAtPath(dict, keys, count);
-    });
+    const void** elements = nullptr;
+    OSStatus err = PathArrayHelper(path, &elements);
+    if (err == 0) {
+        err = CFQDictionaryRemoveValueAtPath(dict, elements, CFArrayGetCount(path));
+    }
+    std::free(elements);
+    return err;
 }
 
 void CFQPropertyListDeepApplyFunction(CFPropertyListRef propList, CFQPropertyListDeepApplierFunction func,

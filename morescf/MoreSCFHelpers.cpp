@@ -154,9 +154,10 @@ OSStatus MoreSCIsAppleTalkActive(CFStringRef setID, Boolean* active) {
 }
 
 OSStatus MoreSCSetAppleTalkActive(CFStringRef setID, Boolean active) {
+    bool madeChanges = false;
     OSStatus err = OpenSession();
     if (err == 0) {
-        err = ForEachService(setID, [setID, active](CFStringRef serviceID) {
+        err = ForEachService(setID, [setID, active, &madeChanges](CFStringRef serviceID) {
             OSStatus stepErr = 0;
             Boolean isActive = false;
             // Services that are off are switched as well, so that they come back as wanted; one without
@@ -164,12 +165,12 @@ OSStatus MoreSCSetAppleTalkActive(CFStringRef setID, Boolean active) {
             if (MoreSCIsEntityActive(setID, serviceID, kAppleTalkProtocol, &isActive) == 0 &&
                 (isActive != 0) != (active != 0)) {
                 stepErr = MoreSCSetEntityActive(setID, serviceID, kAppleTalkProtocol, active);
+                madeChanges = madeChanges || stepErr == 0;
             }
             return stepErr;
         });
     }
-    // Whatever was switched has marked the session.
-    MoreSCClose(&err, false);
+    MoreSCClose(&err, madeChanges);
     return err;
 }
 

@@ -22,19 +22,23 @@ struct NewService {
     UInt32 systemVersion;
 };
 
-// Adds the entity that is made from a digest of zeros and what fill puts into it.
+OSStatus AddEntityToService(CFStringRef setID, CFStringRef serviceID, CFStringRef protocol,
+                            const MoreSCDigest* digest) {
+    CFMutableDictionaryRef entity = nullptr;
+    const OSStatus err = InTurn([&] { return MoreSCCreateEntity(protocol, digest, &entity); },
+                                [&] { return MoreSCNewEntity(setID, serviceID, protocol, entity); });
+    CFQRelease(entity);
+    return err;
+}
+
+// The same with what fill puts into a digest of zeros.
 template <class Fill>
 OSStatus AddEntity(const NewService& service, CFStringRef protocol, Fill fill) {
     MoreSCDigest digest;
-    CFMutableDictionaryRef entity = nullptr;
     // An initializer would zero the first member of the union alone.
     std::memset(&digest, 0, sizeof(digest));
     fill(&digest);
-    const OSStatus err =
-        InTurn([&] { return MoreSCCreateEntity(protocol, &digest, &entity); },
-               [&] { return MoreSCNewEntity(service.setID, service.serviceID, protocol, entity); });
-    CFQRelease(entity);
-    return err;
+    return AddEntityToService(service.setID, service.serviceID, protocol, &digest);
 }
 
 // The entities, a function each.
@@ -80,12 +84,19 @@ OSStatus AddIPv4Entity(const NewService& service) {
     });
 }
 
-// A line is dialled; over a card PPP runs as PPPoE, and is there to be switched on.
+OSStatus AddPPPEntityToService(CFStringRef setID, CFStringRef serviceID, Boolean isPPPoE) {
+    MoreSCPPPDigest digest = {};
+    CFMutableDictionaryRef entity = nullptr;
+    digest.active = !isPPPoE;
+    digest.options = MoreSCGetDefaultPPPOptions(isPPPoE);
+    const OSStatus err = InTurn([&] { return MoreSCCreatePPPEntity(&digest, &entity); },
+                                [&] { return MoreSCNewEntity(setID, serviceID, kPPPProtocol, entity); });
+    CFQRelease(entity);
+    return err;
+}
+
 OSStatus AddPPPEntity(const NewService& service) {
-    return AddEntity(service, kPPPProtocol, [&service](MoreSCDigest* digest) {
-        digest->ppp.active = !service.isEthernetLike;
-        digest->ppp.options = MoreSCGetDefaultPPPOptions(service.isEthernetLike);
-    });
+    return AddPPPEntityToService(service.setID, service.serviceID, service.isEthernetLike);
 }
 
 OSStatus FindDefaultModemScriptAndCopyName(CFStringRef* name) {

@@ -208,8 +208,8 @@ OSStatus CopyUserVisibleNameForModemOrSerialPort(io_object_t entry, CFMutableDic
     return err;
 }
 
-OSStatus SubstituteKeywordsInUserVisibleName(CFDictionaryRef portDict, CFStringRef nameTemplate,
-                                             CFStringRef* name) {
+OSStatus SubstituteKeywordsInUserVisibleName(io_object_t /*entry*/, CFDictionaryRef portDict,
+                                             CFStringRef nameTemplate, CFStringRef* name) {
     const struct {
         CFStringRef keyword;
         CFStringRef key;
@@ -258,7 +258,7 @@ OSStatus CopyUserVisiblePortName(io_object_t entry, CFMutableDictionaryRef portD
         err = baseName != nullptr ? 0 : kCannotDescribePortErr;
     }
     if (err == 0) {
-        err = SubstituteKeywordsInUserVisibleName(portDict, baseName, name);
+        err = SubstituteKeywordsInUserVisibleName(entry, portDict, baseName, name);
     }
     CFQRelease(proposedName);
     CFQRelease(baseName);

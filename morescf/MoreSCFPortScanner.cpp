@@ -11,22 +11,30 @@
 namespace {
 
 // Fills the port's dictionary from its registry entry; one that stays empty is no port.
-using DeviceToDictProc = OSStatus (*)(io_object_t entry, CFMutableDictionaryRef portDict);
+using DeviceToDictProc = OSStatus (*)(void* context, io_object_t entry, CFMutableDictionaryRef portDict);
 
-// A controller without an address, which is 6 bytes, leaves the port without one.
+// Only the 6 bytes of a hardware address make one.
+CFStringRef CreateMACFromData(CFDataRef data) {
+    CFStringRef text = nullptr;
+    if (CFDataGetLength(data) == 6) {
+        static_cast<void>(MoreSCFCreateStringWithMacAddress(CFDataGetBytePtr(data), &text));
+    }
+    return text;
+}
+
+// A controller without an address leaves the port without one.
 void SetMACAddress(io_object_t controller, CFMutableDictionaryRef portDict) {
     auto* address =
         static_cast<CFDataRef>(CopyProperty(controller, CFSTR("IOMACAddress"), CFDataGetTypeID()));
-    CFStringRef text = nullptr;
-    if (address != nullptr && CFDataGetLength(address) == 6 &&
-        MoreSCFCreateStringWithMacAddress(CFDataGetBytePtr(address), &text) == 0) {
+    CFStringRef text = address != nullptr ? CreateMACFromData(address) : nullptr;
+    if (text != nullptr) {
         CFDictionarySetValue(portDict, kMACAddressKey, text);
     }
     CFQRelease(address);
     CFQRelease(text);
 }
 
-OSStatus EthernetDeviceToDictProc(io_object_t entry, CFMutableDictionaryRef portDict) {
+OSStatus EthernetDeviceToDictProc(void* /*context*/, io_object_t entry, CFMutableDictionaryRef portDict) {
     io_object_t controller = IO_OBJECT_NULL;
     CFStringRef bsdName = nullptr;
     OSStatus err = InTurn([&] { return CFQDictionarySetNumber(portDict, kSortOrderKey, kSortEthernet); },
@@ -48,7 +56,8 @@ OSStatus EthernetDeviceToDictProc(io_object_t entry, CFMutableDictionaryRef port
 }
 
 // An entry without a base name, and the raw infrared device below the port of that name, are no ports.
-OSStatus ModemOrSerialDeviceToDictProc(io_object_t entry, CFMutableDictionaryRef portDict) {
+OSStatus ModemOrSerialDeviceToDictProc(void* /*context*/, io_object_t entry,
+                                       CFMutableDictionaryRef portDict) {
     CFMutableDictionaryRef properties = nullptr;
     CFStringRef deviceName = nullptr;
     OSStatus err = CopyProperties(entry, &properties);
@@ -73,11 +82,12 @@ OSStatus ModemOrSerialDeviceToDictProc(io_object_t entry, CFMutableDictionaryRef
     return err;
 }
 
-OSStatus AddDeviceToArray(io_object_t entry, DeviceToDictProc fillProc, CFMutableArrayRef array) {
+OSStatus AddDeviceToArray(io_object_t entry, DeviceToDictProc fillProc, void* context,
+                          CFMutableArrayRef array) {
     CFMutableDictionaryRef portDict = nullptr;
     CFStringRef name = nullptr;
     OSStatus err = InTurn([&] { return CFQDictionaryCreateMutable(&portDict); },
-                          [&] { return fillProc(entry, portDict); });
+                          [&] { return fillProc(context, entry, portDict); });
     if (err == 0 && CFDictionaryGetCount(portDict) != 0) {
         err = CopyUserVisiblePortName(entry, portDict, &name);
         if (err == 0) {
@@ -92,7 +102,7 @@ OSStatus AddDeviceToArray(io_object_t entry, DeviceToDictProc fillProc, CFMutabl
 
 // Consumes a reference of matchingDict, which is null when it could not be made.
 OSStatus AddMatchingDevicesToArray(mach_port_t masterPort, CFDictionaryRef matchingDict,
-                                   DeviceToDictProc fillProc, CFMutableArrayRef array) {
+                                   DeviceToDictProc fillProc, void* context, CFMutableArrayRef array) {
     io_iterator_t iterator = IO_OBJECT_NULL;
     OSStatus err = InTurn([&] { return ErrorIfMissing(matchingDict); },
                           [&] { return IOServiceGetMatchingServices(masterPort, matchingDict, &iterator); });
@@ -102,7 +112,7 @@ OSStatus AddMatchingDevicesToArray(mach_port_t masterPort, CFDictionaryRef match
         if (entry == IO_OBJECT_NULL) {
             break;
         }
-        err = AddDeviceToArray(entry, fillProc, array);
+        err = AddDeviceToArray(entry, fillProc, context, array);
         IOObjectRelease(entry);
     }
     ReleaseEntry(iterator);
@@ -115,7 +125,8 @@ OSStatus AddSerialDevicesToArray(mach_port_t masterPort, CFStringRef streamType,
     if (err == 0) {
         CFDictionarySetValue(matchingDict, CFSTR("IOProviderClass"), CFSTR("IOSerialBSDClient"));
         CFDictionarySetValue(matchingDict, kStreamTypeKey, streamType);
-        err = AddMatchingDevicesToArray(masterPort, matchingDict, ModemOrSerialDeviceToDictProc, array);
+        err = AddMatchingDevicesToArray(masterPort, matchingDict, ModemOrSerialDeviceToDictProc, nullptr,
+                                        array);
     }
     return err;
 }
@@ -150,7 +161,7 @@ OSStatus MoreSCCreatePortArray(CFArrayRef* portArray) {
                [&] { return IOMasterPort(MACH_PORT_NULL, &masterPort); },
                [&] {
                    return AddMatchingDevicesToArray(masterPort, IOServiceMatching("IOEthernetInterface"),
-                                                    EthernetDeviceToDictProc, ports);
+                                                    EthernetDeviceToDictProc, nullptr, ports);
                },
                [&] { return AddSerialDevicesToArray(masterPort, kModemStreamType, ports); },
                [&] { return AddSerialDevicesToArray(masterPort, CFSTR("IORS232SerialStream"), ports); });
