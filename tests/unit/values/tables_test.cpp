@@ -95,7 +95,7 @@ std::string comparisonOf(const Inputs& inputs) {
           std::pair(", numeric ", kCFCompareLocalized | kCFCompareNumerically),
           std::pair(", any case ",
                     kCFCompareLocalized | kCFCompareNumerically | kCFCompareCaseInsensitive)}) {
-        const int order = CFStringCompare(str(inputs[0]).get(), str(inputs[1]).get(), flags);
+        const CFComparisonResult order = CFStringCompare(str(inputs[0]).get(), str(inputs[1]).get(), flags);
         EXPECT_EQ(CFStringCompare(str(inputs[1]).get(), str(inputs[0]).get(), flags), -order) << inputs[0];
         told += name + std::string(1, "<=>"[order + 1]);
     }
