@@ -8,6 +8,9 @@
 namespace platform::apply {
 namespace {
 
+// On both bands, by a card that is on a network.
+constexpr std::chrono::seconds longestScan{10};
+
 class RestoringCard final : public Card {
   public:
     RestoringCard(Daemon& daemon, Task& task, CardSnapshot earlier, std::shared_ptr<Place> place,
@@ -105,7 +108,6 @@ class RestoringCard final : public Card {
             waitUntil(placeDeadline_);
             return {};
         }
-        askedAt_ = Clock::now();
         changesOnAir_ = daemon_.changesOnAir();
         if (!network_.empty()) {
             RETURN_IF_FAILED(daemon_.readLastScan(device_, lastScan_));
@@ -158,12 +160,12 @@ class RestoringCard final : public Card {
         return {};
     }
 
-    // What a whole scan did not hear is not waited for.
+    // What a whole scan did not hear is not waited for. One that was under way when the daemon was asked may
+    // have heard it before.
     Outcome decide() {
         std::vector<HeardNetwork> heard;
         RETURN_IF_FAILED(daemon_.readHeard(device_, network_, heard));
-        const auto sinceThen = Clock::now() - askedAt_ + std::chrono::seconds(1);
-        if (std::ranges::none_of(heard, [&](const HeardNetwork& one) { return one.age <= sinceThen; })) {
+        if (std::ranges::none_of(heard, [](const HeardNetwork& one) { return one.age <= longestScan; })) {
             task_.trouble = "the network of before is not there now, and is joined when it comes";
             stage_ = &RestoringCard::finish;
         } else if (!std::exchange(isAskedAgain_, true)) {
@@ -226,7 +228,6 @@ class RestoringCard final : public Card {
     Clock::time_point reasonDeadline_;
     std::optional<Active> active_;
     std::string network_;  // of the earlier profile; empty for a wired card
-    Clock::time_point askedAt_;
     std::int64_t lastScan_ = 0;
     unsigned changesOnAir_ = 0;
     std::optional<Clock::time_point> decideAt_;
