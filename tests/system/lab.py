@@ -13,11 +13,12 @@ import signal
 import socket
 import subprocess
 import sys
-import threading
-import time
 import unittest
 import urllib.request
 from pathlib import Path
+
+from machine import (CONNECTIONS, ENVIRONMENT, RESIDENT_LINE, RUNTIME, STORE, daemon_state, listen, nmcli, sh, sit_down,
+                     start_tool, state, wait_until)
 
 HERE = Path(__file__).resolve().parent
 PROJECT = HERE.parents[1]
@@ -25,15 +26,10 @@ BINARY = Path(os.environ.get("LA_BINARY", PROJECT / "build/release/app/location-
 BUILD = Path(os.environ.get("LA_BUILD", BINARY.parents[1])).resolve()
 LAB = Path("/run/lab")
 TOOL = LAB / "bin" / BINARY.name
-STORE = Path("/var/lib/location-assistant/preferences.plist")
-RUNTIME = Path("/run/location-assistant")
 NOBODY = 65534
-RESIDENT = 4242  # the user who sits at the computer
 UPDATE = "--update" in sys.argv
 DAEMON = "--networkmanager" in sys.argv  # for the tests that can do without it
 FORBID_SKIPS = os.environ.get("LA_FORBID_SKIPS") == "1"
-ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
-    key: value for key, value in os.environ.items() if key.endswith("SAN_OPTIONS")}
 
 # The second card of a kind gets the next number.
 PCI = {"eth": "0000:02:00.0", "wlan": "0000:03:00.0", "en": "0000:00:19.0"}
@@ -80,7 +76,7 @@ fi
 mount -t overlay -o lowerdir={lab}/usr:$usr overlay /usr
 mount -t overlay -o lowerdir=$etc,upperdir={lab}/etc/upper,workdir={lab}/etc/work overlay /etc
 rm -f /etc/resolv.conf
-{{ cat /etc/passwd; echo 'resident:x:{resident}:{resident}::/:/bin/sh'; }} >{lab}/passwd
+{{ cat /etc/passwd; echo '{resident}'; }} >{lab}/passwd
 mount --bind {lab}/passwd /etc/passwd
 [ -s /etc/machine-id ] || echo 0123456789abcdef0123456789abcdef >/etc/machine-id
 mkdir -p /etc/NetworkManager
@@ -114,10 +110,6 @@ for sysctl in default all; do echo 0 >/proc/sys/net/ipv6/conf/$sysctl/accept_dad
 """
 
 
-def sh(script, **options):
-    return subprocess.run(["sh", "-ec", script], check=True, text=True, capture_output=True, **options).stdout
-
-
 def ip(arguments):
     return sh("ip " + arguments)
 
@@ -139,7 +131,7 @@ def enter():
     hidden = ("/tmp/", "/run/", "/var/lib/")
     kept = {path: os.open(path, os.O_PATH) for path in (PROJECT, BUILD, BINARY.parent) if str(path).startswith(hidden)}
     binaries = os.open(BINARY.parent, os.O_PATH)
-    sh(PREPARE.format(lab=LAB, binaries=binaries, resident=RESIDENT, packages=shlex.quote(str(PROJECT / ".lab/root"))),
+    sh(PREPARE.format(lab=LAB, binaries=binaries, resident=RESIDENT_LINE, packages=shlex.quote(str(PROJECT / ".lab/root"))),
        pass_fds=[binaries], cwd="/")
     for path, descriptor in kept.items():
         path.mkdir(parents=True, exist_ok=True)
@@ -161,15 +153,6 @@ def main():
         print("LABORATORY SKIP:", test, reason)
 
 
-def wait_until(condition, seconds=10):
-    deadline = time.monotonic() + seconds
-    while not (value := condition()):
-        if time.monotonic() > deadline:
-            raise TimeoutError(f"not so after {seconds} s")
-        time.sleep(0.01)
-    return value
-
-
 class Lab:
     """One fresh machine; only one at a time. printer is a manner of printer.py or None; dhcp names the card at whose
     other end a DHCP server answers; with daemon the network before is NetworkManager's work. A card's name ends in its
@@ -185,12 +168,7 @@ class Lab:
         self.cards = cards
         self.by_daemon = daemon
         Path("/etc/resolv.conf").write_text("nameserver 203.0.113.53\n")
-        listener = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
-        listener.bind("/dev/log")
-        os.chmod("/dev/log", 0o666)
-        self.listener = listener
-        self.thread = threading.Thread(target=self._listen, daemon=True)
-        self.thread.start()
+        self.listener, self.thread = listen(self.syslog)
 
         for card in cards:
             ip(f"link add {card} address 02:00:00:00:0{card[-1]}:{ord(card[0]):02x} type veth peer name far-{card} netns far")
@@ -218,10 +196,10 @@ class Lab:
         if daemon:
             self.start_bus()
             self.start_network_manager()
-        if {"eth0", "wlan0"} & set(cards):
-            # A link that is up gets an address of its own a moment later.
-            wait_until(lambda: all("LOWER_UP" in link["flags"] and (daemon or "fe80:" in ip("-6 addr show " + link["ifname"]))
-                                   for link in self.links() if link["ifname"] in ("eth0", "wlan0")))
+        # A link that is up gets an address of its own a moment later.
+        for card in {"eth0", "wlan0"} & set(cards):
+            wait_until(lambda card=card: "LOWER_UP" in ip(f"link show {card}") and (
+                daemon or "fe80:" in ip(f"-6 addr show {card}")))
 
     def close(self):
         for process in Path("/proc").glob("[0-9]*"):
@@ -241,10 +219,6 @@ class Lab:
             rm -rf /etc/NetworkManager/* /run/NetworkManager /var/lib/NetworkManager
             find /tmp -xdev -mindepth 1 -not -type d -delete
         """)
-
-    def _listen(self):
-        while data := self.listener.recv(65536):
-            self.syslog.append(data.decode("utf-8", "replace").split("location-assistant", 1)[-1])
 
     def _make_sysfs(self):
         lines = ["mkdir -p class/net class/tty bus/pci/devices bus/pci/drivers bus/pci/slots/3 devices/virtual/net",
@@ -296,35 +270,24 @@ class Lab:
 
     def start_desktop(self):
         """Lets the resident sit at the computer; what their browser is told goes to /tmp/browser."""
-        for path, fields in {"seats/seat0": f"ACTIVE=1\nACTIVE_UID={RESIDENT}\n", "sessions/1":
-                             f"UID={RESIDENT}\nCLASS=user\nSTATE=active\nTYPE=x11\nDISPLAY=:0\n"}.items():
-            (file := Path("/run/systemd", path)).parent.mkdir(parents=True, exist_ok=True)
-            file.write_text(fields)
+        sit_down()
 
     def start_network_manager(self):
-        folder = Path("/etc/NetworkManager/system-connections")
-        if not folder.exists():
-            folder.mkdir()
+        if not CONNECTIONS.exists():
+            CONNECTIONS.mkdir()
             Path("/etc/NetworkManager/NetworkManager.conf").write_text(NETWORK_MANAGER)
             for name, (uuid, card, lines) in PROFILES.items():
-                (folder / f"{name}.nmconnection").write_text(PROFILE.format(name, uuid, card, lines))
-                (folder / f"{name}.nmconnection").chmod(0o600)
+                (CONNECTIONS / f"{name}.nmconnection").write_text(PROFILE.format(name, uuid, card, lines))
+                (CONNECTIONS / f"{name}.nmconnection").chmod(0o600)
         log = (LAB / "networkmanager.log").open("ab")
         self.network_manager = self.daemon("NetworkManager", "--debug", stdout=log, stderr=log)
-        wait_until(lambda: self.nmcli("-f DEVICE,STATE device").count(":connected\n") >= len({"eth0", "wlan0"} & set(self.cards)), 20)
-
-    @staticmethod
-    def nmcli(arguments):
-        return subprocess.run(["nmcli", "-t", *shlex.split(arguments)], capture_output=True, text=True,
-                              env=ENVIRONMENT, check=False).stdout
+        wait_until(lambda: nmcli("-f DEVICE,STATE device").count(":connected\n") >= len({"eth0", "wlan0"} & set(self.cards)), 20)
 
     def start(self, *words, **options):
-        """The tool as a process; words are strings or bytes."""
-        options = {"env": ENVIRONMENT, "stdin": subprocess.DEVNULL, "stdout": subprocess.PIPE,
-                   "stderr": subprocess.PIPE, "cwd": "/"} | options
+        """The tool as a process, of another user on demand; words are strings or bytes."""
         if "user" in options:
             options |= {"group": options["user"], "extra_groups": []}
-        return subprocess.Popen(["location-assistant", *words], executable=TOOL, **options)
+        return start_tool(TOOL, *words, **options)
 
     def tool(self, *words, typed=None, **options):
         """Runs the tool to its end, adds it to the transcript and returns (exit status, standard output)."""
@@ -341,32 +304,9 @@ class Lab:
             self.transcript += "\n"
         return process.returncode, out
 
-    def links(self):
-        return [link for link in json.loads(ip("-j link")) if link["ifname"] in self.cards]
-
     def network(self):
-        """All that has to be the same before and after: link states, addresses, routes, name servers; with the daemon
-        its devices, its profiles and their files."""
-        volatile = ("valid_life_time", "preferred_life_time", "tentative")
-        state = {"resolv.conf": self.file("/etc/resolv.conf").splitlines(), "links": {}, "addresses": []}
-        for link in json.loads(ip("-j addr")):
-            if link["ifname"] in self.cards:
-                state["links"][link["ifname"]] = "UP" in link["flags"], link["address"], link["mtu"]
-                state["addresses"] += [(link["ifname"], *((key, value) for key, value in address.items()
-                                                         if key not in volatile)) for address in link["addr_info"]]
-        state["routes"] = [json.dumps(route) for family in "46"
-                           for route in json.loads(ip(f"-{family} -j route show table all"))]
-        for key in ("addresses", "routes"):
-            state[key].sort()
-        if self.by_daemon:
-            fields = ",".join("GENERAL." + each for each in
-                              ("DEVICE", "STATE", "CONNECTION", "CON-UUID", "AUTOCONNECT", "NM-MANAGED"))
-            state["devices"] = [self.nmcli(f"-f {fields} device show {card}") for card in self.cards]
-            state["profiles"] = [line for line in self.nmcli("-f NAME,UUID,AUTOCONNECT,DEVICE,FILENAME connection")
-                                 .splitlines() if not line.startswith("lo:")]
-            state["files"] = {str(path): path.read_text() for folder in ("/etc", "/run") for path in
-                              Path(folder, "NetworkManager/system-connections").glob("*") if "lo.nm" not in str(path)}
-        return state
+        """All that has to be the same before and after; with the daemon, its devices and profiles as well."""
+        return state() | (daemon_state(self.cards) if self.by_daemon else {})
 
     def ipv4(self, card):
         """The card's IPv4 addresses as ADDRESS/PREFIX, or None when it is off."""

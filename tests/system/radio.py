@@ -2,8 +2,10 @@
 """A whole emulated machine with a real wireless stack and simulated radios that hear each other.
 
 usage: radio.py run SCRIPT [HOST [ARGUMENT ...]]
+       radio.py packages PACKAGE ...
 
-Boots the machine, plays SCRIPT in it as root and ends with SCRIPT's exit status; what it prints comes out as it is
+The second installs Debian packages on a whole Debian, goes to a printer and back with them, and removes them. The first
+boots the machine, plays SCRIPT in it as root and ends with SCRIPT's exit status; what it prints comes out as it is
 printed. SCRIPT is an executable file or a Python file; it sees the whole file system of this machine below /host, and
 its own root is the same file system with everything that it writes lost at the end. HOST says who runs the network
 there, joined to a network "home" when SCRIPT begins:
@@ -154,26 +156,27 @@ def needed(unpacked):
                   if not file.is_relative_to(BINARY.parent))
 
 
-def boot(words, report, distribution="host", memory=1500, limit=None, output=sys.stdout):
+def boot(words, report, distribution="host", limit=None, output=sys.stdout):
     """Runs the command `words` in a machine of its own. It finds the folder `report` at /report, and may write there.
     Returns its exit status, or None when the machine ended without one."""
     limit = limit or os.environ.get("RADIO_LIMIT", "600")
+    here = shlex.quote(str(HERE))
     (report / "command").write_text(
         "export PATH=/usr/sbin:/usr/bin:/sbin:/bin LC_ALL=C PYTHONUTF8=1 PYTHONCOERCECLOCALE=0\n"
         "export PYTHONDONTWRITEBYTECODE=1 PYTHONUNBUFFERED=1\n"
-        f"export LA_BINARY=/build/app/{BINARY.name} PYTHONPATH=/host{shlex.quote(str(HERE / 'radio'))}\n"
+        f"export LA_BINARY=/build/app/{BINARY.name} PYTHONPATH=/host{here}/radio:/host{here}\n"
         + "".join(f"export {key}={shlex.quote(value)}\n" for key, value in os.environ.items() if "SAN_OPTIONS" in key)
         + f"exec {shlex.join(map(str, words))}\n")
     (report / "needed").write_text("\n".join(needed(LAB / ("debian" if distribution == "debian" else "root"))) + "\n")
     (report / "build").write_text(str(BINARY.parents[1]))
     (report / "status").unlink(missing_ok=True)
-    init = f"/bin/sh /host{shlex.quote(str(HERE / 'radio/init'))}" if distribution == "host" else "/sbin/init"
+    init = f"/bin/sh /host{here}/radio/init" if distribution == "host" else "/sbin/init"
     with tempfile.TemporaryDirectory() as folder:
         machine = subprocess.Popen([
             *END_WITH_PARENT, "timeout", "--foreground", "--signal=KILL", str(limit), *END_WITH_PARENT,
             "qemu-system-x86_64", "-nodefaults", "-no-user-config", "-display", "none", "-no-reboot",
             "-accel", "tcg,thread=single", "-icount", "shift=1,sleep=off", "-rtc", "clock=vm", "-smp", "1",
-            "-m", str(memory), "-kernel", KERNEL, "-initrd", initial_root(Path(folder), distribution, init),
+            "-m", "2000" if distribution == "debian" else "1500", "-kernel", KERNEL, "-initrd", initial_root(Path(folder), distribution, init),
             "-append", WORDS, "-serial", "stdio",
             "-virtfs", "local,path=/,mount_tag=files,security_model=none,readonly=on,multidevs=remap",
             "-virtfs", f"local,path={LAB},mount_tag=lab,security_model=none,readonly=on",
@@ -194,22 +197,31 @@ def boot(words, report, distribution="host", memory=1500, limit=None, output=sys
     return int(status.read_text()) if status.exists() and status.read_text().strip() else None
 
 
+def skip(reason):
+    print("LABORATORY SKIP:", reason)
+    sys.exit(1 if os.environ.get("LA_FORBID_SKIPS") == "1" else SKIP)
+
+
 def main():
-    if len(sys.argv) < 3 or sys.argv[1] != "run":
-        sys.exit(__doc__)
-    if reason := missing():
-        print("LABORATORY SKIP:", reason)
-        sys.exit(1 if os.environ.get("LA_FORBID_SKIPS") == "1" else SKIP)
-    script, host, arguments = Path(sys.argv[2]).resolve(), *(sys.argv[3:4] or ["bare"]), sys.argv[4:]
-    if host not in HOSTS:
-        sys.exit(__doc__)
-    words = [f"/host{script}", *arguments]
-    if script.suffix == ".py":
-        words.insert(0, "python3")
-    if host != "bare":
-        words = ["python3", f"/host{HERE}/radio/hosts.py", host, *words]
+    distribution = "host"
     with tempfile.TemporaryDirectory() as report:
-        status = boot(words, Path(report))
+        match sys.argv[1:]:
+            case ["run", script, *rest] if (rest or ["bare"])[0] in HOSTS:
+                host, *arguments = rest or ["bare"]
+                words = [f"/host{Path(script).resolve()}", *arguments]
+                if script.endswith(".py"):
+                    words.insert(0, "python3")
+                if host != "bare":
+                    words = ["python3", f"/host{HERE}/radio/hosts.py", host, *words]
+            case ["packages", *packages] if packages:
+                distribution, words = "debian", ["python3", f"/host{HERE}/radio/package.py"]
+                for package in packages:
+                    shutil.copy(package, report)
+            case _:
+                sys.exit(__doc__)
+        if reason := missing(distribution):
+            skip(reason)
+        status = boot(words, Path(report), distribution)
     if status is None:
         print("The machine ended without a result.")
     sys.exit(1 if status is None else status)

@@ -23,20 +23,15 @@ def results(host):
     return BUILD / "radio" / host
 
 
-def skip(reason):
-    print("LABORATORY SKIP:", reason)
-    sys.exit(1 if os.environ.get("LA_FORBID_SKIPS") == "1" else radio.SKIP)
-
-
 def play(host, *chosen):
     folder = results(host)
     shutil.rmtree(folder, ignore_errors=True)
     folder.mkdir(parents=True)
     if reason := radio.missing("debian" if host == "debian" else "host"):
         (folder / "skipped").write_text(reason)
-        skip(reason)
+        radio.skip(reason)
     if host == "debian":
-        status = radio.boot(["python3", f"/host{radio.HERE}/radio/distribution.py", *chosen], folder, "debian", memory=2000,
+        status = radio.boot(["python3", f"/host{radio.HERE}/radio/distribution.py", *chosen], folder, "debian",
                             limit=1100)
         sys.exit(0 if status == 0 else 1)
     todo, tries = chosen, 2
@@ -56,7 +51,7 @@ def play(host, *chosen):
 def judge(host, name):
     folder = results(host)
     if (folder / "skipped").exists():
-        skip((folder / "skipped").read_text())
+        radio.skip((folder / "skipped").read_text())
     result = folder / f"{name}.result"
     if not result.exists():
         sys.exit(f"{name} did not run: see the test that boots the machine")

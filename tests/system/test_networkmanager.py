@@ -20,7 +20,6 @@ import lab
 from lab import ip, sh, wait_until
 
 SOCKET = Path("/run/dbus/system_bus_socket")
-PROFILES = Path("/etc/NetworkManager/system-connections")
 ROOM = "type ethernet ifname wlan0 con-name room ipv4.method manual ip4 10.20.0.7/16 gw4 10.20.0.1"
 STATIC = "ipv4.method manual ip4 192.168.77.10/24 gw4 192.168.77.1"
 CREATED = {"auto": ("eth0", "192.168.77."), "from_intro": ("wlan0", "192.0.0.199/24")}
@@ -92,7 +91,7 @@ class Matrix(lab.LabTest):
                 for line in (lines.items() if isinstance(lines, dict) else lines) if '"dst": "ff00::/8"' not in line}
 
     def on(self, card):
-        return self.lab.nmcli(f"-g GENERAL.CONNECTION device show {card}").strip()
+        return lab.nmcli(f"-g GENERAL.CONNECTION device show {card}").strip()
 
     def stop_daemon(self, sign=signal.SIGTERM):
         self.lab.network_manager.send_signal(sign)
@@ -101,7 +100,7 @@ class Matrix(lab.LabTest):
 
     def start_daemon(self):
         self.lab.network_manager = self.lab.daemon("NetworkManager", "--debug")
-        wait_until(lambda: self.lab.nmcli("-g STARTUP general") == "started\n", 20)
+        wait_until(lambda: lab.nmcli("-g STARTUP general") == "started\n", 20)
 
     def unplug(self):
         for card in self.lab.cards:
@@ -111,11 +110,11 @@ class Matrix(lab.LabTest):
     def fresh(self, earlier):
         """A machine that was just started, with these profiles."""
         self.stop_daemon(signal.SIGKILL)
-        for folder in (PROFILES, Path("/run/NetworkManager"), Path("/var/lib/NetworkManager"), lab.RUNTIME):
+        for folder in (lab.CONNECTIONS, Path("/run/NetworkManager"), Path("/var/lib/NetworkManager"), lab.RUNTIME):
             shutil.rmtree(folder, ignore_errors=True)
         shutil.rmtree(lab.STORE.parent, ignore_errors=True)
         sh("rm -f /tmp/*.orig")
-        PROFILES.mkdir()
+        lab.CONNECTIONS.mkdir()
         self.unplug()
         self.start_daemon()
         profiles, last = EARLIER[earlier]
@@ -131,7 +130,7 @@ class Matrix(lab.LabTest):
 
     def settled(self):
         """The view once nothing in it changes any more: IPv6 goes on for a while after a card is up."""
-        wait_until(lambda: "tentative" not in ip("-6 addr") and ":connecting" not in self.lab.nmcli("-f DEVICE,STATE dev"))
+        wait_until(lambda: "tentative" not in ip("-6 addr") and ":connecting" not in lab.nmcli("-f DEVICE,STATE dev"))
         return self.view()
 
     @staticmethod
@@ -183,7 +182,7 @@ class Matrix(lab.LabTest):
     def unplugged(self, before):
         ip("-n far link set far-eth0 down")
         time.sleep(10)
-        self.assertIn("unavailable", self.lab.nmcli("-g GENERAL.STATE device show eth0"))
+        self.assertIn("unavailable", lab.nmcli("-g GENERAL.STATE device show eth0"))
         ip("-n far link set far-eth0 up")
         wait_until(lambda: self.on("eth0") == "location-assistant eth0", 20)
         return before
@@ -315,7 +314,7 @@ class Matrix(lab.LabTest):
             with self.subTest(mode):
                 self.lab.tool("create", mode)
                 self.assertEqual((self.lab.ipv4("eth0") or [""])[0].startswith("192.168.77."), mode == "auto")
-                self.assertIn("unmanaged", self.lab.nmcli("-g GENERAL.STATE device show eth0"))
+                self.assertIn("unmanaged", lab.nmcli("-g GENERAL.STATE device show eth0"))
                 self.remove()
                 self.assert_back(before)
 

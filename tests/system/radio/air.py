@@ -3,11 +3,14 @@
 Each of the three lives in a network namespace of its own. Networks of one boot want names of their own: everybody
 remembers for minutes what was heard.
 """
+import functools
 import re
 import struct
 import subprocess
-import time
 from pathlib import Path
+
+import machine
+from machine import sh
 
 SYSTEM = Path(__file__).resolve().parents[1]
 LOGS = Path("/run/air")
@@ -18,23 +21,8 @@ HOME, HOME_KEY = "Home", "home sweet home"
 CHANNEL = {"printer": 1, "home": 6}
 
 
-def sh(script):
-    """Runs a script and returns what it printed; an error tells what it printed on standard error."""
-    result = subprocess.run(["sh", "-ec", script], capture_output=True, text=True, check=False)
-    if result.returncode != 0:
-        raise RuntimeError(f"{script.strip()}: {result.stderr.strip() or result.returncode}")
-    return result.stdout
-
-
-def wait_until(condition, seconds, what):
-    """Waits for a condition and returns its value."""
-    start = time.monotonic()
-    while not (value := condition()):
-        waited = time.monotonic() - start
-        if waited > seconds:
-            raise TimeoutError(f"not within {seconds} s: {what}")
-        time.sleep(0.2 + waited / 10)  # asking is what costs in an emulator
-    return value
+# Asking is what costs in an emulator.
+wait_until = functools.partial(machine.wait_until, pause=0.2)
 
 
 def at(place, command):

@@ -9,8 +9,8 @@ from pathlib import Path
 import air
 import hosts
 import rows
-from air import sh
 from hosts import CARD
+from machine import RUNTIME, STORE, sh
 
 LEASE = "4m"
 AT_THE_PRINTER = 600  # seconds
@@ -26,7 +26,7 @@ class Debian(hosts.Host):
 
     def __init__(self):
         sh(f"systemctl stop {ALL} 2>/dev/null || :; ip addr flush dev {CARD} 2>/dev/null || :; "
-           f"rm -rf {hosts.STORE} {hosts.RUNTIME}; echo nameserver 203.0.113.53 >/etc/resolv.conf")
+           f"rm -rf {STORE.parent} {RUNTIME}; echo nameserver 203.0.113.53 >/etc/resolv.conf")
         super().__init__()
 
     def listen(self):
@@ -95,9 +95,7 @@ HOSTS = {"networkmanager": Desktop, "systemd_networkd": Networkd, "ifupdown": If
 
 def ten_minutes_at_the_printer(visit):
     visit.offer()
-    visit.remember()
-    visit.create()
-    visit.page()
+    visit.arrive()
     servers = Path("/etc/resolv.conf").read_text()
     routes = sh("ip route")
     for _ in range(AT_THE_PRINTER // 60):

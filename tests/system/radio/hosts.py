@@ -4,26 +4,19 @@ import os
 import plistlib
 import re
 import runpy
-import shlex
 import signal
-import socket
 import struct
 import subprocess
 import sys
-import threading
 import time
 from pathlib import Path
 
 import air
-from air import sh, spawn, wait_until
+import machine
+from air import spawn, wait_until
+from machine import sh
 
 CARD = "wlan0"
-STORE = Path("/var/lib/location-assistant")
-RUNTIME = Path("/run/location-assistant")
-RESIDENT = 4242  # the user who sits at the computer
-ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
-    key: value for key, value in os.environ.items() if key.endswith("SAN_OPTIONS")}
-
 NETWORK_MANAGER = """[main]
 plugins=keyfile
 auth-polkit=false
@@ -70,15 +63,7 @@ class Host:
 
     def listen(self):
         """Keeps the tool's log lines in `syslog`."""
-        listener = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
-        listener.bind("/dev/log")
-        threading.Thread(target=self._listen, args=(listener,), daemon=True).start()
-
-    def _listen(self, listener):
-        while True:
-            line = listener.recv(65536).decode("utf-8", "replace")
-            if "location-assistant" in line:
-                self.syslog.append(line.split("location-assistant", 1)[1])
+        machine.listen(self.syslog)
 
     def begin(self):
         """Starts what runs the network and waits until the card is at home."""
@@ -104,7 +89,7 @@ class Host:
         self.daemons.clear()
         self.switch(False)
         self._end_dhcp_client()
-        sh(f"rm -rf {STORE} {RUNTIME} /tmp/set.orig /tmp/zat.orig; echo nameserver 203.0.113.53 >/etc/resolv.conf")
+        sh(f"rm -rf {machine.STORE.parent} {machine.RUNTIME} /tmp/set.orig /tmp/zat.orig; echo nameserver 203.0.113.53 >/etc/resolv.conf")
         for command in (f"iw dev {CARD} disconnect", f"iw dev {CARD} ibss leave", f"ip link set {CARD} down",
                         f"iw dev {CARD} set type managed", f"ip addr flush dev {CARD}"):
             subprocess.run(command.split(), capture_output=True, check=False)
@@ -113,7 +98,7 @@ class Host:
     @staticmethod
     def _end_dhcp_client():
         """Ends the tool's own, which a row that failed may have left."""
-        note = RUNTIME / f"dhcp-{CARD}.plist"
+        note = machine.RUNTIME / f"dhcp-{CARD}.plist"
         number = plistlib.loads(note.read_bytes())["Client"]["Number"] if note.exists() else None
         if number and (words := Path(f"/proc/{number}/cmdline")).exists() and b"udhcpc" in words.read_bytes():
             os.kill(number, signal.SIGTERM)
@@ -129,29 +114,11 @@ class Host:
 
     @staticmethod
     def begin_tool(*words, **options):
-        return subprocess.Popen([os.environ["LA_BINARY"], *words], text=True, env=ENVIRONMENT, cwd="/",
-                                **{"stdin": subprocess.DEVNULL, "stdout": subprocess.PIPE, "stderr": subprocess.STDOUT}
-                                | options)
+        return machine.start_tool(os.environ["LA_BINARY"], *words,
+                                  **{"text": True, "stderr": subprocess.STDOUT} | options)
 
     def state(self):
-        """What has to be the same before and after; nothing in it tells of time."""
-        state = {"resolv.conf": [line for line in Path("/etc/resolv.conf").read_text().splitlines() if line[:1] != "#"],
-                 "network": self.joined(), "rfkill": self.switched_off()}
-        for link in json.loads(sh("ip -j addr")):
-            if link["ifname"].startswith(("wlan", "eth")):
-                state[link["ifname"]] = {
-                    "up": "UP" in link["flags"], "hardware": link["address"],
-                    "addresses": sorted(" ".join(f"{key}={self._timeless(key, value)}" for key, value in address.items()
-                                                 if key != "tentative") for address in link["addr_info"])}
-        # The way to a card's own link-local address comes a second after the address, when no neighbour has objected.
-        state["routes"] = sorted(json.dumps(route) for family in "46"
-                                 for route in json.loads(sh(f"ip -{family} -j route show table all"))
-                                 if not (route.get("type") == "local" and route["dst"].startswith("fe80:")))
-        return state
-
-    @staticmethod
-    def _timeless(key, value):
-        return ("for ever" if value > 1 << 31 else "for a while") if key.endswith("life_time") else value
+        return machine.state() | {"network": self.joined(), "rfkill": self.switched_off()}
 
     @staticmethod
     def joined():
@@ -219,12 +186,11 @@ class NetworkManager(Host):
     backend = "wpa_supplicant"
 
     def start(self):
-        folder = Path("/etc/NetworkManager/system-connections")
         sh("rm -rf /etc/NetworkManager/* /run/NetworkManager /var/lib/NetworkManager /run/dbus; mkdir /run/dbus")
-        folder.mkdir()
+        machine.CONNECTIONS.mkdir()
         Path("/etc/NetworkManager/NetworkManager.conf").write_text(NETWORK_MANAGER.format(self.backend))
-        (folder / "home.nmconnection").write_text(HOME_PROFILE)
-        (folder / "home.nmconnection").chmod(0o600)
+        (machine.CONNECTIONS / "home.nmconnection").write_text(HOME_PROFILE)
+        (machine.CONNECTIONS / "home.nmconnection").chmod(0o600)
         # udev tells NetworkManager of devices and switches.
         self.daemons.append(spawn("/usr/lib/systemd/systemd-udevd", log="udev"))
         wait_until(Path("/run/udev/control").exists, 20, "udev")
@@ -242,37 +208,20 @@ class NetworkManager(Host):
         self.daemon = spawn("NetworkManager", "--debug", log="networkmanager")
         self.daemons.append(self.daemon)
 
-    @staticmethod
-    def nmcli(arguments):
-        return subprocess.run(["nmcli", "-t", *shlex.split(arguments)], capture_output=True, text=True,
-                              env=ENVIRONMENT, check=False).stdout
+    nmcli = staticmethod(machine.nmcli)
 
     def state(self):
-        state = super().state()
-        fields = "GENERAL.DEVICE,GENERAL.STATE,GENERAL.CONNECTION,GENERAL.AUTOCONNECT,GENERAL.NM-MANAGED"
-        # A card that is being connected goes through states by itself.
-        underway = r"GENERAL.STATE:(?:[4-9]0|120) .*"
-        state["devices"] = [re.sub(underway, "GENERAL.STATE:connecting",
-                                   self.nmcli(f"-f {fields} device show {card}")).splitlines()
-                            for card in (CARD, "eth0") if Path("/sys/class/net", card).exists()]
-        state["profiles"] = [line for line in
-                             self.nmcli("-f NAME,UUID,AUTOCONNECT,DEVICE,FILENAME connection").splitlines()
-                             if not line.startswith("lo:")]
-        state["files"] = {str(path): path.read_text() for folder in ("/etc", "/run") for path in
-                          Path(folder, "NetworkManager/system-connections").glob("*") if "lo.nm" not in str(path)}
-        return state
+        cards = [card for card in (CARD, "eth0") if Path("/sys/class/net", card).exists()]
+        return super().state() | machine.daemon_state(cards)
 
     def start_desktop(self):
         """Lets the resident sit at the computer; what their browser is told goes to /tmp/browser."""
         sh(f"""
-            id resident 2>/dev/null || echo 'resident:x:{RESIDENT}:{RESIDENT}::/:/bin/sh' >>/etc/passwd
+            id resident 2>/dev/null || echo '{machine.RESIDENT_LINE}' >>/etc/passwd
             printf '#!/bin/sh\\necho "$(id -un) opens $*" >>/tmp/browser\\n' >/usr/bin/xdg-open
             chmod 755 /usr/bin/xdg-open
         """)
-        for path, fields in {"seats/seat0": f"ACTIVE=1\nACTIVE_UID={RESIDENT}\n", "sessions/1":
-                             f"UID={RESIDENT}\nCLASS=user\nSTATE=active\nTYPE=x11\nDISPLAY=:0\n"}.items():
-            (file := Path("/run/systemd", path)).parent.mkdir(parents=True, exist_ok=True)
-            file.write_text(fields)
+        machine.sit_down()
 
     def log(self):
         return air.log_of("networkmanager")

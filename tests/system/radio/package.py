@@ -5,9 +5,8 @@ import sys
 from pathlib import Path
 
 import distribution
-import hosts
 import rows
-from air import sh
+from machine import STORE, sh
 
 TOOL = "/usr/sbin/location-assistant"
 # What running daemons and the package manager write by themselves; but systemd-networkd is told by files in NETWORKD.
@@ -45,12 +44,12 @@ def installed_used_and_removed(visit):
     # Removed at the printer, it leads back first.
     sh("dpkg -r location-assistant libmorescf-dev libmorescf1 >>/report/dpkg.txt 2>&1")
     visit.as_before(within=20)
-    left = {path for path in files() - before if not path.startswith(str(hosts.STORE))}
+    left = {path for path in files() - before if not path.startswith(str(STORE.parent))}
     assert not left, f"left behind: {sorted(left)}"
     assert not before - files(), f"gone: {sorted(before - files())}"
-    assert Path(hosts.STORE, "preferences.plist").exists()
+    assert STORE.exists()
     sh("dpkg -P location-assistant")
-    assert not Path(hosts.STORE).exists()
+    assert not STORE.parent.exists()
     visit.say("removed and purged")
 
 

@@ -14,6 +14,7 @@ from pathlib import Path
 import air
 import hosts
 from air import wait_until
+from machine import sh
 
 FIXED = ["192.0.0.199/24"]
 OUT, BACK = 20 + 1.5, 15 + 1.5  # seconds; the rest is for the tool's own start and end
@@ -123,10 +124,13 @@ class Visit:
         assert self.host.joined() is None, self.host.joined()
         assert self.name not in {name for name, _, _ in air.heard() - self.air_before}, "a network was formed"
 
-    def there_and_back(self, *key, mode="from_intro"):
+    def arrive(self, *key, mode="from_intro"):
         self.remember()
         self.create(*key, mode=mode)
         self.page()
+
+    def there_and_back(self, *key, mode="from_intro"):
+        self.arrive(*key, mode=mode)
         self.back()
 
 
@@ -221,9 +225,7 @@ def switched_on_late(visit):
 @row("networkmanager", "networkmanager-iwd", "supplicant")
 def goes_away_and_comes_back(visit):
     network = visit.offer()
-    visit.remember()
-    visit.create()
-    visit.page()
+    visit.arrive()
     time.sleep(10)  # until nobody scans any more: iwd would at once join what it has just heard
     network.stop()
     time.sleep(15)
@@ -247,9 +249,7 @@ def radio_switched_off(visit):
 @row("supplicant")
 def switched_off_at_the_printer(visit):
     visit.offer()
-    visit.remember()
-    visit.create()
-    visit.page()
+    visit.arrive()
     visit.host.switch(True)
     visit.host.tool("remove")
     visit.told("radio was switched off meanwhile")
@@ -260,9 +260,7 @@ def switched_off_at_the_printer(visit):
 @row("networkmanager", "networkmanager-iwd", "supplicant")
 def home_is_gone(visit):
     visit.offer()
-    visit.remember()
-    visit.create()
-    visit.page()
+    visit.arrive()
     visit.host.home.stop()
     # Time for a scan or two; a home network that is to be waited for has longer.
     visit.tool("remove", limit=10)
@@ -274,7 +272,7 @@ def home_is_gone(visit):
 @row("nobody")
 def home_joined_by_the_kernel(visit):
     visit.offer(name="Open home", place="home")
-    visit.disturb(air.sh, "ip link set wlan0 up; iw dev wlan0 connect 'Open home'; "
+    visit.disturb(sh, "ip link set wlan0 up; iw dev wlan0 connect 'Open home'; "
                   "ip addr add 192.168.50.20/24 brd + dev wlan0; ip route add default via 192.168.50.1 dev wlan0")
     wait_until(lambda: visit.host.joined() == ("Open home", "access point"), 10, "at home")
     time.sleep(2)
