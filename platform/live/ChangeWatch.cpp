@@ -2,6 +2,7 @@
 
 #include <sys/epoll.h>
 #include <sys/inotify.h>
+#include <sys/socket.h>
 #include <sys/timerfd.h>
 #include <unistd.h>
 
@@ -17,6 +18,7 @@ constexpr std::uint32_t fileEvents =
 // More than a path has folders that could come one after the other meanwhile.
 constexpr int mostWatchTries = 64;
 constexpr int mostReads = 1000;
+constexpr int mostNotices = 10000;
 
 bool addTo(int poll, int descriptor) {
     epoll_event event{};
@@ -25,16 +27,41 @@ bool addTo(int poll, int descriptor) {
     return ::epoll_ctl(poll, EPOLL_CTL_ADD, descriptor, &event) == 0 || errno == EEXIST;
 }
 
+// What a notice says does not matter: the kernel drops some when they come too fast, and takes routes away
+// without one when a link goes down. So every notice is thrown away unread, and so is the report of an
+// overrun.
+bool drainKernel(int socket) {
+    bool any = false;
+    for (int i = 0; i < mostNotices; ++i) {
+        char nothing = 0;
+        const ssize_t size = ::recv(socket, &nothing, sizeof nothing, MSG_DONTWAIT | MSG_TRUNC);
+        if (size < 0 && errno != ENOBUFS && errno != EINTR) {
+            break;
+        }
+        any = true;
+    }
+    return any;
+}
+
+bool drainFiles(int watch) {
+    bool any = false;
+    alignas(inotify_event) char events[4096];
+    for (int i = 0; i<mostReads&& ::read(watch, events, sizeof events)> 0; ++i) {
+        any = true;
+    }
+    return any;
+}
+
 }  // namespace
 
 Outcome ChangeWatch::open(NetworkState& state, const std::string& preferencesDirectory) {
-    RETURN_IF_FAILED(state.subscribe(notices_));
+    RETURN_IF_FAILED(state.subscribe(kernel_));
     directory_ = preferencesDirectory;
     poll_.reset(::epoll_create1(EPOLL_CLOEXEC));
     timer_.reset(::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC));
     files_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
     if (!poll_.isOpen() || !timer_.isOpen() || !files_.isOpen() || !addTo(poll_.get(), timer_.get()) ||
-        !addTo(poll_.get(), notices_->descriptor()) || !addTo(poll_.get(), files_.get())) {
+        !addTo(poll_.get(), kernel_.get()) || !addTo(poll_.get(), files_.get())) {
         return Outcome::fromErrno("cannot watch for changes");
     }
     watchPreferences();
@@ -64,22 +91,10 @@ void ChangeWatch::watchPreferences() {
     }
 }
 
-bool ChangeWatch::drainPreferences() {
-    bool any = false;
-    alignas(inotify_event) char events[4096];
-    for (int i = 0; i < mostReads && (::read(files_.get(), events, sizeof events)) > 0; ++i) {
-        any = true;
-    }
-    if (any) {
-        watchPreferences();
-    }
-    return any;
-}
-
 // Takes the sources of news out of the poll set instead of masking them: an overrun is reported all the same.
 void ChangeWatch::listen(bool on) {
-    pacing_ = on ? Pacing::listening : Pacing::pausing;
-    for (const int source : {notices_->descriptor(), files_.get()}) {
+    isPausing_ = !on;
+    for (const int source : {kernel_.get(), files_.get()}) {
         if (on) {
             (void)addTo(poll_.get(), source);
         } else {
@@ -88,36 +103,35 @@ void ChangeWatch::listen(bool on) {
     }
 }
 
-void ChangeWatch::startTimer(std::chrono::milliseconds time) {
+void ChangeWatch::pauseFor(std::chrono::milliseconds time) {
+    listen(false);
     itimerspec setting{};
     setting.it_value.tv_sec = time.count() / 1000;
     setting.it_value.tv_nsec = time.count() % 1000 * 1'000'000;
     (void)::timerfd_settime(timer_.get(), 0, &setting, nullptr);
 }
 
-bool ChangeWatch::takeTimer() {
-    std::uint64_t expirations = 0;
-    return ::read(timer_.get(), &expirations, sizeof expirations) == sizeof expirations;
-}
-
 bool ChangeWatch::take() {
-    const bool isPauseOver = takeTimer();
-    if (pacing_ == Pacing::pausing && !isPauseOver) {
+    std::uint64_t expirations = 0;
+    const bool isPauseOver = ::read(timer_.get(), &expirations, sizeof expirations) == sizeof expirations;
+    if (isPausing_ && !isPauseOver) {
         return false;
     }
-    const bool kernelNews = notices_->drain();
-    const bool fileNews = drainPreferences();
-    const bool news = kernelNews || fileNews;
-    listen(!news);
-    if (news) {
-        startTimer(pause);
+    const bool kernelNews = drainKernel(kernel_.get());
+    const bool fileNews = drainFiles(files_.get());
+    if (fileNews) {
+        watchPreferences();
     }
-    return news || isPauseOver;
+    if (kernelNews || fileNews) {
+        pauseFor(pause);
+    } else {
+        listen(true);
+    }
+    return kernelNews || fileNews || isPauseOver;
 }
 
 void ChangeWatch::retryLater() {
-    listen(false);
-    startTimer(longPause);
+    pauseFor(longPause);
 }
 
 }  // namespace platform::live

@@ -3,7 +3,6 @@
 #pragma once
 
 #include <chrono>
-#include <memory>
 #include <string>
 
 #include "platform/base/FileDescriptor.h"
@@ -33,21 +32,17 @@ class ChangeWatch {
     void retryLater();
 
   private:
-    enum class Pacing { listening, pausing };
-
     void listen(bool on);
-    void startTimer(std::chrono::milliseconds time);
-    bool takeTimer();
-    bool drainPreferences();
+    void pauseFor(std::chrono::milliseconds time);
     void watchPreferences();
     bool watchNearest();
 
     FileDescriptor poll_;
     FileDescriptor timer_;
+    FileDescriptor kernel_;
     FileDescriptor files_;
-    std::unique_ptr<Notices> notices_;
     std::string directory_;
-    Pacing pacing_ = Pacing::listening;
+    bool isPausing_ = false;
 };
 
 }  // namespace platform::live

@@ -9,6 +9,7 @@
 #include <optional>
 #include <string>
 
+#include "platform/base/FileDescriptor.h"
 #include "platform/base/Outcome.h"
 
 namespace platform::live {
@@ -37,21 +38,6 @@ struct Reach {
     bool isDirect = false;     // no gateway on the way
 };
 
-// One subscription to the news that something may have changed.
-class Notices {
-  public:
-    Notices() = default;
-    Notices(const Notices&) = delete;
-    Notices& operator=(const Notices&) = delete;
-    virtual ~Notices() = default;
-
-    // Readable while there is news.
-    [[nodiscard]] virtual int descriptor() const noexcept = 0;
-    // Takes away what is there, without waiting and a bounded amount of it a call. Whether there was any:
-    // then the state has to be looked at anew.
-    virtual bool drain() = 0;
-};
-
 class NetworkState {
   public:
     NetworkState() = default;
@@ -64,8 +50,9 @@ class NetworkState {
     // Fails only when the question could not be asked; having no route is an answer, and a route over a link
     // that is down or without a carrier reaches nothing.
     virtual Outcome reach(const Destination& destination, Reach& reach) = 0;
-    // From then on no change of the primary route goes without news.
-    virtual Outcome subscribe(std::unique_ptr<Notices>& notices) = 0;
+    // A socket that is readable while there is news. From then on no change of the primary route goes without
+    // any; what the datagrams say does not matter.
+    virtual Outcome subscribe(FileDescriptor& news) = 0;
 };
 
 // The one of the host in force, or the kernel's own.

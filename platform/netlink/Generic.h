@@ -22,9 +22,6 @@ struct GenericFamily {
     [[nodiscard]] Message request(std::uint8_t command, std::uint16_t flags) const;
 };
 
-// Nothing when the message describes no family.
-[[nodiscard]] std::optional<GenericFamily> decodeFamily(const MessageView& message);
-
 // Nothing, and success, when this kernel has no family of that name. The socket is one to generic netlink.
 Outcome findFamily(Socket& socket, const std::string& name, std::optional<GenericFamily>& family);
 

@@ -10,11 +10,11 @@ namespace {
 
 Outcome ask(Socket& socket, Message message, std::optional<Link>& link) {
     link.reset();
-    OwnedMessage answer;
+    Message answer;
     RETURN_IF_FAILED(socket.ask(std::move(message), answer, {ENODEV}));
-    const auto found = answer.view().family<ifinfomsg>();
-    const auto name = answer.view().attributes<ifinfomsg>().find(IFLA_IFNAME);
-    if (answer.view().type() == RTM_NEWLINK && found && name) {
+    const auto found = answer.family<ifinfomsg>();
+    const auto name = answer.attributes<ifinfomsg>().find(IFLA_IFNAME);
+    if (answer.type() == RTM_NEWLINK && found && name) {
         link = Link{found->ifi_index, (found->ifi_flags & IFF_UP) != 0, (found->ifi_flags & IFF_RUNNING) != 0,
                     std::string(name->text())};
     }

@@ -15,18 +15,6 @@ constexpr std::size_t aligned(std::size_t length) {
 
 }  // namespace
 
-std::optional<std::uint32_t> Attribute::u32() const noexcept {
-    return payload.size() == sizeof(std::uint32_t) ? valueFrom<std::uint32_t>(payload) : std::nullopt;
-}
-
-std::optional<std::uint16_t> Attribute::u16() const noexcept {
-    return payload.size() == sizeof(std::uint16_t) ? valueFrom<std::uint16_t>(payload) : std::nullopt;
-}
-
-std::optional<std::uint8_t> Attribute::u8() const noexcept {
-    return payload.size() == sizeof(std::uint8_t) ? valueFrom<std::uint8_t>(payload) : std::nullopt;
-}
-
 std::string_view Attribute::text() const noexcept {
     const std::string_view all(reinterpret_cast<const char*>(payload.data()), payload.size());
     return all.substr(0, all.find('\0'));
@@ -55,18 +43,7 @@ std::optional<Attribute> Attributes::find(std::uint16_t type) const noexcept {
 
 std::optional<std::uint32_t> Attributes::u32(std::uint16_t type) const noexcept {
     const std::optional<Attribute> found = find(type);
-    return found ? found->u32() : std::nullopt;
-}
-
-std::optional<MessageView> takeMessage(ByteView& datagram) noexcept {
-    const std::optional<nlmsghdr> header = valueFrom<nlmsghdr>(datagram);
-    if (!header || header->nlmsg_len < NLMSG_HDRLEN || header->nlmsg_len > datagram.size()) {
-        datagram = {};
-        return std::nullopt;
-    }
-    const MessageView message(*header, datagram.subspan(NLMSG_HDRLEN, header->nlmsg_len - NLMSG_HDRLEN));
-    datagram = datagram.subspan(std::min<std::size_t>(aligned(header->nlmsg_len), datagram.size()));
-    return message;
+    return found ? found->as<std::uint32_t>() : std::nullopt;
 }
 
 nlmsghdr* Message::makeRoom(std::size_t size) {
@@ -74,11 +51,15 @@ nlmsghdr* Message::makeRoom(std::size_t size) {
     return reinterpret_cast<nlmsghdr*>(bytes_.data());
 }
 
-void Message::start(std::uint16_t type, std::uint16_t flags, ByteView family) {
-    nlmsghdr* const header = mnl_nlmsg_put_header(makeRoom(NLMSG_HDRLEN + family.size()));
+Message::Message(std::uint16_t type, std::uint16_t flags, ByteView payload) {
+    nlmsghdr* const header = mnl_nlmsg_put_header(makeRoom(NLMSG_HDRLEN + payload.size()));
     header->nlmsg_type = type;
     header->nlmsg_flags = flags;
-    std::memcpy(mnl_nlmsg_put_extra_header(header, family.size()), family.data(), family.size());
+    std::ranges::copy(payload, static_cast<std::byte*>(mnl_nlmsg_put_extra_header(header, payload.size())));
+}
+
+const nlmsghdr& Message::header() const noexcept {
+    return *reinterpret_cast<const nlmsghdr*>(bytes_.data());
 }
 
 Message& Message::add(std::uint16_t type, ByteView payload) {
@@ -93,6 +74,16 @@ Message& Message::addText(std::uint16_t type, std::string_view text) {
 
 void Message::setSequence(std::uint32_t sequence) noexcept {
     reinterpret_cast<nlmsghdr*>(bytes_.data())->nlmsg_seq = sequence;
+}
+
+std::vector<Message> messagesIn(ByteView datagram) {
+    std::vector<Message> messages;
+    int left = static_cast<int>(datagram.size());
+    for (const auto* header = reinterpret_cast<const nlmsghdr*>(datagram.data()); mnl_nlmsg_ok(header, left);
+         header = mnl_nlmsg_next(header, &left)) {
+        messages.emplace_back(ByteView(reinterpret_cast<const std::byte*>(header), header->nlmsg_len));
+    }
+    return messages;
 }
 
 }  // namespace platform::netlink

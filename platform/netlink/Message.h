@@ -47,10 +47,11 @@ struct Attribute {
     std::uint16_t type = 0;  // without the flag bits
     ByteView payload;
 
-    // The payload as an integer of exactly this width.
-    [[nodiscard]] std::optional<std::uint32_t> u32() const noexcept;
-    [[nodiscard]] std::optional<std::uint16_t> u16() const noexcept;
-    [[nodiscard]] std::optional<std::uint8_t> u8() const noexcept;
+    // The payload as a plain value of exactly this size.
+    template <class T>
+    [[nodiscard]] std::optional<T> as() const noexcept {
+        return payload.size() == sizeof(T) ? valueFrom<T>(payload) : std::nullopt;
+    }
     // The payload up to its first NUL.
     [[nodiscard]] std::string_view text() const noexcept;
     // The payload as attributes of its own.
@@ -72,48 +73,45 @@ class Attributes {
     std::vector<Attribute> list_;
 };
 
-// One message as it came, borrowed from the buffer that it came in.
-class MessageView {
-  public:
-    MessageView() = default;
-    MessageView(const nlmsghdr& header, ByteView payload) noexcept : header_(header), payload_(payload) {}
+// The attributes behind the fixed part of a payload.
+template <class Family>
+[[nodiscard]] Attributes attributesBehind(ByteView payload) {
+    constexpr std::size_t size = NLMSG_ALIGN(sizeof(Family));
+    return Attributes(payload.size() < size ? ByteView() : payload.subspan(size));
+}
 
-    [[nodiscard]] const nlmsghdr& header() const noexcept { return header_; }
-    [[nodiscard]] std::uint16_t type() const noexcept { return header_.nlmsg_type; }
-    [[nodiscard]] std::uint16_t flags() const noexcept { return header_.nlmsg_flags; }
-    [[nodiscard]] std::uint32_t sequence() const noexcept { return header_.nlmsg_seq; }
-    [[nodiscard]] ByteView payload() const noexcept { return payload_; }
-
-    // The fixed part that follows the header (ifinfomsg, ifaddrmsg, rtmsg); nothing when the message is too
-    // short.
-    template <class Family>
-    [[nodiscard]] std::optional<Family> family() const noexcept {
-        return valueFrom<Family>(payload_);
+// Calls `each` with the next hops of a route that has several (RTA_MULTIPATH), each a header with a length of
+// its own and the attributes behind it, until one gives false; what it changes in the header is written back.
+template <class Each>
+void forEachHop(Bytes& hops, const Each& each) {
+    for (std::size_t at = 0; at < hops.size();) {
+        const ByteView rest = ByteView(hops).subspan(at);
+        std::optional<rtnexthop> hop = valueFrom<rtnexthop>(rest);
+        if (!hop || hop->rtnh_len < sizeof *hop || hop->rtnh_len > rest.size()) {
+            return;
+        }
+        const bool goesOn = each(*hop, Attributes(rest.first(hop->rtnh_len).subspan(sizeof *hop)));
+        std::memcpy(hops.data() + at, &*hop, sizeof *hop);
+        if (!goesOn) {
+            return;
+        }
+        at += NLMSG_ALIGN(std::size_t{hop->rtnh_len});
     }
-    // The attributes behind that part.
-    template <class Family>
-    [[nodiscard]] Attributes attributes() const noexcept {
-        constexpr std::size_t size = NLMSG_ALIGN(sizeof(Family));
-        return Attributes(payload_.size() < size ? ByteView() : payload_.subspan(size));
-    }
+}
 
-  private:
-    nlmsghdr header_{};
-    ByteView payload_;
-};
-
-// Takes the first message off the bytes of a datagram; nothing at the end, or when what is left is no
-// message.
-[[nodiscard]] std::optional<MessageView> takeMessage(ByteView& datagram) noexcept;
-
-// A message being built. The length in its header is always right; the sequence number is the socket's
-// matter.
+// One message, as it came or being built. The length in its header is always right; the sequence number is
+// the socket's matter.
 class Message {
   public:
+    // Of type 0, which no message has.
+    Message() : Message(0, 0, ByteView()) {}
+    // With a fixed part that follows the header (ifinfomsg, ifaddrmsg, rtmsg), or with all that follows it.
     template <class Family>
-    Message(std::uint16_t type, std::uint16_t flags, const Family& family) {
-        start(type, flags, bytesOf(family));
-    }
+    Message(std::uint16_t type, std::uint16_t flags, const Family& family)
+        : Message(type, flags, bytesOf(family)) {}
+    Message(std::uint16_t type, std::uint16_t flags, ByteView payload);
+    // All of the bytes of one that came.
+    explicit Message(ByteView bytes) : bytes_(bytes.begin(), bytes.end()) {}
 
     Message& add(std::uint16_t type, ByteView payload);
     template <class T>
@@ -132,18 +130,32 @@ class Message {
         std::memcpy(bytes_.data() + start + offsetof(nlattr, nla_len), &length, sizeof length);
         return *this;
     }
-
     void setSequence(std::uint32_t sequence) noexcept;
+
     [[nodiscard]] ByteView bytes() const noexcept { return bytes_; }
+    [[nodiscard]] const nlmsghdr& header() const noexcept;
+    [[nodiscard]] std::uint16_t type() const noexcept { return header().nlmsg_type; }
     // What follows the header.
-    [[nodiscard]] ByteView payload() const noexcept { return ByteView(bytes_).subspan(NLMSG_HDRLEN); }
+    [[nodiscard]] ByteView payload() const noexcept { return bytes().subspan(NLMSG_HDRLEN); }
+    // The fixed part; nothing when the message is too short.
+    template <class Family>
+    [[nodiscard]] std::optional<Family> family() const noexcept {
+        return valueFrom<Family>(payload());
+    }
+    // The attributes behind that part, borrowed.
+    template <class Family>
+    [[nodiscard]] Attributes attributes() const {
+        return attributesBehind<Family>(payload());
+    }
 
   private:
-    void start(std::uint16_t type, std::uint16_t flags, ByteView family);
     // Room for so many bytes more behind the message.
     nlmsghdr* makeRoom(std::size_t size);
 
     Bytes bytes_;  // as long as the message, which libmnl pads
 };
+
+// The messages of a datagram, up to what is none.
+[[nodiscard]] std::vector<Message> messagesIn(ByteView datagram);
 
 }  // namespace platform::netlink

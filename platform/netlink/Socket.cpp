@@ -1,11 +1,11 @@
 #include "platform/netlink/Socket.h"
 
-#include <libmnl/libmnl.h>
 #include <poll.h>
 #include <sys/socket.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <iterator>
 #include <string>
 #include <utility>
 
@@ -19,18 +19,18 @@ constexpr int mostNotices = 1000;
 
 // An NLMSG_ERROR as an outcome: the errno, and the text that the kernel puts behind it when the socket asks
 // for it.
-Outcome outcomeOfError(const MessageView& message, std::initializer_list<int> tolerated, int& code) {
+Outcome outcomeOfError(const Message& message, std::initializer_list<int> tolerated, int& code) {
     const auto error = message.family<nlmsgerr>();
     if (!error) {
         return {kSCStatusFailed, "the kernel sent a short netlink answer"};
     }
     code = -error->error;
-    if (code == 0 || std::find(tolerated.begin(), tolerated.end(), code) != tolerated.end()) {
+    if (code == 0 || std::ranges::count(tolerated, code) != 0) {
         return {};
     }
     std::string what = "the kernel refused a netlink request";
     // The request itself is not repeated before them: the socket asks for that too.
-    if ((message.flags() & NLM_F_ACK_TLVS) != 0) {
+    if ((message.header().nlmsg_flags & NLM_F_ACK_TLVS) != 0) {
         if (const auto text = message.attributes<nlmsgerr>().find(NLMSGERR_ATTR_MSG)) {
             what += " (" + std::string(text->text()) + ")";
         }
@@ -40,28 +40,19 @@ Outcome outcomeOfError(const MessageView& message, std::initializer_list<int> to
 
 }  // namespace
 
-void Socket::Close::operator()(mnl_socket* socket) const noexcept {
-    (void)mnl_socket_close(socket);
-}
-
-OwnedMessage::OwnedMessage(const MessageView& view)
-    : header(view.header()), payload(view.payload().begin(), view.payload().end()) {}
-
-int Socket::descriptor() const noexcept {
-    return socket_ ? mnl_socket_get_fd(socket_.get()) : -1;
-}
-
-Outcome Socket::open(int protocol, std::uint32_t groups) {
-    decltype(socket_) socket(mnl_socket_open2(protocol, SOCK_CLOEXEC));
-    if (!socket) {
+Outcome Socket::open(int protocol) {
+    FileDescriptor socket(::socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC, protocol));
+    if (!socket.isOpen()) {
         return Outcome::fromErrno("cannot open a netlink socket");
     }
     // Kernels that lack one of these still answer every request, only with fewer words or less strictness.
-    int on = 1;
+    const int on = 1;
     for (const int option : {NETLINK_EXT_ACK, NETLINK_CAP_ACK, NETLINK_GET_STRICT_CHK}) {
-        (void)mnl_socket_setsockopt(socket.get(), option, &on, sizeof on);
+        (void)::setsockopt(socket.get(), SOL_NETLINK, option, &on, sizeof on);
     }
-    if (mnl_socket_bind(socket.get(), groups, MNL_SOCKET_AUTOPID) != 0) {
+    sockaddr_nl own{};
+    own.nl_family = AF_NETLINK;
+    if (::bind(socket.get(), reinterpret_cast<const sockaddr*>(&own), sizeof own) != 0) {
         return Outcome::fromErrno("cannot bind a netlink socket");
     }
     socket_ = std::move(socket);
@@ -69,18 +60,19 @@ Outcome Socket::open(int protocol, std::uint32_t groups) {
 }
 
 Outcome Socket::joinGroup(std::uint32_t group) {
-    if (mnl_socket_setsockopt(socket_.get(), NETLINK_ADD_MEMBERSHIP, &group, sizeof group) != 0) {
+    if (::setsockopt(socket_.get(), SOL_NETLINK, NETLINK_ADD_MEMBERSHIP, &group, sizeof group) != 0) {
         return Outcome::fromErrno("cannot ask for netlink notices");
     }
     return {};
 }
 
-Outcome Socket::send(Message& message) {
-    message.setSequence(++sequence_);
-    error_ = 0;
+Outcome Socket::send(const Message& message) {
+    sockaddr_nl kernel{};
+    kernel.nl_family = AF_NETLINK;
     ssize_t sent = 0;
     do {
-        sent = mnl_socket_sendto(socket_.get(), message.bytes().data(), message.bytes().size());
+        sent = ::sendto(socket_.get(), message.bytes().data(), message.bytes().size(), 0,
+                        reinterpret_cast<const sockaddr*>(&kernel), sizeof kernel);
     } while (sent < 0 && errno == EINTR);
     return sent < 0 ? Outcome::fromErrno("cannot send a netlink request") : Outcome();
 }
@@ -90,7 +82,7 @@ Outcome Socket::receive(Deadline deadline, Bytes& datagram) {
         const auto left =
             std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
         datagram.clear();
-        pollfd wait{descriptor(), POLLIN, 0};
+        pollfd wait{socket_.get(), POLLIN, 0};
         const int ready = ::poll(&wait, 1, static_cast<int>(std::max(left.count(), std::int64_t{0})));
         if (ready < 0 && errno != EINTR) {
             return Outcome::fromErrno("cannot wait for a netlink answer");
@@ -98,12 +90,11 @@ Outcome Socket::receive(Deadline deadline, Bytes& datagram) {
         if (ready == 0) {
             return {};
         }
-        // Not libmnl's own receiving: it does not tell who sent a datagram.
         datagram.resize(largestDatagram);
         sockaddr_nl sender{};
         socklen_t senderSize = sizeof sender;
         const ssize_t size =
-            ::recvfrom(descriptor(), datagram.data(), datagram.size(), MSG_DONTWAIT | MSG_TRUNC,
+            ::recvfrom(socket_.get(), datagram.data(), datagram.size(), MSG_DONTWAIT | MSG_TRUNC,
                        reinterpret_cast<sockaddr*>(&sender), &senderSize);
         if (size < 0 && errno != EINTR && errno != EAGAIN) {
             return Outcome::fromErrno("cannot read a netlink answer");
@@ -118,12 +109,16 @@ Outcome Socket::receive(Deadline deadline, Bytes& datagram) {
     }
 }
 
-template <class Each>
-Outcome Socket::receiveAnswers(const Each& each) {
+Outcome Socket::exchange(Message& message, std::vector<Message>& answers,
+                         std::initializer_list<int> tolerated, bool& isInterrupted) {
+    answers.clear();
+    isInterrupted = false;
+    error_ = 0;
+    message.setSequence(++sequence_);
+    RETURN_IF_FAILED(send(message));
     const auto deadline = std::chrono::steady_clock::now() + answerTime;
     std::size_t total = 0;
-    Bytes datagram;
-    for (;;) {
+    for (Bytes datagram;;) {
         RETURN_IF_FAILED(receive(deadline, datagram));
         if (datagram.empty()) {
             return {kSCStatusFailed, "the kernel did not answer a netlink request"};
@@ -132,73 +127,53 @@ Outcome Socket::receiveAnswers(const Each& each) {
         if (total > largestDump) {
             return {kSCStatusFailed, "the kernel's netlink dump is too large"};
         }
-        ByteView rest = datagram;
-        while (const auto part = takeMessage(rest)) {
-            if (part->sequence() == sequence_ && each(*part)) {
-                return {};
+        for (Message& part : messagesIn(datagram)) {
+            if (part.header().nlmsg_seq != sequence_) {
+                continue;
             }
+            isInterrupted = isInterrupted || (part.header().nlmsg_flags & NLM_F_DUMP_INTR) != 0;
+            if (part.type() == NLMSG_ERROR) {
+                return outcomeOfError(part, tolerated, error_);
+            }
+            if (part.type() == NLMSG_DONE) {
+                error_ = std::max(-part.family<std::int32_t>().value_or(0), 0);
+                return error_ == 0 || std::ranges::count(tolerated, error_) != 0
+                           ? Outcome()
+                           : Outcome::fromErrno("the kernel ended a netlink dump", error_);
+            }
+            answers.push_back(std::move(part));
         }
     }
 }
 
 Outcome Socket::request(Message message, std::initializer_list<int> tolerated) {
-    OwnedMessage nothing;
+    Message nothing;
     return ask(std::move(message), nothing, tolerated);
 }
 
-Outcome Socket::ask(Message message, OwnedMessage& answer, std::initializer_list<int> tolerated) {
+Outcome Socket::ask(Message message, Message& answer, std::initializer_list<int> tolerated) {
     answer = {};
-    RETURN_IF_FAILED(send(message));
-    Outcome end;
-    RETURN_IF_FAILED(receiveAnswers([&](const MessageView& part) {
-        const bool isEnd = part.type() == NLMSG_ERROR;
-        if (isEnd) {
-            end = outcomeOfError(part, tolerated, error_);
-        } else {
-            answer = OwnedMessage(part);
-        }
-        return isEnd;
-    }));
-    return end;
+    std::vector<Message> answers;
+    bool isInterrupted = false;
+    RETURN_IF_FAILED(exchange(message, answers, tolerated, isInterrupted));
+    if (!answers.empty()) {
+        answer = std::move(answers.back());
+    }
+    return {};
 }
 
-Outcome Socket::dump(const Message& message, std::vector<OwnedMessage>& answers,
-                     std::initializer_list<int> tolerated) {
-    bool interrupted = true;
-    for (int attempt = 0; attempt < dumpTries && interrupted; ++attempt) {
-        RETURN_IF_FAILED(dumpOnce(message, answers, tolerated, interrupted));
+Outcome Socket::dump(Message message, std::vector<Message>& answers, std::initializer_list<int> tolerated) {
+    bool isInterrupted = true;
+    for (int attempt = 0; attempt < dumpTries && isInterrupted; ++attempt) {
+        RETURN_IF_FAILED(exchange(message, answers, tolerated, isInterrupted));
     }
     // After that many tries the last list is as good as the kernel gives; a caller that acts on it compares
     // later.
     return {};
 }
 
-Outcome Socket::dumpOnce(Message message, std::vector<OwnedMessage>& answers,
-                         std::initializer_list<int> tolerated, bool& interrupted) {
-    answers.clear();
-    interrupted = false;
-    RETURN_IF_FAILED(send(message));
-    Outcome end;
-    RETURN_IF_FAILED(receiveAnswers([&](const MessageView& part) {
-        interrupted = interrupted || (part.flags() & NLM_F_DUMP_INTR) != 0;
-        if (part.type() == NLMSG_ERROR) {
-            end = outcomeOfError(part, tolerated, error_);
-        } else if (part.type() == NLMSG_DONE) {
-            error_ = std::max(-valueFrom<std::int32_t>(part.payload()).value_or(0), 0);
-            const bool isFine =
-                error_ == 0 || std::find(tolerated.begin(), tolerated.end(), error_) != tolerated.end();
-            end = isFine ? Outcome() : Outcome::fromErrno("the kernel ended a netlink dump", error_);
-        } else {
-            answers.emplace_back(part);
-            return false;
-        }
-        return true;
-    }));
-    return end;
-}
-
-std::vector<OwnedMessage> Socket::takeNotices(bool& overrun) {
-    std::vector<OwnedMessage> notices;
+std::vector<Message> Socket::takeNotices(bool& overrun) {
+    std::vector<Message> notices;
     overrun = false;
     Bytes datagram;
     for (int i = 0; i < mostNotices; ++i) {
@@ -208,10 +183,7 @@ std::vector<OwnedMessage> Socket::takeNotices(bool& overrun) {
         if (received && datagram.empty()) {
             break;
         }
-        ByteView rest = datagram;
-        while (const auto notice = takeMessage(rest)) {
-            notices.emplace_back(*notice);
-        }
+        std::ranges::move(messagesIn(datagram), std::back_inserter(notices));
     }
     return notices;
 }

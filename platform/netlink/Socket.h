@@ -5,25 +5,14 @@
 #include <chrono>
 #include <cstdint>
 #include <initializer_list>
-#include <memory>
+#include <utility>
 #include <vector>
 
+#include "platform/base/FileDescriptor.h"
 #include "platform/base/Outcome.h"
 #include "platform/netlink/Message.h"
 
-struct mnl_socket;
-
 namespace platform::netlink {
-
-// A message with a buffer of its own.
-struct OwnedMessage {
-    nlmsghdr header{};
-    Bytes payload;
-
-    OwnedMessage() = default;
-    explicit OwnedMessage(const MessageView& view);
-    [[nodiscard]] MessageView view() const noexcept { return {header, payload}; }
-};
 
 // Every wait for an answer is bounded by answerTime, and every dump by largestDump; only datagrams from the
 // kernel itself are read, and answers to other requests than the one at hand are ignored. A request that
@@ -33,14 +22,13 @@ class Socket {
     static constexpr std::chrono::milliseconds answerTime{5000};
     static constexpr std::size_t largestDump = std::size_t{64} << 20U;
 
-    // To the routing tables. groups are RTMGRP_ bits for the notices to receive; a socket for requests takes
-    // none.
-    Outcome open(std::uint32_t groups = 0) { return open(NETLINK_ROUTE, groups); }
+    Outcome open() { return open(NETLINK_ROUTE); }
     // To generic netlink, whose families and groups of notices have numbers of their own.
-    Outcome openGeneric() { return open(NETLINK_GENERIC, 0); }
+    Outcome openGeneric() { return open(NETLINK_GENERIC); }
+    // For the notices of a group (RTNLGRP_ for the routing tables). A socket for requests takes none.
     Outcome joinGroup(std::uint32_t group);
-    [[nodiscard]] bool isOpen() const noexcept { return socket_ != nullptr; }
-    [[nodiscard]] int descriptor() const noexcept;
+    // Of a socket for notices: readable while there are some.
+    [[nodiscard]] FileDescriptor release() noexcept { return std::move(socket_); }
 
     // Sends a request and waits for the acknowledgement. The kernel's errors in `tolerated` count as success.
     Outcome request(Message message, std::initializer_list<int> tolerated = {});
@@ -49,34 +37,28 @@ class Socket {
     [[nodiscard]] int error() const noexcept { return error_; }
     // The one message that answers a request (RTM_GETLINK for one link, RTM_GETROUTE for one destination). An
     // error in `tolerated` leaves the answer with type 0.
-    Outcome ask(Message message, OwnedMessage& answer, std::initializer_list<int> tolerated = {});
+    Outcome ask(Message message, Message& answer, std::initializer_list<int> tolerated = {});
     // Everything that a dump request lists; nothing after an error in `tolerated`, something or nothing on
     // failure. A dump that a change ran into is taken again, a few times.
-    Outcome dump(const Message& message, std::vector<OwnedMessage>& answers,
-                 std::initializer_list<int> tolerated = {});
+    Outcome dump(Message message, std::vector<Message>& answers, std::initializer_list<int> tolerated = {});
 
     // For a socket with groups: takes the notices that are there, without waiting. overrun: the kernel
     // dropped some, so what is known has to be looked up anew.
-    [[nodiscard]] std::vector<OwnedMessage> takeNotices(bool& overrun);
+    [[nodiscard]] std::vector<Message> takeNotices(bool& overrun);
 
   private:
     using Deadline = std::chrono::steady_clock::time_point;
 
-    Outcome open(int protocol, std::uint32_t groups);
-    Outcome send(Message& message);
+    Outcome open(int protocol);
+    Outcome send(const Message& message);
     // One datagram of the kernel's; empty when none has come by the deadline.
     Outcome receive(Deadline deadline, Bytes& datagram);
-    // Calls `each` with every message that answers the request sent last, until it says that this was the
-    // last.
-    template <class Each>
-    Outcome receiveAnswers(const Each& each);
-    Outcome dumpOnce(Message message, std::vector<OwnedMessage>& answers,
-                     std::initializer_list<int> tolerated, bool& interrupted);
+    // Sends a request and takes the answers to it, up to the one that ends them. isInterrupted: a change ran
+    // into the dump.
+    Outcome exchange(Message& message, std::vector<Message>& answers, std::initializer_list<int> tolerated,
+                     bool& isInterrupted);
 
-    struct Close {
-        void operator()(mnl_socket* socket) const noexcept;
-    };
-    std::unique_ptr<mnl_socket, Close> socket_;
+    FileDescriptor socket_;
     std::uint32_t sequence_ = 0;
     int error_ = 0;
 };

@@ -18,7 +18,6 @@ using netlink::Attributes;
 using netlink::Bytes;
 using netlink::ByteView;
 using netlink::Message;
-using netlink::MessageView;
 
 constexpr std::uint8_t lastKernelProtocol = 3;
 
@@ -44,32 +43,37 @@ Bytes ownBytes(const T& value) {
 }
 
 template <class Family>
-Bytes encodeKey(const Family& family, const AttributeMap& attributes) {
-    Message message(0, 0, family);
-    for (const auto& [type, payload] : attributes) {
-        message.add(type, payload);
+Message makeMessage(std::uint16_t type, std::uint16_t flags, const Family& family,
+                    const AttributeMap& attributes) {
+    Message message(type, flags, family);
+    for (const auto& [kind, payload] : attributes) {
+        message.add(kind, payload);
     }
-    return {message.payload().begin(), message.payload().end()};
+    return message;
 }
 
 template <class Family>
-Attributes attributesOf(const Bytes& key) {
-    return MessageView({}, key).attributes<Family>();
+Bytes encodeKey(const Family& family, const AttributeMap& attributes) {
+    const Message message = makeMessage(0, 0, family, attributes);
+    return {message.payload().begin(), message.payload().end()};
 }
 
-// Calls `each` with the hops of a multipath route; what `each` changes is written back.
+// Calls `each` with every index of an interface that a route goes through; what `each` changes is written
+// back.
 template <class Each>
-void forEachHop(Bytes& hops, const Each& each) {
-    std::size_t offset = 0;
-    while (offset + sizeof(rtnexthop) <= hops.size()) {
-        rtnexthop hop{};
-        std::memcpy(&hop, hops.data() + offset, sizeof hop);
-        if (hop.rtnh_len < sizeof hop || hop.rtnh_len > hops.size() - offset) {
-            return;
-        }
-        each(hop);
-        std::memcpy(hops.data() + offset, &hop, sizeof hop);
-        offset += RTNH_ALIGN(hop.rtnh_len);
+void forEachInterface(AttributeMap& attributes, const Each& each) {
+    if (const auto out = attributes.find(RTA_OIF); out != attributes.end()) {
+        int index = netlink::valueFrom<int>(out->second).value_or(0);
+        each(index);
+        out->second = ownBytes(index);
+    }
+    if (const auto hops = attributes.find(RTA_MULTIPATH); hops != attributes.end()) {
+        netlink::forEachHop(hops->second, [&each](rtnexthop& hop, const Attributes&) {
+            // Whether a hop is dead or offloaded now is not the route's own.
+            hop.rtnh_flags = static_cast<unsigned char>(hop.rtnh_flags & RTNH_F_ONLINK);
+            each(hop.rtnh_ifindex);
+            return true;
+        });
     }
 }
 
@@ -96,11 +100,11 @@ std::uint8_t Route::protocol() const noexcept {
 }
 
 bool Route::hasGateway() const noexcept {
-    const Attributes attributes = attributesOf<rtmsg>(key);
+    const Attributes attributes = netlink::attributesBehind<rtmsg>(key);
     return attributes.find(RTA_GATEWAY) || attributes.find(RTA_VIA) || attributes.find(RTA_MULTIPATH);
 }
 
-std::optional<Address> decodeAddress(const MessageView& message, int index) {
+std::optional<Address> decodeAddress(const Message& message, int index) {
     auto header = message.family<ifaddrmsg>();
     if (message.type() != RTM_NEWADDR || !header || static_cast<int>(header->ifa_index) != index ||
         (header->ifa_family != AF_INET && header->ifa_family != AF_INET6)) {
@@ -111,7 +115,7 @@ std::optional<Address> decodeAddress(const MessageView& message, int index) {
     const std::uint32_t flags = all.u32(IFA_FLAGS).value_or(header->ifa_flags);
     Address address;
     if (const auto protocol = all.find(addressProtocol)) {
-        address.protocol = protocol->u8().value_or(0);
+        address.protocol = protocol->as<std::uint8_t>().value_or(0);
     }
     if (const auto times = all.find(IFA_CACHEINFO)) {
         const auto cache = netlink::valueFrom<ifa_cacheinfo>(times->payload).value_or(ifa_cacheinfo{});
@@ -133,8 +137,7 @@ std::optional<Address> decodeAddress(const MessageView& message, int index) {
     return address;
 }
 
-std::optional<Route> decodeRoute(const MessageView& message, int index,
-                                 const std::vector<Address>& addresses) {
+std::optional<Route> decodeRoute(const Message& message, int index, const std::vector<Address>& addresses) {
     auto header = message.family<rtmsg>();
     if (message.type() != RTM_NEWROUTE || !header || (header->rtm_flags & RTM_F_CLONED) != 0 ||
         (header->rtm_family != AF_INET && header->rtm_family != AF_INET6)) {
@@ -146,24 +149,16 @@ std::optional<Route> decodeRoute(const MessageView& message, int index,
     }
     AttributeMap attributes = mapOf(all);
     Route route;
-    bool isOurs = all.u32(RTA_OIF).value_or(0) == static_cast<std::uint32_t>(index);
-    if (isOurs) {
-        attributes[RTA_OIF] = ownBytes(std::uint32_t{0});
-    }
-    if (const auto hops = attributes.find(RTA_MULTIPATH); hops != attributes.end()) {
-        forEachHop(hops->second, [&isOurs, &route, index](rtnexthop& hop) {
-            // Whether a hop is dead or offloaded now is not the route's own.
-            hop.rtnh_flags = static_cast<unsigned char>(hop.rtnh_flags & RTNH_F_ONLINK);
-            (hop.rtnh_ifindex == index ? isOurs : route.isShared) = true;
-            hop.rtnh_ifindex = hop.rtnh_ifindex == index ? 0 : hop.rtnh_ifindex;
-        });
-    }
+    bool isOurs = false;
+    forEachInterface(attributes, [&isOurs, &route, index](int& each) {
+        (each == index ? isOurs : route.isShared) = true;
+        each = each == index ? 0 : each;
+    });
     if (const auto source = attributes.find(RTA_PREFSRC); source != attributes.end() && !isOurs) {
         // The kernel drops such a route together with the address.
-        isOurs = std::any_of(addresses.begin(), addresses.end(), [&source](const Address& address) {
-            const auto local = attributesOf<ifaddrmsg>(address.key).find(IFA_LOCAL);
-            return local && std::equal(local->payload.begin(), local->payload.end(), source->second.begin(),
-                                       source->second.end());
+        isOurs = std::ranges::any_of(addresses, [&source](const Address& address) {
+            const auto local = netlink::attributesBehind<ifaddrmsg>(address.key).find(IFA_LOCAL);
+            return local && std::ranges::equal(local->payload, source->second);
         });
         route.isShared = route.isElsewhere = isOurs;
     } else if (source != attributes.end() && header->rtm_family == AF_INET6) {
@@ -228,10 +223,9 @@ std::vector<Route> makeDefaultRoute(IPv4Address router, unsigned metric,
     if (metric != 0) {
         attributes[RTA_PRIORITY] = ownBytes(std::uint32_t{metric});
     }
-    const bool isNear =
-        std::any_of(addresses.begin(), addresses.end(), [router](const ManualAddress& address) {
-            return ((address.address ^ router) & maskOf(address.prefixLength)) == 0;
-        });
+    const bool isNear = std::ranges::any_of(addresses, [router](const ManualAddress& address) {
+        return ((address.address ^ router) & maskOf(address.prefixLength)) == 0;
+    });
     if (!isNear) {
         rtmsg toRouter = header;
         toRouter.rtm_dst_len = 32;
@@ -252,55 +246,35 @@ std::int64_t secondsSinceStart() {
     return now.tv_sec;
 }
 
-Bytes placeOf(const MessageView& message) {
+Bytes placeOf(const Message& message) {
     auto header = message.family<rtmsg>().value_or(rtmsg{});
-    const Attributes attributes = message.attributes<rtmsg>();
     header.rtm_protocol = header.rtm_scope = header.rtm_type = 0;
     header.rtm_flags = 0;
-    AttributeMap kept;
-    for (const Attribute& attribute : attributes) {
-        if (attribute.type == RTA_TABLE || attribute.type == RTA_DST || attribute.type == RTA_PRIORITY) {
-            kept[attribute.type] = Bytes(attribute.payload.begin(), attribute.payload.end());
-        }
-    }
-    return encodeKey(header, kept);
+    AttributeMap attributes = mapOf(message.attributes<rtmsg>());
+    std::erase_if(attributes, [](const auto& each) {
+        return each.first != RTA_TABLE && each.first != RTA_DST && each.first != RTA_PRIORITY;
+    });
+    return encodeKey(header, attributes);
 }
 
-Message requestFor(std::uint16_t type, std::uint16_t flags, const Address& address,
-                   const netlink::Link& link) {
+Message requestFor(std::uint16_t type, std::uint16_t flags, const Address& address, int index) {
     auto header = netlink::valueFrom<ifaddrmsg>(address.key).value_or(ifaddrmsg{});
-    header.ifa_index = static_cast<unsigned>(link.index);
-    Message message(type, static_cast<std::uint16_t>(NLM_F_REQUEST | NLM_F_ACK | flags), header);
-    for (const Attribute& attribute : attributesOf<ifaddrmsg>(address.key)) {
-        message.add(attribute.type, attribute.payload);
-    }
-    return message;
+    header.ifa_index = static_cast<unsigned>(index);
+    return makeMessage(type, NLM_F_REQUEST | NLM_F_ACK | flags, header,
+                       mapOf(netlink::attributesBehind<ifaddrmsg>(address.key)));
 }
 
-Message requestFor(std::uint16_t type, std::uint16_t flags, const Route& route, const netlink::Link& link) {
-    const auto header = netlink::valueFrom<rtmsg>(route.key).value_or(rtmsg{});
-    Message message(type, static_cast<std::uint16_t>(NLM_F_REQUEST | NLM_F_ACK | flags), header);
-    const auto index = static_cast<std::uint32_t>(link.index);
-    for (const Attribute& attribute : attributesOf<rtmsg>(route.key)) {
-        if (attribute.type == RTA_OIF && attribute.u32() == 0U) {
-            message.addValue(RTA_OIF, index);
-        } else if (attribute.type == RTA_MULTIPATH) {
-            Bytes hops(attribute.payload.begin(), attribute.payload.end());
-            forEachHop(hops, [&link](rtnexthop& hop) {
-                hop.rtnh_ifindex = hop.rtnh_ifindex == 0 ? link.index : hop.rtnh_ifindex;
-            });
-            message.add(RTA_MULTIPATH, hops);
-        } else {
-            message.add(attribute.type, attribute.payload);
-        }
-    }
-    return message;
+Message requestFor(std::uint16_t type, std::uint16_t flags, const Route& route, int index) {
+    AttributeMap attributes = mapOf(netlink::attributesBehind<rtmsg>(route.key));
+    forEachInterface(attributes, [index](int& each) { each = each == 0 ? index : each; });
+    return makeMessage(type, NLM_F_REQUEST | NLM_F_ACK | flags,
+                       netlink::valueFrom<rtmsg>(route.key).value_or(rtmsg{}), attributes);
 }
 
 // The kernel takes no IPv6 address for a route's source before the network has confirmed that nobody else has
 // it, which takes a second or two with a carrier.
 bool needsConfirmedSource(const Route& route) {
-    return route.family() == AF_INET6 && attributesOf<rtmsg>(route.key).find(RTA_PREFSRC);
+    return route.family() == AF_INET6 && netlink::attributesBehind<rtmsg>(route.key).find(RTA_PREFSRC);
 }
 
 }  // namespace platform::apply

@@ -22,7 +22,6 @@
 #include <vector>
 
 #include "platform/apply/Plan.h"
-#include "platform/netlink/Link.h"
 #include "platform/netlink/Message.h"
 
 namespace platform::apply {
@@ -88,8 +87,8 @@ struct InterfaceState {
 
 // The message as an address of the interface, or as a route through it (or from one of its addresses);
 // nothing when it belongs to another interface or is none of these.
-[[nodiscard]] std::optional<Address> decodeAddress(const netlink::MessageView& message, int index);
-[[nodiscard]] std::optional<Route> decodeRoute(const netlink::MessageView& message, int index,
+[[nodiscard]] std::optional<Address> decodeAddress(const netlink::Message& message, int index);
+[[nodiscard]] std::optional<Route> decodeRoute(const netlink::Message& message, int index,
                                                const std::vector<Address>& addresses);
 
 // A manual or leased address with its broadcast address, under the interface's name.
@@ -98,15 +97,15 @@ struct InterfaceState {
 [[nodiscard]] std::vector<Route> makeDefaultRoute(IPv4Address router, unsigned metric,
                                                   const std::vector<ManualAddress>& addresses);
 
-// The request to make or remove a kept address or route on the link.
+// The request to make or remove a kept address or route on the link of that index.
 [[nodiscard]] netlink::Message requestFor(std::uint16_t type, std::uint16_t flags, const Address& address,
-                                          const netlink::Link& link);
+                                          int index);
 [[nodiscard]] netlink::Message requestFor(std::uint16_t type, std::uint16_t flags, const Route& route,
-                                          const netlink::Link& link);
+                                          int index);
 
 // The place that a route leads to and how good it is: routes that agree in it are tried in the order of the
 // list.
-[[nodiscard]] netlink::Bytes placeOf(const netlink::MessageView& message);
+[[nodiscard]] netlink::Bytes placeOf(const netlink::Message& message);
 // Whether the network has to confirm the route's source address before the kernel takes the route.
 [[nodiscard]] bool needsConfirmedSource(const Route& route);
 

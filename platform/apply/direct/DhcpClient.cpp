@@ -4,12 +4,12 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <csignal>
 #include <vector>
 
 #include "platform/apply/StateFile.h"
 #include "platform/apply/direct/DhcpHookPath.h"
-#include "platform/apply/direct/Process.h"
 #include "platform/base/ChildProcess.h"
 #include "platform/base/FileDescriptor.h"
 #include "platform/base/Hexadecimal.h"
@@ -22,22 +22,9 @@ namespace {
 // For the message to the server and the program's last run.
 constexpr std::chrono::milliseconds stopTime{3000};
 
-std::string settingsPath(const std::string& interface) {
+std::string clientPath(const std::string& interface) {
     return runtimePath("dhcp-" + interface + ".plist");
 }
-
-// What is kept of a client.
-struct ClientState {
-    HookSettings settings;
-    Process client;
-
-    template <class Self, class Fields>
-    static void listFields(Self& self, Fields& fields) {
-        fields("Settings", self.settings.dhcp);
-        fields("ResolverFile", self.settings.resolverFile);
-        fields("Client", self.client);
-    }
-};
 
 bool hasEnded(const FileDescriptor& handle, std::chrono::milliseconds wait) {
     pollfd ended{handle.get(), POLLIN, 0};
@@ -67,7 +54,7 @@ Outcome startHeld(const DhcpSettings& settings, const std::string& hook, Process
             ::chdir("/") == 0) {
             (void)becomeProgram(currentHost().dhcpClient, argumentsFor(settings, hook),
                                 {"PATH=/usr/sbin:/usr/bin:/sbin:/bin",
-                                 std::string(dhcpSettingsVariable) + "=" + settingsPath(settings.interface)});
+                                 std::string(dhcpSettingsVariable) + "=" + clientPath(settings.interface)});
         }
     };
     RETURN_IF_FAILED(startDetached(run, gate));
@@ -80,39 +67,16 @@ Outcome startHeld(const DhcpSettings& settings, const std::string& hook, Process
 }
 
 void signalClient(const std::string& interface, int signal) {
-    std::optional<ClientState> state;
-    if (readState(settingsPath(interface), state).ok() && state) {
-        sendSignal(state->client, signal);
+    std::optional<DhcpClient> client;
+    if (readDhcpClient(interface, client).ok() && client) {
+        sendSignal(client->process, signal);
     }
 }
 
 }  // namespace
 
-Outcome readDhcpSettings(const std::string& interface, std::optional<DhcpSettings>& settings) {
-    settings.reset();
-    std::optional<ClientState> state;
-    RETURN_IF_FAILED(readState(settingsPath(interface), state));
-    if (state) {
-        settings = state->settings.dhcp;
-    }
-    return {};
-}
-
-Outcome readHookSettings(const std::string& path, HookSettings& settings) {
-    std::optional<ClientState> state;
-    RETURN_IF_FAILED(readState(path, state));
-    if (!state) {
-        return {kSCStatusFailed, "there are no settings for the DHCP client at " + path};
-    }
-    settings = std::move(state->settings);
-    return {};
-}
-
-Outcome isDhcpClientRunning(const std::string& interface, bool& running) {
-    std::optional<ClientState> state;
-    RETURN_IF_FAILED(readState(settingsPath(interface), state));
-    running = state && isAlive(state->client);
-    return {};
+Outcome readDhcpClient(const std::string& interface, std::optional<DhcpClient>& client) {
+    return readState(clientPath(interface), client);
 }
 
 Outcome startDhcpClient(const DhcpSettings& settings) {
@@ -121,12 +85,11 @@ Outcome startDhcpClient(const DhcpSettings& settings) {
     if (!isProgram(currentHost().dhcpClient)) {
         return Outcome::fromErrno("cannot run the DHCP client " + currentHost().dhcpClient);
     }
-    Process client;
+    DhcpClient client{settings, currentHost().resolverFile, {}};
     FileDescriptor gate;
-    RETURN_IF_FAILED(startHeld(settings, hook, client, gate));
+    RETURN_IF_FAILED(startHeld(settings, hook, client.process, gate));
     // Only a client that the next run can find again is let go.
-    RETURN_IF_FAILED(writeState(settingsPath(settings.interface),
-                                ClientState{{settings, currentHost().resolverFile}, client}));
+    RETURN_IF_FAILED(writeState(clientPath(settings.interface), client));
     return ::send(gate.get(), "g", 1, MSG_NOSIGNAL) == 1 ? Outcome()
                                                          : Outcome::fromErrno("cannot start the DHCP client");
 }
@@ -140,23 +103,23 @@ void askDhcpClientToEnd(const std::string& interface) {
 }
 
 Outcome stopDhcpClient(const std::string& interface) {
-    std::optional<ClientState> state;
-    RETURN_IF_FAILED(readState(settingsPath(interface), state));
-    if (!state) {
+    std::optional<DhcpClient> client;
+    RETURN_IF_FAILED(readDhcpClient(interface, client));
+    if (!client) {
         return {};
     }
-    const FileDescriptor handle = handleOf(state->client);
+    const FileDescriptor handle = handleOf(client->process);
     if (handle.isOpen()) {
-        sendSignal(state->client, SIGTERM);
+        sendSignal(client->process, SIGTERM);
         if (!hasEnded(handle, stopTime)) {
             logLine(LogLevel::warning, interface + ": the DHCP client does not end by itself and is ended");
             // With the program that it may be waiting for: it leads a process group of its own.
-            (void)::kill(-state->client.number, SIGKILL);
+            (void)::kill(-client->process.number, SIGKILL);
             (void)hasEnded(handle, stopTime);
         }
     }
-    RETURN_IF_FAILED(dropLease(state->settings.dhcp));
-    return removeFile(settingsPath(interface));
+    RETURN_IF_FAILED(dropLease(client->settings));
+    return removeFile(clientPath(interface));
 }
 
 }  // namespace platform::apply

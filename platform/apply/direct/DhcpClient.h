@@ -10,25 +10,31 @@
 #include <string>
 
 #include "platform/apply/direct/Lease.h"
+#include "platform/apply/direct/Process.h"
 #include "platform/base/Outcome.h"
 
 namespace platform::apply {
 
-// The name of the environment variable that tells the client's program where the settings are.
+// The name of the environment variable that tells the client's program where its DhcpClient is kept; the
+// file's own directory is the runtime directory.
 inline constexpr const char* dhcpSettingsVariable = "LOCATION_ASSISTANT_DHCP";
 
-// How the interface's client was started; nothing when this system started none, or it is to be taken for
-// gone.
-Outcome readDhcpSettings(const std::string& interface, std::optional<DhcpSettings>& settings);
-// The same from the file that the variable names; the file's own directory is the runtime directory.
-struct HookSettings {
-    DhcpSettings dhcp;
+// What is kept of a client, for its program and for the next run.
+struct DhcpClient {
+    DhcpSettings settings;
     std::string resolverFile;
-};
-Outcome readHookSettings(const std::string& path, HookSettings& settings);
+    Process process;
 
-// Whether the interface's client is running.
-Outcome isDhcpClientRunning(const std::string& interface, bool& running);
+    template <class Self, class Fields>
+    static void listFields(Self& self, Fields& fields) {
+        fields("Settings", self.settings);
+        fields("ResolverFile", self.resolverFile);
+        fields("Client", self.process);
+    }
+};
+
+// The interface's client, running or not; nothing when this system started none.
+Outcome readDhcpClient(const std::string& interface, std::optional<DhcpClient>& client);
 // Starts a client. There must be none.
 Outcome startDhcpClient(const DhcpSettings& settings);
 // Has a client without a lease ask for one right now: its card has just come onto a network. A client that

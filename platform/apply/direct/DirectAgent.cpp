@@ -146,16 +146,16 @@ class Progress {
     }
 
     bool advanceLease() {
-        bool isRunning = false;
+        std::optional<DhcpClient> client;
         LeaseState lease;
-        if (!check(isDhcpClientRunning(name_, isRunning)) || !check(readLease(name_, lease))) {
+        if (!check(readDhcpClient(name_, client)) || !check(readLease(name_, lease))) {
             return true;
         }
         if (lease.isTaken) {
             waitsForLease_ = false;
         } else if (!lease.refusal.empty()) {
             giveUp(lease.refusal);
-        } else if (!isRunning) {
+        } else if (!client || !isAlive(client->process)) {
             check({kSCStatusFailed, "the DHCP client ended before it had a lease"});
         } else if (isLate()) {
             giveUp("no DHCP server answered; the DHCP client goes on asking");

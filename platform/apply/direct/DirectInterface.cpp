@@ -5,6 +5,7 @@
 #include <algorithm>
 
 #include "platform/apply/Radio.h"
+#include "platform/apply/StateFile.h"
 #include "platform/apply/direct/DhcpClient.h"
 #include "platform/apply/direct/KernelWireless.h"
 #include "platform/apply/direct/NameServers.h"
@@ -33,15 +34,11 @@ class Steps {
     Outcome first_;
 };
 
-bool contains(const std::vector<Address>& list, const Address& address) {
-    return std::ranges::find(list, address) != list.end();
-}
-
 std::vector<Address> manualAddresses(const InterfacePlan& plan) {
     std::vector<Address> addresses;
     for (const ManualAddress& address : plan.addresses) {
         Address made = makeAddress(plan.name, address);
-        if (!contains(addresses, made)) {
+        if (std::ranges::count(addresses, made) == 0) {
             addresses.push_back(std::move(made));
         }
     }
@@ -50,6 +47,10 @@ std::vector<Address> manualAddresses(const InterfacePlan& plan) {
 
 DhcpSettings dhcpSettings(const InterfacePlan& plan) {
     return {plan.name, plan.rank, plan.dhcpClientID, !plan.nameServers.empty(), plan.searchDomains};
+}
+
+std::string appliedPath(const std::string& interface) {
+    return runtimePath("direct-" + interface + ".plist");
 }
 
 // What lasts, in an order of its own: two readings of the same state are then equal.
@@ -75,18 +76,13 @@ bool joinsNetwork(const InterfacePlan& plan) noexcept {
     return !isOff(plan) && plan.wireless && plan.wireless->network;
 }
 
-Outcome DirectInterface::open() {
-    RETURN_IF_FAILED(kernel_.open());
-    return refresh();
-}
-
 Outcome DirectInterface::takeSnapshot(LinkSnapshot& snapshot) {
     snapshot = {};
-    snapshot.up = link_->up;
-    snapshot.ipv6Disabled = isIPv6Disabled(interface_);
+    snapshot.up = link()->up;
+    snapshot.ipv6Disabled = kernel_.isIPv6Disabled();
     snapshot.takenAt = secondsSinceStart();
-    snapshot.others = findOtherDaemons(interface_, link_->index);
-    RETURN_IF_FAILED(kernel_.read(*link_, snapshot.state));
+    snapshot.others = findOtherDaemons(interface_, link()->index);
+    RETURN_IF_FAILED(kernel_.read(snapshot.state));
     if (const std::optional<Radio> radio = readRadio(interface_)) {
         snapshot.radioOff = radio->isOff;
     }
@@ -97,7 +93,7 @@ Outcome DirectInterface::takeSnapshot(LinkSnapshot& snapshot) {
 Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<LinkSnapshot>& before,
                                std::unique_ptr<WirelessJoin>& join, std::string& trouble) {
     std::optional<AppliedLink> found;
-    RETURN_IF_FAILED(readApplied(interface_, found));
+    RETURN_IF_FAILED(readState(appliedPath(interface_), found));
     const AppliedLink earlier = found.value_or(AppliedLink{});
     const bool mayStay = joinsNetwork(plan) && earlier.joined &&
                          earlier.phase == AppliedLink::Phase::applied &&
@@ -114,18 +110,18 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Li
     applying.phase = AppliedLink::Phase::applying;
     applying.joined = applied.joined ? applied.joined : earlier.joined;
     for (const Address& address : earlier.addresses) {
-        if (!contains(applying.addresses, address)) {
+        if (std::ranges::count(applying.addresses, address) == 0) {
             applying.addresses.push_back(address);
         }
     }
-    RETURN_IF_FAILED(writeApplied(interface_, applying));
+    RETURN_IF_FAILED(writeState(appliedPath(interface_), applying));
     if (before) {
-        suspendOtherDaemons(interface_, link_->index, before->others);
+        suspendOtherDaemons(interface_, link()->index, before->others);
     }
-    std::optional<DhcpSettings> client;
-    RETURN_IF_FAILED(readDhcpSettings(interface_, client));
+    std::optional<DhcpClient> client;
+    RETURN_IF_FAILED(readDhcpClient(interface_, client));
     const bool wantsClient = !isOff(plan) && plan.method == IPv4Method::dhcp;
-    if (client && !(wantsClient && *client == dhcpSettings(plan))) {
+    if (client && !(wantsClient && client->settings == dhcpSettings(plan))) {
         // While the address is still there, so that the server hears of it.
         RETURN_IF_FAILED(stopDhcpClient(interface_));
     }
@@ -140,7 +136,7 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Li
         RETURN_IF_FAILED(switchRadioOn(plan, isUsable));
         if (!isUsable) {
             trouble = "the radio is switched off";
-            return writeApplied(interface_, applied);
+            return writeState(appliedPath(interface_), applied);
         }
         RETURN_IF_FAILED(switchOn(plan, trouble));
         RETURN_IF_FAILED(startJoin(plan, mayStay, join, trouble));
@@ -148,14 +144,14 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Li
             RETURN_IF_FAILED(startClient(plan, trouble));
         }
     }
-    return writeApplied(interface_, applied);
+    return writeState(appliedPath(interface_), applied);
 }
 
 Outcome DirectInterface::switchOff(std::string& trouble) {
     RETURN_IF_FAILED(setNameServers(0, {}, trouble));
-    RETURN_IF_FAILED(kernel_.makeRoutes(*link_, {}, false));
-    RETURN_IF_FAILED(kernel_.makeAddresses(*link_, {}));
-    return setUp(false);
+    RETURN_IF_FAILED(kernel_.makeRoutes({}, false));
+    RETURN_IF_FAILED(kernel_.makeAddresses({}));
+    return kernel_.setUp(false);
 }
 
 Outcome DirectInterface::switchOn(const InterfacePlan& plan, std::string& trouble) {
@@ -171,14 +167,14 @@ Outcome DirectInterface::switchOn(const InterfacePlan& plan, std::string& troubl
     }
     // IPv6 is off in a location: it has no settings for it, and the routes of a network that the machine is
     // only visiting would lead past the location's own.
-    RETURN_IF_FAILED(setIPv6Disabled(true));
-    RETURN_IF_FAILED(setUp(true));
-    RETURN_IF_FAILED(kernel_.makeAddresses(*link_, addresses));
-    if (!kernel_.makeRoutes(*link_, routes, true).ok()) {
+    RETURN_IF_FAILED(kernel_.setIPv6Disabled(true));
+    RETURN_IF_FAILED(kernel_.setUp(true));
+    RETURN_IF_FAILED(kernel_.makeAddresses(addresses));
+    if (!kernel_.makeRoutes(routes, true).ok()) {
         // Somebody took the way to the addresses' own networks away: it comes with the addresses.
-        RETURN_IF_FAILED(kernel_.makeAddresses(*link_, {}));
-        RETURN_IF_FAILED(kernel_.makeAddresses(*link_, addresses));
-        RETURN_IF_FAILED(kernel_.makeRoutes(*link_, routes, true));
+        RETURN_IF_FAILED(kernel_.makeAddresses({}));
+        RETURN_IF_FAILED(kernel_.makeAddresses(addresses));
+        RETURN_IF_FAILED(kernel_.makeRoutes(routes, true));
     }
     if (plan.method != IPv4Method::dhcp) {
         return setNameServers(plan.rank, {plan.nameServers, plan.searchDomains}, trouble);
@@ -219,17 +215,18 @@ Outcome DirectInterface::leaveNetwork(const LinkSnapshot& before, std::unique_pt
 }
 
 Outcome DirectInterface::startClient(const InterfacePlan& plan, std::string& trouble) {
-    bool running = false;
-    RETURN_IF_FAILED(isDhcpClientRunning(interface_, running));
-    if (!running) {
+    std::optional<DhcpClient> client;
+    RETURN_IF_FAILED(readDhcpClient(interface_, client));
+    const bool isRunning = client && isAlive(client->process);
+    if (!isRunning) {
         RETURN_IF_FAILED(stopDhcpClient(interface_));  // what one that died left behind
     }
     const NameService own{plan.nameServers, plan.searchDomains};
-    if (!running || !own.servers.empty()) {
+    if (!isRunning || !own.servers.empty()) {
         RETURN_IF_FAILED(setNameServers(plan.rank, own, trouble));
     }
     // What an earlier server offered in vain says nothing about the next one.
-    return running ? forgetRefusal(interface_) : startDhcpClient(dhcpSettings(plan));
+    return isRunning ? forgetRefusal(interface_) : startDhcpClient(dhcpSettings(plan));
 }
 
 // Keeps the trouble that was told first.
@@ -243,14 +240,14 @@ Outcome DirectInterface::setNameServers(unsigned rank, const NameService& servic
 }
 
 void DirectInterface::noteJoined() {
-    if (refresh().ok() && link_) {
-        (void)kernel_.forgetSilentNeighbours(*link_).ok();
+    if (refresh().ok() && link()) {
+        (void)kernel_.forgetSilentNeighbours().ok();
     }
 }
 
 Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<WirelessJoin>& join) {
     std::optional<AppliedLink> applied;
-    RETURN_IF_FAILED(readApplied(interface_, applied));
+    RETURN_IF_FAILED(readState(appliedPath(interface_), applied));
     if (!applied) {
         return {};
     }
@@ -263,7 +260,7 @@ Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<Wi
     if (applied->joined) {
         steps.take(leaveNetwork(before, join));
     }
-    if (link_) {
+    if (link()) {
         bool taken = false;
         if (!steps.take(isTakenOver(*applied, before, taken))) {
             return steps.first();
@@ -276,7 +273,7 @@ Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<Wi
         } else {
             applied->phase = AppliedLink::Phase::restoring;
             // For a run that is ended half-way. A runtime directory that is full does not stop the way back.
-            if (const Outcome noted = writeApplied(interface_, *applied); !noted.ok()) {
+            if (const Outcome noted = writeState(appliedPath(interface_), *applied); !noted.ok()) {
                 logLine(LogLevel::warning, interface_ + ": " + noted.reason());
             }
             steps.take(restore(before));
@@ -290,12 +287,12 @@ Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<Wi
 
 Outcome DirectInterface::letOthersIn(const LinkSnapshot& before, bool isBack) {
     RETURN_IF_FAILED(resumeOtherDaemons(interface_, before.others));
-    return isBack ? removeApplied(interface_) : Outcome();
+    return isBack ? removeFile(appliedPath(interface_)) : Outcome();
 }
 
 Outcome DirectInterface::hasAddress(bool& has) {
     InterfaceState now;
-    RETURN_IF_FAILED(kernel_.read(*link_, now));
+    RETURN_IF_FAILED(kernel_.read(now));
     has = std::ranges::any_of(now.addresses, [](const Address& address) {
         return address.family() == AF_INET && address.scope() == RT_SCOPE_UNIVERSE;
     });
@@ -304,14 +301,15 @@ Outcome DirectInterface::hasAddress(bool& has) {
 
 Outcome DirectInterface::isTakenOver(const AppliedLink& applied, const LinkSnapshot& before, bool& taken) {
     InterfaceState now;
-    RETURN_IF_FAILED(kernel_.read(*link_, now));
+    RETURN_IF_FAILED(kernel_.read(now));
     const bool isForeign = std::ranges::any_of(now.addresses, [&](const Address& address) {
         // Link-local ones are taken by daemons that watch for cards without an address, and stand for nobody.
         return address.family() == AF_INET && address.scope() < RT_SCOPE_LINK &&
-               !contains(applied.addresses, address) && !contains(before.state.addresses, address);
+               std::ranges::count(applied.addresses, address) == 0 &&
+               std::ranges::count(before.state.addresses, address) == 0;
     });
     // Half-way there or back it may be on by our own doing.
-    const bool isOn = applied.phase == AppliedLink::Phase::applied && applied.off && link_->up;
+    const bool isOn = applied.phase == AppliedLink::Phase::applied && applied.off && link()->up;
     taken = isForeign || isOn;
     return {};
 }
@@ -319,19 +317,20 @@ Outcome DirectInterface::isTakenOver(const AppliedLink& applied, const LinkSnaps
 Outcome DirectInterface::removeOurs(const AppliedLink& applied, const LinkSnapshot& before) {
     InterfaceState now;
     Steps steps;
-    if (steps.take(kernel_.read(*link_, now))) {
+    if (steps.take(kernel_.read(now))) {
         for (const Route& route : now.routes) {
             if (route.protocol() == ourRouteProtocol) {
-                steps.take(kernel_.removeRoute(*link_, route));
+                steps.take(kernel_.removeRoute(route));
             }
         }
         for (const Address& address : now.addresses) {
-            if (contains(applied.addresses, address) && !contains(before.state.addresses, address)) {
-                steps.take(kernel_.removeAddress(*link_, address));
+            if (std::ranges::count(applied.addresses, address) != 0 &&
+                std::ranges::count(before.state.addresses, address) == 0) {
+                steps.take(kernel_.removeAddress(address));
             }
         }
     }
-    steps.take(setIPv6Disabled(before.ipv6Disabled));
+    steps.take(kernel_.setIPv6Disabled(before.ipv6Disabled));
     return steps.first();
 }
 
@@ -358,42 +357,29 @@ Outcome DirectInterface::restore(const LinkSnapshot& before) {
         address.preferred = left(address.preferred);
     }
     // IPv6 before the link, so that the kernel makes its own addresses when the link comes up.
-    RETURN_IF_FAILED(setIPv6Disabled(before.ipv6Disabled));
+    RETURN_IF_FAILED(kernel_.setIPv6Disabled(before.ipv6Disabled));
     RETURN_IF_FAILED(checkRadio(before));
-    RETURN_IF_FAILED(setUp(before.up));
-    RETURN_IF_FAILED(kernel_.makeAddresses(*link_, addresses));
-    RETURN_IF_FAILED(kernel_.makeRoutes(*link_, before.state.routes, false));
+    RETURN_IF_FAILED(kernel_.setUp(before.up));
+    RETURN_IF_FAILED(kernel_.makeAddresses(addresses));
+    RETURN_IF_FAILED(kernel_.makeRoutes(before.state.routes, false));
     return compare(before);
 }
 
 Outcome DirectInterface::compare(const LinkSnapshot& before) {
     RETURN_IF_FAILED(refresh());
-    if (!link_) {
+    if (!link()) {
         return {};
     }
     InterfaceState now;
-    RETURN_IF_FAILED(kernel_.read(*link_, now));
+    RETURN_IF_FAILED(kernel_.read(now));
     const char* const different =
-        link_->up != before.up || isIPv6Disabled(interface_) != before.ipv6Disabled ? "link is"
-        : lasting(now.addresses) != lasting(before.state.addresses)                 ? "addresses are"
-        : lasting(now.routes) != lasting(before.state.routes)                       ? "routes are"
-                                                                                    : nullptr;
+        link()->up != before.up || kernel_.isIPv6Disabled() != before.ipv6Disabled ? "link is"
+        : lasting(now.addresses) != lasting(before.state.addresses)                ? "addresses are"
+        : lasting(now.routes) != lasting(before.state.routes)                      ? "routes are"
+                                                                                   : nullptr;
     return different == nullptr
                ? Outcome()
                : Outcome(kSCStatusFailed, std::string("the ") + different + " not as before");
-}
-
-Outcome DirectInterface::setUp(bool up) {
-    if (link_->up != up) {
-        RETURN_IF_FAILED(kernel_.setUp(*link_, up));
-        link_->up = up;
-    }
-    return {};
-}
-
-Outcome DirectInterface::setIPv6Disabled(std::optional<bool> disabled) {
-    const std::optional<bool> now = isIPv6Disabled(interface_);
-    return disabled && now && now != disabled ? disableIPv6(interface_, *disabled) : Outcome();
 }
 
 }  // namespace platform::apply

@@ -24,10 +24,10 @@ class DirectInterface {
   public:
     explicit DirectInterface(std::string interface) : interface_(std::move(interface)) {}
 
-    Outcome open();
+    Outcome open() { return kernel_.open(interface_); }
     // Nothing when the interface is gone; brought up to date by refresh().
-    [[nodiscard]] const std::optional<Link>& link() const noexcept { return link_; }
-    Outcome refresh() { return kernel_.findLink(interface_, link_); }
+    [[nodiscard]] const std::optional<Link>& link() const noexcept { return kernel_.link(); }
+    Outcome refresh() { return kernel_.refresh(); }
 
     Outcome takeSnapshot(LinkSnapshot& snapshot);
     // Makes it what the plan says, whatever it is. `join` is the network on its way, null when there is none
@@ -61,12 +61,9 @@ class DirectInterface {
     Outcome removeOurs(const AppliedLink& applied, const LinkSnapshot& before);
     Outcome restore(const LinkSnapshot& before);
     Outcome compare(const LinkSnapshot& before);
-    Outcome setUp(bool up);
-    Outcome setIPv6Disabled(std::optional<bool> disabled);
 
     std::string interface_;
     Kernel kernel_;
-    std::optional<Link> link_;
 };
 
 }  // namespace platform::apply

@@ -1,5 +1,6 @@
 #include "platform/apply/direct/Kernel.h"
 
+#include <fcntl.h>
 #include <linux/if_addr.h>
 #include <linux/neighbour.h>
 #include <net/if.h>
@@ -12,12 +13,13 @@
 #include <thread>
 #include <utility>
 
+#include "platform/base/DurableFile.h"
+
 namespace platform::apply {
 namespace {
 
 using netlink::Bytes;
 using netlink::Message;
-using netlink::OwnedMessage;
 
 constexpr std::chrono::milliseconds confirmationTime{3000};
 constexpr std::chrono::milliseconds lookAgain{50};
@@ -26,74 +28,87 @@ bool isConnected(const Route& route) {
     return route.family() == AF_INET && route.protocol() == RTPROT_KERNEL;
 }
 
-bool contains(const std::vector<Address>& list, const Address& address) {
-    return std::find(list.begin(), list.end(), address) != list.end();
-}
-bool contains(const std::vector<Route>& list, const Route& route) {
-    return std::find(list.begin(), list.end(), route) != list.end();
-}
-
 std::vector<Address> ofFamily(const std::vector<Address>& list, int family) {
     std::vector<Address> result;
-    std::copy_if(list.begin(), list.end(), std::back_inserter(result),
-                 [family](const Address& a) { return a.family() == family && !a.isKernelManaged; });
+    std::ranges::copy_if(list, std::back_inserter(result), [family](const Address& address) {
+        return address.family() == family && !address.isKernelManaged;
+    });
     return result;
+}
+
+std::string switchPath(const std::string& interface) {
+    return "/proc/sys/net/ipv6/conf/" + interface + "/disable_ipv6";
 }
 
 }  // namespace
 
-Outcome Kernel::setUp(const Link& link, bool up) {
+Outcome Kernel::open(const std::string& interface) {
+    interface_ = interface;
+    RETURN_IF_FAILED(socket_.open());
+    return refresh();
+}
+
+Outcome Kernel::setUp(bool up) {
+    if (link_->up == up) {
+        return {};
+    }
     ifinfomsg header{};
-    header.ifi_index = link.index;
+    header.ifi_index = link_->index;
     header.ifi_change = IFF_UP;
     header.ifi_flags = up ? unsigned{IFF_UP} : 0U;
-    return socket_.request(Message(RTM_NEWLINK, NLM_F_REQUEST | NLM_F_ACK, header));
+    RETURN_IF_FAILED(socket_.request(Message(RTM_NEWLINK, NLM_F_REQUEST | NLM_F_ACK, header)));
+    link_->up = up;
+    return {};
 }
 
-Outcome Kernel::dump(std::uint16_t type, int family, std::vector<OwnedMessage>& messages) {
-    constexpr std::uint16_t flags = NLM_F_REQUEST | NLM_F_DUMP;
-    if (type == RTM_GETADDR) {
-        ifaddrmsg header{};
-        header.ifa_family = static_cast<std::uint8_t>(family);
-        return socket_.dump(Message(type, flags, header), messages);
-    }
-    rtmsg header{};
-    header.rtm_family = static_cast<std::uint8_t>(family);
-    return socket_.dump(Message(type, flags, header), messages);
-}
-
-Outcome Kernel::read(const Link& link, InterfaceState& state) {
+Outcome Kernel::read(InterfaceState& state) {
     state = {};
-    std::vector<OwnedMessage> messages;
-    for (const int family : {AF_INET, AF_INET6}) {
-        RETURN_IF_FAILED(dump(RTM_GETADDR, family, messages));
-        for (const OwnedMessage& message : messages) {
-            auto address = decodeAddress(message.view(), link.index);
-            // A kernel without IPv6 answers for every family it has.
-            if (address && address->family() == family) {
-                state.addresses.push_back(std::move(*address));
-            }
+    // Of every family, which the kernel lists in the order of their numbers: IPv4 first.
+    constexpr std::uint16_t flags = NLM_F_REQUEST | NLM_F_DUMP;
+    std::vector<Message> messages;
+    RETURN_IF_FAILED(socket_.dump(Message(RTM_GETADDR, flags, ifaddrmsg{}), messages));
+    for (const Message& message : messages) {
+        if (auto address = decodeAddress(message, link_->index)) {
+            state.addresses.push_back(std::move(*address));
         }
     }
-    for (const int family : {AF_INET, AF_INET6}) {
-        RETURN_IF_FAILED(dump(RTM_GETROUTE, family, messages));
-        Bytes lastPlace;
-        for (const OwnedMessage& message : messages) {
-            Bytes place = placeOf(message.view());
-            auto route = decodeRoute(message.view(), link.index, state.addresses);
-            if (route && route->family() == family) {
-                // The kernel lists the routes to one place one after the other.
-                route->preceded = place == lastPlace;
-                state.routes.push_back(std::move(*route));
-            }
-            lastPlace = std::move(place);
+    RETURN_IF_FAILED(socket_.dump(Message(RTM_GETROUTE, flags, rtmsg{}), messages));
+    Bytes lastPlace;
+    for (const Message& message : messages) {
+        Bytes place = placeOf(message);
+        if (auto route = decodeRoute(message, link_->index, state.addresses)) {
+            // The kernel lists the routes to one place one after the other.
+            route->preceded = place == lastPlace;
+            state.routes.push_back(std::move(*route));
         }
+        lastPlace = std::move(place);
     }
     return {};
 }
 
-Outcome Kernel::addAddress(const Link& link, const Address& address) {
-    Message message = requestFor(RTM_NEWADDR, NLM_F_CREATE | NLM_F_REPLACE, address, link);
+std::optional<bool> Kernel::isIPv6Disabled() const {
+    std::string text;
+    if (!readWholeFile(switchPath(interface_), text).ok() || text.empty()) {
+        return std::nullopt;
+    }
+    return text[0] != '0';
+}
+
+Outcome Kernel::setIPv6Disabled(std::optional<bool> disabled) {
+    const std::optional<bool> now = isIPv6Disabled();
+    if (!disabled || !now || now == disabled) {
+        return {};
+    }
+    const std::string path = switchPath(interface_);
+    const FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CLOEXEC));
+    if (!file.isOpen() || ::write(file.get(), *disabled ? "1" : "0", 1) != 1) {
+        return Outcome::fromErrno("cannot write " + path);
+    }
+    return {};
+}
+
+Outcome Kernel::addAddress(const Address& address) {
+    Message message = requestFor(RTM_NEWADDR, NLM_F_CREATE | NLM_F_REPLACE, address, link_->index);
     if (address.protocol != 0) {
         message.addValue(addressProtocol, address.protocol);
     }
@@ -106,13 +121,13 @@ Outcome Kernel::addAddress(const Link& link, const Address& address) {
     return socket_.request(std::move(message), {EEXIST});
 }
 
-Outcome Kernel::removeAddress(const Link& link, const Address& address) {
-    return socket_.request(requestFor(RTM_DELADDR, 0, address, link), {EADDRNOTAVAIL, ENODEV});
+Outcome Kernel::removeAddress(const Address& address) {
+    return socket_.request(requestFor(RTM_DELADDR, 0, address, link_->index), {EADDRNOTAVAIL, ENODEV});
 }
 
-Outcome Kernel::addRoute(const Link& link, const Route& route) {
+Outcome Kernel::addRoute(const Route& route) {
     const auto flags = static_cast<std::uint16_t>(NLM_F_CREATE | (route.preceded ? NLM_F_APPEND : 0));
-    Message message = requestFor(RTM_NEWROUTE, flags, route, link);
+    Message message = requestFor(RTM_NEWROUTE, flags, route, link_->index);
     if (route.endsAt != 0) {
         const std::int64_t left = std::max<std::int64_t>(route.endsAt - secondsSinceStart(), 1);
         message.addValue(RTA_EXPIRES, static_cast<std::uint32_t>(left));
@@ -120,48 +135,41 @@ Outcome Kernel::addRoute(const Link& link, const Route& route) {
     return socket_.request(std::move(message), {EEXIST});
 }
 
-Outcome Kernel::removeRoute(const Link& link, const Route& route) {
-    return socket_.request(requestFor(RTM_DELROUTE, 0, route, link), {ESRCH, ENODEV});
+Outcome Kernel::removeRoute(const Route& route) {
+    return socket_.request(requestFor(RTM_DELROUTE, 0, route, link_->index), {ESRCH, ENODEV});
 }
 
-Outcome Kernel::makeAddresses(const Link& link, const std::vector<Address>& wanted) {
+Outcome Kernel::makeAddresses(const std::vector<Address>& wanted) {
     InterfaceState state;
-    RETURN_IF_FAILED(read(link, state));
+    RETURN_IF_FAILED(read(state));
     // The first address of a network decides which ones are secondary, so IPv4 addresses that are not exactly
     // these, in this order, are made anew.
-    const std::vector<Address> now = ofFamily(state.addresses, AF_INET);
-    const std::vector<Address> then = ofFamily(wanted, AF_INET);
-    if (now != then) {
+    for (const int family : {AF_INET, AF_INET6}) {
+        const std::vector<Address> now = ofFamily(state.addresses, family);
+        const std::vector<Address> then = ofFamily(wanted, family);
+        const bool isAnew = family == AF_INET && now != then;
         for (const Address& address : now) {
-            RETURN_IF_FAILED(removeAddress(link, address));
+            if (isAnew || std::ranges::count(then, address) == 0) {
+                RETURN_IF_FAILED(removeAddress(address));
+            }
         }
         for (const Address& address : then) {
-            RETURN_IF_FAILED(addAddress(link, address));
-        }
-    }
-    const std::vector<Address> now6 = ofFamily(state.addresses, AF_INET6);
-    const std::vector<Address> then6 = ofFamily(wanted, AF_INET6);
-    for (const Address& address : now6) {
-        if (!contains(then6, address)) {
-            RETURN_IF_FAILED(removeAddress(link, address));
-        }
-    }
-    for (const Address& address : then6) {
-        if (!contains(now6, address)) {
-            RETURN_IF_FAILED(addAddress(link, address));
+            if (isAnew || std::ranges::count(now, address) == 0) {
+                RETURN_IF_FAILED(addAddress(address));
+            }
         }
     }
     return {};
 }
 
-Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, bool keepConnected) {
+Outcome Kernel::makeRoutes(const std::vector<Route>& wanted, bool keepConnected) {
     InterfaceState state;
-    RETURN_IF_FAILED(read(link, state));
+    RETURN_IF_FAILED(read(state));
     for (const Route& route : state.routes) {
-        const bool stays = route.isKernelManaged || route.isElsewhere || contains(wanted, route) ||
-                           (keepConnected && isConnected(route));
+        const bool stays = route.isKernelManaged || route.isElsewhere ||
+                           std::ranges::count(wanted, route) != 0 || (keepConnected && isConnected(route));
         if (!stays) {
-            RETURN_IF_FAILED(removeRoute(link, route));
+            RETURN_IF_FAILED(removeRoute(route));
         }
     }
     const auto deadline = std::chrono::steady_clock::now() + confirmationTime;
@@ -169,14 +177,14 @@ Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, b
     for (const bool throughGateway : {false, true}) {
         for (const Route& route : wanted) {
             if (route.isKernelManaged || route.hasGateway() != throughGateway ||
-                contains(state.routes, route)) {
+                std::ranges::count(state.routes, route) != 0) {
                 continue;
             }
-            Outcome added = addRoute(link, route);
+            Outcome added = addRoute(route);
             while (!added.ok() && needsConfirmedSource(route) &&
                    std::chrono::steady_clock::now() < deadline) {
                 std::this_thread::sleep_for(lookAgain);
-                added = addRoute(link, route);
+                added = addRoute(route);
             }
             // A route that other interfaces share is complete only when the last of them is up again, which
             // then adds it.
@@ -188,19 +196,19 @@ Outcome Kernel::makeRoutes(const Link& link, const std::vector<Route>& wanted, b
     return {};
 }
 
-Outcome Kernel::forgetSilentNeighbours(const Link& link) {
+Outcome Kernel::forgetSilentNeighbours() {
     ndmsg header{};
     header.ndm_family = AF_INET;
     Message message(RTM_GETNEIGH, NLM_F_REQUEST | NLM_F_DUMP, header);
-    message.addValue(NDA_IFINDEX, link.index);
-    std::vector<OwnedMessage> neighbours;
+    message.addValue(NDA_IFINDEX, link_->index);
+    std::vector<Message> neighbours;
     RETURN_IF_FAILED(socket_.dump(message, neighbours));
-    for (const OwnedMessage& neighbour : neighbours) {
-        const auto found = neighbour.view().family<ndmsg>();
-        const auto address = neighbour.view().attributes<ndmsg>().find(NDA_DST);
-        if (found && address && found->ndm_ifindex == link.index &&
+    for (const Message& neighbour : neighbours) {
+        const auto found = neighbour.family<ndmsg>();
+        const auto address = neighbour.attributes<ndmsg>().find(NDA_DST);
+        if (found && address && found->ndm_ifindex == link_->index &&
             (found->ndm_state & (NUD_INCOMPLETE | NUD_FAILED)) != 0) {
-            header.ndm_ifindex = link.index;
+            header.ndm_ifindex = link_->index;
             Message removal(RTM_DELNEIGH, NLM_F_REQUEST | NLM_F_ACK, header);
             removal.add(NDA_DST, address->payload);
             RETURN_IF_FAILED(socket_.request(std::move(removal), {ENOENT}));

@@ -16,37 +16,40 @@ using netlink::Link;
 
 class Kernel {
   public:
-    Outcome open() { return socket_.open(); }
+    Outcome open(const std::string& interface);
+    // Nothing when there is no interface of that name, and then nothing below may be called; brought up to
+    // date by refresh().
+    [[nodiscard]] const std::optional<Link>& link() const noexcept { return link_; }
+    Outcome refresh() { return netlink::findLink(socket_, interface_, link_); }
 
-    // Nothing, and success, when there is no interface of that name.
-    Outcome findLink(const std::string& name, std::optional<Link>& link) {
-        return netlink::findLink(socket_, name, link);
-    }
-    Outcome setUp(const Link& link, bool up);
-    Outcome read(const Link& link, InterfaceState& state);
+    Outcome setUp(bool up);
+    Outcome read(InterfaceState& state);
+    // The switch of IPv6; nothing when the kernel has none, or none is wanted.
+    [[nodiscard]] std::optional<bool> isIPv6Disabled() const;
+    Outcome setIPv6Disabled(std::optional<bool> disabled);
 
     // Already there, or already gone, is success. A lifetime other than forever lets the kernel drop the
     // address.
-    Outcome addAddress(const Link& link, const Address& address);
-    Outcome removeAddress(const Link& link, const Address& address);
-    Outcome addRoute(const Link& link, const Route& route);
-    Outcome removeRoute(const Link& link, const Route& route);
+    Outcome addAddress(const Address& address);
+    Outcome removeAddress(const Address& address);
+    Outcome addRoute(const Route& route);
+    Outcome removeRoute(const Route& route);
 
     // Makes the interface's addresses these and no others, touching nothing when they are; IPv4 ones in this
     // order. What comes by itself is neither wanted nor removed.
-    Outcome makeAddresses(const Link& link, const std::vector<Address>& wanted);
+    Outcome makeAddresses(const std::vector<Address>& wanted);
     // Makes its routes these and no others. With keepConnected the kernel's own routes to the networks of the
     // interface's addresses stay too.
-    Outcome makeRoutes(const Link& link, const std::vector<Route>& wanted, bool keepConnected);
+    Outcome makeRoutes(const std::vector<Route>& wanted, bool keepConnected);
 
     // Forgets the neighbours that have not answered so far. Whoever asks for one in vain keeps the kernel
     // from asking anew for seconds, also when the interface has got onto its network in between.
-    Outcome forgetSilentNeighbours(const Link& link);
+    Outcome forgetSilentNeighbours();
 
   private:
-    Outcome dump(std::uint16_t type, int family, std::vector<netlink::OwnedMessage>& messages);
-
     netlink::Socket socket_;
+    std::string interface_;
+    std::optional<Link> link_;
 };
 
 }  // namespace platform::apply

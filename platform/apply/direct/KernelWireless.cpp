@@ -121,8 +121,8 @@ Outcome KernelJoin::goOn() {
 
 Outcome KernelJoin::scan() {
     since_ = Clock::now();
-    // Somebody else's scan goes on, or the link is down for a moment: asked again the next time.
-    RETURN_IF_FAILED(card_.request(card_.requests().scan(network_), {EBUSY, ENETDOWN}));
+    RETURN_IF_FAILED(card_.scan(network_));
+    // When there is none yet, it is asked for again the next time.
     if (card_.error() == 0) {
         phase_ = Phase::scanning;
         isScanEnding_ = false;
@@ -144,8 +144,7 @@ Outcome KernelJoin::endScanEarly() {
     RETURN_IF_FAILED(choose(choice));
     if (choice.entry && choice.entry->signal >= goodSignal) {
         isScanEnding_ = true;
-        // A card that can't end it sends its notice later.
-        (void)card_.request(card_.requests().endScan());
+        card_.endScan();
     }
     return {};
 }
@@ -163,7 +162,7 @@ Outcome KernelJoin::join() {
     phase_ = Phase::joining;
     since_ = Clock::now();
     reason_ = "the network was heard and has not let the card in yet";
-    return card_.request(card_.requests().join(*chosen_, key_));
+    return card_.join(*chosen_, key_);
 }
 
 Outcome KernelJoin::checkJoined(std::optional<std::uint16_t> joinStatus) {
@@ -178,7 +177,7 @@ Outcome KernelJoin::checkJoined(std::optional<std::uint16_t> joinStatus) {
     if (isThere && (isRunning || elapsed > longestCarrier)) {
         phase_ = Phase::joined;
         reason_.clear();
-        return card_.forgetSilentNeighbours();
+        return {};
     }
     if (joinStatus.value_or(0) != 0 || elapsed > longestJoining) {
         reason_ = joinStatus.value_or(WirelessNotice::noAnswer) == WirelessNotice::noAnswer

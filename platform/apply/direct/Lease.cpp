@@ -5,7 +5,9 @@
 #include <algorithm>
 #include <bit>
 #include <charconv>
+#include <cstdlib>
 #include <optional>
+#include <sstream>
 #include <string_view>
 
 #include "platform/apply/StateFile.h"
@@ -22,9 +24,18 @@ std::string leasePath(const std::string& interface) {
     return runtimePath("lease-" + interface + ".plist");
 }
 
-std::string_view textFor(const Environment& environment, std::string_view name) {
-    const auto found = environment.find(name);
-    return found == environment.end() ? std::string_view() : std::string_view(found->second);
+std::string textOf(const char* variable) {
+    const char* const text = std::getenv(variable);
+    return text == nullptr ? "" : text;
+}
+
+std::vector<std::string> wordsOf(const char* variable) {
+    std::istringstream text(textOf(variable));
+    std::vector<std::string> words;
+    for (std::string word; std::getline(text, word, ' ');) {
+        words.push_back(word);
+    }
+    return words;
 }
 
 std::optional<std::uint32_t> parseNumber(std::string_view text) {
@@ -34,9 +45,9 @@ std::optional<std::uint32_t> parseNumber(std::string_view text) {
 }
 
 // An address that one machine in a network can have.
-std::optional<IPv4Address> parseHost(std::string_view text) {
+std::optional<IPv4Address> parseHost(const std::string& text) {
     in_addr address{};
-    if (::inet_pton(AF_INET, std::string(text).c_str(), &address) != 1) {
+    if (::inet_pton(AF_INET, text.c_str(), &address) != 1) {
         return std::nullopt;
     }
     const std::uint32_t number = ntohl(address.s_addr);
@@ -52,19 +63,8 @@ bool isDomain(std::string_view text) {
            });
 }
 
-template <class Each>
-void forEachWord(std::string_view text, const Each& each) {
-    while (!text.empty()) {
-        const std::size_t end = std::min(text.find(' '), text.size());
-        if (end != 0) {
-            each(text.substr(0, end));
-        }
-        text.remove_prefix(std::min(end + 1, text.size()));
-    }
-}
-
-std::optional<unsigned> parsePrefixLength(const Environment& environment, IPv4Address address) {
-    const std::string_view text = textFor(environment, "mask");
+std::optional<unsigned> parsePrefixLength(IPv4Address address) {
+    const std::string text = textOf("mask");
     if (text.empty()) {
         const std::uint32_t number = ntohl(address);
         return number < 0x80000000U ? 8U : number < 0xC0000000U ? 16U : 24U;
@@ -89,39 +89,38 @@ Outcome writeLease(const std::string& interface, const LeaseState& state) {
 
 }  // namespace
 
-Outcome leaseFromEnvironment(const Environment& environment, Lease& lease) {
+Outcome leaseFromEnvironment(Lease& lease) {
     lease = {};
-    const std::optional<IPv4Address> address = parseHost(textFor(environment, "ip"));
+    const std::optional<IPv4Address> address = parseHost(textOf("ip"));
     if (!address) {
         return {kSCStatusFailed, "the DHCP server offered no address that a machine can have"};
     }
-    const std::optional<unsigned> length = parsePrefixLength(environment, *address);
+    const std::optional<unsigned> length = parsePrefixLength(*address);
     if (!length) {
         return {kSCStatusFailed, "the DHCP server offered no usable subnet mask"};
     }
     lease.address = {*address, *length};
-    forEachWord(textFor(environment, "router"), [&lease](std::string_view word) {
-        const std::optional<IPv4Address> router = parseHost(word);
-        if (lease.router == 0 && router && *router != lease.address.address) {
-            lease.router = *router;
+    for (const std::string& word : wordsOf("router")) {
+        const IPv4Address router = parseHost(word).value_or(0);
+        if (lease.router == 0 && router != *address) {
+            lease.router = router;
         }
-    });
-    forEachWord(textFor(environment, "dns"), [&lease](std::string_view word) {
-        const std::optional<IPv4Address> server = parseHost(word);
-        if (server && lease.nameService.servers.size() < mostServers) {
-            lease.nameService.servers.push_back(*server);
-        }
-    });
-    for (const std::string_view name : {"search", "domain"}) {
-        forEachWord(textFor(environment, name), [&lease](std::string_view word) {
-            auto& domains = lease.nameService.domains;
-            if (isDomain(word) && domains.size() < mostDomains &&
-                std::find(domains.begin(), domains.end(), word) == domains.end()) {
-                domains.emplace_back(word);
-            }
-        });
     }
-    lease.seconds = parseNumber(textFor(environment, "lease")).value_or(0);
+    auto& [servers, domains] = lease.nameService;
+    for (const std::string& word : wordsOf("dns")) {
+        const std::optional<IPv4Address> server = parseHost(word);
+        if (server && servers.size() < mostServers) {
+            servers.push_back(*server);
+        }
+    }
+    for (const char* const variable : {"search", "domain"}) {
+        for (const std::string& word : wordsOf(variable)) {
+            if (isDomain(word) && domains.size() < mostDomains && std::ranges::count(domains, word) == 0) {
+                domains.push_back(word);
+            }
+        }
+    }
+    lease.seconds = parseNumber(textOf("lease")).value_or(0);
     if (lease.seconds == 0) {
         lease.seconds = forever;
     }
@@ -150,10 +149,8 @@ Outcome takeLease(const DhcpSettings& settings, const Lease& lease) {
     LeaseState earlier;
     RETURN_IF_FAILED(readLease(settings.interface, earlier));
     Kernel kernel;
-    RETURN_IF_FAILED(kernel.open());
-    std::optional<Link> link;
-    RETURN_IF_FAILED(kernel.findLink(settings.interface, link));
-    if (!link) {
+    RETURN_IF_FAILED(kernel.open(settings.interface));
+    if (!kernel.link()) {
         return {kSCStatusFailed, "the interface is gone"};
     }
     if (earlier.lease && !(earlier.lease->address == lease.address)) {
@@ -162,14 +159,14 @@ Outcome takeLease(const DhcpSettings& settings, const Lease& lease) {
     // A lease that is only renewed stays taken meanwhile.
     const bool isRenewed = earlier.isTaken && earlier.lease && earlier.lease->address == lease.address;
     RETURN_IF_FAILED(writeLease(settings.interface, {isRenewed, lease, ""}));
-    RETURN_IF_FAILED(kernel.addAddress(*link, addressOf(settings.interface, lease)));
+    RETURN_IF_FAILED(kernel.addAddress(addressOf(settings.interface, lease)));
     if (earlier.lease && earlier.lease->router != lease.router) {
         for (const Route& route : routesOf(*earlier.lease, settings.rank)) {
-            RETURN_IF_FAILED(kernel.removeRoute(*link, route));
+            RETURN_IF_FAILED(kernel.removeRoute(route));
         }
     }
     for (const Route& route : routesOf(lease, settings.rank)) {
-        RETURN_IF_FAILED(kernel.addRoute(*link, route));
+        RETURN_IF_FAILED(kernel.addRoute(route));
     }
     if (!settings.ignoresServers) {
         NameService service = lease.nameService;
@@ -203,14 +200,12 @@ Outcome dropLease(const DhcpSettings& settings) {
     RETURN_IF_FAILED(readLease(settings.interface, state));
     if (state.lease) {
         Kernel kernel;
-        RETURN_IF_FAILED(kernel.open());
-        std::optional<Link> link;
-        RETURN_IF_FAILED(kernel.findLink(settings.interface, link));
-        if (link) {
+        RETURN_IF_FAILED(kernel.open(settings.interface));
+        if (kernel.link()) {
             for (const Route& route : routesOf(*state.lease, settings.rank)) {
-                RETURN_IF_FAILED(kernel.removeRoute(*link, route));
+                RETURN_IF_FAILED(kernel.removeRoute(route));
             }
-            RETURN_IF_FAILED(kernel.removeAddress(*link, addressOf(settings.interface, *state.lease)));
+            RETURN_IF_FAILED(kernel.removeAddress(addressOf(settings.interface, *state.lease)));
         }
         if (!settings.ignoresServers) {
             RETURN_IF_FAILED(setServers(settings, {}));

@@ -2,7 +2,6 @@
 #pragma once
 
 #include <cstdint>
-#include <map>
 #include <optional>
 #include <string>
 #include <vector>
@@ -29,12 +28,11 @@ struct Lease {
     }
 };
 
-using Environment = std::map<std::string, std::string, std::less<>>;
-
-// The lease as the DHCP client tells it in its program's environment. All of it comes from the network and
-// from whoever answers there: an address or a prefix length that no machine can have fails; routers, servers
-// and domains that are none are dropped, and more servers and domains than a resolver reads too.
-Outcome leaseFromEnvironment(const Environment& environment, Lease& lease);
+// The lease as the DHCP client tells it in the environment of its program, this one. All of it comes from the
+// network and from whoever answers there: an address or a prefix length that no machine can have fails;
+// routers, servers and domains that are none are dropped, and more servers and domains than a resolver reads
+// too.
+Outcome leaseFromEnvironment(Lease& lease);
 
 // How the interface's DHCP client was started, for the client's program and for the next run.
 struct DhcpSettings {

@@ -4,7 +4,6 @@
 
 #include <cstdint>
 #include <optional>
-#include <string>
 #include <vector>
 
 #include "platform/apply/Plan.h"
@@ -12,7 +11,6 @@
 #include "platform/apply/direct/OtherDaemons.h"
 #include "platform/apply/direct/Supplicant.h"
 #include "platform/apply/direct/WirelessCard.h"
-#include "platform/base/Outcome.h"
 #include "platform/values/Fields.h"
 
 namespace platform::apply {
@@ -45,10 +43,6 @@ struct LinkSnapshot {
     }
 };
 
-// The IPv6 switch of an interface.
-[[nodiscard]] std::optional<bool> isIPv6Disabled(const std::string& interface);
-Outcome disableIPv6(const std::string& interface, bool disabled);
-
 // A network that was joined, told from another, or from the same with another key, without keeping the key.
 struct JoinedNetwork {
     Salt salt{};
@@ -80,9 +74,5 @@ struct AppliedLink {
         fields("Joined", self.joined);
     }
 };
-
-Outcome readApplied(const std::string& interface, std::optional<AppliedLink>& applied);
-Outcome writeApplied(const std::string& interface, const AppliedLink& applied);
-Outcome removeApplied(const std::string& interface);
 
 }  // namespace platform::apply

@@ -18,10 +18,6 @@ constexpr std::chrono::seconds scanAgain{2};
 // Between two looks at the state when no notice tells of a change.
 constexpr std::chrono::milliseconds lookAgain{250};
 
-bool contains(const std::vector<int>& list, int number) {
-    return std::ranges::find(list, number) != list.end();
-}
-
 // The settings of the network to add, each as the words that follow its number.
 std::vector<std::string> settingsFor(const WirelessSettings& settings, const JoinChoice& choice) {
     std::vector<std::string> words{"ssid " + hexOf(*settings.network), "scan_ssid 1"};
@@ -66,15 +62,15 @@ class SupplicantJoin final : public WirelessJoin {
 
     Outcome start(bool mayStay) {
         std::vector<ConfiguredNetwork> networks;
-        std::vector<ConfiguredNetwork> ours;
         RETURN_IF_FAILED(socket_.listNetworks(networks));
-        RETURN_IF_FAILED(socket_.findOurs(networks, ours));
         RETURN_IF_FAILED(socket_.order("ATTACH", "tell what happens"));
-        for (const ConfiguredNetwork& network : ours) {
-            earlier_.push_back(network.number);
+        for (const ConfiguredNetwork& network : networks) {
+            if (network.isOurs) {
+                earlier_.push_back(network.number);
+            }
         }
-        if (mayStay && ours.size() == 1) {
-            number_ = ours[0].number;
+        if (mayStay && earlier_.size() == 1) {
+            number_ = earlier_[0];
             RETURN_IF_FAILED(look());
             if (state_ == State::joined) {
                 return {};
@@ -105,13 +101,13 @@ class SupplicantJoin final : public WirelessJoin {
   private:
     // Looks whether the card is on the network.
     Outcome look() {
-        std::map<std::string, std::string, std::less<>> status;
+        SupplicantValues status;
         RETURN_IF_FAILED(socket_.readStatus(status));
         if (status["wpa_state"] != "COMPLETED" || status["id"] != std::to_string(number_)) {
             return {};
         }
         const std::string& bssid = status["bssid"];
-        if (choice_.isAdHoc && std::ranges::find(cells_, bssid) == cells_.end()) {
+        if (choice_.isAdHoc && std::ranges::count(cells_, bssid) == 0) {
             // The cell was gone, and the card has formed one of its own: it leaves it at once.
             gone_.insert(gone_.end(), cells_.begin(), cells_.end());
             cells_.clear();
@@ -149,7 +145,7 @@ class SupplicantJoin final : public WirelessJoin {
         std::vector<HeardNetwork> heard;
         RETURN_IF_FAILED(socket_.readHeard(*settings_.network, heard));
         std::erase_if(heard, [this](const HeardNetwork& network) {
-            return std::ranges::find(gone_, network.bssid) != gone_.end();
+            return std::ranges::count(gone_, network.bssid) != 0;
         });
         const JoinDecision decision = chooseNetwork(heard, settings_.key);
         if (!decision.choice) {
@@ -163,7 +159,7 @@ class SupplicantJoin final : public WirelessJoin {
             reason_.clear();
         }
         for (const HeardNetwork& network : heard) {
-            if (network.isAdHoc && std::ranges::find(cells_, network.bssid) == cells_.end()) {
+            if (network.isAdHoc && std::ranges::count(cells_, network.bssid) == 0) {
                 cells_.push_back(network.bssid);
             }
         }
@@ -225,7 +221,7 @@ class SupplicantReturn final : public WirelessJoin {
             return {};
         }
         nextLook_ = steady_clock::now() + lookAgain;
-        std::map<std::string, std::string, std::less<>> status;
+        SupplicantValues status;
         RETURN_IF_FAILED(socket_.readStatus(status));
         if (status["wpa_state"] == "COMPLETED") {
             state = State::joined;
@@ -249,7 +245,7 @@ Outcome readKnownNetworks(const std::string& interface, std::optional<KnownNetwo
         return {};
     }
     std::vector<ConfiguredNetwork> list;
-    std::map<std::string, std::string, std::less<>> status;
+    SupplicantValues status;
     RETURN_IF_FAILED(supplicant.listNetworks(list));
     RETURN_IF_FAILED(supplicant.readStatus(status));
     KnownNetworks& known = networks.emplace();
@@ -288,33 +284,27 @@ Outcome leaveBySupplicant(const std::string& interface, const std::optional<Know
         return {};
     }
     std::vector<ConfiguredNetwork> networks;
-    std::vector<ConfiguredNetwork> ours;
     RETURN_IF_FAILED(supplicant.listNetworks(networks));
-    RETURN_IF_FAILED(supplicant.findOurs(networks, ours));
-    for (const ConfiguredNetwork& network : networks) {
+    for (ConfiguredNetwork& network : networks) {
         // A run that ended between adding one and marking it.
-        const bool isMarked = std::ranges::any_of(
-            ours, [&network](const ConfiguredNetwork& one) { return one.number == network.number; });
-        if (before && network.isNameless && network.isDisabled && !isMarked &&
-            !contains(before->all, network.number)) {
-            ours.push_back(network);
-        }
+        network.isOurs = network.isOurs || (before && network.isNameless && network.isDisabled &&
+                                            std::ranges::count(before->all, network.number) == 0);
     }
     // With another network chosen since, that one is on, and what is on or off is somebody else's choice.
-    const bool isOursChosen = std::ranges::all_of(networks, [&ours](const ConfiguredNetwork& network) {
-        const bool isOurs = std::ranges::any_of(
-            ours, [&network](const ConfiguredNetwork& one) { return one.number == network.number; });
-        return isOurs || network.isDisabled;
-    });
+    const bool isOursChosen = std::ranges::all_of(
+        networks, [](const ConfiguredNetwork& network) { return network.isOurs || network.isDisabled; });
     for (const ConfiguredNetwork& network : networks) {
-        if (before && isOursChosen && network.isDisabled && contains(before->enabled, network.number)) {
+        if (before && isOursChosen && network.isDisabled &&
+            std::ranges::count(before->enabled, network.number) != 0) {
             RETURN_IF_FAILED(
                 supplicant.order("ENABLE_NETWORK " + std::to_string(network.number), "switch on a network"));
         }
     }
     // Last: a run that is ended before finds them again.
-    for (const ConfiguredNetwork& network : ours) {
-        RETURN_IF_FAILED(supplicant.removeNetwork(network.number));
+    for (const ConfiguredNetwork& network : networks) {
+        if (network.isOurs) {
+            RETURN_IF_FAILED(supplicant.removeNetwork(network.number));
+        }
     }
     if (before && before->isOnOne) {
         auto started = std::make_unique<SupplicantReturn>(std::move(supplicant));

@@ -63,14 +63,14 @@ std::string unescape(std::string_view text) {
     return bytes;
 }
 
-// The value of "<name>=..." among the lines of an answer.
-std::string_view lineOf(std::string_view answer, std::string_view name) {
+SupplicantValues valuesIn(std::string_view answer) {
+    SupplicantValues values;
     for (const std::string_view line : split(answer, '\n')) {
-        if (line.size() > name.size() && line.starts_with(name) && line[name.size()] == '=') {
-            return line.substr(name.size() + 1);
+        if (const std::size_t equals = line.find('='); equals != std::string_view::npos) {
+            values.emplace(line.substr(0, equals), line.substr(equals + 1));
         }
     }
-    return {};
+    return values;
 }
 
 // The protection that the flags of a scan result tell of.
@@ -116,8 +116,8 @@ Outcome SupplicantSocket::open(const std::string& interface, bool& isThere) {
     return {};
 }
 
-Outcome SupplicantSocket::receive(steady_clock::time_point deadline, std::string& message, bool& received) {
-    received = false;
+Outcome SupplicantSocket::receive(steady_clock::time_point deadline, std::optional<std::string>& message) {
+    message.reset();
     for (;;) {
         const auto left = std::chrono::duration_cast<milliseconds>(deadline - steady_clock::now());
         pollfd wait{socket_.get(), POLLIN, 0};
@@ -125,11 +125,10 @@ Outcome SupplicantSocket::receive(steady_clock::time_point deadline, std::string
         if (ready == 0 || (ready < 0 && errno != EINTR)) {
             return ready == 0 ? Outcome() : Outcome::fromErrno("cannot wait for the wireless supplicant");
         }
-        message.resize(largestAnswer);
-        const ssize_t size = ::recv(socket_.get(), message.data(), message.size(), 0);
+        std::string text(largestAnswer, '\0');
+        const ssize_t size = ::recv(socket_.get(), text.data(), text.size(), 0);
         if (size >= 0) {
-            message.resize(static_cast<std::size_t>(size));
-            received = true;
+            message = text.substr(0, static_cast<std::size_t>(size));
             return {};
         }
         if (errno != EINTR && errno != EAGAIN) {
@@ -144,29 +143,26 @@ Outcome SupplicantSocket::ask(const std::string& request, const char* what, std:
     }
     const auto deadline = steady_clock::now() + answerTime;
     for (;;) {
-        bool received = false;
-        Outcome done = receive(deadline, answer, received);
-        if (!done.ok()) {
-            return done;
-        }
-        if (!received) {
+        std::optional<std::string> message;
+        RETURN_IF_FAILED(receive(deadline, message));
+        if (!message) {
             return {kSCStatusFailed,
                     std::string("the wireless supplicant does not answer when asked to ") + what};
         }
-        if (answer.empty() || answer.front() != '<') {
+        if (!message->starts_with('<')) {
+            answer = std::move(*message);
             return {};
         }
-        notices_.push_back(answer);
+        notices_.push_back(std::move(*message));
     }
 }
 
 Outcome SupplicantSocket::order(const std::string& request, const char* what) {
     std::string answer;
-    Outcome done = ask(request, what, answer);
-    if (done.ok() && answer.substr(0, 2) != "OK") {
-        return {kSCStatusFailed, std::string("the wireless supplicant refused to ") + what};
-    }
-    return done;
+    RETURN_IF_FAILED(ask(request, what, answer));
+    return answer.starts_with("OK")
+               ? Outcome()
+               : Outcome(kSCStatusFailed, std::string("the wireless supplicant refused to ") + what);
 }
 
 Outcome SupplicantSocket::listNetworks(std::vector<ConfiguredNetwork>& networks) {
@@ -187,25 +183,17 @@ Outcome SupplicantSocket::listNetworks(std::vector<ConfiguredNetwork>& networks)
             }
             const bool isDisabled =
                 fields.size() > 3 && fields[3].find("[DISABLED]") != std::string_view::npos;
-            networks.push_back({*number, isDisabled, fields[1].empty()});
+            networks.push_back({*number, isDisabled, fields[1].empty(), false});
         }
-        if (behind.empty() && networks.empty()) {
+        if (networks.empty()) {
             break;
         }
     }
-    return {};
-}
-
-Outcome SupplicantSocket::findOurs(const std::vector<ConfiguredNetwork>& networks,
-                                   std::vector<ConfiguredNetwork>& ours) {
-    ours.clear();
-    for (const ConfiguredNetwork& network : networks) {
+    for (ConfiguredNetwork& network : networks) {
         std::string tag;
         RETURN_IF_FAILED(
             ask("GET_NETWORK " + std::to_string(network.number) + " id_str", "show a network", tag));
-        if (tag == ourTag) {
-            ours.push_back(network);
-        }
+        network.isOurs = tag == ourTag;
     }
     return {};
 }
@@ -232,15 +220,10 @@ Outcome SupplicantSocket::removeNetwork(int number) {
     return order("REMOVE_NETWORK " + std::to_string(number), "remove a network");
 }
 
-Outcome SupplicantSocket::readStatus(std::map<std::string, std::string, std::less<>>& values) {
-    values.clear();
+Outcome SupplicantSocket::readStatus(SupplicantValues& status) {
     std::string answer;
     RETURN_IF_FAILED(ask("STATUS", "tell its state", answer));
-    for (const std::string_view line : split(answer, '\n')) {
-        if (const std::size_t equals = line.find('='); equals != std::string_view::npos) {
-            values[std::string(line.substr(0, equals))] = line.substr(equals + 1);
-        }
-    }
+    status = valuesIn(answer);
     return {};
 }
 
@@ -251,24 +234,23 @@ Outcome SupplicantSocket::readHeard(const std::string& name, std::vector<HeardNe
     for (std::size_t i = 0; i < mostEntries; ++i) {
         std::string answer;
         RETURN_IF_FAILED(ask("BSS " + which + " MASK=0x1a87", "list what it hears", answer));
-        const std::string_view id = lineOf(answer, "id");
-        if (id.empty()) {
+        SupplicantValues entry = valuesIn(answer);
+        if (entry["id"].empty()) {
             break;
         }
-        which = "NEXT-" + std::string(id);
-        if (unescape(lineOf(answer, "ssid")) != name) {
+        which = "NEXT-" + entry["id"];
+        if (unescape(entry["ssid"]) != name) {
             continue;
         }
-        const std::string_view level = lineOf(answer, "level");
-        const std::string_view flags = lineOf(answer, "flags");
+        const std::string& level = entry["level"];
         HeardNetwork network;
-        network.bssid = lineOf(answer, "bssid");
-        network.frequency = parseNumber(lineOf(answer, "freq")).value_or(0);
+        network.bssid = entry["bssid"];
+        network.frequency = parseNumber(entry["freq"]).value_or(0);
         // In dBm, below zero.
         std::from_chars(level.data(), level.data() + level.size(), network.strength);
-        network.security = securityOf(flags);
-        network.isAdHoc = flags.find("[IBSS]") != std::string_view::npos;
-        network.age = std::chrono::seconds(parseNumber(lineOf(answer, "age")).value_or(0));
+        network.security = securityOf(entry["flags"]);
+        network.isAdHoc = entry["flags"].find("[IBSS]") != std::string::npos;
+        network.age = std::chrono::seconds(parseNumber(entry["age"]).value_or(0));
         heard.push_back(std::move(network));
     }
     return {};
@@ -276,15 +258,13 @@ Outcome SupplicantSocket::readHeard(const std::string& name, std::vector<HeardNe
 
 Outcome SupplicantSocket::takeNotices(std::vector<std::string>& notices) {
     notices = std::exchange(notices_, {});
-    for (;;) {
-        std::string message;
-        bool received = false;
-        RETURN_IF_FAILED(receive(steady_clock::now(), message, received));
-        if (!received) {
+    for (std::optional<std::string> message;;) {
+        RETURN_IF_FAILED(receive(steady_clock::now(), message));
+        if (!message) {
             return {};
         }
-        if (!message.empty() && message.front() == '<') {
-            notices.push_back(std::move(message));
+        if (message->starts_with('<')) {
+            notices.push_back(std::move(*message));
         }
     }
 }

@@ -20,7 +20,10 @@ struct ConfiguredNetwork {
     int number = 0;
     bool isDisabled = false;
     bool isNameless = false;
+    bool isOurs = false;  // it carries this system's tag
 };
+// The values of an answer that has them in lines, by their names.
+using SupplicantValues = std::map<std::string, std::string, std::less<>>;
 
 // Requests hold the key, so none of them ever goes into a reason. Every answer is waited for two seconds.
 class SupplicantSocket {
@@ -35,13 +38,11 @@ class SupplicantSocket {
     Outcome order(const std::string& request, const char* what);
 
     Outcome listNetworks(std::vector<ConfiguredNetwork>& networks);
-    // Those that carry this system's tag.
-    Outcome findOurs(const std::vector<ConfiguredNetwork>& networks, std::vector<ConfiguredNetwork>& ours);
     // Adds a network with the tag and these settings, each the words that follow its number.
     Outcome addNetwork(const std::vector<std::string>& settings, int& number);
     Outcome removeNetwork(int number);
     // "wpa_state", "id", "bssid" and the like.
-    Outcome readStatus(std::map<std::string, std::string, std::less<>>& values);
+    Outcome readStatus(SupplicantValues& status);
     // The networks of this name that it heard, with their ages.
     Outcome readHeard(const std::string& name, std::vector<HeardNetwork>& heard);
 
@@ -49,7 +50,8 @@ class SupplicantSocket {
     Outcome takeNotices(std::vector<std::string>& notices);
 
   private:
-    Outcome receive(std::chrono::steady_clock::time_point deadline, std::string& message, bool& received);
+    // Nothing when none has come by the deadline.
+    Outcome receive(std::chrono::steady_clock::time_point deadline, std::optional<std::string>& message);
 
     FileDescriptor socket_;
     std::vector<std::string> notices_;

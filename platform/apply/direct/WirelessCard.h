@@ -3,7 +3,6 @@
 #pragma once
 
 #include <cstdint>
-#include <initializer_list>
 #include <optional>
 #include <string>
 #include <vector>
@@ -43,15 +42,16 @@ class WirelessCard {
     Outcome readCurrent(std::optional<ScanEntry>& current);
     // Whether its link has a carrier that the kernel has taken note of.
     Outcome readRunning(bool& isRunning);
-    Outcome forgetSilentNeighbours() { return kernel_.forgetSilentNeighbours(*link_); }
 
     // Goes down for a moment to do so, and has its addresses and routes again afterwards.
     Outcome setType(std::uint32_t type);
+    // Calls out for one network by its name, which one that hides it answers too. A scan that is under way
+    // goes on, and a link that is down for a moment has none: error() tells.
+    Outcome scan(const std::string& network);
+    // A card that can't end its scan sends its notice later.
+    void endScan();
+    Outcome join(const ScanEntry& network, const std::optional<std::string>& key);
     Outcome leave();
-    Outcome request(const netlink::Message& message, std::initializer_list<int> tolerated = {}) {
-        return socket_.request(message, tolerated);
-    }
-    [[nodiscard]] WirelessRequests requests() const { return {*family_, link_->index}; }
     // The errno that the kernel answered the last request with; see Socket.
     [[nodiscard]] int error() const noexcept { return socket_.error(); }
 
@@ -61,9 +61,12 @@ class WirelessCard {
     void takeNotices(bool& isScanOver, std::optional<std::uint16_t>& joinStatus);
 
   private:
-    std::string interface_;
+    [[nodiscard]] netlink::Message requestFor(std::uint8_t command, std::uint16_t flags = NLM_F_ACK) const {
+        return makeRequest(*family_, index_, command, flags);
+    }
+
     Kernel kernel_;
-    std::optional<Link> link_;
+    int index_ = 0;
     netlink::Socket socket_;
     netlink::Socket notices_;
     std::optional<netlink::GenericFamily> family_;

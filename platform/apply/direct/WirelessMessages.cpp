@@ -12,7 +12,6 @@ using netlink::Attributes;
 using netlink::Bytes;
 using netlink::ByteView;
 using netlink::Message;
-using netlink::MessageView;
 
 // IEEE 802.11: bits of the capability field, elements of a beacon, cipher suites.
 constexpr std::uint16_t capabilityAdHoc = 0x0002;
@@ -100,7 +99,7 @@ ByteView viewOf(const std::string& text) {
 
 }  // namespace
 
-std::optional<ScanEntry> decodeScanEntry(const MessageView& message) {
+std::optional<ScanEntry> decodeScanEntry(const Message& message) {
     const auto entry = message.attributes<genlmsghdr>().find(NL80211_ATTR_BSS);
     if (!entry) {
         return std::nullopt;
@@ -118,7 +117,7 @@ std::optional<ScanEntry> decodeScanEntry(const MessageView& message) {
     constexpr std::uint32_t notJoined = NL80211_BSS_STATUS_AUTHENTICATED;
     network.isCurrent = parts.u32(NL80211_BSS_STATUS).value_or(notJoined) != notJoined;
     if (const auto capability = parts.find(NL80211_BSS_CAPABILITY)) {
-        const unsigned bits = capability->u16().value_or(0);
+        const unsigned bits = capability->as<std::uint16_t>().value_or(0);
         network.isAdHoc = (bits & capabilityAdHoc) != 0;
         network.security = (bits & capabilityPrivacy) != 0 ? Security::wep : Security::open;
     }
@@ -132,11 +131,7 @@ std::optional<ScanEntry> decodeScanEntry(const MessageView& message) {
     return network;
 }
 
-std::optional<std::uint32_t> decodeInterfaceType(const MessageView& message) {
-    return message.attributes<genlmsghdr>().u32(NL80211_ATTR_IFTYPE);
-}
-
-std::optional<WirelessNotice> decodeNotice(const MessageView& message, int index) {
+std::optional<WirelessNotice> decodeNotice(const Message& message, int index) {
     const auto header = message.family<genlmsghdr>();
     const Attributes attributes = message.attributes<genlmsghdr>();
     if (!header || attributes.u32(NL80211_ATTR_IFINDEX) != static_cast<std::uint32_t>(index)) {
@@ -151,7 +146,7 @@ std::optional<WirelessNotice> decodeNotice(const MessageView& message, int index
         case NL80211_CMD_CONNECT: {
             const auto status = attributes.find(NL80211_ATTR_STATUS_CODE);
             notice.joinStatus = status && !attributes.find(NL80211_ATTR_TIMED_OUT)
-                                    ? status->u16().value_or(WirelessNotice::noAnswer)
+                                    ? status->as<std::uint16_t>().value_or(WirelessNotice::noAnswer)
                                     : WirelessNotice::noAnswer;
             return notice;
         }
@@ -160,38 +155,17 @@ std::optional<WirelessNotice> decodeNotice(const MessageView& message, int index
     }
 }
 
-Message WirelessRequests::request(std::uint8_t command, std::uint16_t flags) const {
-    Message message = family_.request(command, flags);
-    message.addValue(NL80211_ATTR_IFINDEX, index_);
+Message makeRequest(const netlink::GenericFamily& family, int index, std::uint8_t command,
+                    std::uint16_t flags) {
+    Message message = family.request(command, flags);
+    message.addValue(NL80211_ATTR_IFINDEX, index);
     return message;
 }
 
-Message WirelessRequests::getInterface() const {
-    return request(NL80211_CMD_GET_INTERFACE, NLM_F_ACK);
-}
-
-Message WirelessRequests::setType(std::uint32_t type) const {
-    Message message = request(NL80211_CMD_SET_INTERFACE, NLM_F_ACK);
-    message.addValue(NL80211_ATTR_IFTYPE, type);
-    return message;
-}
-
-Message WirelessRequests::scan(const std::string& network) const {
-    Message message = request(NL80211_CMD_TRIGGER_SCAN, NLM_F_ACK);
-    message.addNested(NL80211_ATTR_SCAN_SSIDS, [&network](Message& names) { names.add(1, viewOf(network)); });
-    return message;
-}
-
-Message WirelessRequests::endScan() const {
-    return request(NL80211_CMD_ABORT_SCAN, NLM_F_ACK);
-}
-
-Message WirelessRequests::getEntries() const {
-    return request(NL80211_CMD_GET_SCAN, NLM_F_DUMP);
-}
-
-Message WirelessRequests::join(const ScanEntry& network, const std::optional<std::string>& key) const {
-    Message message = request(network.isAdHoc ? NL80211_CMD_JOIN_IBSS : NL80211_CMD_CONNECT, NLM_F_ACK);
+Message makeJoinRequest(const netlink::GenericFamily& family, int index, const ScanEntry& network,
+                        const std::optional<std::string>& key) {
+    Message message =
+        makeRequest(family, index, network.isAdHoc ? NL80211_CMD_JOIN_IBSS : NL80211_CMD_CONNECT);
     message.add(NL80211_ATTR_SSID, viewOf(network.network))
         .add(NL80211_ATTR_MAC, network.bssid)
         .addValue(NL80211_ATTR_WIPHY_FREQ, network.frequency);
@@ -212,10 +186,6 @@ Message WirelessRequests::join(const ScanEntry& network, const std::optional<std
         });
     }
     return message;
-}
-
-Message WirelessRequests::leave(bool isAdHoc) const {
-    return request(isAdHoc ? NL80211_CMD_LEAVE_IBSS : NL80211_CMD_DISCONNECT, NLM_F_ACK);
 }
 
 }  // namespace platform::apply

@@ -30,10 +30,7 @@ struct ScanEntry {
     unsigned keyManagement = 0;  // of Security::wpa; 0 when it offers nothing that is known here
 };
 // Nothing when the message describes none.
-[[nodiscard]] std::optional<ScanEntry> decodeScanEntry(const netlink::MessageView& message);
-
-// The type of an interface, NL80211_IFTYPE_; nothing when the message does not say it.
-[[nodiscard]] std::optional<std::uint32_t> decodeInterfaceType(const netlink::MessageView& message);
+[[nodiscard]] std::optional<ScanEntry> decodeScanEntry(const netlink::Message& message);
 
 // What a notice means for the interface of that index; nothing for another one, or another notice.
 struct WirelessNotice {
@@ -43,30 +40,15 @@ struct WirelessNotice {
     std::optional<std::uint16_t> joinStatus;
     static constexpr std::uint16_t noAnswer = 0xFFFF;
 };
-[[nodiscard]] std::optional<WirelessNotice> decodeNotice(const netlink::MessageView& message, int index);
+[[nodiscard]] std::optional<WirelessNotice> decodeNotice(const netlink::Message& message, int index);
 
-// Requests that the kernel acknowledges; what follows from them comes by notice.
-class WirelessRequests {
-  public:
-    WirelessRequests(const netlink::GenericFamily& family, int index) : family_(family), index_(index) {}
-
-    [[nodiscard]] netlink::Message getInterface() const;
-    [[nodiscard]] netlink::Message setType(std::uint32_t type) const;
-    // Calls out for one network by its name, which one that hides it answers too.
-    [[nodiscard]] netlink::Message scan(const std::string& network) const;
-    [[nodiscard]] netlink::Message endScan() const;
-    // A dump.
-    [[nodiscard]] netlink::Message getEntries() const;
-    // The key is one that fits WEP; none joins an open network.
-    [[nodiscard]] netlink::Message join(const ScanEntry& network,
-                                        const std::optional<std::string>& key) const;
-    [[nodiscard]] netlink::Message leave(bool isAdHoc) const;
-
-  private:
-    [[nodiscard]] netlink::Message request(std::uint8_t command, std::uint16_t flags) const;
-
-    netlink::GenericFamily family_;
-    int index_;
-};
+// A request about the interface of that index. The kernel acknowledges it; what follows from it comes by
+// notice.
+[[nodiscard]] netlink::Message makeRequest(const netlink::GenericFamily& family, int index,
+                                           std::uint8_t command, std::uint16_t flags = NLM_F_ACK);
+// To join the network. The key is one that fits WEP; none joins an open network.
+[[nodiscard]] netlink::Message makeJoinRequest(const netlink::GenericFamily& family, int index,
+                                               const ScanEntry& network,
+                                               const std::optional<std::string>& key);
 
 }  // namespace platform::apply

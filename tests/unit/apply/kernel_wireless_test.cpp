@@ -17,7 +17,8 @@ namespace platform::apply {
 namespace {
 
 using netlink::Bytes;
-using netlink::MessageView;
+using netlink::ByteView;
+using netlink::Message;
 using testing_support::fromHex;
 using testing_support::PrivateNetwork;
 using testing_support::shell;
@@ -35,9 +36,9 @@ std::string meaningOf(const Inputs& inputs) {
     const Bytes payload = fromHex(message);
     for (std::size_t length = 0; length < payload.size(); ++length) {
         const Bytes part(payload.begin(), payload.begin() + static_cast<std::ptrdiff_t>(length));
-        (void)decodeScanEntry(MessageView({}, part));
+        (void)decodeScanEntry(Message(0, 0, ByteView(part)));
     }
-    const auto entry = decodeScanEntry(MessageView({}, payload));
+    const auto entry = decodeScanEntry(Message(0, 0, ByteView(payload)));
     return entry->network + (entry->isAdHoc ? " cell " : " access point ") + toHex(entry->bssid) + " " +
            std::to_string(entry->frequency) + " " + std::to_string(entry->signal) + " " +
            std::to_string(entry->age.count()) + (entry->isCurrent ? " current" : "") + " security " +
@@ -48,7 +49,7 @@ std::string meaningOf(const Inputs& inputs) {
 // The request to join a cell with a key.
 std::string requestOf(const Inputs& inputs) {
     const ScanEntry cell{"WepCell1", {}, 2412, 0, {}, true};
-    return toHex(WirelessRequests({32, {}}, 3).join(cell, inputs[0]).payload());
+    return toHex(makeJoinRequest({32, {}}, 3, cell, inputs[0]).payload());
 }
 
 // A notice by its command and interface, with a status, or -1 for none, and whether its time ran out.
@@ -57,15 +58,14 @@ std::string noticeOf(const Inputs& inputs) {
                                                               {"aborted", NL80211_CMD_SCAN_ABORTED},
                                                               {"trigger", NL80211_CMD_TRIGGER_SCAN},
                                                               {"connect", NL80211_CMD_CONNECT}};
-    netlink::Message message = netlink::GenericFamily{32, {}}.request(commands.at(inputs[0]), 0);
-    message.addValue(NL80211_ATTR_IFINDEX, std::stoi(inputs[1]));
+    Message message = makeRequest({32, {}}, std::stoi(inputs[1]), commands.at(inputs[0]));
     if (inputs.size() > 2) {
         message.addValue(NL80211_ATTR_STATUS_CODE, static_cast<std::uint16_t>(std::stoi(inputs[2])));
     }
     if (inputs.size() > 3) {
         message.add(NL80211_ATTR_TIMED_OUT, {});
     }
-    const auto notice = decodeNotice(MessageView({}, message.payload()), 3);
+    const auto notice = decodeNotice(message, 3);
     return !notice             ? "nothing"
            : notice->isScanEnd ? "scan over"
                                : "status " + std::to_string(notice->joinStatus.value_or(1));
@@ -120,9 +120,8 @@ TEST_F(KernelWirelessTest, NeighboursThatDidNotAnswerAreForgotten) {
             "ip neigh add 10.1.0.3 dev card0 lladdr 02:00:00:00:00:03 nud reachable;"
             "ip neigh add 10.1.0.4 dev card0 nud incomplete");
         Kernel kernel;
-        std::optional<Link> link;
-        ASSERT_TRUE(kernel.open().ok() && kernel.findLink("card0", link).ok() && link);
-        EXPECT_EQ("", kernel.forgetSilentNeighbours(*link).reason());
+        ASSERT_TRUE(kernel.open("card0").ok() && kernel.link());
+        EXPECT_EQ("", kernel.forgetSilentNeighbours().reason());
         EXPECT_EQ("10.1.0.2 dev far0 FAILED \n10.1.0.3 dev card0 lladdr 02:00:00:00:00:03 REACHABLE \n",
                   shell("ip -4 neigh show nud all | sort"));
     });

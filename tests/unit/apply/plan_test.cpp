@@ -60,12 +60,14 @@ std::string planOf(const Inputs& inputs) {
 
 // The environment of the DHCP client's program, "name=value": the lease, or why there is none.
 std::string leaseOf(const Inputs& inputs) {
-    Environment environment;
-    for (const std::string& each : inputs) {
-        environment[each.substr(0, each.find('='))] = each.substr(each.find('=') + 1);
-    }
     Lease lease;
-    const Outcome outcome = leaseFromEnvironment(environment, lease);
+    for (const std::string& each : inputs) {
+        setenv(each.substr(0, each.find('=')).c_str(), each.substr(each.find('=') + 1).c_str(), 1);
+    }
+    const Outcome outcome = leaseFromEnvironment(lease);
+    for (const std::string& each : inputs) {
+        unsetenv(each.substr(0, each.find('=')).c_str());
+    }
     return outcome.ok() ? "lease" +
                               describe({lease.address}, lease.router, lease.nameService.servers,
                                        lease.nameService.domains) +

@@ -2,7 +2,7 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <sys/eventfd.h>
+#include <sys/socket.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -45,9 +45,15 @@ class FakeNetworkState : public platform::live::NetworkState {
     int looks = 0;
     std::vector<Destination> asked;
 
+    FakeNetworkState() { EXPECT_EQ(socketpair(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0, ends_), 0); }
+    ~FakeNetworkState() override {
+        close(ends_[0]);
+        close(ends_[1]);
+    }
+
     void change(std::optional<PrimaryRoute> route) {
         primary = std::move(route);
-        EXPECT_EQ(eventfd_write(news_.get(), 1), 0);
+        EXPECT_EQ(send(ends_[0], "", 1, 0), 1);
     }
 
     Outcome primaryRoute(std::optional<PrimaryRoute>& route) override {
@@ -60,30 +66,17 @@ class FakeNetworkState : public platform::live::NetworkState {
         reach = Reach();
         return outcome();
     }
-    Outcome subscribe(std::unique_ptr<platform::live::Notices>& notices) override {
-        notices = std::make_unique<FakeNotices>(dup(news_.get()));
+    Outcome subscribe(platform::FileDescriptor& news) override {
+        news.reset(dup(ends_[1]));
         return outcome();
     }
 
   private:
-    class FakeNotices : public platform::live::Notices {
-      public:
-        explicit FakeNotices(int news) : news_(news) {}
-        [[nodiscard]] int descriptor() const noexcept override { return news_.get(); }
-        bool drain() override {
-            eventfd_t count = 0;
-            return eventfd_read(news_.get(), &count) == 0;
-        }
-
-      private:
-        platform::FileDescriptor news_;
-    };
-
     [[nodiscard]] Outcome outcome() const {
         return isFailing ? Outcome(kSCStatusFailed, "told to fail") : Outcome();
     }
 
-    platform::FileDescriptor news_{eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)};
+    int ends_[2];
 };
 
 using StoreRef = Owned<SCDynamicStoreRef>;
