@@ -16,6 +16,7 @@ struct FileOwnership {
     unsigned mode = 0600;
     unsigned user = 0;
     unsigned group = 0;
+    bool operator==(const FileOwnership&) const = default;
 };
 
 // "/" for "/etc", "." for a name without a slash.

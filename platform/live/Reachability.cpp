@@ -7,6 +7,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/SystemConfiguration.h"
 #include "platform/live/NetworkState.h"
@@ -20,12 +21,6 @@ using platform::live::Reach;
 using platform::preferences::setStatus;
 
 constexpr const char* who = "reachability";
-
-SCNetworkConnectionFlags flagsOf(const Reach& reach) {
-    return (reach.isReachable ? kSCNetworkFlagsReachable : 0) |
-           (reach.isLocal ? kSCNetworkFlagsIsLocalAddress : 0) |
-           (reach.isDirect ? kSCNetworkFlagsIsDirect : 0);
-}
 
 std::optional<Destination> destinationOf(const sockaddr* address, std::size_t length) {
     Destination destination;
@@ -51,29 +46,39 @@ std::optional<Destination> destinationOf(const sockaddr* address, std::size_t le
     return std::nullopt;
 }
 
-using AddressList = std::unique_ptr<addrinfo, decltype(&::freeaddrinfo)>;
-
 // getaddrinfo's own status.
-int resolve(const char* name, int flags, AddressList& list) {
+int resolve(const char* name, int flags, std::vector<Destination>& destinations) {
     addrinfo hints{};
     hints.ai_flags = flags;
     hints.ai_socktype = SOCK_STREAM;
     addrinfo* found = nullptr;
     const int status = ::getaddrinfo(name, nullptr, &hints, &found);
-    list.reset(status == 0 ? found : nullptr);
+    if (status == 0) {
+        const std::unique_ptr<addrinfo, decltype(&::freeaddrinfo)> list(found, &::freeaddrinfo);
+        for (const addrinfo* entry = found; entry != nullptr; entry = entry->ai_next) {
+            if (const auto destination = destinationOf(entry->ai_addr, entry->ai_addrlen)) {
+                destinations.push_back(*destination);
+            }
+        }
+    }
     return status;
 }
 
-// The first address of the list that can be reached tells the answer.
-Outcome askForAny(const AddressList& list, Reach& reach) {
+// The first address of the list that can be reached tells the answer; the flags are untouched on failure.
+Boolean answer(const std::vector<Destination>& destinations, SCNetworkConnectionFlags* flags) {
+    Reach reach;
     Outcome done;
-    for (const addrinfo* entry = list.get(); entry != nullptr && done.ok() && !reach.isReachable;
-         entry = entry->ai_next) {
-        if (const auto destination = destinationOf(entry->ai_addr, entry->ai_addrlen)) {
-            done = platform::live::currentNetworkState()->reach(*destination, reach);
+    for (const Destination& destination : destinations) {
+        if (done.ok() && !reach.isReachable) {
+            done = platform::live::currentNetworkState()->reach(destination, reach);
         }
     }
-    return done;
+    if (setStatus(done, who)) {
+        *flags = (reach.isReachable ? kSCNetworkFlagsReachable : 0) |
+                 (reach.isLocal ? kSCNetworkFlagsIsLocalAddress : 0) |
+                 (reach.isDirect ? kSCNetworkFlagsIsDirect : 0);
+    }
+    return static_cast<Boolean>(done.ok());
 }
 
 }  // namespace
@@ -85,32 +90,22 @@ Boolean SCNetworkCheckReachabilityByAddress(const sockaddr* address, int address
     if (!destination || flags == nullptr) {
         return static_cast<Boolean>(setStatus(kSCStatusInvalidArgument));
     }
-    Reach reach;
-    const bool done = setStatus(platform::live::currentNetworkState()->reach(*destination, reach), who);
-    if (done) {
-        *flags = flagsOf(reach);
-    }
-    return static_cast<Boolean>(done);
+    return answer({*destination}, flags);
 }
 
 Boolean SCNetworkCheckReachabilityByName(const char* nodename, SCNetworkConnectionFlags* flags) noexcept {
     if (nodename == nullptr || *nodename == '\0' || flags == nullptr) {
         return static_cast<Boolean>(setStatus(kSCStatusInvalidArgument));
     }
-    AddressList list(nullptr, &::freeaddrinfo);
-    int status = resolve(nodename, AI_NUMERICHOST, list);
+    std::vector<Destination> destinations;
+    int status = resolve(nodename, AI_NUMERICHOST, destinations);
     if (status == EAI_NONAME) {
-        status = resolve(nodename, 0, list);
+        status = resolve(nodename, 0, destinations);
     }
     if (status != 0 && status != EAI_NONAME && status != EAI_NODATA) {
         const Outcome failed(kSCStatusFailed,
                              std::string("cannot look up ") + nodename + ": " + ::gai_strerror(status));
         return static_cast<Boolean>(setStatus(failed, who));
     }
-    Reach reach;
-    const bool done = setStatus(askForAny(list, reach), who);
-    if (done) {
-        *flags = flagsOf(reach);
-    }
-    return static_cast<Boolean>(done);
+    return answer(destinations, flags);
 }

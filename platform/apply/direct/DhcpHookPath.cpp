@@ -4,6 +4,8 @@
 #include <link.h>
 #include <unistd.h>
 
+#include <filesystem>
+
 #include "platform/base/Host.h"
 
 namespace platform::apply {
@@ -14,10 +16,8 @@ std::string folderOf(const std::string& path) {
 }
 
 std::string folderOfThisProgram() {
-    std::string path(4096, '\0');
-    const ssize_t size = ::readlink("/proc/self/exe", path.data(), path.size());
-    path.resize(size < 0 ? 0 : static_cast<std::size_t>(size));
-    return folderOf(path);
+    std::error_code ignored;
+    return folderOf(std::filesystem::read_symlink("/proc/self/exe", ignored));
 }
 
 // Of the shared library; empty when this code is a part of the program. The dynamic linker has no name for

@@ -148,7 +148,7 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Li
 }
 
 Outcome DirectInterface::switchOff(std::string& trouble) {
-    RETURN_IF_FAILED(setNameServers(0, {}, trouble));
+    RETURN_IF_FAILED(setInterfaceNameServers(interface_, 0, {}, trouble));
     RETURN_IF_FAILED(kernel_.makeRoutes({}, false));
     RETURN_IF_FAILED(kernel_.makeAddresses({}));
     return kernel_.setUp(false);
@@ -177,7 +177,8 @@ Outcome DirectInterface::switchOn(const InterfacePlan& plan, std::string& troubl
         RETURN_IF_FAILED(kernel_.makeRoutes(routes, true));
     }
     if (plan.method != IPv4Method::dhcp) {
-        return setNameServers(plan.rank, {plan.nameServers, plan.searchDomains}, trouble);
+        return setInterfaceNameServers(interface_, plan.rank, {plan.nameServers, plan.searchDomains},
+                                       trouble);
     }
     return {};
 }
@@ -223,20 +224,10 @@ Outcome DirectInterface::startClient(const InterfacePlan& plan, std::string& tro
     }
     const NameService own{plan.nameServers, plan.searchDomains};
     if (!isRunning || !own.servers.empty()) {
-        RETURN_IF_FAILED(setNameServers(plan.rank, own, trouble));
+        RETURN_IF_FAILED(setInterfaceNameServers(interface_, plan.rank, own, trouble));
     }
     // What an earlier server offered in vain says nothing about the next one.
     return isRunning ? forgetRefusal(interface_) : startDhcpClient(dhcpSettings(plan));
-}
-
-// Keeps the trouble that was told first.
-Outcome DirectInterface::setNameServers(unsigned rank, const NameService& service, std::string& trouble) {
-    std::string met;
-    RETURN_IF_FAILED(setInterfaceNameServers(interface_, rank, service, met));
-    if (trouble.empty()) {
-        trouble = std::move(met);
-    }
-    return {};
 }
 
 void DirectInterface::noteJoined() {

@@ -49,7 +49,6 @@ class DirectInterface {
     Outcome switchOff(std::string& trouble);
     Outcome switchOn(const InterfacePlan& plan, std::string& trouble);
     Outcome switchRadioOn(const InterfacePlan& plan, bool& isUsable);
-    Outcome setNameServers(unsigned rank, const NameService& service, std::string& trouble);
     Outcome startClient(const InterfacePlan& plan, std::string& trouble);
     Outcome startJoin(const InterfacePlan& plan, bool mayStay, std::unique_ptr<WirelessJoin>& join,
                       std::string& trouble);

@@ -7,7 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdio>
+#include <filesystem>
 #include <optional>
 #include <tuple>
 
@@ -40,12 +40,7 @@ struct FileState {
         fields("Group", self.ownership.group);
     }
 
-    bool operator==(const FileState& other) const {
-        return kind == other.kind && content == other.content &&
-               (kind != Kind::file ||
-                (ownership.mode == other.ownership.mode && ownership.user == other.ownership.user &&
-                 ownership.group == other.ownership.group));
-    }
+    bool operator==(const FileState&) const = default;
 };
 
 // What one interface brings.
@@ -85,15 +80,10 @@ Outcome readFileState(const std::string& path, FileState& state) {
         return errno == ENOENT ? Outcome() : Outcome::fromErrno("cannot look at " + path);
     }
     if (S_ISLNK(status.st_mode)) {
-        std::string target(4096, '\0');
-        const ssize_t size = ::readlink(path.c_str(), target.data(), target.size());
-        if (size < 0 || static_cast<std::size_t>(size) == target.size()) {
-            return Outcome::fromErrno("cannot read the link " + path);
-        }
-        target.resize(static_cast<std::size_t>(size));
+        std::error_code error;
         state.kind = FileState::Kind::link;
-        state.content = std::move(target);
-        return {};
+        state.content = std::filesystem::read_symlink(path, error).string();
+        return error ? Outcome::fromErrno("cannot read the link " + path, error.value()) : Outcome();
     }
     state.kind = FileState::Kind::file;
     state.ownership = {status.st_mode & 07777U, status.st_uid, status.st_gid};
@@ -151,6 +141,10 @@ std::string contentFor(const std::vector<Contribution>& contributions) {
            (domains.empty() ? "" : "search" + domains + "\n") + servers;
 }
 
+void keepFirst(std::string& trouble, const Outcome& outcome) {
+    trouble = trouble.empty() ? outcome.reason() : trouble;
+}
+
 bool isOurs(const FileState& now, const State& state) {
     return now.kind == FileState::Kind::file &&
            std::ranges::any_of(state.written,
@@ -167,7 +161,7 @@ Outcome giveFileBack(const std::string& path, const FileState& now, State& state
         (void)writeState(statePath(), state).ok();
         if (const Outcome made = makeFileState(path, state.before); !made.ok()) {
             // The state stays, for the next try.
-            trouble = made.reason();
+            keepFirst(trouble, made);
             return {};
         }
     }
@@ -178,7 +172,6 @@ Outcome giveFileBack(const std::string& path, const FileState& now, State& state
 
 Outcome setInterfaceNameServers(const std::string& interface, unsigned rank, const NameService& service,
                                 std::string& trouble) {
-    trouble.clear();
     FileDescriptor lock;
     RETURN_IF_FAILED(takeFileLock(runtimePath("name-servers.lock"), lockBound, lock));
     std::optional<State> known;
@@ -189,7 +182,7 @@ Outcome setInterfaceNameServers(const std::string& interface, unsigned rank, con
     const std::string& path = currentHost().resolverFile;
     FileState now;
     if (const Outcome read = readFileState(path, now); !read.ok()) {
-        trouble = read.reason();
+        keepFirst(trouble, read);
         return {};
     }
     State state = known.value_or(State{now, {}, {}});
@@ -219,10 +212,7 @@ Outcome setInterfaceNameServers(const std::string& interface, unsigned rank, con
     std::erase_if(state.written, [&now](const std::string& old) { return !old.starts_with(now.content); });
     state.written.push_back(content);
     RETURN_IF_FAILED(writeState(statePath(), state));
-    if (const Outcome replaced = replaceFileOrMount(path, content, {0644, ::geteuid(), ::getegid()});
-        !replaced.ok()) {
-        trouble = replaced.reason();
-    }
+    keepFirst(trouble, replaceFileOrMount(path, content, {0644, ::geteuid(), ::getegid()}));
     return {};
 }
 

@@ -31,8 +31,8 @@ struct NameService {
 // may call it at once: the programs that take leases do.
 //
 // A file that cannot be read or replaced, as with a read-only /etc, is a success with the reason in
-// `trouble`, which is empty otherwise: the addresses stand without it. What cannot be kept in the runtime
-// directory is a failure.
+// `trouble`, unless that tells of another one before: the addresses stand without it. What cannot be kept in
+// the runtime directory is a failure.
 Outcome setInterfaceNameServers(const std::string& interface, unsigned rank, const NameService& service,
                                 std::string& trouble);
 

@@ -24,13 +24,9 @@ constexpr std::chrono::milliseconds lookAgain{20};
 constexpr pid_t firstProcess = 1;
 
 bool sharesNetwork(pid_t number) {
-    const auto read = [](const std::string& process, struct stat& info) {
-        return ::stat(("/proc/" + process + "/ns/net").c_str(), &info) == 0;
-    };
-    struct stat own {};
-    struct stat its {};
-    return read("self", own) && read(std::to_string(number), its) && own.st_dev == its.st_dev &&
-           own.st_ino == its.st_ino;
+    std::error_code ignored;
+    return std::filesystem::equivalent("/proc/self/ns/net", "/proc/" + std::to_string(number) + "/ns/net",
+                                       ignored);
 }
 
 // The value of NAME=VALUE in what networkd says of a link; empty without one.
@@ -109,9 +105,9 @@ std::vector<std::string> argumentsOf(pid_t number) {
 }
 
 bool isInterface(const std::string& name) {
-    struct stat info {};
+    std::error_code ignored;
     return !name.empty() && name.find('/') == std::string::npos &&
-           ::stat((currentHost().sysfsRoot + "/class/net/" + name).c_str(), &info) == 0;
+           std::filesystem::exists(currentHost().sysfsRoot + "/class/net/" + name, ignored);
 }
 
 bool isClientOf(const std::string& interface, pid_t number) {

@@ -3,12 +3,17 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
-#include <charconv>
+#include <sstream>
 #include <string>
 
 #include "platform/apply/StateFile.h"
 
 namespace platform::apply {
+namespace {
+
+constexpr int startField = 22;
+
+}  // namespace
 
 Process processOf(pid_t number) {
     std::string text;
@@ -16,18 +21,16 @@ Process processOf(pid_t number) {
         return {number, 0};
     }
     // The program's name, in parentheses, may hold anything; the fields (proc(5)) are counted behind it.
-    std::size_t position = text.rfind(')');
-    constexpr int stateField = 3;
-    constexpr int startField = 22;
-    for (int field = stateField; position != std::string::npos && field <= startField; ++field) {
-        position = text.find(' ', position + 1);
-        if (field == stateField && position != std::string::npos && text[position + 1] == 'Z') {
-            return {number, 0};
-        }
+    std::istringstream fields(text.substr(text.rfind(')') + 1));
+    std::string state;
+    std::string skipped;
+    fields >> state;
+    for (int field = 4; field < startField; ++field) {
+        fields >> skipped;
     }
     Process process{number, 0};
-    if (position != std::string::npos) {
-        std::from_chars(text.data() + position + 1, text.data() + text.size(), process.started);
+    if (state != "Z") {
+        fields >> process.started;
     }
     return process;
 }
