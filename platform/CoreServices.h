@@ -93,7 +93,7 @@ LA_CONSTANT(OSStatus, kURLMalformedAnswerError, -30793);  // what came is not HT
 LA_CONSTANT(OSStatus, kURLAnswerTooLargeError, -30794);
 LA_CONSTANT(OSStatus, kURLClientError, -30795);  // the HTTP client library is missing or does not work
 // Fetches an http URL into the buffer, replacing what it holds. No proxy, no redirects, and never longer or
-// larger than the bounds of platform/services/Download.h. 0 for an answer of class 2xx; the HTTP status for
+// larger than the bounds of platform/services/Download.cpp. 0 for an answer of class 2xx; the HTTP status for
 // every other answer (404, a redirect's 302), whatever its body; a negative value when there was no answer,
 // or a 2xx did not arrive whole, with the reason in the log. Only a 2xx fills the buffer. destination,
 // eventProc and context are null, flags is 0.

@@ -5,6 +5,7 @@
 // everything below the faces uses that one until the scope ends.
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -18,10 +19,6 @@ namespace platform {
 namespace apply {
 class Agent;
 }
-namespace services {
-class Downloader;
-class Opener;
-}  // namespace services
 namespace live {
 class NetworkState;
 }
@@ -54,6 +51,18 @@ struct Host {
     std::string localModemScripts = "/usr/local/share/modem-scripts";
     std::string systemModemScripts = "/usr/share/modem-scripts";
 
+    // How long one download may take, connecting included. Three tries at a silent server take 15 seconds.
+    std::chrono::milliseconds downloadBound{5000};
+    // The HTTP client's library: the first that is there. Debian has one for each TLS library, of which
+    // nothing is used here.
+    std::vector<std::string> httpLibraries = {"libcurl-gnutls.so.4", "libcurl.so.4"};
+
+    // Holds one folder for each user with a session, with the user's own bus in it.
+    std::string userRuntimeRoot = "/run/user";
+    // What opens a URL the way the user wants it, with the arguments before the URL: the first that is
+    // installed.
+    std::vector<std::vector<std::string>> openingPrograms = {{"/usr/bin/xdg-open"}, {"/usr/bin/gio", "open"}};
+
     // A BCD version number; nothing: the question fails.
     std::optional<std::int32_t> systemVersion = 0x1040;
 
@@ -63,8 +72,6 @@ struct Host {
     // "close", "rename", "unlink"); false, with errno set, fails the step. Null: nothing but the system can.
     std::function<bool(const char* step, const std::string& path)> fileStep;
     // Null: the platform's own, chosen at the call.
-    std::shared_ptr<services::Downloader> downloader;
-    std::shared_ptr<services::Opener> opener;
     std::shared_ptr<live::NetworkState> networkState;
 };
 

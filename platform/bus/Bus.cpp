@@ -17,7 +17,8 @@ constexpr std::size_t longestText = 300;
 
 std::uint64_t microseconds(Clock::duration duration) {
     const auto count = std::chrono::duration_cast<std::chrono::microseconds>(duration).count();
-    return static_cast<std::uint64_t>(std::max<std::int64_t>(count, 0));
+    // At least one: 0 would stand for the library's own 25 seconds.
+    return static_cast<std::uint64_t>(std::max<std::int64_t>(count, 1));
 }
 
 // A D-Bus address keeps only these as they are; every other byte is escaped.
@@ -87,6 +88,10 @@ Outcome fromBus(const std::string& what, int result, const sd_bus_error& error, 
 
 Bus::~Bus() = default;
 
+std::uint64_t Bus::timeout() const {
+    return microseconds(std::min<Clock::duration>(callBound, end_ - Clock::now()));
+}
+
 Outcome Bus::process(Clock::time_point deadline, bool& inTime) {
     int result = sd_bus_process(bus_.get(), nullptr);
     inTime = true;
@@ -101,7 +106,7 @@ Outcome Bus::process(Clock::time_point deadline, bool& inTime) {
 
 Outcome Bus::connect(const std::string& service, bool& owned) {
     const std::string what = "connecting to the system bus";
-    const Clock::time_point deadline = Clock::now() + connectBound;
+    const Clock::time_point deadline = std::min(Clock::now() + connectBound, end_);
     service_ = service;
     owned = false;
     watches_.clear();
@@ -111,13 +116,14 @@ Outcome Bus::connect(const std::string& service, bool& owned) {
     int result = sd_bus_new(&made);
     bus_.reset(made);
     if (result >= 0) {
-        result = sd_bus_set_address(made, addressOf(currentHost().systemBusSocket).c_str());
+        result = sd_bus_set_address(
+            made, addressOf(socket_.empty() ? currentHost().systemBusSocket : socket_).c_str());
     }
     if (result >= 0) {
         result = sd_bus_set_bus_client(made, 1);
     }
     if (result >= 0) {
-        result = sd_bus_set_method_call_timeout(made, microseconds(callBound));
+        result = sd_bus_set_method_call_timeout(made, timeout());
     }
     if (result >= 0) {
         result = sd_bus_start(made);
@@ -178,7 +184,7 @@ Outcome Bus::call(const Call& call, Message& reply, std::string* errorName) {
     Error error;
     sd_bus_message* answer = nullptr;
     if (result >= 0) {
-        result = sd_bus_call(bus_.get(), made, microseconds(callBound), error.out(), &answer);
+        result = sd_bus_call(bus_.get(), made, timeout(), error.out(), &answer);
     }
     reply.reset(answer);
     if (errorName != nullptr) {
@@ -203,6 +209,20 @@ Outcome Bus::readProperties(const std::string& path, const std::string& interfac
     }
     const int result = readValue(reply.get(), properties);
     return result < 0 ? fromBus("the properties of " + path, result) : Outcome();
+}
+
+Outcome Bus::readProperty(const std::string& path, const std::string& interface, const char* property,
+                          Value& value) {
+    Message reply;
+    RETURN_IF_FAILED(
+        call({path,
+              propertiesInterface,
+              "Get",
+              [&](sd_bus_message* m) { return sd_bus_message_append(m, "ss", interface.c_str(), property); },
+              {}},
+             reply));
+    const int result = readValue(reply.get(), value);
+    return result < 0 ? fromBus(property, result) : Outcome();
 }
 
 Outcome Bus::setProperty(const std::string& path, const std::string& interface, const char* property,

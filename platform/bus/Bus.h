@@ -1,4 +1,4 @@
-// The system bus, with a bound on every wait.
+// A message bus, with a bound on every wait.
 //
 // The bus may be mute, the daemon may be stopped, and either may be killed while we wait. Client libraries
 // then hang for minutes; here every step ends within its own bound: connecting one second, a call five.
@@ -9,6 +9,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "platform/base/Outcome.h"
@@ -33,11 +34,14 @@ class Bus {
   public:
     // Nothing is open: every operation fails until connect has succeeded.
     Bus() = default;
+    // On another bus than the host's system bus, by the path of its socket. No call or connecting goes on
+    // after the end.
+    Bus(std::string socket, Clock::time_point end) : socket_(std::move(socket)), end_(end) {}
     ~Bus();
     Bus(const Bus&) = delete;
     Bus& operator=(const Bus&) = delete;
 
-    // Connects to the host's system bus, whatever the environment says. owned tells whether anybody owns the
+    // Connects to the bus, whatever the environment says. owned tells whether anybody owns the
     // service's name, whom calls go to from then on; it is false, and the outcome success, without a bus
     // socket too. Never starts the service.
     Outcome connect(const std::string& service, bool& owned);
@@ -56,6 +60,9 @@ class Bus {
     // All properties of an interface of an object; of a type that Value does not know: left out.
     Outcome readProperties(const std::string& path, const std::string& interface, Dictionary& properties,
                            std::string* error = nullptr);
+    // One of them, which is left as it is when its type is none that Value knows.
+    Outcome readProperty(const std::string& path, const std::string& interface, const char* property,
+                         Value& value);
     Outcome setProperty(const std::string& path, const std::string& interface, const char* property,
                         const Value& value);
 
@@ -79,6 +86,7 @@ class Bus {
     };
     static int forwardSignal(sd_bus_message* message, void* watch, sd_bus_error* error);
     Outcome readOwner(bool& owned);
+    [[nodiscard]] std::uint64_t timeout() const;  // of a call, in microseconds
     Outcome process(Clock::time_point deadline, bool& inTime);
 
     struct BusUnref {
@@ -88,6 +96,8 @@ class Bus {
             sd_bus_unref(bus);
         }
     };
+    std::string socket_;  // empty for the system bus
+    Clock::time_point end_ = Clock::time_point::max();
     std::string service_;
     std::unique_ptr<sd_bus, BusUnref> bus_;
     std::string owner_;  // the unique name of the service's owner; empty when there is none

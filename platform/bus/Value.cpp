@@ -205,6 +205,7 @@ template <class T>
 int readValue(sd_bus_message* message, T& value) {
     return read(message, value);
 }
+template int readValue(sd_bus_message* message, Value& value);
 template int readValue(sd_bus_message* message, Dictionary& value);
 template int readValue(sd_bus_message* message, Sections& value);
 template int readValue(sd_bus_message* message, Objects& value);

@@ -53,8 +53,9 @@ using Message = std::unique_ptr<sd_bus_message, MessageUnref>;
 template <class T>
 int appendValue(sd_bus_message* message, const T& value);
 
-// Of a Dictionary, Sections, Objects (a{oa{sa{sv}}}) or Texts (as or ao). Values of other types than the ones
-// above are left out. More than a hundred thousand elements in one container are an error (-EMSGSIZE).
+// Of a Value, a Dictionary, Sections, Objects (a{oa{sa{sv}}}) or Texts (as or ao). Values of other types than
+// the ones above are left out. More than a hundred thousand elements in one container are an error
+// (-EMSGSIZE).
 template <class T>
 int readValue(sd_bus_message* message, T& value);
 

@@ -1,6 +1,15 @@
+// Opening a page in the browser of the user who sits at the computer: the active graphical session of the
+// first seat, as the login manager keeps it under /run/systemd.
+//
+// The desktop's opening program runs in it as the session's user, never as root, with an environment made
+// anew (the user's name, home and buses, a fixed path, and what the user's own service manager says about the
+// display), without descriptors of ours, in a process session of its own.
+//
+// Nobody waits for the program, and nothing is left to reap. Handing over takes at most 1.5 seconds.
 #include <grp.h>
 #include <poll.h>
 #include <pwd.h>
+#include <strings.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -8,17 +17,17 @@
 #include <array>
 #include <cerrno>
 #include <chrono>
-#include <optional>
 #include <string>
 #include <string_view>
-#include <utility>
 #include <vector>
 
+#include "platform/CoreServices.h"
 #include "platform/base/ChildProcess.h"
 #include "platform/base/FileDescriptor.h"
+#include "platform/base/Host.h"
 #include "platform/base/Log.h"
 #include "platform/services/DesktopSession.h"
-#include "platform/services/Opener.h"
+#include "platform/values/Values.h"
 
 namespace platform::services {
 namespace {
@@ -29,24 +38,6 @@ using Clock = std::chrono::steady_clock;
 constexpr std::chrono::milliseconds handOverBound{1500};
 // The end of a child that hangs on its way to the program, in seconds.
 constexpr unsigned lifetimeBeforeProgram = 10;
-
-struct User {
-    uid_t id = 0;
-    gid_t group = 0;
-    std::string name;
-    std::string home;
-    std::string shell;
-};
-
-std::optional<User> userWithId(uid_t id) {
-    passwd record{};
-    passwd* found = nullptr;
-    std::vector<char> buffer(std::size_t{64} * 1024);
-    if (getpwuid_r(id, &record, buffer.data(), buffer.size(), &found) != 0 || found == nullptr) {
-        return std::nullopt;
-    }
-    return User{id, found->pw_gid, found->pw_name, found->pw_dir, found->pw_shell};
-}
 
 // What a program has to know to show itself on the display and to find the user's choice of a browser.
 bool belongsToDisplay(std::string_view name) {
@@ -69,9 +60,8 @@ bool belongsToDisplay(std::string_view name) {
     return std::find(names.begin(), names.end(), name) != names.end();
 }
 
-std::vector<std::string> environmentFor(const User& user, const DesktopSession& session,
-                                        const std::string& runtimeRoot) {
-    const std::string runtime = runtimeRoot + "/" + std::to_string(user.id);
+std::vector<std::string> environmentFor(const passwd& user, const DesktopSession& session) {
+    const std::string runtime = currentHost().userRuntimeRoot + "/" + std::to_string(user.pw_uid);
     std::vector<std::string> environment = managerEnvironment(runtime + "/bus");
     std::erase_if(environment, [](const std::string& entry) {
         return !belongsToDisplay(std::string_view(entry).substr(0, entry.find('=')));
@@ -86,10 +76,10 @@ std::vector<std::string> environmentFor(const User& user, const DesktopSession& 
     if (!isSet("XDG_SESSION_TYPE=")) {
         environment.push_back("XDG_SESSION_TYPE=" + session.type);
     }
-    environment.push_back("HOME=" + user.home);
-    environment.push_back("USER=" + user.name);
-    environment.push_back("LOGNAME=" + user.name);
-    environment.push_back("SHELL=" + user.shell);
+    environment.push_back(std::string("HOME=") + user.pw_dir);
+    environment.push_back(std::string("USER=") + user.pw_name);
+    environment.push_back(std::string("LOGNAME=") + user.pw_name);
+    environment.push_back(std::string("SHELL=") + user.pw_shell);
     environment.emplace_back("PATH=/usr/local/bin:/usr/bin:/bin");
     environment.push_back("XDG_RUNTIME_DIR=" + runtime);
     environment.push_back("DBUS_SESSION_BUS_ADDRESS=unix:path=" + runtime + "/bus");
@@ -97,23 +87,22 @@ std::vector<std::string> environmentFor(const User& user, const DesktopSession& 
 }
 
 // Becomes the user for good.
-bool become(const User& user) {
-    if (geteuid() == 0 &&
-        (initgroups(user.name.c_str(), user.group) != 0 ||
-         setresgid(user.group, user.group, user.group) != 0 || setresuid(user.id, user.id, user.id) != 0)) {
+bool become(const passwd& user) {
+    if (geteuid() == 0 && (initgroups(user.pw_name, user.pw_gid) != 0 ||
+                           setresgid(user.pw_gid, user.pw_gid, user.pw_gid) != 0 ||
+                           setresuid(user.pw_uid, user.pw_uid, user.pw_uid) != 0)) {
         return false;
     }
     uid_t real = 0;
     uid_t effective = 0;
     uid_t saved = 0;
-    return getresuid(&real, &effective, &saved) == 0 && real == user.id && effective == user.id &&
-           saved == user.id && setuid(0) != 0;
+    return getresuid(&real, &effective, &saved) == 0 && real == user.pw_uid && effective == user.pw_uid &&
+           saved == user.pw_uid && setuid(0) != 0;
 }
 
 // In the child; tells each status on the way to the program: noErr right before it, so that an end without a
 // word is a failure.
-void runProgram(const Desktop& desktop, const User& user, const DesktopSession& session,
-                const std::string& url, int channel) {
+void runProgram(const passwd& user, const DesktopSession& session, const std::string& url, int channel) {
     const auto report = [channel](OSStatus status) {
         static_cast<void>(!write(channel, &status, sizeof status));
     };
@@ -122,15 +111,15 @@ void runProgram(const Desktop& desktop, const User& user, const DesktopSession& 
         report(permErr);
         return;
     }
-    const std::vector<std::string> environment = environmentFor(user, session, desktop.runtimeRoot);
-    if (chdir(user.home.c_str()) != 0 && chdir("/") != 0) {
+    const std::vector<std::string> environment = environmentFor(user, session);
+    if (chdir(user.pw_dir) != 0 && chdir("/") != 0) {
         return;
     }
     umask(022);
     alarm(0);
     report(noErr);
     int error = ENOENT;
-    for (std::vector<std::string> arguments : desktop.programs) {
+    for (std::vector<std::string> arguments : currentHost().openingPrograms) {
         arguments.push_back(url);
         const int failure = becomeProgram(arguments.front(), arguments, environment);
         error = error == ENOENT ? failure : error;
@@ -161,11 +150,10 @@ OSStatus lastReport(int reports) {
     }
 }
 
-OSStatus handOver(const Desktop& desktop, const User& user, const DesktopSession& session,
-                  const std::string& url) {
+OSStatus handOver(const passwd& user, const DesktopSession& session, const std::string& url) {
     FileDescriptor channel;
     const Outcome started =
-        startDetached([&](int reports) { runProgram(desktop, user, session, url, reports); }, channel);
+        startDetached([&](int reports) { runProgram(user, session, url, reports); }, channel);
     return started.ok() ? lastReport(channel.get()) : ioErr;
 }
 
@@ -174,42 +162,39 @@ OSStatus failed(OSStatus status, const std::string& reason) {
     return status;
 }
 
-class DesktopOpener : public Opener {
-  public:
-    explicit DesktopOpener(Desktop desktop) : desktop_(std::move(desktop)) {}
-
-    OSStatus open(const std::string& url) override {
-        std::string reason;
-        const auto session = findDesktopSession(reason);
-        if (!session) {
-            return failed(fnfErr, reason);
-        }
-        if (session->user == 0) {
-            return failed(permErr, "root sits at the computer, and no browser runs as root");
-        }
-        if (geteuid() != 0 && geteuid() != session->user) {
-            return failed(permErr, "another user sits at the computer");
-        }
-        const auto user = userWithId(session->user);
-        if (!user) {
-            return failed(fnfErr, "there is no user " + std::to_string(session->user));
-        }
-        const OSStatus err = handOver(desktop_, *user, *session, url);
-        if (err != noErr) {
-            return failed(err,
-                          "the desktop's opening program could not be run (" + std::to_string(err) + ")");
-        }
-        return noErr;
+OSStatus openPage(const std::string& url) {
+    std::string reason;
+    const auto session = findDesktopSession(reason);
+    if (!session) {
+        return failed(fnfErr, reason);
     }
-
-  private:
-    Desktop desktop_;
-};
-
-}  // namespace
-
-std::shared_ptr<Opener> makeDesktopOpener(Desktop desktop) {
-    return std::make_shared<DesktopOpener>(std::move(desktop));
+    if (session->user == 0) {
+        return failed(permErr, "root sits at the computer, and no browser runs as root");
+    }
+    if (geteuid() != 0 && geteuid() != session->user) {
+        return failed(permErr, "another user sits at the computer");
+    }
+    const passwd* const user = getpwuid(session->user);
+    if (user == nullptr) {
+        return failed(fnfErr, "there is no user " + std::to_string(session->user));
+    }
+    const OSStatus err = handOver(*user, *session, url);
+    return err == noErr
+               ? noErr
+               : failed(err, "the desktop's opening program could not be run (" + std::to_string(err) + ")");
 }
 
+}  // namespace
 }  // namespace platform::services
+
+OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL) noexcept {
+    if (url == nullptr || openedURL != nullptr) {
+        return paramErr;
+    }
+    const std::string text(platform::values::textOf(CFURLGetString(url)));
+    // A page, never a file or whatever else the desktop would know how to run.
+    if (strncasecmp(text.c_str(), "http://", 7) != 0 && strncasecmp(text.c_str(), "https://", 8) != 0) {
+        return paramErr;
+    }
+    return platform::services::openPage(text);
+}

@@ -1,29 +1,18 @@
 #include "platform/services/DesktopSession.h"
 
-#include <systemd/sd-bus.h>
 #include <systemd/sd-login.h>
 
-#include <algorithm>
-#include <cerrno>
 #include <chrono>
-#include <cstdint>
 #include <cstdlib>
 #include <memory>
+
+#include "platform/bus/Bus.h"
 
 namespace platform::services {
 namespace {
 
-using Clock = std::chrono::steady_clock;
-
 struct Freer {
     void operator()(char* text) const noexcept { std::free(text); }
-};
-struct Closer {
-    void operator()(sd_bus* bus) const noexcept {
-        // Not flushed: that could wait for a bus that reads nothing.
-        sd_bus_close(bus);
-        sd_bus_unref(bus);
-    }
 };
 
 // What one of sd-login's questions is answered with; empty without an answer.
@@ -32,25 +21,6 @@ std::string textOf(int (*ask)(const char*, char**), const std::string& session) 
     const int result = ask(session.c_str(), &text);
     const std::unique_ptr<char, Freer> owned(text);
     return result >= 0 && text != nullptr ? text : "";
-}
-
-std::uint64_t microsecondsUntil(Clock::time_point deadline) {
-    const auto left = std::chrono::duration_cast<std::chrono::microseconds>(deadline - Clock::now()).count();
-    // At least one: 0 would stand for the library's own 25 seconds.
-    return static_cast<std::uint64_t>(std::max<std::int64_t>(left, 1));
-}
-
-// Whether the bus has said hello. A call would wait for that without an end.
-bool isReady(sd_bus* bus, Clock::time_point deadline) {
-    int result = sd_bus_is_ready(bus);
-    while (result == 0 && Clock::now() < deadline) {
-        result = sd_bus_process(bus, nullptr);
-        if (result == 0) {
-            result = sd_bus_wait(bus, microsecondsUntil(deadline));
-        }
-        result = result < 0 && result != -EINTR ? result : sd_bus_is_ready(bus);
-    }
-    return result > 0;
 }
 
 }  // namespace
@@ -77,24 +47,15 @@ std::optional<DesktopSession> findDesktopSession(std::string& reason) {
 }
 
 std::vector<std::string> managerEnvironment(const std::string& busSocket) {
-    const Clock::time_point deadline = Clock::now() + std::chrono::seconds(1);
-    sd_bus* made = nullptr;
-    const int result = sd_bus_new(&made);
-    const std::unique_ptr<sd_bus, Closer> bus(made);
-    char** entries = nullptr;
-    std::vector<std::string> environment;
-    if (result < 0 || sd_bus_set_address(made, ("unix:path=" + busSocket).c_str()) < 0 ||
-        sd_bus_set_bus_client(made, 1) < 0 || sd_bus_start(made) < 0 || !isReady(made, deadline) ||
-        sd_bus_set_method_call_timeout(made, microsecondsUntil(deadline)) < 0 ||
-        sd_bus_get_property_strv(made, "org.freedesktop.systemd1", "/org/freedesktop/systemd1",
-                                 "org.freedesktop.systemd1.Manager", "Environment", nullptr, &entries) < 0) {
-        return environment;
-    }
-    for (char** entry = entries; entry != nullptr && *entry != nullptr; ++entry) {
-        environment.emplace_back(std::unique_ptr<char, Freer>(*entry).get());
-    }
-    std::free(entries);
-    return environment;
+    bus::Bus bus(busSocket, bus::Clock::now() + std::chrono::seconds(1));
+    bool owned = false;
+    bus::Value environment;
+    const bool isRead = bus.connect("org.freedesktop.systemd1", owned).ok() && owned &&
+                        bus.readProperty("/org/freedesktop/systemd1", "org.freedesktop.systemd1.Manager",
+                                         "Environment", environment)
+                            .ok();
+    const auto* const entries = std::get_if<bus::Texts>(&environment.content);
+    return isRead && entries != nullptr ? *entries : bus::Texts();
 }
 
 }  // namespace platform::services

@@ -84,11 +84,8 @@ Paths& paths() {
 
 // "?" when the password database does not say.
 std::string homeOfUser() {
-    passwd record{};
-    passwd* found = nullptr;
-    std::vector<char> buffer(std::size_t{64} * 1024);
-    const int error = getpwuid_r(getuid(), &record, buffer.data(), buffer.size(), &found);
-    return error == 0 && found != nullptr && record.pw_dir != nullptr ? record.pw_dir : "?";
+    const passwd* const user = getpwuid(getuid());
+    return user != nullptr ? user->pw_dir : "?";
 }
 
 OSErr findModemScripts(SInt16 domain, std::string& path) {

@@ -1,9 +1,7 @@
 #include "tests/unit/networkmanager/StandInDaemon.h"
 
 #include <algorithm>
-#include <chrono>
 #include <ctime>
-#include <stdexcept>
 #include <utility>
 
 namespace testing_support {
@@ -11,13 +9,6 @@ namespace testing_support {
 using namespace platform::apply;
 
 namespace {
-
-const std::string prefix = "org.freedesktop.NetworkManager";
-
-std::string readText(sd_bus_message* message, const char* type = "s") {
-    const char* text = nullptr;
-    return sd_bus_message_read(message, type, &text) > 0 ? text : "";
-}
 
 // Either the secrets of a profile or all else.
 Sections pick(const Sections& sections, bool secrets) {
@@ -38,40 +29,13 @@ std::string textIn(const Sections& sections, const char* key) {
 
 }  // namespace
 
-sd_bus* PrivateBus::connect() const {
-    sd_bus* bus = nullptr;
-    for (int i = 0; i < 500; ++i) {
-        if (sd_bus_new(&bus) >= 0 && sd_bus_set_address(bus, ("unix:path=" + socket()).c_str()) >= 0 &&
-            sd_bus_set_bus_client(bus, 1) >= 0 && sd_bus_start(bus) >= 0) {
-            return bus;
-        }
-        sd_bus_unref(bus);
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    throw std::runtime_error("the bus is not up");
-}
-
-StandInDaemon::StandInDaemon(const PrivateBus& bus) : bus_(bus.connect()) {
+StandInDaemon::StandInDaemon(const StandInBus& bus)
+    : service_(bus, "org.freedesktop.NetworkManager",
+               [this](sd_bus_message* call, sd_bus_message* reply) { return answer(call, reply); }) {
     objects[manager] = {
         {"Startup", {false}}, {"WirelessEnabled", {true}}, {"WirelessHardwareEnabled", {true}}};
     objects[card] = {
         {"DeviceType", {2U}}, {"State", {deviceDisconnected}}, {"Managed", {true}}, {"Autoconnect", {true}}};
-    sd_bus_add_filter(bus_, nullptr, handle, this);
-    if (sd_bus_request_name(bus_, prefix.c_str(), 0) < 0) {
-        throw std::runtime_error("no place on the bus");
-    }
-    thread_ = std::thread([this] {
-        while (!isOver_ && sd_bus_wait(bus_, 10'000) >= 0) {
-            while (sd_bus_process(bus_, nullptr) > 0) {
-            }
-        }
-    });
-}
-
-StandInDaemon::~StandInDaemon() {
-    isOver_ = true;
-    thread_.join();
-    sd_bus_flush_close_unref(bus_);
 }
 
 void StandInDaemon::offer(const std::string& network, std::uint32_t mode, std::uint32_t privacy,
@@ -88,37 +52,16 @@ void StandInDaemon::offer(const std::string& network, std::uint32_t mode, std::u
     (isQuiet ? quietPoints_ : points_).push_back(path);
 }
 
-int StandInDaemon::handle(sd_bus_message* call, void* daemon, sd_bus_error* /*error*/) {
-    auto& self = *static_cast<StandInDaemon*>(daemon);
-    sd_bus_message* made = nullptr;
-    if (sd_bus_message_is_method_call(call, nullptr, nullptr) <= 0 ||
-        sd_bus_message_new_method_return(call, &made) < 0) {
-        return 0;
-    }
-    const Message reply(made);
-    if (const std::string error = self.answer(call, made); !error.empty()) {
-        return sd_bus_reply_method_errorf(call, (error[0] == '.' ? prefix + error : error).c_str(), "no: %s",
-                                          self.refusal.c_str());
-    }
-    sd_bus_send(nullptr, made, nullptr);
-    for (const Message& signal : std::exchange(self.signals_, {})) {
-        sd_bus_send(self.bus_, signal.get(), nullptr);
-    }
-    return 1;
-}
-
 std::string StandInDaemon::answer(sd_bus_message* call, sd_bus_message* reply) {
     const std::string path = sd_bus_message_get_path(call);
     const std::string member = sd_bus_message_get_member(call);
-    if (member == "GetAll" && objects.contains(path)) {
-        appendValue(reply, objects[path]);
-    } else if (member == "GetDeviceByIpIface") {
-        if (readText(call) != "wlan0") {
+    if (member == "GetDeviceByIpIface") {
+        if (StandInService::readText(call) != "wlan0") {
             return ".UnknownDevice";
         }
         sd_bus_message_append(reply, "o", card.c_str());
     } else if (member == "GetConnectionByUuid") {
-        const std::string uuid = readText(call);
+        const std::string uuid = StandInService::readText(call);
         const auto found = std::ranges::find_if(
             profiles, [&uuid](const auto& profile) { return textIn(profile.second, "uuid") == uuid; });
         if (found == profiles.end()) {
@@ -134,7 +77,7 @@ std::string StandInDaemon::answer(sd_bus_message* call, sd_bus_message* reply) {
         }
         sd_bus_message_close_container(reply);
     } else {
-        return refusal.empty() ? change(member, path, call, reply) : ".PermissionDenied";
+        return service_.refusal.empty() ? change(member, path, call, reply) : ".PermissionDenied";
     }
     return "";
 }
@@ -144,8 +87,8 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
     changes.push_back(member);
     if (member == "Set") {
         int flag = 0;
-        readText(call);
-        const std::string name = readText(call);
+        StandInService::readText(call);
+        const std::string name = StandInService::readText(call);
         sd_bus_message_read(call, "v", "b", &flag);
         objects[path][name] = {flag != 0};
         changes.back() = name + (flag != 0 ? " on" : " off");
@@ -167,7 +110,7 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
     } else if (member == "Delete") {
         profiles.erase(path);
     } else if (member == "ActivateConnection") {
-        const std::string profile = readText(call, "o");
+        const std::string profile = StandInService::readText(call, "o");
         changes.back() = "Activate " + textIn(profiles.at(profile), "id");
         activate(profile, reply);
     } else if (member == "Disconnect") {
@@ -197,10 +140,7 @@ void StandInDaemon::activate(const std::string& profile, sd_bus_message* reply) 
     for (const std::string& point : std::exchange(quietPoints_, {})) {
         points_.push_back(point);
         objects[card]["LastScan"] = {std::int64_t{++next_}};
-        sd_bus_message* made = nullptr;
-        sd_bus_message_new_signal(bus_, &made, card.c_str(), (prefix + ".Device.Wireless").c_str(),
-                                  "AccessPointAdded");
-        signals_.emplace_back(made);
+        service_.tell(card, ".Device.Wireless", "AccessPointAdded", "");
     }
     moveCard(40);
     moveActive(path, 1);
@@ -225,13 +165,14 @@ void StandInDaemon::leave(std::uint32_t reason) {
     moveCard(deviceDisconnected);
 }
 
-void StandInDaemon::tell(const std::string& path, const char* interface, const char* types,
-                         std::uint32_t state, std::uint32_t reason) {
+void StandInDaemon::moveCard(std::uint32_t state, std::uint32_t reason) {
+    objects[card]["State"] = {state};
+    service_.tell(card, ".Device", "StateChanged", "uuu", state, 0U, reason);
+}
+
+void StandInDaemon::moveActive(const std::string& path, std::uint32_t state) {
     objects[path]["State"] = {state};
-    sd_bus_message* made = nullptr;
-    sd_bus_message_new_signal(bus_, &made, path.c_str(), (prefix + interface).c_str(), "StateChanged");
-    sd_bus_message_append(made, types, state, 0U, reason);
-    signals_.emplace_back(made);
+    service_.tell(path, ".Connection.Active", "StateChanged", "uu", state, 0U);
 }
 
 }  // namespace testing_support

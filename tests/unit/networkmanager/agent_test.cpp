@@ -72,7 +72,7 @@ class Scene {
         } else if (name == "hang") {
             daemon_.hangs = true;
         } else if (name == "refuse") {
-            daemon_.refusal = word();
+            daemon_.refuse(word());
         } else if (name == "within") {
             deadline_ = std::chrono::milliseconds(number());
         } else if (name == "forge") {
@@ -157,13 +157,14 @@ class Scene {
         return text;
     }
 
-    static Host hostOf(const testing_support::PrivateBus& bus) {
+    static Host hostOf(const testing_support::StandInBus& bus) {
         Host host;
         host.systemBusSocket = bus.socket();
         return host;
     }
 
-    const testing_support::PrivateBus bus_{};
+    const testing_support::TemporaryDirectory folder_;
+    const testing_support::StandInBus bus_{folder_.at("bus")};
     StandInDaemon daemon_{bus_};
     const HostOverride override_{hostOf(bus_)};
     const std::shared_ptr<Agent> agent_ = makeNetworkManagerAgent();

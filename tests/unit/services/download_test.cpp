@@ -9,10 +9,10 @@
 #include <thread>
 #include <vector>
 
+#include "platform/CoreServices.h"
 #include "platform/base/FileDescriptor.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
-#include "platform/services/Download.h"
 #include "tests/unit/support/Transcript.h"
 
 namespace {
@@ -90,10 +90,10 @@ class Download : public testing::Test {
     ~Download() override { DisposeHandle(buffer_); }
 
     OSStatus fetch(const std::string& url, std::chrono::milliseconds whole,
-                   std::vector<std::string> libraries = {"libcurl-gnutls.so.4", "libcurl.so.4"}) {
+                   std::vector<std::string> libraries = platform::Host().httpLibraries) {
         platform::Host host;
-        host.downloader =
-            platform::services::makeHttpDownloader({.connecting = whole / 2, .whole = whole}, libraries);
+        host.downloadBound = whole;
+        host.httpLibraries = std::move(libraries);
         const platform::HostOverride override(host);
         const auto begin = std::chrono::steady_clock::now();
         const OSStatus err = URLSimpleDownload(url.c_str(), nullptr, buffer_, 0, nullptr, nullptr);
