@@ -3,6 +3,7 @@
 
 #include <arpa/inet.h>
 
+#include <algorithm>
 #include <string>
 #include <vector>
 
@@ -24,6 +25,12 @@ inline const std::string switchedOff = "__INACTIVE__ = #1;";
 inline Service fixedService(const std::string& device, const std::string& address = "192.0.0.199") {
     return {device, "IPv4 = {ConfigMethod = Manual; Addresses = (" + address +
                         "); SubnetMasks = (255.255.255.0); Router = 192.0.0.192};"};
+}
+
+// Of "device entries".
+inline Service serviceOf(const std::string& text) {
+    const std::size_t space = std::min(text.find(' '), text.size());
+    return {text.substr(0, space), text.substr(space)};
 }
 
 inline values::Owned<CFDictionaryRef> readTree(const std::string& text) {

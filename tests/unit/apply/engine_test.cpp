@@ -1,183 +1,144 @@
-#include <gtest/gtest.h>
-
+// What is committed is what the machine becomes: from a store to agents that lead a made-up machine.
+#include <cmath>
+#include <cstdlib>
 #include <filesystem>
-#include <memory>
 
-#include "platform/apply/Apply.h"
-#include "platform/base/Host.h"
-#include "platform/base/Log.h"
+#include "platform/values/PropertyListXML.h"
 #include "tests/unit/apply/Trees.h"
+#include "tests/unit/preferences/Fixture.h"
 #include "tests/unit/support/RecordingAgent.h"
-#include "tests/unit/support/TemporaryDirectory.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace platform::apply {
 namespace {
 
 using testing_support::RecordingAgent;
-using Services = std::vector<Service>;
 
-class EngineTest : public testing::Test {
-  protected:
-    EngineTest() {
-        agent_->machine = earlier_;
-        install({agent_});
+// A machine of three interfaces, and a store in which a location of this number is current.
+class Scene {
+  public:
+    explicit Scene(int location) : location_(std::to_string(location)) {
+        agent_->machine = {{"eth0", "E"}, {"eth1", "F"}, {"wlan0", "W"}};
+        write("");
+        install();
+        session_ = Session::adopt(SCPreferencesCreate(nullptr, CFSTR("tester"), nullptr));
     }
-    void install(std::vector<std::shared_ptr<Agent>> agents) {
+
+    // What came of it: the status of a failure and the log, then what each agent was asked and changed.
+    std::string play(const std::string& step) {
+        const std::string name = step.substr(0, step.find(' '));
+        const std::string rest = step.substr(std::min(step.size(), name.size() + 1));
+        if (name == "commit") {
+            const auto tree = treeOf(rest);
+            for (const auto& [key, value] : values::entriesOf(tree.get())) {
+                EXPECT_TRUE(SCPreferencesSetValue(session_.get(), static_cast<CFStringRef>(key), value));
+            }
+        } else if (name == "other") {
+            EXPECT_TRUE(
+                SCPreferencesSetValue(session_.get(), CFSTR("Other"), values::makeString(rest).get()));
+        } else if (name == "daemon") {
+            daemon_->machine[rest] = "D";
+            install();
+        } else if (name == "slow") {
+            agent_->slow = daemon_->slow = 1;
+        } else if (name == "fail") {
+            rest.empty() ? agent_->failing.clear() : (void)agent_->failing.insert(rest);
+        } else if (name == "trouble") {
+            rest.empty() ? agent_->troubled.clear() : (void)agent_->troubled.insert(rest);
+        } else if (name == "foreign") {
+            agent_->foreign = {rest};
+        } else if (name == "meanwhile") {
+            agent_->interruption = [this, rest] { write(rest); };
+        } else if (name == "store") {
+            write(rest);
+        } else if (name == "sh") {
+            EXPECT_EQ(0, std::system(("cd " + folder_.path().string() + " && " + rest).c_str())) << rest;
+        }
+        if (name != "commit" && name != "other" && name != "finish") {
+            return "";
+        }
+        const bool isDone = (name == "finish" || SCPreferencesCommitChanges(session_.get()) != 0) &&
+                            SCPreferencesApplyChanges(session_.get()) != 0;
+        std::vector<std::string> told;
+        if (!isDone) {
+            told.push_back(std::to_string(SCError()));
+        }
+        for (const std::string& line : std::exchange(log_, {})) {
+            const std::size_t path = line.find(folder_.path().string());
+            told.push_back(path == std::string::npos
+                               ? line
+                               : std::string(line).erase(path, folder_.path().string().size() + 1));
+        }
+        take(*daemon_, told);
+        take(*agent_, told);
+        if (!std::filesystem::exists(folder_.at("run/applied.plist"))) {
+            told.emplace_back("no record");
+        }
+        return joined(told, "\n");
+    }
+
+  private:
+    using Session = values::Owned<SCPreferencesRef>;
+
+    void install() {
         override_.reset();
         Host host;
+        host.preferencesDirectory = folder_.at("store");
         host.runtimeDirectory = folder_.at("run");
-        host.agents = std::move(agents);
+        host.agents = {agent_};
+        if (!daemon_->machine.empty()) {
+            host.agents.insert(host.agents.begin(), daemon_);
+        }
         override_ = std::make_unique<HostOverride>(host);
     }
-    // A commit of these services in place of the last one's: why it failed.
-    std::string apply(const Services& services) {
-        const auto replaced = std::exchange(committed_, makeTree(services));
-        return applyTree(committed_.get(), replaced.get()).reason();
+    values::Owned<CFDictionaryRef> treeOf(const std::string& services) const {
+        std::vector<Service> all;
+        for (const std::string& each : testing_support::Transcript::inputsIn(services)) {
+            all.push_back(serviceOf(each));
+        }
+        return makeTree(services.empty() ? std::vector<Service>() : all, location_);
     }
-    // A commit that does not change the plan.
-    std::string commitOther() {
-        const auto copy = values::Owned<CFMutableDictionaryRef>::adopt(
-            CFDictionaryCreateMutableCopy(kCFAllocatorDefault, 0, committed_.get()));
-        CFDictionarySetValue(copy.get(), CFSTR("Another"), CFSTR("value"));
-        return applyTree(committed_.get(), copy.get()).reason();
+    void write(const std::string& services) const {
+        (void)folder_.write("store/preferences.plist", *values::writePropertyListXML(treeOf(services).get()));
     }
-    std::string finish() { return applyTree(committed_.get(), nullptr).reason(); }
-    // What was asked and changed since the last look.
-    Lines taken(RecordingAgent& agent) {
-        Lines all = std::exchange(agent.calls, {});
-        const Lines changes = std::exchange(agent.changes, {});
-        all.insert(all.end(), changes.begin(), changes.end());
-        return all;
+    static std::string joined(const std::vector<std::string>& parts, const char* between) {
+        std::string text;
+        for (const std::string& part : parts) {
+            text += (text.empty() ? "" : between) + part;
+        }
+        return text;
     }
-    Lines taken() { return taken(*agent_); }
-    Lines log() { return std::exchange(log_, {}); }
-    bool hasRecord() const { return std::filesystem::exists(folder_.at("run/applied.plist")); }
+    static void take(RecordingAgent& agent, std::vector<std::string>& told) {
+        const std::string name(agent.name());
+        if (!agent.calls.empty()) {
+            told.push_back(name + ": " + joined(std::exchange(agent.calls, {}), "; ") + ", " +
+                           std::to_string(std::lround(agent.seconds)) + " s");
+        }
+        if (!agent.changes.empty()) {
+            told.push_back(name + ": " + joined(std::exchange(agent.changes, {}), "; "));
+        }
+    }
 
-    const Services there_{{"eth0", switchedOff}, fixedService("wlan0")};
-    const std::map<std::string, std::string> earlier_{{"eth0", "E"}, {"eth1", "F"}, {"wlan0", "W"}};
+    const std::string location_;
     const testing_support::TemporaryDirectory folder_;
-    const std::shared_ptr<RecordingAgent> agent_ = std::make_shared<RecordingAgent>();
-    values::Owned<CFDictionaryRef> committed_ = makeTree({});
-    Lines log_;
+    const std::shared_ptr<RecordingAgent> agent_ = std::make_shared<RecordingAgent>("agent");
+    const std::shared_ptr<RecordingAgent> daemon_ = std::make_shared<RecordingAgent>("daemon");
+    std::vector<std::string> log_;
     const LogCapture capture_{[this](LogLevel, std::string_view text) { log_.emplace_back(text); }};
     std::unique_ptr<HostOverride> override_;
+    Session session_;
 };
 
-TEST_F(EngineTest, GoesThereAndBackAndAsksNobodyForTheSameAgain) {
-    EXPECT_EQ("", apply({}));
-    EXPECT_FALSE(std::filesystem::exists(folder_.at("run")));
-
-    agent_->slow = 1;
-    EXPECT_EQ("", apply(there_));
-    EXPECT_EQ((Lines{"capture eth0 wlan0", "takeOver eth0", "takeOver wlan0", "settle", "settle",
-                     "eth0: E -> ours: off", "wlan0: W -> ours: manual 0"}),
-              taken())
-        << "all are started before any is waited for";
-    EXPECT_NEAR(20, agent_->seconds, 1);
-    agent_->slow = 0;
-    EXPECT_EQ("", commitOther() + finish());
-    EXPECT_EQ(Lines{}, taken());
-
-    // Whoever commits the same once more wants the machine looked at.
-    EXPECT_EQ("", apply(there_));
-    EXPECT_EQ((Lines{"takeOver eth0", "takeOver wlan0", "settle"}), taken());
-
-    // A changed interface is made anew, a new one captured, one no longer named given back, all against the
-    // first capture.
-    EXPECT_EQ("", apply({fixedService("wlan0", "10.0.0.1"), fixedService("eth1")}));
-    EXPECT_EQ((Lines{"giveBack eth0", "settle", "capture eth1", "takeOver wlan0", "takeOver eth1", "settle",
-                     "eth0: ours: off -> E", "eth1: F -> ours: manual 1"}),
-              taken());
-    EXPECT_EQ("", apply({fixedService("*")}));
-    EXPECT_EQ((Lines{"giveBack wlan0", "giveBack eth1", "settle", "wlan0: ours: manual 0 -> W",
-                     "eth1: ours: manual 1 -> F"}),
-              taken());
-    EXPECT_NEAR(15, agent_->seconds, 1);
-    EXPECT_FALSE(hasRecord());
-    EXPECT_EQ(earlier_, agent_->machine);
-}
-
-TEST_F(EngineTest, TellsWhatTheMachineRefusedAndOnlyLogsTheRest) {
-    agent_->foreign = {"eth1"};
-    agent_->troubled = {"takeOver wlan0"};
-    EXPECT_EQ("", apply({{"eth0", switchedOff},
-                         fixedService("wlan0"),
-                         fixedService("eth7"),
-                         fixedService("eth1"),
-                         {"eth2", "IPv4 = {ConfigMethod = #true};"}}));
-    EXPECT_EQ((Lines{"eth2: its settings cannot be used, and it is left to the system: \"ConfigMethod\" is "
-                     "not a string",
-                     "eth1: it is somebody else's", "eth7: there is no such interface",
-                     "wlan0: takeOver wlan0 met trouble"}),
-              log());
-    taken();
-    EXPECT_EQ("", commitOther() + finish());
-    EXPECT_EQ(Lines{}, taken()) << "nothing of this is unfinished";
-    EXPECT_EQ(Lines{}, log());
-
-    // What failed is tried again, once in a process, and is only logged.
-    agent_->troubled.clear();
-    agent_->failing = {"takeOver eth0"};
-    EXPECT_EQ("takeOver eth0 was told to fail", apply(there_));
-    taken();
-    EXPECT_EQ("", commitOther());
-    EXPECT_EQ((Lines{"takeOver eth0", "takeOver wlan0", "settle"}), taken());
-    EXPECT_EQ("", commitOther());
-    EXPECT_EQ(Lines{}, taken());
-    log();
-    agent_->failing.insert("takeOver wlan0");
-    EXPECT_EQ("takeOver eth0 was told to fail", apply(there_));
-    EXPECT_EQ((Lines{"eth0: takeOver eth0 was told to fail", "wlan0: takeOver wlan0 was told to fail"}),
-              log());
-    agent_->failing = {"capture eth7"};
-    EXPECT_EQ("capture eth7 was told to fail", apply({there_[0], there_[1], fixedService("eth7")}));
-    EXPECT_EQ(Lines{"capture eth7 was told to fail"}, log());
-
-    // What cannot be given back keeps its entry until it can; trouble on the way back is no reason to keep
-    // it.
-    agent_->failing = {"giveBack wlan0"};
-    EXPECT_EQ("giveBack wlan0 was told to fail", apply({}));
-    EXPECT_TRUE(hasRecord());
-    agent_->failing.clear();
-    agent_->troubled = {"giveBack wlan0"};
-    taken();
-    EXPECT_EQ("", apply({}));
-    EXPECT_EQ((Lines{"giveBack wlan0", "settle", "wlan0: ours: manual 0 -> W"}), taken());
-    EXPECT_FALSE(hasRecord());
-}
-
-TEST_F(EngineTest, ChoosesAnAgentForEachInterface) {
-    const auto daemon = std::make_shared<RecordingAgent>("daemon");
-    install({daemon, agent_});
-    daemon->machine = {{"wlan0", "D"}};
-    agent_->slow = 1;
-    EXPECT_EQ("", apply(there_));
-    EXPECT_EQ(
-        (Lines{"capture eth0 wlan0", "takeOver wlan0", "settle", "settle", "wlan0: D -> ours: manual 0"}),
-        taken(*daemon))
-        << "each is asked until all have settled";
-    EXPECT_EQ((Lines{"capture eth0", "takeOver eth0", "settle", "settle", "eth0: E -> ours: off"}), taken());
-
-    // The daemon has begun to lead eth0 too.
-    daemon->machine["eth0"] = "D";
-    EXPECT_EQ("", apply(there_));
-    EXPECT_EQ("ours: off", daemon->machine["eth0"]);
-    EXPECT_EQ("E", agent_->machine["eth0"]);
-    EXPECT_EQ("", apply({}));
-    EXPECT_EQ(earlier_, agent_->machine);
-    EXPECT_EQ("D", daemon->machine["wlan0"]);
-}
-
-TEST_F(EngineTest, ChangesNothingWithoutARecordItCanRead) {
-    ASSERT_EQ("", apply(there_));
-    taken();
-    for (const char* const broken : {"", "<plist><array/></plist>", "<plist><dict/></plist>"}) {
-        folder_.write("run/applied.plist", broken);
-        EXPECT_NE("", apply({}));
-        EXPECT_EQ("", finish());
-        EXPECT_EQ(2U, log().size());
-        EXPECT_EQ(Lines{}, taken());
-    }
+TEST(Engine, MakesTheMachineWhatIsCommitted) {
+    std::unique_ptr<Scene> scene;
+    testing_support::Transcript("engine").playItself([&, location = 0](const std::string& step) mutable {
+        if (step == "another machine") {
+            scene.reset();
+            scene = std::make_unique<Scene>(++location);
+            return std::string();
+        }
+        return scene->play(step);
+    });
 }
 
 }  // namespace

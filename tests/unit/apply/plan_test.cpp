@@ -34,8 +34,7 @@ std::string describe(const std::vector<ManualAddress>& addresses, IPv4Address ro
 std::string planOf(const Inputs& inputs) {
     std::vector<Service> services;
     for (const std::string& each : inputs) {
-        const std::size_t space = each.find(' ');
-        services.push_back({each.substr(0, space), each.substr(std::min(space, each.size()))});
+        services.push_back(serviceOf(each));
     }
     std::vector<Trouble> troubles;
     std::string text;

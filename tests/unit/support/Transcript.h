@@ -102,7 +102,7 @@ class Transcript {
         }
     }
 
-  private:
+    // Of "input | input".
     static Inputs inputsIn(std::string_view line) {
         const std::size_t end = line.find(" | ");
         Inputs inputs{unescaped(line.substr(0, end))};
@@ -112,6 +112,7 @@ class Transcript {
         return inputs;
     }
 
+  private:
     std::string path_;
     std::string expected_;
     std::string text_;
