@@ -8,9 +8,11 @@
 
 #include "app/NetworkWatcher.h"
 #include "morecfq/MoreCFQ.h"
+#include "platform/base/Host.h"
 #include "platform/values/RunLoop.h"
 #include "tests/unit/live/Fixture.h"
 #include "tests/unit/support/Notation.h"
+#include "tests/unit/support/TemporaryDirectory.h"
 #include "tests/unit/support/Transcript.h"
 
 namespace {

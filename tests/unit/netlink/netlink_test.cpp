@@ -36,6 +36,7 @@ TEST(Message, LengthsThatLeaveItEndTheWalk) {
     ASSERT_EQ(2U, taken.size());
     EXPECT_EQ("card0", taken[1].attributes<ifaddrmsg>().find(IFA_LABEL)->text());
     EXPECT_EQ(addressBody, toHex(taken[1].payload()));
+    EXPECT_FALSE(taken[1].attributes<ifaddrmsg>().u32(IFA_LABEL)) << "six bytes";
     const struct {
         const char* attributes;
         int count;
@@ -81,10 +82,13 @@ TEST_F(SocketTest, AsksDumpsExplainsAndTakesNotices) {
         ASSERT_TRUE(socket.open().ok());
         std::vector<Message> links;
         EXPECT_TRUE(socket.dump(Message(RTM_GETLINK, NLM_F_REQUEST | NLM_F_DUMP, ifinfomsg{}), links).ok());
+        EXPECT_TRUE(socket.dump(Message(RTM_GETLINK, NLM_F_REQUEST | NLM_F_DUMP, ifinfomsg{}), links).ok());
         EXPECT_EQ(3U, links.size());
         std::optional<Link> link;
         EXPECT_TRUE(findLink(socket, "card0", link).ok());
         EXPECT_TRUE(link && link->index == 3 && link->up && !link->running);
+        EXPECT_TRUE(findLink(socket, 2, link).ok());
+        EXPECT_TRUE(link && !link->up);
         shell("ip link set far0 up");
         EXPECT_TRUE(findLink(socket, 2, link).ok());
         EXPECT_TRUE(link && link->name == "far0" && link->running);
@@ -103,8 +107,10 @@ TEST_F(SocketTest, AsksDumpsExplainsAndTakesNotices) {
         EXPECT_EQ(2U, socket.takeNotices(overrun).size());
         EXPECT_FALSE(overrun);
         shell("ip addr del 10.0.0.2/8 dev lo");
-        EXPECT_TRUE(findLink(socket, "none", link).ok());
-        EXPECT_FALSE(link) << "a notice that is there is no answer";
+        Message answer = links[0];
+        Message question(RTM_GETLINK, NLM_F_REQUEST | NLM_F_ACK, ifinfomsg{});
+        EXPECT_TRUE(socket.ask(question.addText(IFLA_IFNAME, "none"), answer, {ENODEV}).ok());
+        EXPECT_EQ(0, answer.type()) << "a notice that is there is no answer";
         EXPECT_EQ(ENODEV, socket.error());
     });
 }
