@@ -108,6 +108,21 @@ OSStatus CFQMutableDictionaryGetParentForPath(CFMutableDictionaryRef dict, const
     return err;
 }
 
+struct DeepWalk {
+    CFQPropertyListDeepApplierFunction func;
+    void* context;
+};
+
+// One node of a deep walk, then what is in it.
+void WalkDeep(CFTypeRef /*key*/, CFPropertyListRef node, void* context) {
+    const auto* walk = static_cast<const DeepWalk*>(context);
+    // The walk's function may take the node out of the container that held it.
+    CFQRetain(node);
+    walk->func(node, walk->context);
+    CFQPropertyListShallowApplyFunction(node, WalkDeep, context);
+    CFQRelease(node);
+}
+
 }  // namespace
 
 CFTypeRef CFQRetain(CFTypeRef value) {
@@ -259,27 +274,8 @@ OSStatus CFQDictionaryRemoveValueAtPathArray(CFMutableDictionaryRef dict, CFArra
 
 void CFQPropertyListDeepApplyFunction(CFPropertyListRef propList, CFQPropertyListDeepApplierFunction func,
                                       void* context) {
-    // func may take the node out of the container that held it.
-    CFQRetain(propList);
-    func(propList, context);
-    if (IsDictionary(propList)) {
-        auto* const dict = static_cast<CFDictionaryRef>(propList);
-        CFArrayRef keys = CreateArrayOfKeysForWalk(dict);
-        const CFIndex count = CFArrayGetCount(keys);
-        for (CFIndex i = 0; i < count; ++i) {
-            CFTypeRef value = nullptr;
-            if (CFDictionaryGetValueIfPresent(dict, CFArrayGetValueAtIndex(keys, i), &value)) {
-                CFQPropertyListDeepApplyFunction(value, func, context);
-            }
-        }
-        CFQRelease(keys);
-    } else if (IsArray(propList)) {
-        auto* const array = static_cast<CFArrayRef>(propList);
-        for (CFIndex i = 0; i < CFArrayGetCount(array); ++i) {
-            CFQPropertyListDeepApplyFunction(CFArrayGetValueAtIndex(array, i), func, context);
-        }
-    }
-    CFQRelease(propList);
+    DeepWalk walk = {func, context};
+    WalkDeep(nullptr, propList, &walk);
 }
 
 void CFQPropertyListShallowApplyFunction(CFPropertyListRef propList,

@@ -186,12 +186,10 @@ const char* readAirPort(CFDictionaryRef entity, InterfacePlan& plan) {
     if (const CFTypeRef power = valueIn(entity, CFSTR("PowerEnabled"))) {
         const auto flag = values::as<CFBooleanRef>(power);
         const auto number = values::as<CFNumberRef>(power);
-        std::int64_t on = 0;
         if (flag != nullptr) {
-            settings.powerEnabled = CFBooleanGetValue(flag) != 0;
-        } else if (number != nullptr && CFNumberIsFloatType(number) == 0 &&
-                   CFNumberGetValue(number, kCFNumberSInt64Type, &on) != 0) {
-            settings.powerEnabled = on != 0;
+            settings.powerEnabled = flag == kCFBooleanTrue;
+        } else if (const auto on = number != nullptr ? values::integerOf(number) : std::nullopt) {
+            settings.powerEnabled = *on != 0;
         } else {
             return "\"PowerEnabled\" is neither a boolean nor a number";
         }

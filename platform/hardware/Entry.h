@@ -2,37 +2,22 @@
 // properties that the entries carry.
 #pragma once
 
-#include <cstdint>
 #include <memory>
 #include <optional>
-#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "platform/CoreFoundation.h"
-#include "platform/values/Values.h"
+#include "platform/values/Object.h"
 
 namespace platform::hardware {
 
 inline constexpr std::string_view ethernetClass = "IOEthernetInterface";
 inline constexpr std::string_view serialClass = "IOSerialBSDClient";
 
-struct Property {
-    CFStringRef key;
-    values::Owned<CFTypeRef> value;  // null: left out
-};
-// Null when the text is not UTF-8.
-[[nodiscard]] values::Owned<CFTypeRef> textValue(std::string_view text);
-// The text and a NUL behind it, as firmware gives its names.
-[[nodiscard]] values::Owned<CFTypeRef> firmwareValue(const std::string& text);
-[[nodiscard]] values::Owned<CFTypeRef> dataValue(std::span<const std::uint8_t> bytes);
-[[nodiscard]] values::Owned<CFTypeRef> numberValue(std::int64_t number);
-
 // Never changes once it is made, and keeps its parents alive.
 struct Entry {
-    Entry(std::string_view ofClass, const std::vector<Property>& with, std::shared_ptr<const Entry> above);
-
     // Empty for a parent, of which only the properties are of interest.
     std::string_view className;
     values::Owned<CFDictionaryRef> properties;

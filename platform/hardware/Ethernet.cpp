@@ -1,3 +1,5 @@
+#include <netinet/ether.h>
+
 #include <algorithm>
 #include <array>
 #include <charconv>
@@ -5,17 +7,18 @@
 #include <map>
 #include <optional>
 #include <set>
+#include <span>
 #include <tuple>
 #include <utility>
 
 #include "platform/base/DeviceText.h"
 #include "platform/hardware/Entry.h"
 #include "platform/hardware/Sysfs.h"
+#include "platform/values/Fields.h"
 
 namespace platform::hardware {
 namespace {
 
-using Value = values::Owned<CFTypeRef>;
 using MacAddress = std::array<std::uint8_t, 6>;
 
 enum class Bus { pci, usb, other };
@@ -54,18 +57,13 @@ std::optional<int> numberFrom(std::string_view text) {
     return number;
 }
 
-std::optional<MacAddress> macAddressFrom(std::string_view text) {
-    MacAddress bytes{};
-    if (text.size() != bytes.size() * 3 - 1) {
+std::optional<MacAddress> macAddressFrom(const std::string& text) {
+    constexpr std::size_t size = 17;
+    ether_addr address{};
+    if (text.size() != size || ether_aton_r(text.c_str(), &address) == nullptr) {
         return std::nullopt;
     }
-    for (std::size_t i = 0; i < bytes.size(); ++i) {
-        const char* digits = text.data() + i * 3;
-        const auto [rest, error] = std::from_chars(digits, digits + 2, bytes[i], 16);
-        if (error != std::errc() || rest != digits + 2 || (i + 1 < bytes.size() && *rest != ':')) {
-            return std::nullopt;
-        }
-    }
+    const MacAddress bytes = std::to_array(address.ether_addr_octet);
     // Zeros are what a driver shows that has no address to give.
     return bytes == MacAddress{} ? std::nullopt : std::optional(bytes);
 }
@@ -190,31 +188,35 @@ std::string slotLabelOf(const Port& port, const std::map<std::string, std::strin
     return std::string(lastComponent(port.busDevice));
 }
 
+// The text and a NUL behind it, as firmware gives its names.
+std::vector<std::byte> firmwareText(const std::string& text) {
+    const auto bytes = std::as_bytes(std::span(text.c_str(), text.size() + 1));
+    return {bytes.begin(), bytes.end()};
+}
+
 EntryRef busEntry(const Port& port, const std::map<std::string, std::string>& slots) {
+    values::FieldWriter properties;
     // With the bus in front the name is never by accident one that a name rule looks for.
-    const std::string name = linkedName(port.busDevice + "/subsystem").value_or("device") + ":" +
-                             std::string(lastComponent(port.busDevice));
-    const bool isPci = port.bus == Bus::pci;
-    return std::make_shared<const Entry>(
-        "",
-        std::vector<Property>{
-            {CFSTR("name"), firmwareValue(name)},
-            {CFSTR("AAPL,slot-name"), isPci ? firmwareValue("SLOT-" + slotLabelOf(port, slots)) : Value()},
-            {CFSTR("IOChildIndex"), port.index ? numberValue(*port.index) : Value()}},
-        nullptr);
+    properties("name", firmwareText(linkedName(port.busDevice + "/subsystem").value_or("device") + ":" +
+                                    std::string(lastComponent(port.busDevice))));
+    if (port.bus == Bus::pci) {
+        properties("AAPL,slot-name", firmwareText("SLOT-" + slotLabelOf(port, slots)));
+    }
+    properties("IOChildIndex", port.index);
+    return std::make_shared<const Entry>(Entry{"", properties.take(), nullptr});
 }
 
 EntryRef controllerEntry(const Port& port, EntryRef bus) {
-    const auto address = macAddressOf(port);
     const bool isWireless = exists(port.node + "/phy80211") || exists(port.node + "/wireless");
     const std::string driverClass =
         (isWireless ? "AirPort" : "") + linkedName(port.device + "/driver").value_or("");
-    return std::make_shared<const Entry>(
-        "",
-        std::vector<Property>{{CFSTR("IOMACAddress"), address ? dataValue(*address) : Value()},
-                              {CFSTR("IOClass"), driverClass.empty() ? Value() : textValue(driverClass)},
-                              {CFSTR("IOProviderClass"), textValue(providerClassOf(port.bus))}},
-        std::move(bus));
+    values::FieldWriter properties;
+    properties("IOMACAddress", macAddressOf(port));
+    if (!driverClass.empty()) {
+        properties("IOClass", driverClass);
+    }
+    properties("IOProviderClass", std::string(providerClassOf(port.bus)));
+    return std::make_shared<const Entry>(Entry{"", properties.take(), std::move(bus)});
 }
 
 }  // namespace
@@ -235,9 +237,10 @@ std::optional<std::vector<EntryRef>> scanEthernet(const std::string& sysfsRoot) 
     const auto slots = labelsOfSlots(root);
     std::vector<EntryRef> entries;
     for (const Port& port : ports) {
+        values::FieldWriter properties;
+        properties("BSD Name", port.name);
         entries.push_back(std::make_shared<const Entry>(
-            ethernetClass, std::vector<Property>{{CFSTR("BSD Name"), textValue(port.name)}},
-            controllerEntry(port, busEntry(port, slots))));
+            Entry{ethernetClass, properties.take(), controllerEntry(port, busEntry(port, slots))}));
     }
     return entries;
 }

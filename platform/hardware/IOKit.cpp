@@ -103,7 +103,7 @@ kern_return_t IOMasterPort(mach_port_t /*bootstrapPort*/, mach_port_t* masterPor
 }
 
 CFMutableDictionaryRef IOServiceMatching(const char* className) noexcept {
-    const auto name = textValue(className != nullptr ? className : "");
+    const auto name = platform::values::makeString(className != nullptr ? className : "");
     if (className == nullptr || !name) {
         return nullptr;
     }

@@ -4,14 +4,13 @@
 #include "platform/base/DeviceText.h"
 #include "platform/hardware/Entry.h"
 #include "platform/hardware/Sysfs.h"
+#include "platform/values/Fields.h"
 
 namespace platform::hardware {
 namespace {
 
-using Value = values::Owned<CFTypeRef>;
-
 struct Stream {
-    const char* type;
+    std::string type;
     std::string baseName;
 };
 
@@ -46,17 +45,17 @@ std::vector<std::string> activeConsoles(const std::string& root) {
 }
 
 EntryRef serialEntry(const std::string& name, const std::string& device, const std::string& root) {
+    values::FieldWriter ofDevice;
+    if (const std::string product = productOf(device, root); !product.empty()) {
+        ofDevice("Product Name", product);
+    }
     const Stream stream = streamOf(name);
-    const std::string product = productOf(device, root);
-    const auto above = std::make_shared<const Entry>(
-        "", std::vector<Property>{{CFSTR("Product Name"), product.empty() ? Value() : textValue(product)}},
-        nullptr);
-    return std::make_shared<const Entry>(
-        serialClass,
-        std::vector<Property>{{CFSTR("IOTTYDevice"), textValue(name)},
-                              {CFSTR("IOTTYBaseName"), textValue(stream.baseName)},
-                              {CFSTR("IOSerialBSDClientType"), textValue(stream.type)}},
-        above);
+    values::FieldWriter properties;
+    properties("IOTTYDevice", name);
+    properties("IOTTYBaseName", stream.baseName);
+    properties("IOSerialBSDClientType", stream.type);
+    return std::make_shared<const Entry>(Entry{
+        serialClass, properties.take(), std::make_shared<const Entry>(Entry{"", ofDevice.take(), nullptr})});
 }
 
 }  // namespace

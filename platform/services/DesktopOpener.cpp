@@ -191,7 +191,7 @@ OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL) noexcept {
     if (url == nullptr || openedURL != nullptr) {
         return paramErr;
     }
-    const std::string text(platform::values::textOf(CFURLGetString(url)));
+    const std::string text(platform::values::descriptionOf(url));
     // A page, never a file or whatever else the desktop would know how to run.
     if (strncasecmp(text.c_str(), "http://", 7) != 0 && strncasecmp(text.c_str(), "https://", 8) != 0) {
         return paramErr;

@@ -20,8 +20,38 @@ std::span<const CFTypeRef> itemsIn(CFArrayRef array, CFRange range) {
 
 }  // namespace
 
+OpaqueCFArray::OpaqueCFArray(bool isMutable, std::span<Owned<CFTypeRef>> items)
+    : OpaqueCFArray(isMutable, true) {
+    items_.reserve(items.size());
+    for (Owned<CFTypeRef>& item : items) {
+        items_.push_back(item.take());
+    }
+}
+
+OpaqueCFArray::OpaqueCFArray(bool isMutable, const OpaqueCFArray& other)
+    : OpaqueCFArray(isMutable, other.retainsValues()) {
+    items_.reserve(other.count());
+    std::ranges::for_each(other.items_, [this](CFTypeRef item) { append(item); });
+}
+
+OpaqueCFArray::~OpaqueCFArray() {
+    if (retainsValues()) {
+        releaseAll(items_);
+    }
+}
+
+void OpaqueCFArray::remove(std::size_t position) {
+    const auto place = items_.begin() + static_cast<std::ptrdiff_t>(position);
+    releaseValue(*place);
+    items_.erase(place);
+}
+
+void OpaqueCFArray::reorder(std::span<const CFTypeRef> items, std::size_t position) noexcept {
+    std::ranges::copy(items, items_.begin() + static_cast<std::ptrdiff_t>(position));
+}
+
 std::span<const CFTypeRef> platform::values::itemsOf(CFArrayRef array) noexcept {
-    return array->storage().items();
+    return array->slots();
 }
 
 CFTypeID CFArrayGetTypeID() noexcept {
@@ -30,19 +60,19 @@ CFTypeID CFArrayGetTypeID() noexcept {
 
 CFArrayRef CFArrayCreate(CFAllocatorRef, const void** values, CFIndex count,
                          const CFArrayCallBacks* callBacks) noexcept {
-    auto* const array = makeContainer<OpaqueCFArray>(false, callBacks != nullptr);
+    auto* const array = new OpaqueCFArray(false, callBacks != nullptr);
     for (CFIndex i = 0; i < count; ++i) {
-        array->writable().append(values[i]);
+        array->append(values[i]);
     }
     return array;
 }
 
 CFMutableArrayRef CFArrayCreateMutable(CFAllocatorRef, CFIndex, const CFArrayCallBacks* callBacks) noexcept {
-    return makeContainer<OpaqueCFArray>(true, callBacks != nullptr);
+    return new OpaqueCFArray(true, callBacks != nullptr);
 }
 
 CFMutableArrayRef CFArrayCreateMutableCopy(CFAllocatorRef, CFIndex, CFArrayRef array) noexcept {
-    return shareStorage(*array, true);
+    return new OpaqueCFArray(true, *array);
 }
 
 CFIndex CFArrayGetCount(CFArrayRef array) noexcept {
@@ -66,14 +96,14 @@ CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void*
 void CFArrayAppendValue(CFMutableArrayRef array, const void* value) noexcept {
     assert(array->isMutable());
     if (array->isMutable()) {
-        array->writable().append(value);
+        array->append(value);
     }
 }
 
 void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index) noexcept {
     assert(array->isMutable());
     if (array->isMutable() && index >= 0 && index < CFArrayGetCount(array)) {
-        array->writable().removeItem(static_cast<std::size_t>(index));
+        array->remove(static_cast<std::size_t>(index));
     }
 }
 
@@ -89,7 +119,7 @@ void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunct
     std::ranges::stable_sort(sorted, [&](CFTypeRef lhs, CFTypeRef rhs) {
         return comparator(lhs, rhs, context) == kCFCompareLessThan;
     });
-    array->writable().reorder(sorted, static_cast<std::size_t>(range.location));
+    array->reorder(sorted, static_cast<std::size_t>(range.location));
 }
 
 CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value,

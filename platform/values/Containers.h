@@ -1,7 +1,6 @@
-// Dictionaries and arrays: handles on storage that they share until one of them writes.
+// Dictionaries and arrays, and telling the kinds of values apart.
 #pragma once
 
-#include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
@@ -16,127 +15,122 @@
 
 namespace platform::values {
 
-// A counted block of items in their order: one pointer an item for an array, key and value for a dictionary.
-//
-// A removed dictionary entry leaves a hole (a null key) until the next enumeration, so that removing
-// thousands of entries one by one does not move the rest thousands of times. Look-up is linear in a small
-// dictionary and through an index of positions in a large one.
-class Storage {
-  public:
-    enum class Shape : std::uint8_t { array = 1, dictionary = 2 };
-
-    Storage(Shape shape, bool retainsValues) noexcept : shape_(shape), retainsValues_(retainsValues) {}
-    // With these items (for a dictionary key, value, key, value, ...), which it takes over.
-    Storage(Shape shape, std::span<Owned<CFTypeRef>> slots);
-    Storage(const Storage&) = delete;
-    Storage& operator=(const Storage&) = delete;
-
-    [[nodiscard]] Storage* retain() noexcept {
-        references_.fetch_add(1, std::memory_order_relaxed);
-        return this;
-    }
-    void release() noexcept;
-    // Storage with this content that nobody else holds; consumes a reference.
-    [[nodiscard]] Storage* writable();
-
-    [[nodiscard]] std::size_t count() const noexcept { return live_; }
-    [[nodiscard]] bool retainsValues() const noexcept { return retainsValues_; }
-
-    // The items of an array.
-    [[nodiscard]] std::span<const CFTypeRef> items() const noexcept { return slots_; }
-    void append(CFTypeRef value);
-    void removeItem(std::size_t position);
-    void reorder(std::span<const CFTypeRef> items, std::size_t position) noexcept;
-
-    static constexpr std::size_t absent = SIZE_MAX;
-    // The entries of a dictionary; fills the holes first.
-    [[nodiscard]] std::span<const Entry> entries();
-    // The position of the entry, or absent.
-    [[nodiscard]] std::size_t find(CFTypeRef key);
-    [[nodiscard]] CFTypeRef valueAt(std::size_t position) const noexcept { return slots_[2 * position + 1]; }
-    // The key must not be there.
-    void addEntry(CFTypeRef key, CFTypeRef value);
-    void replaceValue(std::size_t position, CFTypeRef value);
-    void removeEntry(std::size_t position);
-    // Whether no two keys are equal, as they are in every dictionary that was not made from slots.
-    [[nodiscard]] bool hasDistinctKeys();
-
-  private:
-    struct KeyHash {
-        std::size_t operator()(CFTypeRef key) const noexcept { return hashOfValue(key); }
-    };
-    struct KeyEqual {
-        bool operator()(CFTypeRef lhs, CFTypeRef rhs) const { return equalValues(lhs, rhs); }
-    };
-    using Index = std::unordered_map<CFTypeRef, std::size_t, KeyHash, KeyEqual>;
-
-    ~Storage();
-    [[nodiscard]] std::size_t width() const noexcept { return static_cast<std::size_t>(shape_); }
-    [[nodiscard]] bool isIndexed() const noexcept;
-    void releaseSlot(std::size_t slot) const noexcept;
-    void fillHoles();
-    void buildIndex();
-
-    std::atomic<std::int32_t> references_{1};
-    Shape shape_;
-    bool retainsValues_;
-    std::vector<CFTypeRef> slots_;
-    std::size_t live_ = 0;
-    std::unique_ptr<Index> index_;
-};
-
-// What the two kinds of handles have in common.
+// What the two kinds of containers have in common.
 class Container : public Object {
   public:
-    ~Container() override { storage_->release(); }
-
-    [[nodiscard]] std::size_t count() const noexcept { return storage_->count(); }
     [[nodiscard]] bool isMutable() const noexcept { return mutable_; }
-    [[nodiscard]] bool retainsValues() const noexcept { return storage_->retainsValues(); }
-    [[nodiscard]] Storage& storage() const noexcept { return *storage_; }
-    // Storage that may be written to.
-    [[nodiscard]] Storage& writable() {
-        storage_ = storage_->writable();
-        return *storage_;
-    }
+    [[nodiscard]] bool retainsValues() const noexcept { return retainsValues_; }
 
   protected:
-    // Takes over a reference to the storage.
-    Container(Type type, bool isMutable, Storage* storage) noexcept
-        : Object(type), mutable_(isMutable), storage_(storage) {}
+    Container(Type type, bool isMutable, bool retainsValues) noexcept
+        : Object(type), mutable_(isMutable), retainsValues_(retainsValues) {}
+    [[nodiscard]] CFTypeRef retained(CFTypeRef value) const noexcept {
+        return retainsValues_ ? CFRetain(value) : value;
+    }
+    void releaseValue(CFTypeRef value) const noexcept {
+        if (retainsValues_) {
+            CFRelease(value);
+        }
+    }
+    // Gives back what a container held that is being destroyed; null counts for nothing.
+    static void releaseAll(std::span<const CFTypeRef> held) noexcept;
 
   private:
     bool mutable_;
-    Storage* storage_;
+    bool retainsValues_;
 };
 
 }  // namespace platform::values
 
-struct OpaqueCFDictionary final : platform::values::Container {
-    static constexpr auto shape = platform::values::Storage::Shape::dictionary;
-    OpaqueCFDictionary(bool isMutable, platform::values::Storage* storage) noexcept
-        : Container(platform::values::Type::dictionary, isMutable, storage) {}
+struct OpaqueCFArray final : platform::values::Container {
+    OpaqueCFArray(bool isMutable, bool retainsValues) noexcept
+        : Container(platform::values::Type::array, isMutable, retainsValues) {}
+    // With these items, which it takes over.
+    OpaqueCFArray(bool isMutable, std::span<platform::values::Owned<CFTypeRef>> items);
+    // A copy, one level deep.
+    OpaqueCFArray(bool isMutable, const OpaqueCFArray& other);
+    ~OpaqueCFArray() override;
 
-    void set(CFTypeRef key, CFTypeRef value, bool replace);
-    void remove(CFTypeRef key);
+    [[nodiscard]] std::size_t count() const noexcept { return items_.size(); }
+    [[nodiscard]] std::span<const CFTypeRef> slots() const noexcept { return items_; }
+    void append(CFTypeRef value) { items_.push_back(retained(value)); }
+    void remove(std::size_t position);
+    // Puts items that it holds in another order, from a position on.
+    void reorder(std::span<const CFTypeRef> items, std::size_t position) noexcept;
+
+  private:
+    std::vector<CFTypeRef> items_;
 };
 
-struct OpaqueCFArray final : platform::values::Container {
-    static constexpr auto shape = platform::values::Storage::Shape::array;
-    OpaqueCFArray(bool isMutable, platform::values::Storage* storage) noexcept
-        : Container(platform::values::Type::array, isMutable, storage) {}
+// A removed entry leaves a hole (a null key) until the next enumeration, so that removing thousands of
+// entries one by one does not move the rest thousands of times. Look-up is linear in a small dictionary and
+// through an index of positions in a large one.
+struct OpaqueCFDictionary final : platform::values::Container {
+    OpaqueCFDictionary(bool isMutable, bool retainsValues) noexcept
+        : Container(platform::values::Type::dictionary, isMutable, retainsValues) {}
+    // With these keys and values (key, value, key, value, ...), which it takes over.
+    OpaqueCFDictionary(bool isMutable, std::span<platform::values::Owned<CFTypeRef>> slots);
+    // A copy, one level deep.
+    OpaqueCFDictionary(bool isMutable, const OpaqueCFDictionary& other);
+    ~OpaqueCFDictionary() override;
+
+    [[nodiscard]] std::size_t count() const noexcept { return live_; }
+    // Both without the holes, which they fill.
+    [[nodiscard]] std::span<const platform::values::Entry> entries() const;
+    [[nodiscard]] std::span<const CFTypeRef> slots() const;
+    // Null when the key is not there; borrowed until the dictionary is changed or enumerated.
+    [[nodiscard]] const platform::values::Entry* find(CFTypeRef key) const;
+    void set(CFTypeRef key, CFTypeRef value, bool replace);
+    void remove(CFTypeRef key);
+    // Whether no two keys are equal, as they are in every dictionary that was not made from slots.
+    [[nodiscard]] bool hasDistinctKeys() const;
+
+  private:
+    struct KeyHash {
+        std::size_t operator()(CFTypeRef key) const noexcept { return platform::values::hashOfValue(key); }
+    };
+    struct KeyEqual {
+        bool operator()(CFTypeRef lhs, CFTypeRef rhs) const {
+            return platform::values::equalValues(lhs, rhs);
+        }
+    };
+    using Index = std::unordered_map<CFTypeRef, std::size_t, KeyHash, KeyEqual>;
+
+    [[nodiscard]] bool isIndexed() const noexcept;
+    void fillHoles() const;
+    void buildIndex() const;
+
+    mutable std::vector<platform::values::Entry> entries_;
+    mutable std::unique_ptr<Index> index_;
+    std::size_t live_ = 0;
 };
 
 namespace platform::values {
 
-template <class Handle>
-[[nodiscard]] Handle* makeContainer(bool isMutable, bool retainsValues) {
-    return new Handle(isMutable, new Storage(Handle::shape, retainsValues));
-}
-// A second handle on the container's storage.
-template <class Handle>
-[[nodiscard]] Handle* shareStorage(const Handle& container, bool isMutable) {
-    return new Handle(isMutable, container.storage().retain());
+// Calls the function with the value as what it is: as an Object when it is none of these.
+template <class Function>
+decltype(auto) visit(CFTypeRef value, Function&& function) {
+    const auto& object = *static_cast<const Object*>(value);
+    switch (object.type()) {
+        case Type::string:
+            return function(static_cast<const OpaqueCFString&>(object));
+        case Type::dictionary:
+            return function(static_cast<const OpaqueCFDictionary&>(object));
+        case Type::array:
+            return function(static_cast<const OpaqueCFArray&>(object));
+        case Type::number:
+            return function(static_cast<const OpaqueCFNumber&>(object));
+        case Type::boolean:
+            return function(static_cast<const OpaqueCFBoolean&>(object));
+        case Type::data:
+            return function(static_cast<const OpaqueCFData&>(object));
+        case Type::date:
+            return function(static_cast<const OpaqueCFDate&>(object));
+        case Type::url:
+            return function(static_cast<const OpaqueCFURL&>(object));
+        default:
+            return function(object);
+    }
 }
 
 }  // namespace platform::values

@@ -11,37 +11,51 @@ namespace {
 
 void describe(std::string& text, CFTypeRef value, int depth);
 
-void describeText(std::string& text, std::string_view content) {
-    for (const char character : content) {
+// A value that its container does not look at is shown as "?".
+void describeHeld(std::string& text, const Container& holder, CFTypeRef value, int depth) {
+    holder.retainsValues() ? describe(text, value, depth) : text.push_back('?');
+}
+
+void describe(std::string& text, const OpaqueCFString& string, int) {
+    for (const char character : string.text()) {
         text.push_back(character == '\n' || character == '\r' ? ' ' : character);
     }
 }
-
-void describeBytes(std::string& text, std::string_view bytes) {
-    text.push_back('<');
-    text += platform::hexOf(bytes);
-    text.push_back('>');
-}
-
-// A value that its container does not look at is shown as "?".
-void describeContainer(std::string& text, CFDictionaryRef dictionary, int depth) {
+void describe(std::string& text, const OpaqueCFDictionary& dictionary, int depth) {
     const char* separator = "{";
-    for (const Entry& entry : entriesOf(dictionary)) {
+    for (const Entry& entry : dictionary.entries()) {
         text += std::exchange(separator, "; ");
-        describe(text, entry.key, depth);
+        describe(text, entry.key, depth + 1);
         text += " = ";
-        dictionary->retainsValues() ? describe(text, entry.value, depth) : text.push_back('?');
+        describeHeld(text, dictionary, entry.value, depth + 1);
     }
-    text += dictionary->count() == 0 ? "{}" : "}";
+    text += dictionary.count() == 0 ? "{}" : "}";
 }
-
-void describeContainer(std::string& text, CFArrayRef array, int depth) {
+void describe(std::string& text, const OpaqueCFArray& array, int depth) {
     const char* separator = "(";
-    for (const CFTypeRef item : itemsOf(array)) {
+    for (const CFTypeRef item : array.slots()) {
         text += std::exchange(separator, ", ");
-        array->retainsValues() ? describe(text, item, depth) : text.push_back('?');
+        describeHeld(text, array, item, depth + 1);
     }
-    text += array->count() == 0 ? "()" : ")";
+    text += array.count() == 0 ? "()" : ")";
+}
+void describe(std::string& text, const OpaqueCFNumber& number, int) {
+    text += number.isReal ? realText(number.real) : std::to_string(number.integer);
+}
+void describe(std::string& text, const OpaqueCFBoolean& boolean, int) {
+    text += boolean.value ? "true" : "false";
+}
+void describe(std::string& text, const OpaqueCFData& data, int) {
+    text += "<" + platform::hexOf(data.bytes) + ">";
+}
+void describe(std::string& text, const OpaqueCFDate& date, int) {
+    text += dateText(date.seconds);
+}
+void describe(std::string& text, const OpaqueCFURL& url, int) {
+    text += url.text.get()->text();
+}
+void describe(std::string& text, const Object&, int) {
+    text += "<object>";
 }
 
 void describe(std::string& text, CFTypeRef value, int depth) {
@@ -49,36 +63,7 @@ void describe(std::string& text, CFTypeRef value, int depth) {
         text += "...";
         return;
     }
-    switch (static_cast<const Object*>(value)->propertyListType()) {
-        case PropertyListType::string:
-            describeText(text, static_cast<CFStringRef>(value)->text());
-            return;
-        case PropertyListType::dictionary:
-            describeContainer(text, static_cast<CFDictionaryRef>(value), depth + 1);
-            return;
-        case PropertyListType::array:
-            describeContainer(text, static_cast<CFArrayRef>(value), depth + 1);
-            return;
-        case PropertyListType::number: {
-            const auto* const number = static_cast<CFNumberRef>(value);
-            text += number->isReal ? realText(number->real) : std::to_string(number->integer);
-            return;
-        }
-        case PropertyListType::boolean:
-            text += static_cast<CFBooleanRef>(value)->value ? "true" : "false";
-            return;
-        case PropertyListType::data:
-            describeBytes(text, static_cast<CFDataRef>(value)->bytes);
-            return;
-        case PropertyListType::date:
-            text += dateText(static_cast<CFDateRef>(value)->seconds);
-            return;
-        case PropertyListType::none: {
-            const auto* const url = static_cast<CFURLRef>(value);
-            text += url->type() == Type::url ? url->text.get()->text() : "<object>";
-            return;
-        }
-    }
+    visit(value, [&](const auto& each) { describe(text, each, depth); });
 }
 
 }  // namespace

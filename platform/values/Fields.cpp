@@ -62,7 +62,7 @@ CFTypeRef FieldReader::valueAt(const char* key) const {
 
 bool FieldReader::decode(CFTypeRef value, bool& flag) {
     const auto boolean = as<CFBooleanRef>(value);
-    flag = boolean != nullptr && CFBooleanGetValue(boolean) != 0;
+    flag = boolean == kCFBooleanTrue;
     return boolean != nullptr;
 }
 
@@ -95,7 +95,9 @@ bool FieldReader::decode(CFTypeRef value, Owned<CFDictionaryRef>& dictionary) {
 
 bool FieldReader::decodeNumber(CFTypeRef value, std::int64_t& number) {
     const auto found = as<CFNumberRef>(value);
-    return found != nullptr && CFNumberGetValue(found, kCFNumberSInt64Type, &number) != 0;
+    const auto integer = found != nullptr ? integerOf(found) : std::nullopt;
+    number = integer.value_or(0);
+    return integer.has_value();
 }
 
 bool FieldReader::decodeData(CFTypeRef value, std::span<std::byte> bytes) {

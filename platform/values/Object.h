@@ -9,7 +9,7 @@
 
 namespace platform::values {
 
-// The types that CFGetTypeID tells apart.
+// The types that CFGetTypeID tells apart; property lists are made of those up to date.
 enum class Type : std::uint8_t {
     string = 1,
     dictionary,
@@ -25,12 +25,6 @@ enum class Type : std::uint8_t {
     dynamicStore,
 };
 
-// The types of which a property list is made; none for every other type.
-enum class PropertyListType : std::uint8_t { none, string, dictionary, array, number, boolean, data, date };
-[[nodiscard]] constexpr PropertyListType propertyListTypeOf(Type type) noexcept {
-    return type <= Type::date ? static_cast<PropertyListType>(type) : PropertyListType::none;
-}
-
 // Every opaque type of the faces is a class derived from this one, with Object as its only base, so that a
 // CFTypeRef is always a pointer to an Object.
 class Object {
@@ -40,7 +34,6 @@ class Object {
     Object& operator=(const Object&) = delete;
 
     [[nodiscard]] Type type() const noexcept { return type_; }
-    [[nodiscard]] PropertyListType propertyListType() const noexcept { return propertyListTypeOf(type_); }
     void retain() const noexcept { count_.fetch_add(1, std::memory_order_relaxed); }
     void release() const noexcept {
         if (count_.fetch_sub(1, std::memory_order_acq_rel) == 1) {

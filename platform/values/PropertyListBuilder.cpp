@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
-#include <chrono>
+#include <ctime>
 
 #include "platform/values/PropertyListXML.h"
 
@@ -34,24 +34,14 @@ std::optional<Number> numberFrom(std::string_view text) {
 }
 
 std::optional<std::int64_t> secondsFrom(std::string_view text) {
-    using namespace std::chrono;
-    constexpr std::string_view shape = "0000-00-00T00:00:00Z";
-    text = trimmed(text);
-    const auto fits = [](char character, char wanted) {
-        return wanted == '0' ? character >= '0' && character <= '9' : character == wanted;
-    };
-    if (!std::ranges::equal(text, shape, fits)) {
+    const std::string date(trimmed(text));
+    std::tm time{};
+    if (strptime(date.c_str(), "%Y-%m-%dT%H:%M:%SZ", &time) == nullptr) {
         return std::nullopt;
     }
-    const auto number = [text](std::size_t place, std::size_t digits) {
-        return static_cast<unsigned>(numberFrom<std::int64_t>(text.substr(place, digits)).value_or(0));
-    };
-    const year_month_day date(year(static_cast<int>(number(0, 4))), month(number(5, 2)), day(number(8, 2)));
-    if (!date.ok() || number(11, 2) > 23 || number(14, 2) > 59 || number(17, 2) > 59) {
-        return std::nullopt;
-    }
-    return sys_days(date).time_since_epoch().count() * 86'400LL + number(11, 2) * 3600LL +
-           number(14, 2) * 60LL + number(17, 2);
+    // What is no date, or is written in another way, comes back as another text.
+    const std::int64_t seconds = timegm(&time);
+    return dateText(seconds) == date ? std::optional(seconds) : std::nullopt;
 }
 
 constexpr std::array<std::int16_t, 256> makeBase64Values() {
@@ -187,14 +177,13 @@ const char* PropertyListBuilder::endContainer() {
     const std::span<Owned<CFTypeRef>> slots = std::span(values_).subspan(level.firstValue);
     Owned<CFTypeRef> container;
     if (isDictionary) {
-        const auto storage = new Storage(Storage::Shape::dictionary, slots);
-        container = Owned<CFTypeRef>::adopt(new OpaqueCFDictionary(false, storage));
-        if (!storage->hasDistinctKeys()) {
+        const auto* const dictionary = new OpaqueCFDictionary(false, slots);
+        container = Owned<CFTypeRef>::adopt(dictionary);
+        if (!dictionary->hasDistinctKeys()) {
             return "a dictionary with the same key twice";
         }
     } else {
-        container =
-            Owned<CFTypeRef>::adopt(new OpaqueCFArray(false, new Storage(Storage::Shape::array, slots)));
+        container = Owned<CFTypeRef>::adopt(new OpaqueCFArray(false, slots));
     }
     values_.resize(level.firstValue);
     levels_.pop_back();

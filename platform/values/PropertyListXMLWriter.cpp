@@ -23,105 +23,116 @@ class Writer {
     }
 
   private:
-    [[nodiscard]] bool write(CFTypeRef value, std::size_t depth);
-    bool writeText(std::string_view open, CFStringRef string, std::string_view close);
-    bool writeDictionary(CFDictionaryRef dictionary, std::size_t depth);
-    bool writeArray(CFArrayRef array, std::size_t depth);
-    void writeNumber(CFNumberRef number);
-    bool writeDate(std::int64_t seconds);
-    void writeData(std::string_view bytes, std::size_t depth);
+    // Each is false when the value cannot be written.
+    bool write(CFTypeRef value, std::size_t depth) {
+        indent(depth);
+        return visit(value, [&](const auto& each) { return write(each, depth); });
+    }
+    bool writeText(std::string_view open, const OpaqueCFString& string, std::string_view close);
+    bool write(const OpaqueCFString& string, std::size_t) {
+        return writeText("<string>", string, "</string>\n");
+    }
+    bool write(const OpaqueCFDictionary& dictionary, std::size_t depth);
+    bool write(const OpaqueCFArray& array, std::size_t depth);
+    bool write(const OpaqueCFNumber& number, std::size_t);
+    bool write(const OpaqueCFBoolean& boolean, std::size_t) {
+        return put(boolean.value ? "<true/>\n" : "<false/>\n");
+    }
+    bool write(const OpaqueCFData& data, std::size_t depth);
+    bool write(const OpaqueCFDate& date, std::size_t);
+    // Everything else is no property-list value.
+    bool write(const Object&, std::size_t) { return false; }
 
     void put(char character) { text_.push_back(character); }
-    void put(std::string_view piece) { text_.append(piece); }
+    bool put(std::string_view piece) {
+        text_.append(piece);
+        return true;
+    }
     void indent(std::size_t depth) { text_.append(depth, '\t'); }
 
     std::string text_;
 };
 
-bool Writer::writeText(std::string_view open, CFStringRef string, std::string_view close) {
-    const TextTraits traits = string->traits();
-    if ((traits & textBeyondXml) != 0) {
+bool Writer::writeText(std::string_view open, const OpaqueCFString& string, std::string_view close) {
+    if ((string.traits() & textBeyondXml) != 0) {
         return false;
     }
     put(open);
-    if ((traits & textNeedsEscape) == 0) {
-        put(string->text());
-    } else {
-        for (const char character : string->text()) {
-            switch (character) {
-                case '&':
-                    put("&amp;");
-                    break;
-                case '<':
-                    put("&lt;");
-                    break;
-                case '>':
-                    put("&gt;");
-                    break;
-                case '\r':
-                    // As it stands a reader would take it for a line feed.
-                    put("&#13;");
-                    break;
-                default:
-                    put(character);
-            }
+    if ((string.traits() & textNeedsEscape) == 0) {
+        put(string.text());
+        return put(close);
+    }
+    for (const char character : string.text()) {
+        switch (character) {
+            case '&':
+                put("&amp;");
+                break;
+            case '<':
+                put("&lt;");
+                break;
+            case '>':
+                put("&gt;");
+                break;
+            case '\r':
+                // As it stands a reader would take it for a line feed.
+                put("&#13;");
+                break;
+            default:
+                put(character);
         }
     }
-    put(close);
-    return true;
+    return put(close);
 }
 
-bool Writer::writeDictionary(CFDictionaryRef dictionary, std::size_t depth) {
-    if (dictionary->count() == 0) {
-        put("<dict/>\n");
-        return true;
+bool Writer::write(const OpaqueCFDictionary& dictionary, std::size_t depth) {
+    if (depth >= deepestPropertyList || !dictionary.retainsValues()) {
+        return false;
+    }
+    if (dictionary.count() == 0) {
+        return put("<dict/>\n");
     }
     put("<dict>\n");
-    for (const Entry& entry : entriesOf(dictionary)) {
+    for (const Entry& entry : dictionary.entries()) {
         const auto* const key = as<CFStringRef>(entry.key);
         indent(depth + 1);
-        if (key == nullptr || !writeText("<key>", key, "</key>\n") || !write(entry.value, depth + 1)) {
+        if (key == nullptr || !writeText("<key>", *key, "</key>\n") || !write(entry.value, depth + 1)) {
             return false;
         }
     }
     indent(depth);
-    put("</dict>\n");
-    return true;
+    return put("</dict>\n");
 }
 
-bool Writer::writeArray(CFArrayRef array, std::size_t depth) {
-    if (array->count() == 0) {
-        put("<array/>\n");
-        return true;
+bool Writer::write(const OpaqueCFArray& array, std::size_t depth) {
+    if (depth >= deepestPropertyList || !array.retainsValues()) {
+        return false;
+    }
+    if (array.count() == 0) {
+        return put("<array/>\n");
     }
     put("<array>\n");
-    for (const CFTypeRef item : itemsOf(array)) {
+    for (const CFTypeRef item : array.slots()) {
         if (!write(item, depth + 1)) {
             return false;
         }
     }
     indent(depth);
-    put("</array>\n");
-    return true;
+    return put("</array>\n");
 }
 
-void Writer::writeNumber(CFNumberRef number) {
-    if (number->isReal) {
-        put("<real>");
-        put(realText(number->real));
-        put("</real>\n");
-        return;
+bool Writer::write(const OpaqueCFNumber& number, std::size_t) {
+    if (number.isReal) {
+        return put("<real>") && put(realText(number.real)) && put("</real>\n");
     }
     char digits[24];
-    const std::to_chars_result result = std::to_chars(std::begin(digits), std::end(digits), number->integer);
-    put("<integer>");
-    put({std::begin(digits), result.ptr});
-    put("</integer>\n");
+    const std::to_chars_result result = std::to_chars(std::begin(digits), std::end(digits), number.integer);
+    return put("<integer>") && put({std::begin(digits), result.ptr}) && put("</integer>\n");
 }
 
-void Writer::writeData(std::string_view bytes, std::size_t depth) {
+bool Writer::write(const OpaqueCFData& data, std::size_t depth) {
     constexpr std::string_view alphabet = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
     constexpr std::size_t bytesInLine = 51;
+    const std::string_view bytes = data.bytes;
     put("<data>\n");
     for (std::size_t start = 0; start < bytes.size(); start += 3) {
         if (start % bytesInLine == 0) {
@@ -143,51 +154,15 @@ void Writer::writeData(std::string_view bytes, std::size_t depth) {
         put('\n');
     }
     indent(depth);
-    put("</data>\n");
+    return put("</data>\n");
 }
 
-bool Writer::writeDate(std::int64_t seconds) {
+bool Writer::write(const OpaqueCFDate& date, std::size_t) {
     // Four digits carry the years 0 to 9999.
     constexpr std::int64_t first = -62'167'219'200;
     constexpr std::int64_t last = 253'402'300'799;
-    if (seconds < first || seconds > last) {
-        return false;
-    }
-    put("<date>");
-    put(dateText(seconds));
-    put("</date>\n");
-    return true;
-}
-
-bool Writer::write(CFTypeRef value, std::size_t depth) {
-    indent(depth);
-    switch (static_cast<const Object*>(value)->propertyListType()) {
-        case PropertyListType::string:
-            return writeText("<string>", static_cast<CFStringRef>(value), "</string>\n");
-        case PropertyListType::dictionary: {
-            const auto* const dictionary = static_cast<CFDictionaryRef>(value);
-            return depth < deepestPropertyList && dictionary->retainsValues() &&
-                   writeDictionary(dictionary, depth);
-        }
-        case PropertyListType::array: {
-            const auto* const array = static_cast<CFArrayRef>(value);
-            return depth < deepestPropertyList && array->retainsValues() && writeArray(array, depth);
-        }
-        case PropertyListType::number:
-            writeNumber(static_cast<CFNumberRef>(value));
-            return true;
-        case PropertyListType::boolean:
-            put(static_cast<CFBooleanRef>(value)->value ? "<true/>\n" : "<false/>\n");
-            return true;
-        case PropertyListType::data:
-            writeData(static_cast<CFDataRef>(value)->bytes, depth);
-            return true;
-        case PropertyListType::date:
-            return writeDate(static_cast<CFDateRef>(value)->seconds);
-        case PropertyListType::none:
-            break;
-    }
-    return false;
+    return date.seconds >= first && date.seconds <= last && put("<date>") && put(dateText(date.seconds)) &&
+           put("</date>\n");
 }
 
 }  // namespace

@@ -174,10 +174,6 @@ void CFRunLoopRemoveSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStrin
     }
 }
 
-void CFRunLoopRun() noexcept {
-    CFRunLoopGetCurrent()->run(std::nullopt, false);
-}
-
 SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds,
                           Boolean returnAfterSourceHandled) noexcept {
     if (!isDefaultMode(mode)) {

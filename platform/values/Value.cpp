@@ -1,6 +1,8 @@
 // What every value has in common: its references, its type, equality and hash.
+#include <algorithm>
 #include <bit>
 #include <cmath>
+#include <optional>
 #include <utility>
 #include <vector>
 
@@ -15,128 +17,133 @@ const Object& objectOf(CFTypeRef value) {
     return *static_cast<const Object*>(value);
 }
 
-bool equalNumbers(const OpaqueCFNumber& lhs, const OpaqueCFNumber& rhs) {
-    if (!lhs.isReal && !rhs.isReal) {
-        return lhs.integer == rhs.integer;
+// The integer that a number is equal to.
+std::optional<std::int64_t> integerIn(const OpaqueCFNumber& number) {
+    if (!number.isReal) {
+        return number.integer;
     }
+    constexpr double beyond = 9223372036854775808.0;
+    const bool isInteger =
+        number.real >= -beyond && number.real < beyond && std::trunc(number.real) == number.real;
+    return isInteger ? std::optional(static_cast<std::int64_t>(number.real)) : std::nullopt;
+}
+
+using Pairs = std::vector<std::pair<CFTypeRef, CFTypeRef>>;
+
+// Notes two values that must be equal as well; false when they are known not to be.
+bool note(const Container& holder, CFTypeRef lhs, CFTypeRef rhs, Pairs& pairs) {
+    if (lhs != rhs) {
+        pairs.emplace_back(lhs, rhs);
+    }
+    return lhs == rhs || holder.retainsValues();
+}
+
+// Whether two different values of the same type are equal, as long as each of the pairs noted is.
+
+bool equalSoFar(const OpaqueCFString& lhs, const OpaqueCFString& rhs, Pairs&) {
+    return lhs.text() == rhs.text();
+}
+bool equalSoFar(const OpaqueCFArray& lhs, const OpaqueCFArray& rhs, Pairs& pairs) {
+    return lhs.retainsValues() == rhs.retainsValues() &&
+           std::ranges::equal(lhs.slots(), rhs.slots(),
+                              [&](CFTypeRef left, CFTypeRef right) { return note(lhs, left, right, pairs); });
+}
+bool equalSoFar(const OpaqueCFDictionary& lhs, const OpaqueCFDictionary& rhs, Pairs& pairs) {
+    return lhs.count() == rhs.count() && lhs.retainsValues() == rhs.retainsValues() &&
+           std::ranges::all_of(lhs.entries(), [&](const Entry& left) {
+               const Entry* const right = rhs.find(left.key);
+               return right != nullptr && note(lhs, left.value, right->value, pairs);
+           });
+}
+bool equalSoFar(const OpaqueCFNumber& lhs, const OpaqueCFNumber& rhs, Pairs&) {
     if (lhs.isReal && rhs.isReal) {
         return lhs.real == rhs.real || (std::isnan(lhs.real) && std::isnan(rhs.real));
     }
-    const OpaqueCFNumber& real = lhs.isReal ? lhs : rhs;
-    const OpaqueCFNumber& integer = lhs.isReal ? rhs : lhs;
-    std::int64_t value = 0;
-    return CFNumberGetValue(&real, kCFNumberSInt64Type, &value) != 0 && value == integer.integer;
+    return integerIn(lhs) == integerIn(rhs);
 }
-
-std::uint32_t hashOfNumber(const OpaqueCFNumber& number) {
-    std::int64_t integer = 0;
-    const bool isInteger = CFNumberGetValue(&number, kCFNumberSInt64Type, &integer) != 0;
-    return hashOf(isInteger || std::isnan(number.real) ? integer : std::bit_cast<std::int64_t>(number.real));
+bool equalSoFar(const OpaqueCFData& lhs, const OpaqueCFData& rhs, Pairs&) {
+    return lhs.bytes == rhs.bytes;
 }
-
-using Pair = std::pair<CFTypeRef, CFTypeRef>;
-
-// Whether two containers of the same kind are equal, as long as each of the pairs noted is.
-bool equalSoFar(const Container& lhs, const Container& rhs, std::vector<Pair>& pairs) {
-    if (lhs.count() != rhs.count() || lhs.retainsValues() != rhs.retainsValues()) {
-        return false;
-    }
-    if (&lhs.storage() == &rhs.storage()) {
-        return true;
-    }
-    const auto note = [&](CFTypeRef left, CFTypeRef right) {
-        if (left != right) {
-            pairs.emplace_back(left, right);
-        }
-        return left == right || lhs.retainsValues();
-    };
-    if (lhs.type() == Type::array) {
-        const std::span<const CFTypeRef> left = lhs.storage().items();
-        const std::span<const CFTypeRef> right = rhs.storage().items();
-        for (std::size_t i = 0; i < left.size(); ++i) {
-            if (!note(left[i], right[i])) {
-                return false;
-            }
-        }
-        return true;
-    }
-    for (const Entry& entry : lhs.storage().entries()) {
-        const std::size_t position = rhs.storage().find(entry.key);
-        if (position == Storage::absent || !note(entry.value, rhs.storage().valueAt(position))) {
-            return false;
-        }
-    }
-    return true;
+bool equalSoFar(const OpaqueCFDate& lhs, const OpaqueCFDate& rhs, Pairs&) {
+    return lhs.seconds == rhs.seconds;
 }
-
-// Whether two values of the same type are equal, as above.
-bool equalSoFar(const Object& lhs, const Object& rhs, std::vector<Pair>& pairs) {
-    switch (lhs.propertyListType()) {
-        case PropertyListType::string:
-            return static_cast<const OpaqueCFString&>(lhs).equals(static_cast<const OpaqueCFString&>(rhs));
-        case PropertyListType::dictionary:
-        case PropertyListType::array:
-            return equalSoFar(static_cast<const Container&>(lhs), static_cast<const Container&>(rhs), pairs);
-        case PropertyListType::number:
-            return equalNumbers(static_cast<const OpaqueCFNumber&>(lhs),
-                                static_cast<const OpaqueCFNumber&>(rhs));
-        case PropertyListType::data:
-            return static_cast<const OpaqueCFData&>(lhs).bytes == static_cast<const OpaqueCFData&>(rhs).bytes;
-        case PropertyListType::date:
-            return static_cast<const OpaqueCFDate&>(lhs).seconds ==
-                   static_cast<const OpaqueCFDate&>(rhs).seconds;
-        case PropertyListType::boolean:
-            break;
-        case PropertyListType::none:
-            return lhs.type() == Type::url && equalValues(static_cast<const OpaqueCFURL&>(lhs).text.get(),
-                                                          static_cast<const OpaqueCFURL&>(rhs).text.get());
-    }
+bool equalSoFar(const OpaqueCFURL& lhs, const OpaqueCFURL& rhs, Pairs&) {
+    return equalValues(lhs.text.get(), rhs.text.get());
+}
+bool equalSoFar(const Object&, const Object&, Pairs&) {
     return false;
+}
+
+std::uint32_t contentHash(const OpaqueCFString& string) {
+    return string.hash();
+}
+std::uint32_t contentHash(const OpaqueCFArray& array) {
+    return hashOf(array.count());
+}
+std::uint32_t contentHash(const OpaqueCFDictionary& dictionary) {
+    return hashOf(dictionary.count());
+}
+std::uint32_t contentHash(const OpaqueCFNumber& number) {
+    if (const auto integer = integerIn(number)) {
+        return hashOf(*integer);
+    }
+    return hashOf(std::isnan(number.real) ? 0 : std::bit_cast<std::int64_t>(number.real));
+}
+std::uint32_t contentHash(const OpaqueCFData& data) {
+    return hashOf(data.bytes);
+}
+std::uint32_t contentHash(const OpaqueCFDate& date) {
+    return hashOf(date.seconds);
+}
+std::uint32_t contentHash(const OpaqueCFURL& url) {
+    return url.text.get()->hash();
+}
+std::uint32_t contentHash(const Object& object) {
+    return hashOf(&object);
 }
 
 }  // namespace
 
 bool platform::values::equalValues(CFTypeRef lhs, CFTypeRef rhs) {
-    if (lhs == rhs) {
-        return true;
-    }
-    if (objectOf(lhs).type() != objectOf(rhs).type()) {
-        return false;
-    }
     // A list instead of recursion, so that no nesting is too deep for the stack.
-    std::vector<Pair> pairs;
-    bool equal = equalSoFar(objectOf(lhs), objectOf(rhs), pairs);
+    Pairs pairs;
+    const auto areEqual = [&pairs](CFTypeRef left, CFTypeRef right) {
+        return left == right ||
+               (objectOf(left).type() == objectOf(right).type() && visit(left, [&](const auto& value) {
+                    return equalSoFar(value, static_cast<decltype(value)>(objectOf(right)), pairs);
+                }));
+    };
+    bool equal = areEqual(lhs, rhs);
     while (equal && !pairs.empty()) {
         const auto [left, right] = pairs.back();
         pairs.pop_back();
-        equal = objectOf(left).type() == objectOf(right).type() &&
-                equalSoFar(objectOf(left), objectOf(right), pairs);
+        equal = areEqual(left, right);
     }
     return equal;
 }
 
 std::uint32_t platform::values::hashOfValue(CFTypeRef value) noexcept {
-    switch (objectOf(value).propertyListType()) {
-        case PropertyListType::string:
-            return static_cast<const OpaqueCFString*>(value)->hash();
-        case PropertyListType::dictionary:
-        case PropertyListType::array:
-            return hashOf(static_cast<const Container*>(value)->count());
-        case PropertyListType::number:
-            return hashOfNumber(*static_cast<const OpaqueCFNumber*>(value));
-        case PropertyListType::data:
-            return hashOf(std::string_view(static_cast<const OpaqueCFData*>(value)->bytes));
-        case PropertyListType::date:
-            return hashOf(static_cast<const OpaqueCFDate*>(value)->seconds);
-        case PropertyListType::boolean:
-            break;
-        case PropertyListType::none:
-            if (const auto* const url = static_cast<const OpaqueCFURL*>(value); url->type() == Type::url) {
-                return url->text.get()->hash();
-            }
-            break;
+    return visit(value, [](const auto& each) { return contentHash(each); });
+}
+
+// Destroying a value nested in a value nested in a value ... does not recurse: what the inner ones held waits
+// for the outermost one.
+void Container::releaseAll(std::span<const CFTypeRef> held) noexcept {
+    constinit thread_local std::vector<CFTypeRef>* waiting = nullptr;
+    if (waiting != nullptr) {
+        waiting->insert(waiting->end(), held.begin(), held.end());
+        return;
     }
-    return hashOf(value);
+    std::vector<CFTypeRef> own(held.begin(), held.end());
+    waiting = &own;
+    while (!own.empty()) {
+        const CFTypeRef next = own.back();
+        own.pop_back();
+        if (next != nullptr) {
+            CFRelease(next);
+        }
+    }
+    waiting = nullptr;
 }
 
 CFTypeRef CFRetain(CFTypeRef value) noexcept {

@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
@@ -52,9 +53,10 @@ template <class Ref>
 
 [[nodiscard]] Owned<CFNumberRef> makeNumber(std::int64_t value);
 [[nodiscard]] Owned<CFNumberRef> makeReal(double value);
+// Nothing for a real.
+[[nodiscard]] std::optional<std::int64_t> integerOf(CFNumberRef number) noexcept;
 // Seconds since the beginning of 1970, UTC.
 [[nodiscard]] Owned<CFDateRef> makeDate(std::int64_t seconds);
-[[nodiscard]] std::int64_t secondsOf(CFDateRef date) noexcept;
 
 struct Entry {
     CFTypeRef key;

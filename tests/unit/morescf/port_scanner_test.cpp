@@ -31,12 +31,9 @@ namespace platform::hardware {
 static EntryRef entryOf(const Chain& chain, std::string_view className) {
     const std::size_t end = chain.find(" < ");
     const Value content = read(chain.substr(0, end));
-    std::vector<Property> properties;
-    for (const auto& [key, value] : values::entriesOf(static_cast<CFDictionaryRef>(content.get()))) {
-        properties.push_back({static_cast<CFStringRef>(key), Value::retained(value)});
-    }
-    return std::make_shared<const Entry>(
-        className, properties, end == Chain::npos ? EntryRef() : entryOf(chain.substr(end + 3), ""));
+    return std::make_shared<const Entry>(Entry{
+        className, values::Owned<CFDictionaryRef>::retained(static_cast<CFDictionaryRef>(content.get())),
+        end == Chain::npos ? EntryRef() : entryOf(chain.substr(end + 3), "")});
 }
 static std::optional<std::vector<EntryRef>> entriesOf(const std::vector<Chain>& chains,
                                                       std::string_view className) {
