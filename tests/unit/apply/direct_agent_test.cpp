@@ -1,13 +1,17 @@
-// The engine and the direct agent on the kernel of a private network.
+// The engine and the direct agent on the kernel of a private network, and the daemons and files around them.
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <fstream>
 #include <iostream>
 #include <sstream>
+#include <thread>
 
 #include "platform/apply/Apply.h"
 #include "platform/apply/StateFile.h"
+#include "platform/apply/direct/Kernel.h"
+#include "platform/apply/direct/NameServers.h"
+#include "platform/apply/direct/OtherDaemons.h"
+#include "platform/apply/direct/Supplicant.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
 #include "tests/unit/apply/StandInSupplicant.h"
@@ -39,6 +43,9 @@ std::string machineState() {
             if (const std::size_t at = line.find(word); at != std::string::npos) {
                 line.erase(at, std::string(word).size());
             }
+        }
+        if (has("expires ")) {
+            line.erase(line.find("expires ") + 8);
         }
         state += line.substr(0, line.find(" qdisc")) + "\n";
     }
@@ -73,6 +80,7 @@ class DirectAgentTest : public testing_support::PrivateNetworkTest {
             Host host;
             host.dhcpHook = LA_DHCP_HOOK;
             host.dhcpClient = "/run/client";
+            host.sysfsRoot = "/run/sys";
             const HostOverride override(host);
             const LogCapture log([](LogLevel, std::string_view text) {
                 std::cout << "log: " << text << "\n";
@@ -80,7 +88,7 @@ class DirectAgentTest : public testing_support::PrivateNetworkTest {
             });
             for (const std::string n : {"0", "1"}) {
                 shell("ip link add card" + n + " type veth peer name far" + n + "; ip link set far" + n +
-                      " up");
+                      " up; mkdir -p /run/sys/class/net/card" + n);
             }
             body();
         });
@@ -99,8 +107,11 @@ class DirectAgentTest : public testing_support::PrivateNetworkTest {
         std::ranges::replace(text, '\n', ';');
         return text;
     }
-    static std::string log() { return shell("cat /run/log 2>/dev/null; rm -f /run/log"); }
 };
+
+std::string takeLog() {
+    return shell("cat /run/log 2>/dev/null; rm -f /run/log");
+}
 
 values::Owned<CFDictionaryRef> thereTree(const std::string& address = "192.0.0.199") {
     Service card0 = fixedService("card0", address);
@@ -128,7 +139,7 @@ TEST_F(DirectAgentTest, GivesBackEveryEarlierState) {
             EXPECT_EQ(made, machineState());
             EXPECT_EQ("", activate(makeTree({}).get()));
             EXPECT_EQ(before, machineState());
-            EXPECT_EQ("", log());
+            EXPECT_EQ("", takeLog());
         });
         return HasFailure() ? "not given back" : "given back";
     });
@@ -202,21 +213,6 @@ TEST_F(DirectAgentTest, LooksAtTheMachineAgain) {
     }
 }
 
-TEST_F(DirectAgentTest, KeepsWhatAWayBackNeedsUntilItIsBack) {
-    run([] {
-        shell(
-            "echo nameserver 9.9.9.9 >/run/outer; touch /etc/resolv.conf; mount --bind /run/outer "
-            "/etc/resolv.conf");
-        const std::string before = machineState();
-        EXPECT_EQ("", activate(thereTree().get()));
-        shell("mount -o remount,bind,ro /etc/resolv.conf");
-        EXPECT_EQ("cannot open /etc/resolv.conf: Read-only file system", activate(makeTree({}).get()));
-        shell("mount -o remount,bind,rw /etc/resolv.conf");
-        EXPECT_EQ("", activate(makeTree({}).get()));
-        EXPECT_EQ(before + kept(), machineState());
-    });
-}
-
 // A DHCP client that does what the test writes into /run/offer, once each; $hook is the program that it
 // calls.
 const char* const client = R"(#!/bin/sh
@@ -229,77 +225,167 @@ while :; do
 done
 )";
 
-values::Owned<CFDictionaryRef> dhcpTree(const std::string& dns) {
-    return makeTree({{"card0", "IPv4 = {ConfigMethod = DHCP; DHCPClientID = me}; DNS = {" + dns + "};"}});
-}
+// A machine, what happens to it step by step, and what comes of it.
+class Scene {
+  public:
+    Scene() { std::ofstream("/run/client") << client; }
 
-// Steps: a shell's commands behind "sh", the client's next ones behind "offer", "there" with an entity for
-// the name servers, and "back", after which the machine has to be as it was.
-TEST_F(DirectAgentTest, FollowsItsDhcpClient) {
-    run([] {
-        std::ofstream("/run/client") << client;
-        chmod("/run/client", 0700);
-        shell("ip link set card0 up; echo nameserver 9.9.9.9 >/run/real; ln -s /run/real /etc/resolv.conf");
-        const std::string before = machineState();
-        testing_support::Transcript("dhcp").playItself([&before](const std::string& step) {
-            const std::string name = step.substr(0, step.find(' '));
-            const std::string rest = step.substr(std::min(name.size() + 1, step.size()));
-            std::string seen;
-            if (name == "sh") {
-                seen = shell(rest);
-            } else if (name == "offer") {
-                shell("printf '%s' '" + rest + "' >/run/new; mv /run/new /run/offer");
-            } else if (name == "there") {
-                // A client that dies leaves its steps behind.
-                seen = activate(dhcpTree(rest).get());
-                shell(seen.empty() ? "while [ -e /run/offer ] || [ -e /run/taken ]; do sleep 0.02; done"
-                                   : "rm -f /run/taken");
-                seen += (seen.empty() ? "" : "\n") + addressesOf("card0") + defaultRoutes() +
-                        shell("grep -v '^#' /etc/resolv.conf") + log();
-            } else {
-                seen = activate(makeTree({}).get());
-                EXPECT_EQ(before + kept(), machineState());
-                seen += log();
-            }
-            return seen.substr(0, seen.find_last_not_of('\n') + 1);
-        });
-    });
-}
-
-TEST_F(DirectAgentTest, StaysOnTheNetworkThatItJoined) {
-    run([] {
-        mkdir("/run/wpa_supplicant", 0700);
-        StandInSupplicant supplicant("/run/wpa_supplicant/card0");
-        supplicant.next = 1;
-        supplicant.answers["LIST_NETWORKS"] = "0\tprinter\tany\t[CURRENT]\n";
-        supplicant.answers["GET_NETWORK 0"] = "\"location-assistant\"";
-        const auto tree = [](const char* address, const char* key) {
-            Service service = fixedService("card0", address);
-            service.entries +=
-                std::string("AirPort = {PreferredNetwork = printer; AuthPassword = <") + key + ">};";
-            return makeTree({service});
-        };
-        const char* const key = "00310032003300340035003600370038";
-        const char* const otherKey = "00320032003300340035003600370038";
-        const struct {
-            const char *address, *key;
-            int number;
-            bool isJoined;
-        } rows[] = {{"192.0.0.1", key, 1, true},
-                    {"192.0.0.2", key, 0, false},
-                    {"192.0.0.2", otherKey, 2, true},
-                    {"192.0.0.3", "0066", 0, true}};
-        for (const auto& row : rows) {
-            supplicant.join(row.number);
-            EXPECT_EQ("", activate(tree(row.address, row.key).get()));
-            EXPECT_EQ(row.isJoined, !supplicant.changes().empty()) << row.number;
-            EXPECT_EQ(std::string(row.address) + "/24 \n", addressesOf("card0"));
+    std::string play(const std::string& step) {
+        const std::string name = step.substr(0, step.find(' '));
+        const std::string rest = step.substr(std::min(name.size() + 1, step.size()));
+        std::istringstream words(rest);
+        if (name == "sh") {
+            return shell(rest);
         }
-        supplicant.answers["STATUS"] = "wpa_state=SCANNING\n";
-        EXPECT_EQ("", activate(thereTree().get()));
-        EXPECT_EQ(Lines{"REMOVE_NETWORK 0"}, supplicant.changes())
-            << "a location without a network leaves it";
-    });
+        if (name == "offer") {
+            shell("printf '%s' '" + rest + "' >/run/new; mv /run/new /run/offer");
+        } else if (name == "location") {
+            before_ = before_.empty() ? machineState() : before_;
+            return locate(rest);
+        } else if (name == "back") {
+            const std::string reason = activate(makeTree({}).get());
+            EXPECT_EQ(reason.empty(), before_ + kept() == machineState());
+            before_.erase(reason.empty() ? 0 : before_.size());
+            return told(reason);
+        } else if (name == "bring") {
+            return bring(words);
+        } else if (name == "daemons") {
+            daemons_ = findOtherDaemons("card0", linkIndex);
+            return std::string(daemons_.networkd ? "networkd" : "no networkd") + ", clients " +
+                   std::to_string(daemons_.dhcpClients.size());
+        } else if (name == "suspend") {
+            suspendOtherDaemons(rest, linkIndex, daemons_);
+        } else if (name == "resume") {
+            return resumeOtherDaemons("card0", daemons_).reason();
+        } else if (name == "settled") {
+            return isNetworkdSettled(linkIndex) ? "yes" : "no";
+        } else if (name == "forget") {
+            Kernel kernel;
+            EXPECT_TRUE(kernel.open("card0").ok() && kernel.link());
+            return kernel.forgetSilentNeighbours().reason();
+        } else {
+            return playSupplicant(name, rest);
+        }
+        return "";
+    }
+
+  private:
+    static constexpr int linkIndex = 7;
+
+    std::string locate(const std::string& entities) {
+        const std::string reason = activate(makeTree({{"card0", entities}}).get());
+        // A client that dies leaves its steps behind.
+        shell(reason.empty() ? "while [ -e /run/offer ] || [ -e /run/taken ]; do sleep 0.02; done"
+                             : "rm -f /run/taken");
+        return told(reason) + addressesOf("card0") + defaultRoutes() +
+               shell("grep -v '^#' /etc/resolv.conf || true");
+    }
+
+    // Servers and search domains.
+    static std::string bring(std::istringstream& words) {
+        std::string interface;
+        unsigned rank = 0;
+        NameService service;
+        words >> interface >> rank;
+        for (std::string word; words >> word;) {
+            if (word.find_first_not_of("0123456789.") == std::string::npos) {
+                service.servers.push_back(address(word.c_str()));
+            } else {
+                service.domains.push_back(word);
+            }
+        }
+        std::string trouble;
+        const Outcome outcome = setInterfaceNameServers(interface, rank, service, trouble);
+        return outcome.reason() + (trouble.empty() ? "" : "trouble: " + trouble + "\n") +
+               shell("grep -v '^#' /etc/resolv.conf || true") + takeLog();
+    }
+
+    // A command of the stand-in's, or what is asked of it: what that changed, and what came of it.
+    std::string playSupplicant(const std::string& name, const std::string& rest) {
+        std::istringstream words(rest);
+        if (name == "supplicant") {
+            supplicant_.reset();
+            join_.reset();
+            shell("mkdir -p /run/wpa_supplicant");
+            supplicant_ = std::make_unique<StandInSupplicant>("/run/wpa_supplicant/card0");
+        } else if (name == "answer") {
+            const std::size_t equals = rest.find(" = ");
+            supplicant_->answers[rest.substr(0, equals)] =
+                testing_support::unescaped(rest.substr(equals + 3));
+        } else if (name == "hear") {
+            supplicant_->hear(rest);
+        } else if (name == "hear-of-old") {
+            supplicant_->hear(rest, 16);
+        } else if (name == "hear-later") {
+            supplicant_->heardLater = rest;
+        } else if (name == "notice") {
+            supplicant_->notice = rest;
+        } else if (name == "on") {
+            int number = 0;
+            std::string bssid;
+            words >> number >> bssid;
+            supplicant_->join(number, bssid.empty() ? "02:00:00:00:00:01" : bssid);
+        } else if (name == "next") {
+            words >> supplicant_->next;
+        } else if (name == "end") {
+            supplicant_.reset();
+        } else if (name == "look") {
+            return readKnownNetworks("card0", networks_).reason();
+        } else if (name == "join") {
+            const std::size_t space = rest.find(' ');
+            WirelessSettings settings{{}, testing_support::unescaped(rest.substr(0, space)), {}};
+            if (space != std::string::npos) {
+                settings.key = testing_support::unescaped(rest.substr(space + 1));
+            }
+            const std::string text = told(joinBySupplicant("card0", settings, false, join_).reason());
+            return text + wait();
+        } else if (name == "leave") {
+            return told(leaveBySupplicant("card0", networks_, join_).reason());
+        } else if (name == "wait") {
+            return wait();
+        } else {
+            ADD_FAILURE() << name;
+        }
+        return "";
+    }
+    std::string wait() {
+        WirelessJoin::State state = WirelessJoin::State::waiting;
+        std::string reason = "no network is on its way";
+        const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(400);
+        while (join_ && state == WirelessJoin::State::waiting &&
+               std::chrono::steady_clock::now() < deadline) {
+            EXPECT_EQ("", join_->poll(state, reason).reason());
+            std::this_thread::sleep_for(std::chrono::milliseconds(5));
+        }
+        return told("") + (state == WirelessJoin::State::joined ? "joined" : reason);
+    }
+    // The commands that changed something, each in a line; why it failed, and what was logged.
+    std::string told(const std::string& reason) {
+        std::string text;
+        for (const std::string& line : supplicant_ ? supplicant_->changes() : Lines()) {
+            text += line + "\n";
+        }
+        return text + reason + (reason.empty() ? "" : "\n") + takeLog();
+    }
+
+    std::string before_;
+    OtherDaemons daemons_;
+    std::unique_ptr<StandInSupplicant> supplicant_;
+    std::optional<KnownNetworks> networks_;
+    std::unique_ptr<WirelessJoin> join_;
+};
+
+TEST_F(DirectAgentTest, WorksWithDaemonsAndFiles) {
+    for (const char* const name : {"dhcp", "supplicant", "name_servers", "other_daemons"}) {
+        run([name] {
+            EXPECT_TRUE(makeRuntimeDirectory().ok());
+            Scene scene;
+            testing_support::Transcript(name).playItself([&scene](const std::string& step) {
+                const std::string text = scene.play(step);
+                return text.substr(0, text.find_last_not_of('\n') + 1);
+            });
+        });
+    }
 }
 
 }  // namespace

@@ -10,7 +10,6 @@
 
 #include "platform/apply/direct/KernelWireless.h"
 #include "tests/unit/support/Hexadecimal.h"
-#include "tests/unit/support/PrivateNetwork.h"
 #include "tests/unit/support/Transcript.h"
 
 namespace platform::apply {
@@ -20,8 +19,6 @@ using netlink::Bytes;
 using netlink::ByteView;
 using netlink::Message;
 using testing_support::fromHex;
-using testing_support::PrivateNetwork;
-using testing_support::shell;
 using testing_support::toHex;
 using Inputs = testing_support::Transcript::Inputs;
 
@@ -108,23 +105,6 @@ TEST(KernelWireless, IsReadAndAsked) {
     transcript.replay("requests to join", requestOf);
     transcript.replay("notices", noticeOf);
     transcript.replay("what was heard, and a key", choiceOf);
-}
-
-class KernelWirelessTest : public testing_support::PrivateNetworkTest {};
-
-TEST_F(KernelWirelessTest, NeighboursThatDidNotAnswerAreForgotten) {
-    PrivateNetwork::run([] {
-        shell(
-            "ip link add card0 type veth peer name far0; ip link set far0 up; ip link set card0 up;"
-            "ip neigh add 10.1.0.1 dev card0 nud failed; ip neigh add 10.1.0.2 dev far0 nud failed;"
-            "ip neigh add 10.1.0.3 dev card0 lladdr 02:00:00:00:00:03 nud reachable;"
-            "ip neigh add 10.1.0.4 dev card0 nud incomplete");
-        Kernel kernel;
-        ASSERT_TRUE(kernel.open("card0").ok() && kernel.link());
-        EXPECT_EQ("", kernel.forgetSilentNeighbours().reason());
-        EXPECT_EQ("10.1.0.2 dev far0 FAILED \n10.1.0.3 dev card0 lladdr 02:00:00:00:00:03 REACHABLE \n",
-                  shell("ip -4 neigh show nud all | sort"));
-    });
 }
 
 }  // namespace

@@ -64,11 +64,11 @@ class Scene {
             network_->isFailing = name == "fail";
         } else if (name == "commit") {
             const bool isTree = rest.starts_with('{');
-            (void)directory_.write(
-                "store/new.plist",
+            const std::string file = directory_.write(
+                "new.plist",
                 isTree ? *platform::values::writePropertyListXML(testing_support::read(rest).get()) : rest);
-            std::filesystem::rename(directory_.at("store/new.plist"),
-                                    directory_.at("store/preferences.plist"));
+            std::filesystem::create_directories(directory_.at("store"));
+            std::filesystem::rename(file, directory_.at("store/preferences.plist"));
         } else if (name == "remove") {
             std::filesystem::remove_all(directory_.at("store"));
         } else if (name == "value") {
