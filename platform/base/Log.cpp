@@ -6,7 +6,6 @@
 #include <unistd.h>
 
 #include <array>
-#include <cstdio>
 #include <ctime>
 #include <utility>
 
@@ -21,41 +20,24 @@ std::function<void(LogLevel, std::string_view)>& sink() {
     return instead;
 }
 
-int severityOf(LogLevel level) {
-    switch (level) {
-        case LogLevel::error:
-            return LOG_ERR;
-        case LogLevel::warning:
-            return LOG_WARNING;
-        case LogLevel::notice:
-            return LOG_NOTICE;
-        case LogLevel::debug:
-            return LOG_DEBUG;
-    }
-    return LOG_ERR;
-}
-
 // "Nov  3 09:05:07": of Greenwich, because the local zone is a file that the environment chooses. The daemons
 // put their own time.
 std::string timeStamp() {
-    constexpr std::array<const char*, 12> months = {"Jan", "Feb", "Mar", "Apr", "May", "Jun",
-                                                    "Jul", "Aug", "Sep", "Oct", "Nov", "Dec"};
     const std::time_t now = std::time(nullptr);
     std::tm time{};
     gmtime_r(&now, &time);
+    // asctime's "Tue Nov  3 09:05:07 2026" is the same in every locale.
     std::array<char, 64> text{};
-    std::snprintf(text.data(), text.size(), "%s %2d %02d:%02d:%02d",
-                  months[static_cast<std::size_t>(time.tm_mon)], time.tm_mday, time.tm_hour, time.tm_min,
-                  time.tm_sec);
-    return text.data();
+    return std::string(asctime_r(&time, text.data())).substr(4, 15);
 }
 
 // What syslog(3) would send, but without waiting: a daemon that reads nothing, or a queue that somebody else
 // filled, would otherwise hold a run for ever. A socket for each line, because the daemon may be started
 // anew.
-void send(int severity, const std::string& text) {
-    const std::string datagram = "<" + std::to_string(LOG_DAEMON | severity) + ">" + timeStamp() +
-                                 " location-assistant[" + std::to_string(getpid()) + "]: " + text;
+void send(LogLevel level, const std::string& text) {
+    const std::string datagram = "<" + std::to_string(LOG_DAEMON | static_cast<int>(level)) + ">" +
+                                 timeStamp() + " location-assistant[" + std::to_string(getpid()) +
+                                 "]: " + text;
     const FileDescriptor daemon(socket(AF_UNIX, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
     const sockaddr_un address{AF_UNIX, "/dev/log"};
     if (connect(daemon.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0) {
@@ -78,7 +60,7 @@ void logLine(LogLevel level, std::string_view text) {
         sink()(level, line);
         return;
     }
-    send(severityOf(level), line);
+    send(level, line);
 }
 
 LogCapture::LogCapture(std::function<void(LogLevel, std::string_view)> newSink)

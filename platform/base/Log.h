@@ -1,13 +1,16 @@
 // The system log, for the reasons behind a status. One line a message; secrets never go here.
 #pragma once
 
+#include <syslog.h>
+
 #include <functional>
 #include <string>
 #include <string_view>
 
 namespace platform {
 
-enum class LogLevel { error, warning, notice, debug };
+// The severities of syslog(3).
+enum class LogLevel { error = LOG_ERR, warning = LOG_WARNING, notice = LOG_NOTICE, debug = LOG_DEBUG };
 
 // Writes one line to the system log under the name "location-assistant". Control bytes are shown as '?', and
 // a line is cut at 1000 bytes, so that a file's content cannot forge lines of its own. It never waits: a line

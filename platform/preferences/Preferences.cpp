@@ -1,6 +1,7 @@
 // The operations of SystemConfiguration.h on the preferences store.
+#include <chrono>
 #include <string>
-#include <utility>
+#include <type_traits>
 
 #include "platform/SystemConfiguration.h"
 #include "platform/preferences/Session.h"
@@ -9,19 +10,24 @@
 
 namespace {
 
-using platform::Outcome;
 using platform::preferences::Session;
 using platform::preferences::setStatus;
 using platform::values::as;
 using platform::values::Owned;
 using platform::values::textOf;
 
-Boolean answer(int status) {
-    return static_cast<Boolean>(setStatus(status));
-}
-
-Boolean answer(const Outcome& outcome, const Session& session) {
-    return static_cast<Boolean>(setStatus(outcome, session.name()));
+// What an operation on the session comes to; 3001 without one.
+template <class Operation>
+Boolean onSession(SCPreferencesRef reference, Operation operation) {
+    Session* const session = Session::from(reference);
+    if (session == nullptr) {
+        return static_cast<Boolean>(setStatus(kSCStatusNoPrefsSession));
+    }
+    if constexpr (std::is_same_v<decltype(operation(*session)), int>) {
+        return static_cast<Boolean>(setStatus(operation(*session)));
+    } else {
+        return static_cast<Boolean>(setStatus(operation(*session), session->name()));
+    }
 }
 
 bool isPath(CFStringRef path) {
@@ -60,17 +66,13 @@ SCPreferencesRef SCPreferencesCreate(CFAllocatorRef /*allocator*/, CFStringRef n
 }
 
 Boolean SCPreferencesLock(SCPreferencesRef session, Boolean wait) noexcept {
-    Session* const self = Session::from(session);
-    if (self == nullptr) {
-        return answer(kSCStatusNoPrefsSession);
-    }
-    const std::chrono::milliseconds time = platform::preferences::lockWait;
-    return answer(self->lock(wait != 0 ? time : std::chrono::milliseconds(0)), *self);
+    return onSession(session, [wait](Session& self) {
+        return self.lock(wait != 0 ? platform::preferences::lockWait : std::chrono::seconds(0));
+    });
 }
 
 Boolean SCPreferencesUnlock(SCPreferencesRef session) noexcept {
-    Session* const self = Session::from(session);
-    return self == nullptr ? answer(kSCStatusNoPrefsSession) : answer(self->unlock(), *self);
+    return onSession(session, [](Session& self) { return self.unlock(); });
 }
 
 CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef key) noexcept {
@@ -85,12 +87,10 @@ CFPropertyListRef SCPreferencesGetValue(SCPreferencesRef session, CFStringRef ke
 }
 
 Boolean SCPreferencesSetValue(SCPreferencesRef session, CFStringRef key, CFPropertyListRef value) noexcept {
-    Session* const self = Session::from(session);
-    if (self == nullptr) {
-        return answer(kSCStatusNoPrefsSession);
-    }
     const bool valid = as<CFStringRef>(key) != nullptr && value != nullptr;
-    return answer(valid ? self->tree().setTopValue(key, value) : kSCStatusInvalidArgument);
+    return onSession(session, [&](Session& self) {
+        return valid ? self.tree().setTopValue(key, value) : kSCStatusInvalidArgument;
+    });
 }
 
 CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef path) noexcept {
@@ -99,12 +99,10 @@ CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef 
 
 Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path,
                                   CFDictionaryRef value) noexcept {
-    Session* const self = Session::from(session);
-    if (self == nullptr) {
-        return answer(kSCStatusNoPrefsSession);
-    }
     const bool valid = isPath(path) && as<CFDictionaryRef>(value) != nullptr;
-    return answer(valid ? self->tree().set(textOf(path), value) : kSCStatusInvalidArgument);
+    return onSession(session, [&](Session& self) {
+        return valid ? self.tree().set(textOf(path), value) : kSCStatusInvalidArgument;
+    });
 }
 
 CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path) noexcept {
@@ -119,14 +117,11 @@ CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path)
 }
 
 Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path) noexcept {
-    Session* const self = Session::from(session);
-    if (self == nullptr) {
-        return answer(kSCStatusNoPrefsSession);
-    }
-    return answer(isPath(path) ? self->tree().remove(textOf(path)) : kSCStatusInvalidArgument);
+    return onSession(session, [path](Session& self) {
+        return isPath(path) ? self.tree().remove(textOf(path)) : kSCStatusInvalidArgument;
+    });
 }
 
 Boolean SCPreferencesCommitChanges(SCPreferencesRef session) noexcept {
-    Session* const self = Session::from(session);
-    return self == nullptr ? answer(kSCStatusNoPrefsSession) : answer(self->commit(), *self);
+    return onSession(session, [](Session& self) { return self.commit(); });
 }

@@ -5,7 +5,6 @@
 
 #include <cerrno>
 #include <utility>
-#include <vector>
 
 #include "platform/base/DurableFile.h"
 #include "platform/base/FileLock.h"
@@ -13,8 +12,6 @@
 namespace platform::preferences {
 namespace {
 
-constexpr mode_t newDirectoryMode = 0700;
-constexpr mode_t newParentMode = 0755;
 constexpr int readTries = 3;
 
 std::int64_t nanoseconds(const timespec& time) {
@@ -35,6 +32,18 @@ Outcome checkCouldMake(std::string directory) {
         directory = parentOf(directory);
     }
     return {};
+}
+
+// Makes a directory unless it is there, and those above it, each on the disk before anything is put into it.
+Outcome makeDirectory(const std::string& path, mode_t mode) {
+    if (::access(path.c_str(), F_OK) == 0 || errno != ENOENT) {
+        return {};
+    }
+    RETURN_IF_FAILED(makeDirectory(parentOf(path), 0755));
+    if ((!isStepAllowed("mkdir", path) || ::mkdir(path.c_str(), mode) != 0) && errno != EEXIST) {
+        return Outcome::fromErrno("cannot make " + path);
+    }
+    return syncDirectory(parentOf(path));
 }
 
 }  // namespace
@@ -85,22 +94,6 @@ Outcome StoreFile::read(std::string& content, KnownFile& known) const {
     return {kSCStatusFailed, path_ + " changes while it is read"};
 }
 
-Outcome StoreFile::makeDirectories() const {
-    std::vector<std::string> missing;
-    for (std::string path = directory_; ::access(path.c_str(), F_OK) != 0 && errno == ENOENT;) {
-        missing.push_back(path);
-        path = parentOf(path);
-    }
-    for (auto path = missing.rbegin(); path != missing.rend(); ++path) {
-        const mode_t mode = *path == directory_ ? newDirectoryMode : newParentMode;
-        if ((!isStepAllowed("mkdir", *path) || ::mkdir(path->c_str(), mode) != 0) && errno != EEXIST) {
-            return Outcome::fromErrno("cannot make " + *path);
-        }
-        RETURN_IF_FAILED(syncDirectory(parentOf(*path)));
-    }
-    return checkDirectory();
-}
-
 void StoreFile::keepPrivate(KnownFile& known) const {
     struct stat status {};
     const int file = known.pin->get();
@@ -112,7 +105,8 @@ void StoreFile::keepPrivate(KnownFile& known) const {
 }
 
 Outcome StoreFile::lock(std::chrono::milliseconds wait, FileDescriptor& lock) const {
-    RETURN_IF_FAILED(makeDirectories());
+    RETURN_IF_FAILED(makeDirectory(directory_, 0700));
+    RETURN_IF_FAILED(checkDirectory());
     return takeFileLock(directory_ + "/preferences.lock", wait, lock, kSCStatusPrefsBusy);
 }
 

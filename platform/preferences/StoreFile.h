@@ -68,7 +68,6 @@ class StoreFile {
   private:
     // That the directory is one, and nobody else can change what is in it.
     [[nodiscard]] Outcome checkDirectory() const;
-    [[nodiscard]] Outcome makeDirectories() const;
     [[nodiscard]] std::optional<KnownFile> recognize(const struct stat& written) const;
 
     std::string directory_;

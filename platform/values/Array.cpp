@@ -1,5 +1,4 @@
 #include <algorithm>
-#include <cassert>
 #include <vector>
 
 #include "platform/values/Containers.h"
@@ -94,23 +93,20 @@ CFIndex CFArrayGetFirstIndexOfValue(CFArrayRef array, CFRange range, const void*
 }
 
 void CFArrayAppendValue(CFMutableArrayRef array, const void* value) noexcept {
-    assert(array->isMutable());
-    if (array->isMutable()) {
+    if (array->mayChange()) {
         array->append(value);
     }
 }
 
 void CFArrayRemoveValueAtIndex(CFMutableArrayRef array, CFIndex index) noexcept {
-    assert(array->isMutable());
-    if (array->isMutable() && index >= 0 && index < CFArrayGetCount(array)) {
+    if (array->mayChange() && index >= 0 && index < CFArrayGetCount(array)) {
         array->remove(static_cast<std::size_t>(index));
     }
 }
 
 void CFArraySortValues(CFMutableArrayRef array, CFRange range, CFComparatorFunction comparator,
                        void* context) noexcept {
-    assert(array->isMutable());
-    if (!array->isMutable() || range.length < 2) {
+    if (!array->mayChange() || range.length < 2) {
         return;
     }
     // The comparator never sees the array half sorted.

@@ -1,6 +1,7 @@
 // Dictionaries and arrays, and telling the kinds of values apart.
 #pragma once
 
+#include <cassert>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
@@ -19,6 +20,11 @@ namespace platform::values {
 class Container : public Object {
   public:
     [[nodiscard]] bool isMutable() const noexcept { return mutable_; }
+    // For the operations that change a container: one that is not mutable is a mistake of the caller's.
+    [[nodiscard]] bool mayChange() const noexcept {
+        assert(mutable_);
+        return mutable_;
+    }
     [[nodiscard]] bool retainsValues() const noexcept { return retainsValues_; }
 
   protected:

@@ -1,5 +1,4 @@
 #include <algorithm>
-#include <cassert>
 #include <utility>
 
 #include "platform/values/Containers.h"
@@ -205,22 +204,19 @@ void CFDictionaryGetKeysAndValues(CFDictionaryRef dictionary, const void** keys,
 }
 
 void CFDictionarySetValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) noexcept {
-    assert(dictionary->isMutable());
-    if (dictionary->isMutable()) {
+    if (dictionary->mayChange()) {
         dictionary->set(key, value, true);
     }
 }
 
 void CFDictionaryAddValue(CFMutableDictionaryRef dictionary, const void* key, const void* value) noexcept {
-    assert(dictionary->isMutable());
-    if (dictionary->isMutable()) {
+    if (dictionary->mayChange()) {
         dictionary->set(key, value, false);
     }
 }
 
 void CFDictionaryRemoveValue(CFMutableDictionaryRef dictionary, const void* key) noexcept {
-    assert(dictionary->isMutable());
-    if (dictionary->isMutable()) {
+    if (dictionary->mayChange()) {
         dictionary->remove(key);
     }
 }

@@ -5,6 +5,7 @@
 #include <array>
 #include <cassert>
 #include <memory>
+#include <optional>
 
 #include "platform/values/ICUStatus.h"
 #include "platform/values/Scalars.h"
@@ -27,19 +28,14 @@ Collator openCollator(bool ignoreCase, bool numeric) {
 
 // Null when ICU has no collation data. Opened on first use: most runs compare nothing.
 const icu::Collator* collatorFor(CFStringCompareFlags flags) {
-    struct Slot {
-        bool tried = false;
-        Collator collator;
-    };
-    thread_local std::array<Slot, 4> slots;
+    thread_local std::array<std::optional<Collator>, 4> collators;
     const bool ignoreCase = (flags & kCFCompareCaseInsensitive) != 0;
     const bool numeric = (flags & kCFCompareNumerically) != 0;
-    Slot& slot = slots.at((ignoreCase ? 1U : 0U) | (numeric ? 2U : 0U));
-    if (!slot.tried) {
-        slot.tried = true;
-        slot.collator = openCollator(ignoreCase, numeric);
+    std::optional<Collator>& collator = collators.at((ignoreCase ? 1U : 0U) | (numeric ? 2U : 0U));
+    if (!collator) {
+        collator = openCollator(ignoreCase, numeric);
     }
-    return slot.collator.get();
+    return collator->get();
 }
 
 }  // namespace

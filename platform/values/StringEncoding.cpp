@@ -1,11 +1,8 @@
 // Text from and to the encodings of the faces.
-#include <unicode/ucnv.h>
+#include <unicode/unistr.h>
 #include <unicode/ustring.h>
 
-#include <algorithm>
 #include <cstring>
-#include <memory>
-#include <vector>
 
 #include "platform/values/ICUStatus.h"
 #include "platform/values/Scalars.h"
@@ -15,37 +12,17 @@ using namespace platform::values;
 
 namespace {
 
-struct ConverterCloser {
-    void operator()(UConverter* converter) const { ucnv_close(converter); }
-};
-using Converter = std::unique_ptr<UConverter, ConverterCloser>;
-
 // ICU's own table and not one of ours: the encoding has had two meanings of byte 0xDB and a private-use
 // character, and nobody here reads Mac OS Roman often enough to feel the converter being opened. Plain ASCII
 // never comes here.
-Converter openMacRoman() {
-    UErrorCode status = U_ZERO_ERROR;
-    Converter converter(ucnv_open("macintosh", &status));
-    if (succeeded(status)) {
-        ucnv_setToUCallBack(converter.get(), UCNV_TO_U_CALLBACK_STOP, nullptr, nullptr, nullptr, &status);
-    }
-    return succeeded(status) ? std::move(converter) : nullptr;
-}
-
 CFStringRef createFromMacRoman(std::string_view bytes) {
-    const Converter converter = openMacRoman();
-    if (!converter || bytes.size() > OpaqueCFString::longestText) {
+    if (bytes.size() > OpaqueCFString::longestText) {
         return nullptr;
     }
-    std::vector<UChar> units(bytes.size());
-    UErrorCode status = U_ZERO_ERROR;
-    const auto size = static_cast<std::int32_t>(bytes.size());
-    const std::int32_t count =
-        ucnv_toUChars(converter.get(), units.data(), size, bytes.data(), size, &status);
-    if (!succeeded(status)) {
-        return nullptr;
-    }
-    return CFStringCreateWithCharacters(nullptr, reinterpret_cast<const UniChar*>(units.data()), count);
+    // Every byte is a character. Without the table nothing comes out.
+    const icu::UnicodeString decoded(bytes.data(), static_cast<std::int32_t>(bytes.size()), "macintosh");
+    std::string text;
+    return decoded.isEmpty() ? nullptr : makeString(decoded.toUTF8String(text)).take();
 }
 
 }  // namespace
@@ -92,15 +69,9 @@ CFStringRef CFStringCreateWithCharacters(CFAllocatorRef, const UniChar* characte
 }
 
 void CFStringGetCharacters(CFStringRef string, CFRange range, UniChar* buffer) noexcept {
-    const std::string_view text = string->text();
-    std::vector<UChar> units(static_cast<std::size_t>(CFStringGetLength(string)));
-    UErrorCode status = U_ZERO_ERROR;
-    u_strFromUTF8(units.data(), static_cast<std::int32_t>(units.size()), nullptr, text.data(),
-                  static_cast<std::int32_t>(text.size()), &status);
-    const auto end = std::min(units.size(), static_cast<std::size_t>(range.location + range.length));
-    for (auto unit = static_cast<std::size_t>(range.location); unit < end; ++unit) {
-        *buffer++ = units[unit];
-    }
+    const auto units = icu::UnicodeString::fromUTF8(string->text());
+    units.extract(static_cast<std::int32_t>(range.location), static_cast<std::int32_t>(range.length),
+                  reinterpret_cast<char16_t*>(buffer));
 }
 
 Boolean CFStringGetCString(CFStringRef string, char* buffer, CFIndex bufferSize,
