@@ -5,7 +5,7 @@
 
 #include "platform/values/PropertyListXML.h"
 #include "tests/unit/apply/Trees.h"
-#include "tests/unit/preferences/Fixture.h"
+#include "tests/unit/preferences/Store.h"
 #include "tests/unit/support/RecordingAgent.h"
 #include "tests/unit/support/Transcript.h"
 
