@@ -129,8 +129,8 @@ const std::map<std::string, Call> operations = tableOf(
     OPERATION(MoreSCCopyServicesDictMutable), OPERATION(MoreSCCopySetIDs), OPERATION(MoreSCCopySetsDict),
     OPERATION(MoreSCCopyUserVisibleNameOfService), OPERATION(MoreSCCopyUserVisibleNameOfSet),
     OPERATION(MoreSCCreateActiveDHCPServicesArray), OPERATION(MoreSCCreateCCLArray),
-    OPERATION(MoreSCDeleteEntity), OPERATION(MoreSCDeleteService), OPERATION(MoreSCDeleteSet),
-    OPERATION(MoreSCDuplicateService), OPERATION(MoreSCDuplicateSet),
+    OPERATION(MoreSCDHCPRelease), OPERATION(MoreSCDeleteEntity), OPERATION(MoreSCDeleteService),
+    OPERATION(MoreSCDeleteSet), OPERATION(MoreSCDuplicateService), OPERATION(MoreSCDuplicateSet),
     OPERATION(MoreSCFCopyEncodedPPPPassword), OPERATION(MoreSCFindSetByUserVisibleNameAndCopyID),
     OPERATION(MoreSCIsAppleTalkActive), OPERATION(MoreSCIsEntityActive), OPERATION(MoreSCIsServiceActive),
     OPERATION(MoreSCMakeNewDialupSet), OPERATION(MoreSCNewEntity), OPERATION(MoreSCNewService),
@@ -157,10 +157,14 @@ class Calls : public MoreSCFTest, public testing::WithParamInterface<const char*
     std::string play(const std::string& step) {
         const std::size_t end = step.find_first_of(" (");
         const std::string name = step.substr(0, end);
+        const std::string rest = step.substr(std::min(end, step.size() - 1) + 1);
         if (end != std::string::npos && step[end] == '(') {
-            return call(operations.at(name), step.substr(end + 1, step.rfind(')') - end - 1));
+            return isInSession_ ? plainCall(step) : call(step);
         }
-        arrangements.at(name)(step.substr(std::min(end, step.size() - 1) + 1));
+        if (uses.contains(name)) {
+            return "    " + uses.at(name)(rest);
+        }
+        arrangements.at(name)(rest);
         return "";
     }
 
@@ -183,7 +187,49 @@ class Calls : public MoreSCFTest, public testing::WithParamInterface<const char*
                                                   : std::optional(std::stoi(version, nullptr, 16));
              version_.emplace(host);
          }},
+        {"file", [this](const std::string& notation) { setTree(notation); }},
+        {"fail", [this](const std::string& call) { agent->failing.insert(call); }},
+        {"set",
+         [](const std::string& path) {
+             SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), CFSTR("CurrentSet"), Str(path));
+         }},
     };
+
+    // How a session is used. Between "begin" and "end" the calls are made in it, or without one, as they
+    // are: shown is what came to the file and to the machine by then.
+    const std::map<std::string, std::function<std::string(const std::string&)>> uses = {
+        {"begin",
+         [this](const std::string&) {
+             setTree(tree_);
+             isInSession_ = true;
+             return "the file as it was";
+         }},
+        {"open",
+         [](const std::string& how) {
+             return std::to_string(MoreSCOpen(how.starts_with("locked"), how == "locked, waiting"));
+         }},
+        {"close",
+         [this](const std::string& how) {
+             OSStatus err = std::stoi(how);
+             MoreSCClose(&err, how.ends_with("dirty"));
+             return std::to_string(err) + outside();
+         }},
+        {"end",
+         [this](const std::string&) {
+             isInSession_ = false;
+             agent->failing.clear();
+             return "all" + outside();
+         }},
+    };
+
+    std::string outside() {
+        changes_.clear();
+        compare(read(tree_).get(), read(tree()).get(), "");
+        for (const std::string& each : std::exchange(agent->changes, {})) {
+            changes_ += "\n    made so: " + each;
+        }
+        return changes_;
+    }
 
     // Where a comma stands outside of all brackets, the next argument begins.
     static std::vector<std::string> split(const std::string& text) {
@@ -200,18 +246,26 @@ class Calls : public MoreSCFTest, public testing::WithParamInterface<const char*
         return arguments;
     }
 
-    std::string call(const Call& operation, const std::string& arguments) {
+    // The step is "Operation(argument, argument)".
+    static std::string plainCall(const std::string& step) {
+        const std::size_t open = step.find('(');
+        std::string outputs;
+        const OSStatus status = operations.at(step.substr(0, open))(
+            split(step.substr(open + 1, step.rfind(')') - open - 1)), outputs);
+        return "    " + std::to_string(status) + outputs;
+    }
+    std::string call(const std::string& step) {
         setTree(tree_);
         OSStatus err = MoreSCOpen(false, false);
-        std::string outputs;
-        const OSStatus status = operation(split(arguments), outputs);
+        std::string outcome = plainCall(step);
         changes_.clear();
         compare(read(tree_).get(), SCPreferencesPathGetValue(MoreSCGetSCPreferencesRef(), CFSTR("/")), "");
         // On disk only what a marked session commits.
         SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), CFSTR("Added"), kCFBooleanTrue);
         MoreSCClose(&err, false);
         const bool isMarked = tree().ends_with("; Added = #true}");
-        return "    " + std::to_string(status) + (isMarked ? ", marked" : "") + outputs + changes_;
+        outcome.insert(std::min(outcome.find('\n'), outcome.size()), isMarked ? ", marked" : "");
+        return outcome + changes_;
     }
 
     void compare(CFTypeRef before, CFTypeRef after, const std::string& path) {
@@ -250,6 +304,7 @@ class Calls : public MoreSCFTest, public testing::WithParamInterface<const char*
 
     std::string tree_ = "{}";
     std::string changes_;
+    bool isInSession_ = false;
     std::optional<platform::HostOverride> version_;
 };
 
@@ -259,7 +314,7 @@ TEST_P(Calls, DoWhatTheirTranscriptShows) {
 }
 INSTANTIATE_TEST_SUITE_P(Of, Calls,
                          testing::Values("locations", "services", "new_services", "entities", "wrong_types",
-                                         "helpers", "dialup", "tree", "scripts", "conversions"));
+                                         "helpers", "dialup", "tree", "scripts", "conversions", "session"));
 
 }  // namespace
 }  // namespace morescf_test

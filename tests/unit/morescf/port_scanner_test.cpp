@@ -76,6 +76,22 @@ std::string scan() {
     return text;
 }
 
+// The hook's status and the name that it gives, behind a blank: "none", or "=" for the one that the rules
+// propose.
+std::string gHook;
+
+OSStatus giveName(io_object_t port, CFMutableDictionaryRef dict, CFStringRef proposed, CFStringRef* base) {
+    EXPECT_TRUE(IOObjectConformsTo(port, "IOEthernetInterface"));
+    CFDictionarySetValue(dict, CFSTR("AAPL,slot-name"), CFSTR("%3$@%2$@"));
+    const std::string name = gHook.substr(gHook.find(' ') + 1);
+    if (name == "=") {
+        *base = CFStringCreateCopy(nullptr, proposed);
+    } else if (name != "none") {
+        *base = platform::values::makeString(name).take();
+    }
+    return std::stoi(gHook);
+}
+
 TEST(PortScanner, DescribesNamesAndSorts) {
     testing_support::Transcript transcript("ports");
     transcript.playItself([](const std::string& step) -> std::string {
@@ -85,43 +101,17 @@ TEST(PortScanner, DescribesNamesAndSorts) {
             const std::string ports = scan();
             gCards.clear();
             gSerialPorts.clear();
+            MoreSCFSetPortNameCallback(nullptr);
             return "    " + ports;
         }
-        (what == "card" ? gCards : gSerialPorts).push_back(with);
+        if (what == "hook") {
+            gHook = with;
+            MoreSCFSetPortNameCallback(giveName);
+        } else {
+            (what == "card" ? gCards : gSerialPorts).push_back(with);
+        }
         return "";
     });
-}
-
-TEST(PortScanner, AHooksNameAndStatusReplaceThoseOfTheRules) {
-    const auto nameWith = [](MoreSCFPortNameCallback hook, const Chain& port) {
-        MoreSCFSetPortNameCallback(hook);
-        gCards = {port};
-        const std::string ports = scan();
-        gCards.clear();
-        MoreSCFSetPortNameCallback(nullptr);
-        return ports.starts_with("(") ? ports.substr(ports.find("UserDefinedName")) : ports;
-    };
-    const Chain unnamed = "{BSD Name = en1} < {} < {}";
-    // Later keywords are found in what replaced earlier ones, and each one only once.
-    EXPECT_EQ("UserDefinedName = unknown unknown%2$@ %2$@ unknown})",
-              nameWith(
-                  [](io_object_t port, CFMutableDictionaryRef dict, CFStringRef proposed, CFStringRef* base) {
-                      EXPECT_EQ(nullptr, proposed);
-                      EXPECT_TRUE(IOObjectConformsTo(port, "IOEthernetInterface"));
-                      CFDictionarySetValue(dict, CFSTR("AAPL,slot-name"), CFSTR("%3$@%2$@"));
-                      *base = CFStringCreateCopy(nullptr, CFSTR("%1$@ %2$@ %2$@ %4$@"));
-                      return OSStatus{0};
-                  },
-                  unnamed));
-    EXPECT_EQ("-77", nameWith(
-                         [](io_object_t, CFMutableDictionaryRef, CFStringRef proposed, CFStringRef* base) {
-                             *base = CFStringCreateCopy(nullptr, proposed);
-                             return OSStatus{-77};
-                         },
-                         "{BSD Name = en1} < {IOClass = AirPort} < {}"));
-    EXPECT_EQ("-1", nameWith([](io_object_t, CFMutableDictionaryRef, CFStringRef,
-                                CFStringRef*) { return OSStatus{0}; },
-                             unnamed));
 }
 
 }  // namespace

@@ -4,7 +4,6 @@
 #include <chrono>
 #include <thread>
 
-#include "morescf/MoreSCFHelpers.h"
 #include "platform/base/FileDescriptor.h"
 #include "tests/unit/morescf/Fixture.h"
 
@@ -15,55 +14,6 @@ class SessionTest : public MoreSCFTest {
   protected:
     SessionTest() { setTree(twoSets); }
 };
-
-TEST_F(SessionTest, CommitsAndAppliesOnceAtTheOutermostClose) {
-    const std::string before = tree();
-    OSStatus err = MoreSCOpen(false, false);
-    SCPreferencesRef session = MoreSCGetSCPreferencesRef();
-    EXPECT_EQ(0, MoreSCRenameSet(Str("1"), Str("Cottage")));
-    EXPECT_EQ(0, MoreSCSetServiceActive(nullptr, Str("5"), false));
-    EXPECT_EQ(session, MoreSCGetSCPreferencesRef());
-    EXPECT_EQ(before, tree());
-    EXPECT_TRUE(agent->changes.empty());
-    MoreSCClose(&err, false);
-    EXPECT_EQ(0, err);
-    EXPECT_NE(std::string::npos, tree().find("Cottage"));
-    EXPECT_EQ(std::vector<std::string>({"eth0: idle -> ours: off"}), agent->changes);
-}
-
-// That a writer marks the session, and only when it succeeds, every operation shows.
-TEST_F(SessionTest, TheMarkOutlivesFailuresButNotTheSession) {
-    for (const Boolean dirty : {true, false}) {
-        for (const bool isMarked : {true, false}) {
-            setTree(twoSets);
-            const std::string before = tree();
-            OSStatus err = MoreSCOpen(false, false);
-            SCPreferencesSetValue(MoreSCGetSCPreferencesRef(), CFSTR("CurrentSet"), CFSTR("/Sets/2"));
-            EXPECT_EQ(isMarked ? 0 : 1004, MoreSCRenameSet(Str(isMarked ? "1" : "none"), Str("Cottage")));
-            err = -1;
-            MoreSCClose(&err, dirty);
-            EXPECT_EQ(-1, err);
-            EXPECT_EQ(isMarked, before != tree());
-        }
-    }
-}
-
-TEST_F(SessionTest, AFailedCommitReplacesOnlySuccessAndIsNotApplied) {
-    for (const OSStatus earlier : {0, -17}) {
-        OSStatus err = MoreSCOpen(false, false);
-        EXPECT_EQ(0, MoreSCSetServiceActive(nullptr, Str("5"), false));
-        setTree("{CurrentSet = /Sets/1}");
-        err = earlier;
-        MoreSCClose(&err, true);
-        EXPECT_EQ(earlier != 0 ? earlier : kSCStatusStale, err);
-        EXPECT_EQ("{CurrentSet = /Sets/1}", tree());
-        EXPECT_TRUE(agent->calls.empty());
-        setTree(twoSets);
-    }
-    agent->failing.insert("takeOver eth0");
-    EXPECT_EQ(kSCStatusFailed, MoreSCSetServiceActive(nullptr, Str("5"), false));
-    EXPECT_NE(std::string::npos, tree().find("__INACTIVE__")) << "saved, though not made so";
-}
 
 TEST_F(SessionTest, AnOpenThatFailsIsBalancedAndTheLogNamesTheClient) {
     const auto failure = [this] {
@@ -114,17 +64,6 @@ TEST_F(SessionTest, LocksForAsLongAsTheOutermostUse) {
     MoreSCClose(&err, false);
     EXPECT_TRUE(isFree());
     CFRelease(session);
-}
-
-TEST_F(SessionTest, ReleaseIsTwoCommitsAndTwoApplies) {
-    EXPECT_EQ(0, MoreSCDHCPRelease(Str("5")));
-    EXPECT_EQ((std::vector<std::string>{"eth0: idle -> ours: none 0", "eth0: ours: none 0 -> ours: dhcp 0"}),
-              agent->changes);
-    EXPECT_EQ(std::string::npos, tree().find("__INACTIVE__"));
-    agent->failing.insert("takeOver eth0");
-    EXPECT_EQ(kSCStatusFailed, MoreSCDHCPRelease(Str("5")));
-    EXPECT_NE(std::string::npos, tree().find("__INACTIVE__")) << "not switched on again after a failure";
-    EXPECT_EQ(-50, MoreSCDHCPRelease(nullptr));
 }
 
 }  // namespace
