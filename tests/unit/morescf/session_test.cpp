@@ -59,11 +59,16 @@ TEST_F(SessionTest, LocksForAsLongAsTheOutermostUse) {
     });
     EXPECT_EQ(0, inner = MoreSCOpen(true, true)) << "a failure is not taken for the lock, and waiting waits";
     release.join();
+    EXPECT_EQ(0, MoreSCOpen(true, false)) << "what is locked is not locked again";
+    MoreSCClose(&inner, false);
     MoreSCClose(&inner, false);
     EXPECT_FALSE(isFree());
     MoreSCClose(&err, false);
     EXPECT_TRUE(isFree());
     CFRelease(session);
+    EXPECT_EQ(0, err = MoreSCOpen(true, false));
+    EXPECT_FALSE(isFree()) << "the next session has a lock of its own";
+    MoreSCClose(&err, false);
 }
 
 }  // namespace
