@@ -6,6 +6,7 @@
 #include <ctime>
 
 #include "platform/values/PropertyListXML.h"
+#include "platform/values/PropertyListXMLForms.h"
 
 namespace platform::values {
 
@@ -44,18 +45,7 @@ std::optional<std::int64_t> secondsFrom(std::string_view text) {
     return dateText(seconds) == date ? std::optional(seconds) : std::nullopt;
 }
 
-constexpr std::array<std::int16_t, 256> makeBase64Values() {
-    std::array<std::int16_t, 256> values{};
-    values.fill(-1);
-    constexpr std::string_view alphabet = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
-    for (std::size_t i = 0; i < alphabet.size(); ++i) {
-        values[static_cast<unsigned char>(alphabet[i])] = static_cast<std::int16_t>(i);
-    }
-    return values;
-}
-
 std::optional<std::string> bytesFromBase64(std::string_view text) {
-    static constexpr std::array<std::int16_t, 256> values = makeBase64Values();
     std::string bytes;
     bytes.reserve(text.size() / 4 * 3);
     std::uint32_t group = 0;
@@ -65,13 +55,13 @@ std::optional<std::string> bytesFromBase64(std::string_view text) {
         if (isXMLSpace(character)) {
             continue;
         }
-        const int value = values[static_cast<unsigned char>(character)];
-        if (character == '=') {
-            ++padding;
-        } else if (value < 0 || padding > 0) {
+        const std::size_t value = base64Alphabet.find(character);
+        const bool isPadding = character == '=';
+        padding += isPadding ? 1 : 0;
+        if (!isPadding && (value == std::string_view::npos || padding > 0)) {
             return std::nullopt;
         }
-        group = (group << 6) | static_cast<std::uint32_t>(std::max(value, 0));
+        group = (group << 6) | static_cast<std::uint32_t>(isPadding ? 0 : value);
         if (++size == 4) {
             if (padding > 2) {
                 return std::nullopt;

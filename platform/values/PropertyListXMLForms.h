@@ -13,6 +13,8 @@ inline constexpr std::string_view documentType =
     "<!DOCTYPE plist PUBLIC \"-//Apple//DTD PLIST 1.0//EN\" "
     "\"http://www.apple.com/DTDs/PropertyList-1.0.dtd\">";
 inline constexpr std::string_view plistStart = "<plist version=\"1.0\">";
+inline constexpr std::string_view base64Alphabet =
+    "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
 
 // The value of a document in plain form: the pieces above, elements without attributes, text, the five
 // entities and "&#13;". Null for everything else, which may or may not be a property list.

@@ -48,14 +48,12 @@ class PlainReader {
     }
     [[nodiscard]] bool readProlog() {
         // White space behind each is that of the pieces themselves, and of whoever edits them by hand.
-        skipSpaceAfter(take(xmlDeclaration));
-        skipSpaceAfter(take(documentType));
-        return take(plistStart) && builder_.begin(Element::plist) == nullptr;
-    }
-    void skipSpaceAfter(bool taken) {
-        if (taken) {
-            skipSpace();
+        for (const std::string_view piece : {xmlDeclaration, documentType}) {
+            if (take(piece)) {
+                skipSpace();
+            }
         }
+        return take(plistStart) && builder_.begin(Element::plist) == nullptr;
     }
     [[nodiscard]] bool readElements();
     [[nodiscard]] bool readLeaf(std::string_view name);

@@ -130,7 +130,6 @@ bool Writer::write(const OpaqueCFNumber& number, std::size_t) {
 }
 
 bool Writer::write(const OpaqueCFData& data, std::size_t depth) {
-    constexpr std::string_view alphabet = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
     constexpr std::size_t bytesInLine = 51;
     const std::string_view bytes = data.bytes;
     put("<data>\n");
@@ -147,7 +146,7 @@ bool Writer::write(const OpaqueCFData& data, std::size_t depth) {
             bits = (bits << 8) | (i < group.size() ? static_cast<unsigned char>(group[i]) : 0U);
         }
         for (std::size_t i = 0; i < 4; ++i) {
-            put(i <= group.size() ? alphabet[(bits >> (18 - 6 * i)) & 0x3F] : '=');
+            put(i <= group.size() ? base64Alphabet[(bits >> (18 - 6 * i)) & 0x3F] : '=');
         }
     }
     if (!bytes.empty()) {

@@ -10,7 +10,6 @@
 #include <chrono>
 #include <cmath>
 #include <memory>
-#include <optional>
 #include <vector>
 
 #include "platform/base/FileDescriptor.h"
@@ -53,16 +52,14 @@ struct OpaqueCFRunLoop final : Object {
         [[maybe_unused]] const ssize_t written = ::write(wake_.get(), &one, sizeof one);
         errno = error;
     }
-    // Runs until the deadline, or without one.
-    SInt32 run(std::optional<Clock::time_point> deadline, bool returnAfterSourceHandled);
+    SInt32 run(Clock::time_point deadline, bool returnAfterSourceHandled);
 
   private:
     [[nodiscard]] bool holds(CFRunLoopSourceRef source) const {
         return std::ranges::any_of(sources_, [source](const Source& held) { return held.get() == source; });
     }
-    [[nodiscard]] bool takeStop() noexcept { return isStopped_.exchange(false); }
-    [[nodiscard]] int waitingTime(std::optional<Clock::time_point> deadline) const;
-    bool handleReady(std::optional<Clock::time_point> deadline, bool onlyOne);
+    [[nodiscard]] int waitingTime(Clock::time_point deadline) const;
+    bool handleReady(Clock::time_point deadline, bool onlyOne);
 
     std::vector<Source> sources_;
     FileDescriptor wake_;
@@ -87,15 +84,15 @@ bool isDefaultMode(CFStringRef mode) {
 const CFStringRef kCFRunLoopDefaultMode = &defaultMode.value;
 
 // poll's, rounded up so that the loop does not spin through the last millisecond.
-int OpaqueCFRunLoop::waitingTime(std::optional<Clock::time_point> deadline) const {
+int OpaqueCFRunLoop::waitingTime(Clock::time_point deadline) const {
     using std::chrono::milliseconds;
     const milliseconds longest(wake_.isOpen() ? 3'600'000 : 100);
-    const milliseconds left = deadline ? std::chrono::ceil<milliseconds>(*deadline - Clock::now()) : longest;
+    const auto left = std::chrono::ceil<milliseconds>(deadline - Clock::now());
     return static_cast<int>(std::clamp(left, milliseconds(0), longest).count());
 }
 
 // Waits, and calls the sources that are ready; whether there was one.
-bool OpaqueCFRunLoop::handleReady(std::optional<Clock::time_point> deadline, bool onlyOne) {
+bool OpaqueCFRunLoop::handleReady(Clock::time_point deadline, bool onlyOne) {
     // The callbacks may change the list of sources and drop their own.
     const std::vector<Source> watched = sources_;
     std::vector<pollfd> polled;
@@ -127,7 +124,7 @@ bool OpaqueCFRunLoop::handleReady(std::optional<Clock::time_point> deadline, boo
     return handled;
 }
 
-SInt32 OpaqueCFRunLoop::run(std::optional<Clock::time_point> deadline, bool returnAfterSourceHandled) {
+SInt32 OpaqueCFRunLoop::run(Clock::time_point deadline, bool returnAfterSourceHandled) {
     // What was stopped before this run began is an outer run, which learns of it when this one has ended.
     struct Outer {
         std::atomic<bool>& flag;
@@ -139,13 +136,13 @@ SInt32 OpaqueCFRunLoop::run(std::optional<Clock::time_point> deadline, bool retu
             return kCFRunLoopRunFinished;
         }
         const bool handled = handleReady(deadline, returnAfterSourceHandled);
-        if (takeStop()) {
+        if (isStopped_.exchange(false)) {
             return kCFRunLoopRunStopped;
         }
         if (handled && returnAfterSourceHandled) {
             return kCFRunLoopRunHandledSource;
         }
-        if (deadline.has_value() && Clock::now() >= *deadline) {
+        if (Clock::now() >= deadline) {
             return kCFRunLoopRunTimedOut;
         }
     }
@@ -179,15 +176,11 @@ SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds,
     if (!isDefaultMode(mode)) {
         return kCFRunLoopRunFinished;
     }
-    // More than this is for ever.
-    constexpr CFTimeInterval longest = 1e9;
-    std::optional<OpaqueCFRunLoop::Clock::time_point> deadline;
-    if (!(seconds > longest)) {
-        const std::chrono::duration<double> time(seconds > 0 ? seconds : 0);
-        deadline = OpaqueCFRunLoop::Clock::now() +
-                   std::chrono::duration_cast<OpaqueCFRunLoop::Clock::duration>(time);
-    }
-    return CFRunLoopGetCurrent()->run(deadline, returnAfterSourceHandled != 0);
+    // Thirty years are for ever, and fit the clock. What is no number is no time.
+    const std::chrono::duration<double> time(std::max(0.0, std::min(seconds, 1e9)));
+    using Clock = OpaqueCFRunLoop::Clock;
+    return CFRunLoopGetCurrent()->run(Clock::now() + std::chrono::duration_cast<Clock::duration>(time),
+                                      returnAfterSourceHandled != 0);
 }
 
 void CFRunLoopStop(CFRunLoopRef loop) noexcept {

@@ -5,6 +5,7 @@
 
 #include "morecfq/MoreCFQ.h"
 #include "tests/unit/support/Notation.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace {
 
@@ -45,47 +46,52 @@ TEST(Creation, ArraysOfADictionaryCorrespondAndMakeItAgain) {
     EXPECT_EQ(1, CFGetRetainCount(CFDictionaryGetValue(dict.get(), CFSTR("n"))));
 }
 
-// Every case by the vector and by the array.
-TEST(Paths, GetSetRemove) {
-    const struct {
-        const char* tree;
-        const char* path;
-        OSStatus get;  // and of removing
-        OSStatus set;
-        const char* afterSet;
-    } rows[] = {
-        {"{a = x}", "(a)", 0, 0, "{a = new}"},
-        {"{a = {b = x}}", "(a)", 0, 0, "{a = new}"},
-        {"{}", "(a)", 5400, 0, "{a = new}"},
-        {"{}", "(a, b)", 5400, 5400, "{}"},
-        {"{a = x}", "(a, b)", 5401, 5401, "{a = x}"},
-        {"{a = (b)}", "(a, b)", 5401, 5401, "{a = (b)}"},
-        {"{a = {}}", "(a, b)", 5400, 0, "{a = {b = new}}"},
-        {"{a = {b = x; c = y}}", "(a, b)", 0, 0, "{a = {b = new; c = y}}"},
-        {"{a = {b = {d = x}}}", "(a, b, c)", 5400, 0, "{a = {b = {d = x; c = new}}}"},
-        {"{a = {b = x}}", "(a, b, c)", 5401, 5401, "{a = {b = x}}"},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(std::string(row.tree) + row.path);
-        const Value keys = read(row.path);
-        CFArrayRef path = array(keys);
-        const CFIndex count = CFArrayGetCount(path);
-        const CFTypeRef* vector = platform::values::itemsOf(path).data();
-        for (const bool byArray : {false, true}) {
-            const auto original = changeable(row.tree);
-            const auto set = changeable(row.tree), removed = changeable(row.tree);
-            CFTypeRef found = CFSTR("untouched");
-            EXPECT_EQ(row.get, byArray ? CFQDictionaryGetValueAtPathArray(original.get(), path, &found)
-                                       : CFQDictionaryGetValueAtPath(original.get(), vector, count, &found));
-            EXPECT_EQ(row.get == 0, !CFEqual(found, CFSTR("untouched")));
-            EXPECT_EQ(row.set, byArray ? CFQDictionarySetValueAtPathArray(set.get(), path, CFSTR("new"))
-                                       : CFQDictionarySetValueAtPath(set.get(), vector, count, CFSTR("new")));
-            EXPECT_EQ(row.afterSet, show(set.get()));
-            EXPECT_EQ(row.get, byArray ? CFQDictionaryRemoveValueAtPathArray(removed.get(), path)
-                                       : CFQDictionaryRemoveValueAtPath(removed.get(), vector, count));
-            EXPECT_EQ(row.get == 0, show(removed.get()) != row.tree);
-        }
+// A tree and a path: what getting, setting and removing come to, by the vector and by the array.
+std::string pathOutcome(const std::vector<std::string>& inputs) {
+    const Value keys = read(inputs[1]);
+    CFArrayRef path = array(keys);
+    const CFIndex count = CFArrayGetCount(path);
+    const CFTypeRef* vector = platform::values::itemsOf(path).data();
+    std::string told[2];
+    for (const bool byArray : {false, true}) {
+        const auto original = changeable(inputs[0].c_str());
+        CFTypeRef found = CFSTR("untouched");
+        const OSStatus get = byArray ? CFQDictionaryGetValueAtPathArray(original.get(), path, &found)
+                                     : CFQDictionaryGetValueAtPath(original.get(), vector, count, &found);
+        told[byArray] = "get " + std::to_string(get) + " " + show(found);
+        const auto tree = changeable(inputs[0].c_str());
+        const OSStatus set = byArray ? CFQDictionarySetValueAtPathArray(tree.get(), path, CFSTR("new"))
+                                     : CFQDictionarySetValueAtPath(tree.get(), vector, count, CFSTR("new"));
+        told[byArray] += ", set " + std::to_string(set) + " " + show(tree.get());
+        const auto rest = changeable(inputs[0].c_str());
+        const OSStatus remove = byArray ? CFQDictionaryRemoveValueAtPathArray(rest.get(), path)
+                                        : CFQDictionaryRemoveValueAtPath(rest.get(), vector, count);
+        told[byArray] += ", remove " + std::to_string(remove) + " " + show(rest.get());
     }
+    EXPECT_EQ(told[0], told[1]);
+    return told[0];
+}
+
+// What the deep walk sees, and with its keys the shallow one.
+std::string walkOutcome(const std::vector<std::string>& inputs) {
+    const Value value = read(inputs[0]);
+    std::string seen = CFQPropertyListIsLeaf(value.get()) != 0 ? "leaf: " : "";
+    const auto deep = [](CFTypeRef node, void* context) {
+        *static_cast<std::string*>(context) += show(node) + " ";
+    };
+    const auto shallow = [](CFTypeRef key, CFTypeRef node, void* context) {
+        *static_cast<std::string*>(context) += " " + show(key) + ":" + show(node);
+    };
+    CFQPropertyListDeepApplyFunction(value.get(), deep, &seen);
+    seen += "|";
+    CFQPropertyListShallowApplyFunction(value.get(), shallow, &seen);
+    return seen;
+}
+
+TEST(PropertyLists, HavePathsAndWalks) {
+    testing_support::Transcript transcript("property_lists");
+    transcript.replay("paths", pathOutcome);
+    transcript.replay("walks", walkOutcome);
 }
 
 TEST(Paths, EveryLevelIsReplacedEvenBeforeAFailure) {
@@ -117,36 +123,6 @@ TEST(Paths, NullOnTheWayIsNoDictionary) {
     EXPECT_EQ(0, CFQDictionaryGetValueAtPath(dict, path, 1, &found));
     EXPECT_EQ(nullptr, found);
     CFRelease(dict);
-}
-
-TEST(Walks, DeepGoesInOrderAndShallowOneLevel) {
-    const auto deep = [](CFTypeRef node, void* context) {
-        *static_cast<std::string*>(context) += show(node) + " ";
-    };
-    const auto shallow = [](CFTypeRef key, CFTypeRef node, void* context) {
-        *static_cast<std::string*>(context) += show(key) + ":" + show(node) + " ";
-    };
-    const struct {
-        const char* value;
-        const char* seen;  // by both walks
-        bool isLeaf;
-    } rows[] = {
-        {"{k = (s, {n = #1})}", "{k = (s, {n = #1})} (s, {n = #1}) s {n = #1} #1 | k:(s, {n = #1}) ", false},
-        {"(x, (y), #true)", "(x, (y), #true) x (y) y #true | #0:x #1:(y) #2:#true ", false},
-        {"{b = x; a = y}", "{b = x; a = y} x y | b:x a:y ", false},
-        {"{}", "{} | ", false},
-        {"()", "() | ", false},
-        {"text", "text | ", true},
-    };
-    for (const auto& row : rows) {
-        const Value value = read(row.value);
-        std::string seen;
-        CFQPropertyListDeepApplyFunction(value.get(), deep, &seen);
-        seen += "| ";
-        CFQPropertyListShallowApplyFunction(value.get(), shallow, &seen);
-        EXPECT_EQ(row.seen, seen);
-        EXPECT_EQ(row.isLeaf, CFQPropertyListIsLeaf(value.get()) != 0) << row.value;
-    }
 }
 
 struct Emptied {

@@ -26,6 +26,8 @@ TEST(Dictionary, KeepsOrderReferencesAndAnyKey) {
     CFDictionarySetValue(dictionary.get(), value.get(), CFSTR("number"));
     EXPECT_EQ(text(CFDictionaryGetValue(dictionary.get(), makeReal(1).get())), "number");
     EXPECT_EQ(text(dictionary.get()), "{b = replaced in place; a = first; 1 = number}");
+    CFDictionarySetValue(dictionary.get(), CFSTR("held"), value.get());
+    CFDictionaryRemoveValue(dictionary.get(), CFSTR("held"));
     CFDictionaryRemoveValue(dictionary.get(), value.get());
     EXPECT_EQ(CFGetRetainCount(value.get()), 1);
     CFDictionaryRemoveValue(dictionary.get(), CFSTR("b"));
@@ -133,6 +135,14 @@ TEST(Array, SortsStablyAndSearchesInARange) {
     };
     EXPECT_EQ(search("xxx"), 4);
     EXPECT_EQ(search("xxxx"), 6);
+    // A short range is sorted stably by whatever sorts it.
+    const auto many = arrayOf("()");
+    for (int i = 0; i < 90; ++i) {
+        CFArrayAppendValue(many.get(), str(std::to_string(10 + i * 7 % 90)).get());
+    }
+    const std::string before = text(many.get());
+    CFArraySortValues(many.get(), CFRangeMake(0, 90), compareLengths, &calls);
+    EXPECT_EQ(text(many.get()), before);
 }
 
 TEST(Values, SurviveBeingNestedVeryDeep) {
