@@ -8,6 +8,7 @@
 
 #include "platform/base/DeviceText.h"
 #include "platform/preferences/Store.h"
+#include "platform/values/Fields.h"
 #include "platform/values/Values.h"
 
 namespace platform::live {
@@ -40,12 +41,6 @@ void addEntityKeys(const std::string& prefix, CFDictionaryRef container, std::ve
         if (entity != nullptr && isActive(entity)) {
             keys.push_back(prefix + std::string(textOf(as<CFStringRef>(entry.key))));
         }
-    }
-}
-
-void setText(CFMutableDictionaryRef dictionary, CFStringRef key, std::string_view text) {
-    if (const values::Owned<CFStringRef> value = values::makeString(text)) {
-        CFDictionarySetValue(dictionary, key, value.get());
     }
 }
 
@@ -91,7 +86,7 @@ std::vector<LiveView::Service> LiveView::services() const {
     return services;
 }
 
-std::string LiveView::serviceNaming(const std::string& interface) const {
+std::optional<std::string> LiveView::serviceNaming(const std::string& interface) const {
     std::vector<std::string> found;
     for (const Service& service : services()) {
         const auto name = valueIn<CFStringRef>(entityIn(service.content, "Interface"), CFSTR("DeviceName"));
@@ -108,7 +103,7 @@ std::string LiveView::serviceNaming(const std::string& interface) const {
             }
         }
     }
-    return found.empty() ? std::string() : found.front();
+    return found.empty() ? std::nullopt : std::optional(found.front());
 }
 
 Outcome LiveView::globalIPv4(Value& value) const {
@@ -117,17 +112,13 @@ Outcome LiveView::globalIPv4(Value& value) const {
     if (!route) {
         return {};
     }
-    CFMutableDictionaryRef const dictionary = CFDictionaryCreateMutable(
-        kCFAllocatorDefault, 0, &kCFTypeDictionaryKeyCallBacks, &kCFTypeDictionaryValueCallBacks);
-    value = Value::adopt(dictionary);
-    setText(dictionary, CFSTR("PrimaryInterface"), deviceText(route->interface));
+    values::FieldWriter fields;
+    fields("PrimaryInterface", deviceText(route->interface));
     if (route->router) {
-        setText(dictionary, CFSTR("Router"), dottedQuad(*route->router));
+        fields("Router", dottedQuad(*route->router));
     }
-    const std::string service = serviceNaming(route->interface);
-    if (!service.empty()) {
-        setText(dictionary, CFSTR("PrimaryService"), service);
-    }
+    fields("PrimaryService", serviceNaming(route->interface));
+    value = Value::adopt(fields.take().take());
     return {};
 }
 

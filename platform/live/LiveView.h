@@ -11,7 +11,7 @@
 // left out, and so are links that lead nowhere and values that are no dictionaries.
 #pragma once
 
-#include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -46,7 +46,8 @@ class LiveView {
     [[nodiscard]] CFDictionaryRef network() const;
     [[nodiscard]] std::vector<Service> services() const;
     [[nodiscard]] CFDictionaryRef serviceBehind(CFTypeRef link) const;
-    [[nodiscard]] std::string serviceNaming(const std::string& interface) const;
+    // The first one in the order of the services; nothing when none does.
+    [[nodiscard]] std::optional<std::string> serviceNaming(const std::string& interface) const;
     Outcome globalIPv4(Value& value) const;
 
     NetworkState* state_;

@@ -18,10 +18,6 @@ namespace platform::live {
 struct PrimaryRoute {
     std::string interface;
     std::optional<in_addr> router;  // nothing when the route has none
-    bool operator==(const PrimaryRoute& other) const noexcept {
-        return interface == other.interface && router.has_value() == other.router.has_value() &&
-               (!router || router->s_addr == other.router->s_addr);
-    }
 };
 
 // An address to ask for. The first 4 or all 16 bytes, in network byte order, by the family.

@@ -18,21 +18,12 @@ namespace {
 // What is left at least to an address whose own DHCP client renews it.
 constexpr std::uint32_t shortestLife = 60;
 
-// Does what follows even when something failed, and keeps the first failure.
-class Steps {
-  public:
-    bool take(const Outcome& outcome) {
-        if (first_.ok()) {
-            first_ = outcome;
-        }
-        return outcome.ok();
-    }
-    [[nodiscard]] bool ok() const noexcept { return first_.ok(); }
-    [[nodiscard]] Outcome first() const { return first_; }
-
-  private:
-    Outcome first_;
-};
+// For steps of which each is taken even when one before failed: keeps the first failure, and tells whether
+// this one was none.
+bool take(Outcome& first, const Outcome& step) {
+    first = first.ok() ? step : first;
+    return step.ok();
+}
 
 std::vector<Address> manualAddresses(const InterfacePlan& plan) {
     std::vector<Address> addresses;
@@ -242,24 +233,24 @@ Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<Wi
     if (!applied) {
         return {};
     }
-    Steps steps;
-    steps.take(stopDhcpClient(interface_));
+    Outcome done;
+    take(done, stopDhcpClient(interface_));
     // The file of before is kept nowhere else: until it is back, this interface is not given back.
     std::string notBack;
-    steps.take(setInterfaceNameServers(interface_, 0, {}, notBack));
-    steps.take(notBack.empty() ? Outcome() : Outcome(kSCStatusFailed, notBack));
+    take(done, setInterfaceNameServers(interface_, 0, {}, notBack));
+    take(done, notBack.empty() ? Outcome() : Outcome(kSCStatusFailed, notBack));
     if (applied->joined) {
-        steps.take(leaveNetwork(before, join));
+        take(done, leaveNetwork(before, join));
     }
     if (link()) {
         bool taken = false;
-        if (!steps.take(isTakenOver(*applied, before, taken))) {
-            return steps.first();
+        if (!take(done, isTakenOver(*applied, before, taken))) {
+            return done;
         }
         if (taken) {
             logLine(LogLevel::notice,
                     interface_ + ": configured by somebody else meanwhile, and left to them");
-            steps.take(removeOurs(*applied, before));
+            take(done, removeOurs(*applied, before));
             join.reset();
         } else {
             applied->phase = AppliedLink::Phase::restoring;
@@ -267,13 +258,13 @@ Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<Wi
             if (const Outcome noted = writeState(appliedPath(interface_), *applied); !noted.ok()) {
                 logLine(LogLevel::warning, interface_ + ": " + noted.reason());
             }
-            steps.take(restore(before));
+            take(done, restore(before));
             if (before.radioOff.value_or(false)) {
-                steps.take(switchRadio(interface_, false));
+                take(done, switchRadio(interface_, false));
             }
         }
     }
-    return steps.first();
+    return done;
 }
 
 Outcome DirectInterface::letOthersIn(const LinkSnapshot& before, bool isBack) {
@@ -307,22 +298,22 @@ Outcome DirectInterface::isTakenOver(const AppliedLink& applied, const LinkSnaps
 
 Outcome DirectInterface::removeOurs(const AppliedLink& applied, const LinkSnapshot& before) {
     InterfaceState now;
-    Steps steps;
-    if (steps.take(kernel_.read(now))) {
+    Outcome done;
+    if (take(done, kernel_.read(now))) {
         for (const Route& route : now.routes) {
             if (route.protocol() == ourRouteProtocol) {
-                steps.take(kernel_.removeRoute(route));
+                take(done, kernel_.removeRoute(route));
             }
         }
         for (const Address& address : now.addresses) {
             if (std::ranges::count(applied.addresses, address) != 0 &&
                 std::ranges::count(before.state.addresses, address) == 0) {
-                steps.take(kernel_.removeAddress(address));
+                take(done, kernel_.removeAddress(address));
             }
         }
     }
-    steps.take(kernel_.setIPv6Disabled(before.ipv6Disabled));
-    return steps.first();
+    take(done, kernel_.setIPv6Disabled(before.ipv6Disabled));
+    return done;
 }
 
 // Without its radio a card cannot be switched on, and no route goes through it.

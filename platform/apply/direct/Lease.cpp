@@ -17,9 +17,6 @@
 namespace platform::apply {
 namespace {
 
-constexpr std::size_t mostServers = 3;
-constexpr std::size_t mostDomains = 6;
-
 std::string leasePath(const std::string& interface) {
     return runtimePath("lease-" + interface + ".plist");
 }

@@ -20,9 +20,6 @@ namespace platform::apply {
 namespace {
 
 constexpr std::chrono::seconds lockBound{10};
-// What the C library's resolver reads.
-constexpr std::size_t mostServers = 3;
-constexpr std::size_t mostDomains = 6;
 
 // What stands under the name of the file: nothing, a file, or a link.
 struct FileState {

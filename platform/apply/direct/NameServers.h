@@ -6,6 +6,7 @@
 // file is never touched.
 #pragma once
 
+#include <cstddef>
 #include <string>
 #include <vector>
 
@@ -13,6 +14,10 @@
 #include "platform/base/Outcome.h"
 
 namespace platform::apply {
+
+// What the C library's resolver reads.
+inline constexpr std::size_t mostServers = 3;
+inline constexpr std::size_t mostDomains = 6;
 
 struct NameService {
     std::vector<IPv4Address> servers;
