@@ -11,10 +11,10 @@ Outcome findAgents(Agents& agents) {
     if (!agents.empty()) {
         return {};
     }
-    bool running = false;
-    RETURN_IF_FAILED(isNetworkManagerRunning(running));
-    if (running) {
-        agents.push_back(makeNetworkManagerAgent());
+    std::shared_ptr<Agent> daemon;
+    RETURN_IF_FAILED(findNetworkManagerAgent(daemon));
+    if (daemon != nullptr) {
+        agents.push_back(std::move(daemon));
     }
     agents.push_back(makeDirectAgent());
     return {};

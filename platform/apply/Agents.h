@@ -26,9 +26,8 @@ Outcome findAgent(std::string_view name, std::shared_ptr<Agent>& agent);
 
 // NetworkManager over the system bus. Its name is "networkmanager".
 [[nodiscard]] std::shared_ptr<Agent> makeNetworkManagerAgent();
-
-// Whether NetworkManager owns its name on the host's system bus. No bus socket, or no owner, is a no;
-// everything else that goes wrong is a failure. It never starts the daemon.
-Outcome isNetworkManagerRunning(bool& running);
+// The same when NetworkManager runs, on the connection that showed it; else null. Fails when the bus does not
+// answer.
+Outcome findNetworkManagerAgent(std::shared_ptr<Agent>& agent);
 
 }  // namespace platform::apply

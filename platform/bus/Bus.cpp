@@ -193,51 +193,28 @@ Outcome Bus::call(const Call& call, Message& reply, std::string* errorName) {
     return result < 0 ? fromBus(call.member, result, error.get(), call.secret) : Outcome();
 }
 
-Outcome Bus::readProperties(const std::string& path, const std::string& interface, Dictionary& properties,
+Outcome Bus::readProperties(const std::string& path, const char* interface, Dictionary& properties,
                             std::string* error) {
-    Message reply;
-    Outcome outcome =
-        call({path,
-              propertiesInterface,
-              "GetAll",
-              [&interface](sd_bus_message* m) { return sd_bus_message_append(m, "s", interface.c_str()); },
-              {}},
-             reply, error);
     properties.clear();
-    if (!outcome.ok()) {
-        return outcome;
-    }
+    Message reply;
+    RETURN_IF_FAILED(call({path, propertiesInterface, "GetAll", arguments(interface), {}}, reply, error));
     const int result = readValue(reply.get(), properties);
     return result < 0 ? fromBus("the properties of " + path, result) : Outcome();
 }
 
-Outcome Bus::readProperty(const std::string& path, const std::string& interface, const char* property,
+Outcome Bus::readProperty(const std::string& path, const char* interface, const char* property,
                           Value& value) {
     Message reply;
-    RETURN_IF_FAILED(
-        call({path,
-              propertiesInterface,
-              "Get",
-              [&](sd_bus_message* m) { return sd_bus_message_append(m, "ss", interface.c_str(), property); },
-              {}},
-             reply));
+    RETURN_IF_FAILED(call({path, propertiesInterface, "Get", arguments(interface, property), {}}, reply));
     const int result = readValue(reply.get(), value);
     return result < 0 ? fromBus(property, result) : Outcome();
 }
 
-Outcome Bus::setProperty(const std::string& path, const std::string& interface, const char* property,
+Outcome Bus::setProperty(const std::string& path, const char* interface, const char* property,
                          const Value& value) {
     Message reply;
-    Outcome outcome = call({path,
-                            propertiesInterface,
-                            "Set",
-                            [&](sd_bus_message* m) {
-                                const int result =
-                                    sd_bus_message_append(m, "ss", interface.c_str(), property);
-                                return result < 0 ? result : appendValue(m, value);
-                            },
-                            {}},
-                           reply);
+    Outcome outcome =
+        call({path, propertiesInterface, "Set", arguments(interface, property, value), {}}, reply);
     return outcome.ok() ? outcome
                         : Outcome(outcome.status(), std::string(property) + ": " + outcome.reason());
 }

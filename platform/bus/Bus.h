@@ -29,6 +29,15 @@ using Slot = std::unique_ptr<sd_bus_slot, SlotUnref>;
 
 // Writes a call's arguments; returns what sd-bus returned.
 using Arguments = std::function<int(sd_bus_message*)>;
+// These values, one after the other.
+template <class... Values>
+[[nodiscard]] Arguments arguments(const Values&... values) {
+    return [values...](sd_bus_message* message) {
+        int result = 0;
+        ((result = result < 0 ? result : appendValue(message, values)), ...);
+        return result;
+    };
+}
 
 class Bus {
   public:
@@ -58,12 +67,11 @@ class Bus {
     Outcome call(const Call& call, Message& reply, std::string* error = nullptr);
 
     // All properties of an interface of an object; of a type that Value does not know: left out.
-    Outcome readProperties(const std::string& path, const std::string& interface, Dictionary& properties,
+    Outcome readProperties(const std::string& path, const char* interface, Dictionary& properties,
                            std::string* error = nullptr);
     // One of them, which is left as it is when its type is none that Value knows.
-    Outcome readProperty(const std::string& path, const std::string& interface, const char* property,
-                         Value& value);
-    Outcome setProperty(const std::string& path, const std::string& interface, const char* property,
+    Outcome readProperty(const std::string& path, const char* interface, const char* property, Value& value);
+    Outcome setProperty(const std::string& path, const char* interface, const char* property,
                         const Value& value);
 
     // Hands the service's signals of this name to the function as long as the bus is open. The message is

@@ -197,6 +197,8 @@ template <class T>
 int appendValue(sd_bus_message* message, const T& value) {
     return append(message, value);
 }
+template int appendValue(sd_bus_message* message, const std::string& value);
+template int appendValue(sd_bus_message* message, const std::uint32_t& value);
 template int appendValue(sd_bus_message* message, const Value& value);
 template int appendValue(sd_bus_message* message, const Dictionary& value);
 template int appendValue(sd_bus_message* message, const Sections& value);
@@ -205,6 +207,7 @@ template <class T>
 int readValue(sd_bus_message* message, T& value) {
     return read(message, value);
 }
+template int readValue(sd_bus_message* message, std::string& value);
 template int readValue(sd_bus_message* message, Value& value);
 template int readValue(sd_bus_message* message, Dictionary& value);
 template int readValue(sd_bus_message* message, Sections& value);

@@ -49,12 +49,24 @@ using Message = std::unique_ptr<sd_bus_message, MessageUnref>;
 // Both return 0 or more, or a negative errno, as sd-bus does. Appending writes at the message's end; reading
 // takes what comes next.
 
-// Of a Value (v), a Dictionary (a{sv}) or Sections (a{sa{sv}}).
+// A path of an object, as an argument.
+struct Path {
+    std::string text;
+};
+
+// Of text (s), a Path (o), a number (u), a Value (v), a Dictionary (a{sv}) or Sections (a{sa{sv}}).
 template <class T>
 int appendValue(sd_bus_message* message, const T& value);
+inline int appendValue(sd_bus_message* message, const char* text) {
+    return sd_bus_message_append(message, "s", text);
+}
+inline int appendValue(sd_bus_message* message, const Path& path) {
+    return sd_bus_message_append(message, "o", path.text.c_str());
+}
 
-// Of a Value, a Dictionary, Sections, Objects (a{oa{sa{sv}}}) or Texts (as or ao). Values of other types than
-// the ones above are left out. More than a hundred thousand elements in one container are an error
+// Of text or a path, a Value, a Dictionary, Sections, Objects (a{oa{sa{sv}}}) or Texts (as or ao). Values of
+// other types than the ones above are left out. More than a hundred thousand elements in one container are an
+// error
 // (-EMSGSIZE).
 template <class T>
 int readValue(sd_bus_message* message, T& value);

@@ -5,7 +5,7 @@ namespace platform::apply {
 bool Card::step() {
     isWaiting_ = false;
     while (!isSettled_ && !isWaiting_) {
-        task_.refusal = advance();
+        task_.refusal = (this->*next_)();
         isSettled_ = isSettled_ || !task_.refusal.ok();
     }
     return isSettled_;
@@ -16,6 +16,41 @@ void Card::settle(const std::string& trouble) {
         task_.trouble = trouble;
     }
     isSettled_ = true;
+}
+
+Outcome Card::findCard(std::optional<Device>& device) {
+    RETURN_IF_FAILED(daemon_.findDevice(interface_, device));
+    return device && device->kind == Device::Kind::wireless ? daemon_.listenToAir() : Outcome();
+}
+
+Outcome Card::awaitReady(bool& isReady) {
+    std::uint32_t state = 0;
+    RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
+    isReady = state >= deviceDisconnected;
+    if (!isReady && Clock::now() < readyDeadline_) {
+        waitUntil(readyDeadline_);
+    }
+    return {};
+}
+
+Outcome Card::awaitRest() {
+    std::uint32_t state = 0;
+    RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
+    if (state > deviceDisconnected) {
+        if (isLate()) {
+            return {kSCStatusFailed, "NetworkManager did not switch the card off in time"};
+        }
+        waitUntil(deadline_);
+    }
+    return {};
+}
+
+std::uint32_t Card::awaitReason() {
+    const std::uint32_t reason = daemon_.failureOf(device_.path);
+    if (reason == 0 && Clock::now() < reasonDeadline_) {
+        waitUntil(reasonDeadline_);
+    }
+    return reason;
 }
 
 Outcome Card::findOurProfile(std::optional<Profile>& profile, bool& isForeign) {

@@ -44,8 +44,12 @@ struct Place {
 // One card's task, taken step by step: it never waits itself.
 class Card {
   public:
-    Card(Daemon& daemon, Task& task, Clock::time_point deadline)
-        : daemon_(daemon), task_(task), interface_(task.before->interface), deadline_(deadline) {}
+    Card(Daemon& daemon, Task& task, CardSnapshot earlier, Clock::time_point deadline)
+        : daemon_(daemon),
+          task_(task),
+          interface_(task.before->interface),
+          before_(std::move(earlier)),
+          deadline_(deadline) {}
     Card(const Card&) = delete;
     Card& operator=(const Card&) = delete;
     virtual ~Card() = default;
@@ -57,16 +61,28 @@ class Card {
     [[nodiscard]] Task& task() noexcept { return task_; }
 
   protected:
-    // Takes one step and sets what comes next; isWaiting() or settle() end the steps of this turn.
-    virtual Outcome advance() = 0;
+    // Each step names the one that comes next, is taken again, or ends the steps of this turn by waitUntil()
+    // or settle().
+    template <class Kind>
+    void next(Outcome (Kind::*stage)()) {
+        next_ = static_cast<Outcome (Card::*)()>(stage);
+    }
     void settle(const std::string& trouble = {});
     void waitUntil(Clock::time_point time) {
         isWaiting_ = true;
         wakeAt_ = time;
     }
+    [[nodiscard]] bool isWaiting() const noexcept { return isWaiting_; }
     [[nodiscard]] bool isLate() const { return Clock::now() >= deadline_; }
     // Nothing, and success, when there is no such card.
-    Outcome findCard(std::optional<Device>& device) { return daemon_.findDevice(interface_, device); }
+    Outcome findCard(std::optional<Device>& device);
+    // These wait, and are to be asked again, or are done. That a profile can be activated on the card, or
+    // that it never can without a carrier, a radio, ...:
+    Outcome awaitReady(bool& isReady);
+    // ... that nothing is active on it any more:
+    Outcome awaitRest();
+    // ... why its profile is down; 0 for no reason.
+    std::uint32_t awaitReason();
     // Our profile for the card; nothing when there is none. isForeign when somebody else's has its UUID.
     Outcome findOurProfile(std::optional<Profile>& profile, bool& isForeign);
     Outcome removeProfile();
@@ -74,9 +90,18 @@ class Card {
     Daemon& daemon_;
     Task& task_;
     const std::string& interface_;
+    const CardSnapshot before_;
+    Device device_;
+    std::optional<Active> active_;
+    // What was on the air, and when the card's last scan ended, when it was looked at last.
+    unsigned changesOnAir_ = 0;
+    std::int64_t lastScan_ = 0;
     Clock::time_point deadline_;
+    Clock::time_point readyDeadline_;
+    Clock::time_point reasonDeadline_;
 
   private:
+    Outcome (Card::*next_)() = nullptr;
     Clock::time_point wakeAt_;
     bool isWaiting_ = false;
     bool isSettled_ = false;

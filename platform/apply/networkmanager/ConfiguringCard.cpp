@@ -15,14 +15,11 @@ constexpr std::chrono::seconds scanAgain{3};
 class ConfiguringCard final : public Card {
   public:
     ConfiguringCard(Daemon& daemon, Task& task, CardSnapshot earlier, Clock::time_point deadline)
-        : Card(daemon, task, deadline), plan_(*task.plan), before_(std::move(earlier)) {}
+        : Card(daemon, task, std::move(earlier), deadline), plan_(*task.plan) {
+        next(&ConfiguringCard::begin);
+    }
 
   private:
-    // One of the steps below; each names the one that comes next.
-    using Stage = Outcome (ConfiguringCard::*)();
-
-    Outcome advance() override { return (this->*stage_)(); }
-
     [[nodiscard]] std::optional<std::string> network() const {
         return plan_.wireless ? plan_.wireless->network : std::nullopt;
     }
@@ -40,7 +37,7 @@ class ConfiguringCard final : public Card {
         }
         device_ = std::move(*device);
         if (!plan_.active) {
-            stage_ = &ConfiguringCard::comeToRest;
+            next(&ConfiguringCard::comeToRest);
             return daemon_.disconnect(device_);
         }
         if (!isWireless() && network()) {
@@ -53,7 +50,7 @@ class ConfiguringCard final : public Card {
         if (isWireless()) {
             RETURN_IF_FAILED(switchRadioOn());
         }
-        stage_ = &ConfiguringCard::becomeReady;
+        next(&ConfiguringCard::becomeReady);
         return {};
     }
 
@@ -80,13 +77,8 @@ class ConfiguringCard final : public Card {
 
     // Nothing is active on it any more.
     Outcome comeToRest() {
-        std::uint32_t state = 0;
-        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
-        if (state > deviceDisconnected) {
-            if (isLate()) {
-                return {kSCStatusFailed, "NetworkManager did not switch the card off in time"};
-            }
-            waitUntil(deadline_);
+        RETURN_IF_FAILED(awaitRest());
+        if (isWaiting()) {
             return {};
         }
         // Only after it has come to rest: it then stays unmanaged through a restart of the daemon.
@@ -99,15 +91,12 @@ class ConfiguringCard final : public Card {
     }
 
     Outcome becomeReady() {
-        std::uint32_t state = 0;
-        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
-        isReady_ = state >= deviceDisconnected;
-        if (!isReady_ && Clock::now() < readyDeadline_) {
-            waitUntil(readyDeadline_);
+        RETURN_IF_FAILED(awaitReady(isReady_));
+        if (isWaiting()) {
             return {};
         }
         RETURN_IF_FAILED(daemon_.findActive(device_, active_));
-        stage_ = isWireless() ? &ConfiguringCard::chooseLink : &ConfiguringCard::store;
+        next(isWireless() ? &ConfiguringCard::chooseLink : &ConfiguringCard::store);
         return {};
     }
 
@@ -130,7 +119,7 @@ class ConfiguringCard final : public Card {
                 settle("no network is named and the card is on none, so it joins none");
                 return {};
             }
-            stage_ = &ConfiguringCard::store;
+            next(&ConfiguringCard::store);
             return {};
         }
         std::vector<HeardNetwork> heard;
@@ -158,7 +147,7 @@ class ConfiguringCard final : public Card {
                 isAskedAgain_ = true;
                 askAgainAt_ = Clock::now() + joinsAtOnce;
             }
-            stage_ = isSearching_ ? &ConfiguringCard::search : &ConfiguringCard::comeUp;
+            next(isSearching_ ? &ConfiguringCard::search : &ConfiguringCard::comeUp);
             return {};
         }
         isAskedAgain_ = false;
@@ -170,7 +159,7 @@ class ConfiguringCard final : public Card {
         link_->choice = *decision.choice;
         // Or it would turn to another one as soon as this one goes away.
         RETURN_IF_FAILED(daemon_.iwd().limitAutoconnect(before_.iwdAutoconnect, network()));
-        stage_ = &ConfiguringCard::store;
+        next(&ConfiguringCard::store);
         return {};
     }
 
@@ -227,7 +216,7 @@ class ConfiguringCard final : public Card {
             }
             RETURN_IF_FAILED(daemon_.activate(path, device_, active_->path));
         }
-        stage_ = &ConfiguringCard::comeUp;
+        next(&ConfiguringCard::comeUp);
         return {};
     }
 
@@ -253,7 +242,7 @@ class ConfiguringCard final : public Card {
         if (state == activeActivated) {
             settle();
         } else if (state == activeDeactivated) {
-            stage_ = &ConfiguringCard::tellFailure;
+            next(&ConfiguringCard::tellFailure);
             reasonDeadline_ = Clock::now() + reasonBound;
         } else if (isLate()) {
             return giveUp();
@@ -262,11 +251,11 @@ class ConfiguringCard final : public Card {
             RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
             if (state < deviceGetsAddresses) {
                 active_.reset();
-                stage_ = &ConfiguringCard::store;
+                next(&ConfiguringCard::store);
             }
         } else if (link_ && link_->choice &&
                    (changesOnAir_ != daemon_.changesOnAir() || Clock::now() >= lookAgainAt_)) {
-            stage_ = &ConfiguringCard::chooseLink;
+            next(&ConfiguringCard::chooseLink);
         } else {
             waitUntil(askAgainAt_.value_or(link_ && link_->choice ? lookAgainAt_ : deadline_));
         }
@@ -311,7 +300,7 @@ class ConfiguringCard final : public Card {
         if (changesOnAir_ == daemon_.changesOnAir() && Clock::now() < lookAgainAt_) {
             waitUntil(std::min(lookAgainAt_, scanAgainAt_));
         } else {
-            stage_ = &ConfiguringCard::chooseLink;
+            next(&ConfiguringCard::chooseLink);
         }
         return {};
     }
@@ -320,13 +309,12 @@ class ConfiguringCard final : public Card {
         if (link_ && link_->choice && !link_->choice->isHeard) {
             isSearching_ = true;
             active_.reset();
-            stage_ = &ConfiguringCard::search;
+            next(&ConfiguringCard::search);
             // Or it would turn to another one of its own accord.
             return daemon_.disconnect(device_);
         }
-        const std::uint32_t reason = daemon_.failureOf(device_.path);
-        if (reason == 0 && Clock::now() < reasonDeadline_) {
-            waitUntil(reasonDeadline_);
+        const std::uint32_t reason = awaitReason();
+        if (isWaiting()) {
             return {};
         }
         settle(describeFailure(reason));
@@ -340,20 +328,12 @@ class ConfiguringCard final : public Card {
     }
 
     const InterfacePlan& plan_;
-    const CardSnapshot before_;
-    Stage stage_ = &ConfiguringCard::begin;
-    Device device_;
     bool isReady_ = false;
-    Clock::time_point readyDeadline_;
-    Clock::time_point reasonDeadline_;
     Clock::time_point lookAgainAt_;
     Clock::time_point scanAgainAt_;
-    std::int64_t lastScan_ = 0;  // when it was asked to join
     bool isAskedAgain_ = false;
     std::optional<Clock::time_point> askAgainAt_;
-    unsigned changesOnAir_ = 0;
     bool isSearching_ = false;
-    std::optional<Active> active_;
     std::optional<WirelessLink> link_;  // of a wireless card
     std::string reason_;                // why the card is not on its network so far
 };

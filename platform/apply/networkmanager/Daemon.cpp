@@ -1,6 +1,7 @@
 #include "platform/apply/networkmanager/Daemon.h"
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <ctime>
 #include <utility>
@@ -22,6 +23,17 @@ constexpr const char* accessPointInterface = "org.freedesktop.NetworkManager.Acc
 constexpr const char* propertiesInterface = "org.freedesktop.DBus.Properties";
 
 constexpr std::chrono::seconds startupBound{10};
+
+// Errors that are answers: the object is gone; there is none of that name; there is nothing to do.
+constexpr std::array<std::string_view, 3> gone = {SD_BUS_ERROR_UNKNOWN_OBJECT, SD_BUS_ERROR_UNKNOWN_METHOD,
+                                                  SD_BUS_ERROR_UNKNOWN_INTERFACE};
+constexpr std::array<std::string_view, 1> unknownDevice = {"org.freedesktop.NetworkManager.UnknownDevice"};
+constexpr std::array<std::string_view, 1> unknownProfile = {
+    "org.freedesktop.NetworkManager.Settings.InvalidConnection"};
+constexpr std::array<std::string_view, 1> noSecrets = {
+    "org.freedesktop.NetworkManager.AgentManager.NoSecrets"};
+constexpr std::array<std::string_view, 4> atRest = {"org.freedesktop.NetworkManager.Device.NotActive",
+                                                    gone[0], gone[1], gone[2]};
 
 constexpr std::uint32_t typeEthernet = 1;
 constexpr std::uint32_t typeWireless = 2;
@@ -50,11 +62,6 @@ std::string pathIn(const Dictionary& properties, const char* key) {
     return path == "/" ? "" : path;
 }
 
-bool isGone(const std::string& error) {
-    return error == SD_BUS_ERROR_UNKNOWN_OBJECT || error == SD_BUS_ERROR_UNKNOWN_METHOD ||
-           error == SD_BUS_ERROR_UNKNOWN_INTERFACE;
-}
-
 Security securityOf(const Dictionary& point) {
     const std::uint32_t protection = numberIn(point, "WpaFlags") | numberIn(point, "RsnFlags");
     if (protection == 0) {
@@ -65,38 +72,37 @@ Security securityOf(const Dictionary& point) {
                                                    : Security::enterprise;
 }
 
-Arguments textArgument(const std::string& text) {
-    return [text](sd_bus_message* message) { return sd_bus_message_append(message, "s", text.c_str()); };
-}
-
-Outcome unreadable(const char* what) {
-    return {kSCStatusFailed, std::string(what) + ": the answer of NetworkManager cannot be read"};
-}
-
-Outcome readPath(const char* what, const Message& reply, std::string& path) {
-    const char* borrowed = nullptr;
-    if (sd_bus_message_read(reply.get(), "o", &borrowed) < 0) {
-        return unreadable(what);
-    }
-    path = borrowed;
-    return {};
+// Nothing is read, and that is a success, without a reply.
+template <class T>
+Outcome readReply(const char* what, const Message& reply, T& value) {
+    return reply != nullptr && readValue(reply.get(), value) < 0
+               ? Outcome(kSCStatusFailed, std::string(what) + ": the answer of NetworkManager cannot be read")
+               : Outcome();
 }
 
 }  // namespace
 
 Outcome Daemon::call(const std::string& path, const char* interface, const char* member, Arguments arguments,
-                     Message& reply, std::string* error, std::string_view secret) {
-    return bus_.call({path, interface, member, std::move(arguments), secret}, reply, error);
+                     Message& reply, Answers answers, std::string_view secret) {
+    std::string error;
+    Outcome outcome = bus_.call({path, interface, member, std::move(arguments), secret}, reply, &error);
+    return std::ranges::find(answers, error) != answers.end() ? Outcome() : outcome;
+}
+
+Outcome Daemon::open(bool& running) {
+    running = isConnected_;
+    if (!isConnected_) {
+        RETURN_IF_FAILED(bus_.connect(serviceName, running));
+        isConnected_ = running;
+    }
+    return {};
 }
 
 Outcome Daemon::connect() {
-    if (!isConnected_) {
-        bool owned = false;
-        RETURN_IF_FAILED(bus_.connect(serviceName, owned));
-        if (!owned) {
-            return {kSCStatusFailed, "NetworkManager does not run"};
-        }
-        isConnected_ = true;
+    bool running = false;
+    RETURN_IF_FAILED(open(running));
+    if (!running) {
+        return {kSCStatusFailed, "NetworkManager does not run"};
     }
     RETURN_IF_FAILED(readManager());
     return starting_ ? awaitStartup() : Outcome();
@@ -114,7 +120,10 @@ Outcome Daemon::readManager() {
 }
 
 Outcome Daemon::awaitStartup() {
-    RETURN_IF_FAILED(listen());
+    RETURN_IF_FAILED(bus_.watch(
+        propertiesInterface, "PropertiesChanged",
+        [this](const char* /*path*/, sd_bus_message* /*message*/) { managerChanged_ = true; },
+        managerInterface));
     const Clock::time_point deadline = Clock::now() + startupBound;
     // A daemon that takes longer, because a card waits for an address, can be worked with.
     while (starting_ && Clock::now() < deadline) {
@@ -131,7 +140,7 @@ Outcome Daemon::readObject(const std::string& path, const char* interface,
                            std::optional<Dictionary>& properties) {
     std::string error;
     Outcome outcome = bus_.readProperties(path, interface, properties.emplace(), &error);
-    if (isGone(error)) {
+    if (std::ranges::find(gone, error) != gone.end()) {
         properties.reset();
         return {};
     }
@@ -139,12 +148,11 @@ Outcome Daemon::readObject(const std::string& path, const char* interface,
 }
 
 Outcome Daemon::findPath(const std::string& object, const char* interface, const char* member,
-                         const std::string& name, std::string_view unknown, std::string& path) {
+                         const std::string& name, Answers unknown, std::string& path) {
     path.clear();
     Message reply;
-    std::string error;
-    Outcome outcome = call(object, interface, member, textArgument(name), reply, &error);
-    return error == unknown ? Outcome() : outcome.ok() ? readPath(member, reply, path) : outcome;
+    RETURN_IF_FAILED(call(object, interface, member, arguments(name), reply, unknown));
+    return readReply(member, reply, path);
 }
 
 Outcome Daemon::findDevice(const std::string& interface, std::optional<Device>& device) {
@@ -158,7 +166,7 @@ Outcome Daemon::findDevice(const std::string& interface, std::optional<Device>& 
     }
     if (!properties || valueOf<std::string>(*properties, "Interface").value_or(interface) != interface) {
         RETURN_IF_FAILED(findPath(managerPath, managerInterface, "GetDeviceByIpIface", interface,
-                                  "org.freedesktop.NetworkManager.UnknownDevice", found.path));
+                                  unknownDevice, found.path));
         properties.reset();
         if (!found.path.empty()) {
             RETURN_IF_FAILED(readObject(found.path, deviceInterface, properties));
@@ -174,7 +182,7 @@ Outcome Daemon::findDevice(const std::string& interface, std::optional<Device>& 
     } else if (type == typeWireless) {
         found.kind = Device::Kind::wireless;
     }
-    found.state = devices_[found.path] = numberIn(*properties, "State");
+    devices_[found.path] = numberIn(*properties, "State");
     found.managed = valueOf<bool>(*properties, "Managed").value_or(false);
     found.autoconnect = valueOf<bool>(*properties, "Autoconnect").value_or(false);
     found.active = pathIn(*properties, "ActiveConnection");
@@ -201,21 +209,18 @@ Outcome Daemon::findActive(const Device& device, std::optional<Active>& active) 
 Outcome Daemon::findProfile(const std::string& uuid, std::optional<Profile>& profile) {
     profile.reset();
     std::string path;
-    RETURN_IF_FAILED(findPath(settingsPath, settingsInterface, "GetConnectionByUuid", uuid,
-                              "org.freedesktop.NetworkManager.Settings.InvalidConnection", path));
+    RETURN_IF_FAILED(
+        findPath(settingsPath, settingsInterface, "GetConnectionByUuid", uuid, unknownProfile, path));
     if (path.empty()) {
         return {};
     }
     Message reply;
-    std::string error;
-    Outcome outcome = call(path, profileInterface, "GetSettings", {}, reply, &error);
-    if (outcome.ok()) {
+    RETURN_IF_FAILED(call(path, profileInterface, "GetSettings", {}, reply, gone));
+    if (reply != nullptr) {
         profile.emplace().path = path;
-        if (readValue(reply.get(), profile->sections) < 0) {
-            return unreadable("GetSettings");
-        }
+        return readReply("GetSettings", reply, profile->sections);
     }
-    return isGone(error) ? Outcome() : outcome;
+    return {};
 }
 
 Outcome Daemon::isVolatile(const std::string& profile, bool& result) {
@@ -232,21 +237,10 @@ Outcome Daemon::readSecrets(const std::string& profile, Sections& sections) {
             continue;
         }
         Message reply;
-        std::string error;
-        Outcome outcome = call(profile, profileInterface, "GetSecrets", textArgument(name), reply, &error);
         Sections secrets;
-        if (error == "org.freedesktop.NetworkManager.AgentManager.NoSecrets") {
-            continue;
-        }
-        if (!outcome.ok()) {
-            return outcome;
-        }
-        if (readValue(reply.get(), secrets) < 0) {
-            return unreadable("GetSecrets");
-        }
-        if (const auto found = secrets.find(name); found != secrets.end()) {
-            section->second.insert(found->second.begin(), found->second.end());
-        }
+        RETURN_IF_FAILED(call(profile, profileInterface, "GetSecrets", arguments(name), reply, noSecrets));
+        RETURN_IF_FAILED(readReply("GetSecrets", reply, secrets));
+        section->second.merge(secrets[name]);
     }
     return {};
 }
@@ -256,33 +250,20 @@ Outcome Daemon::addProfile(const Sections& sections, Adding adding, std::string_
     Message reply;
     const std::uint32_t flags = inMemory | (adding == Adding::heldBack ? blockAutoconnect : 0);
     // Not AddAndActivateConnection, which completes what is missing or wrong instead of refusing it.
-    RETURN_IF_FAILED(call(
-        settingsPath, settingsInterface, "AddConnection2",
-        [&sections, flags](sd_bus_message* message) {
-            const int result = appendValue(message, sections);
-            return result < 0 ? result : sd_bus_message_append(message, "ua{sv}", flags, 0);
-        },
-        reply, nullptr, secret));
-    return readPath("AddConnection2", reply, path);
+    RETURN_IF_FAILED(call(settingsPath, settingsInterface, "AddConnection2",
+                          arguments(sections, flags, Dictionary()), reply, {}, secret));
+    return readReply("AddConnection2", reply, path);
 }
 
 Outcome Daemon::updateProfile(const std::string& path, const Sections& sections, std::string_view secret) {
     Message reply;
-    return call(
-        path, profileInterface, "Update2",
-        [&sections](sd_bus_message* message) {
-            const int result = appendValue(message, sections);
-            return result < 0 ? result
-                              : sd_bus_message_append(message, "ua{sv}", inMemory | blockAutoconnect, 0);
-        },
-        reply, nullptr, secret);
+    return call(path, profileInterface, "Update2",
+                arguments(sections, inMemory | blockAutoconnect, Dictionary()), reply, {}, secret);
 }
 
 Outcome Daemon::deleteProfile(const std::string& path) {
     Message reply;
-    std::string error;
-    Outcome outcome = call(path, profileInterface, "Delete", {}, reply, &error);
-    return isGone(error) ? Outcome() : outcome;
+    return call(path, profileInterface, "Delete", {}, reply, gone);
 }
 
 Outcome Daemon::activate(const std::string& profile, const Device& device, std::string& active) {
@@ -290,24 +271,19 @@ Outcome Daemon::activate(const std::string& profile, const Device& device, std::
     failures_.erase(device.path);
     // Until a signal tells how far the new one is.
     devices_[device.path] = deviceDisconnected;
-    RETURN_IF_FAILED(call(
-        managerPath, managerInterface, "ActivateConnection",
-        [&](sd_bus_message* message) {
-            return sd_bus_message_append(message, "ooo", profile.c_str(), device.path.c_str(), "/");
-        },
-        reply));
-    return readPath("ActivateConnection", reply, active);
+    RETURN_IF_FAILED(call(managerPath, managerInterface, "ActivateConnection",
+                          arguments(Path{profile}, Path{device.path}, Path{"/"}), reply));
+    return readReply("ActivateConnection", reply, active);
 }
 
 Outcome Daemon::disconnect(const Device& device) {
     Message reply;
-    std::string error;
-    Outcome outcome = call(device.path, deviceInterface, "Disconnect", {}, reply, &error);
-    if (isGone(error)) {
-        devices_[device.path] = 0;
-        return {};
+    RETURN_IF_FAILED(call(device.path, deviceInterface, "Disconnect", {}, reply, atRest));
+    if (reply == nullptr) {
+        // No signal will tell of a card that is gone: its state is asked for again.
+        devices_.erase(device.path);
     }
-    return error == "org.freedesktop.NetworkManager.Device.NotActive" ? Outcome() : outcome;
+    return {};
 }
 
 Outcome Daemon::setManaged(const Device& device, bool managed) {
@@ -352,9 +328,7 @@ Outcome Daemon::readHeard(const Device& device, const std::string& network,
     Message reply;
     RETURN_IF_FAILED(call(device.path, wirelessInterface, "GetAllAccessPoints", {}, reply));
     Texts paths;
-    if (readValue(reply.get(), paths) < 0) {
-        return unreadable("GetAllAccessPoints");
-    }
+    RETURN_IF_FAILED(readReply("GetAllAccessPoints", reply, paths));
     paths.resize(std::min(paths.size(), mostAccessPoints));
     timespec now{};
     ::clock_gettime(CLOCK_BOOTTIME, &now);
@@ -385,20 +359,19 @@ Outcome Daemon::readLastScan(const Device& device, std::int64_t& time) {
 
 Outcome Daemon::scanFor(const Device& device, const std::string& network) {
     const Dictionary byName{{"ssids", {std::vector<Bytes>{Bytes(network.begin(), network.end())}}}};
-    Message reply;
-    std::string error;
     Outcome outcome;
+    std::string error;
     // Not every daemon below it can call out for a name.
     for (const Dictionary& options : {byName, Dictionary()}) {
-        outcome = call(
-            device.path, wirelessInterface, "RequestScan",
-            [&options](sd_bus_message* message) { return appendValue(message, options); }, reply, &error);
+        Message reply;
+        outcome =
+            bus_.call({device.path, wirelessInterface, "RequestScan", arguments(options), {}}, reply, &error);
         if (error.empty()) {
-            break;
+            return outcome;
         }
     }
     // It has just looked, or is busy with joining, for which it looks by itself.
-    return error.empty() ? outcome : Outcome();
+    return {};
 }
 
 Outcome Daemon::listen() {
@@ -412,18 +385,19 @@ Outcome Daemon::listen() {
                 actives_[path] = state;
             }
         }));
-    RETURN_IF_FAILED(
-        bus_.watch(deviceInterface, "StateChanged", [this](const char* path, sd_bus_message* message) {
-            std::uint32_t state = 0;
-            std::uint32_t reason = 0;
-            if (sd_bus_message_read(message, "uuu", &state, nullptr, &reason) >= 0) {
-                noteDevice(path, state, reason);
-            }
-        }));
-    RETURN_IF_FAILED(bus_.watch(
-        propertiesInterface, "PropertiesChanged",
-        [this](const char* /*path*/, sd_bus_message* /*message*/) { managerChanged_ = true; },
-        managerInterface));
+    return bus_.watch(deviceInterface, "StateChanged", [this](const char* path, sd_bus_message* message) {
+        std::uint32_t state = 0;
+        std::uint32_t reason = 0;
+        if (sd_bus_message_read(message, "uuu", &state, nullptr, &reason) >= 0) {
+            noteDevice(path, state, reason);
+        }
+    });
+}
+
+Outcome Daemon::listenToAir() {
+    if (std::exchange(isListeningToAir_, true)) {
+        return {};
+    }
     const auto noteAir = [this](const char* /*path*/, sd_bus_message* /*message*/) { ++changesOnAir_; };
     RETURN_IF_FAILED(bus_.watch(propertiesInterface, "PropertiesChanged", noteAir, wirelessInterface));
     return bus_.watch(wirelessInterface, "AccessPointAdded", noteAir);

@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <map>
 #include <optional>
+#include <span>
 #include <string>
 #include <vector>
 
@@ -18,15 +19,12 @@
 namespace platform::apply {
 
 using bus::Arguments;
+using bus::arguments;
 using bus::Bus;
 using bus::Clock;
-using bus::Dictionary;
 using bus::Message;
+using bus::Path;
 using bus::readValue;
-using bus::Sections;
-using bus::Texts;
-using bus::Value;
-using bus::valueOf;
 
 // Of NetworkManager's states of a card: unmanaged 10, unavailable 20, disconnected 30, then activating,
 // activated 100, deactivating 110, failed 120.
@@ -45,7 +43,6 @@ struct Device {
 
     std::string path;
     Kind kind = Kind::other;
-    std::uint32_t state = 0;
     bool managed = false;
     bool autoconnect = false;
     std::string active;     // the path of what is active on it; empty for nothing
@@ -74,6 +71,9 @@ enum class Adding { heldBack, atOnce };
 // has just been started. What goes on is told by signals, which handleSignals takes in.
 class Daemon {
   public:
+    // Whether NetworkManager owns its name on the host's system bus. No bus socket, or no owner, is a no;
+    // everything else that goes wrong is a failure. It never starts the daemon.
+    Outcome open(bool& running);
     // Fails when NetworkManager does not run. Waits for a daemon that is starting, whose cards are not yet
     // what they will be, for at most ten seconds. Connected already, it only looks at the radio again.
     Outcome connect();
@@ -120,8 +120,9 @@ class Daemon {
     // Whom it may have left the radio to.
     [[nodiscard]] Iwd& iwd() noexcept { return iwd_; }
 
-    // From here on the signals of cards and profiles are taken in.
+    // From here on the signals of cards and profiles are taken in, and those about the networks on the air.
     Outcome listen();
+    Outcome listenToAir();
     // Waits for a signal at most until the time; fails when the daemon left the bus.
     Outcome handleSignals(Clock::time_point until) { return bus_.handleSignals(until); }
     // The state of a card or of an active profile (activeDeactivated when it is gone), read once and then
@@ -130,19 +131,21 @@ class Daemon {
     Outcome activeState(const std::string& path, std::uint32_t& state);
     // Why the card last failed or was switched off, since it last began anything; 0 for no reason.
     [[nodiscard]] std::uint32_t failureOf(const std::string& device) const;
-    // Counts what changed about the networks on the air.
+    // Counts what changed about the networks on the air since listenToAir.
     [[nodiscard]] unsigned changesOnAir() const noexcept { return changesOnAir_; }
 
   private:
+    // Names of errors that are answers too: a success without a reply.
+    using Answers = std::span<const std::string_view>;
     Outcome call(const std::string& path, const char* interface, const char* member, Arguments arguments,
-                 Message& reply, std::string* error = nullptr, std::string_view secret = {});
+                 Message& reply, Answers answers = {}, std::string_view secret = {});
     Outcome readManager();
     Outcome awaitStartup();
     // Nothing, and success, when the object is gone.
     Outcome readObject(const std::string& path, const char* interface, std::optional<Dictionary>& properties);
-    // The path that a look-up by name gives; empty, and success, when it ends in the error `unknown`.
+    // The path that a look-up by name gives; empty, and success, when it ends in such an error.
     Outcome findPath(const std::string& object, const char* interface, const char* member,
-                     const std::string& name, std::string_view unknown, std::string& path);
+                     const std::string& name, Answers unknown, std::string& path);
     using States = std::map<std::string, std::uint32_t, std::less<>>;
     // `gone` is the state of an object that is not there.
     Outcome readState(States& known, const std::string& path, const char* interface, std::uint32_t gone,
@@ -153,6 +156,7 @@ class Daemon {
     Iwd iwd_;
     bool isConnected_ = false;
     bool isListening_ = false;
+    bool isListeningToAir_ = false;
     bool starting_ = false;
     bool radio_ = true;
     bool radioHardware_ = true;

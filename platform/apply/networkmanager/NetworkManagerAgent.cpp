@@ -22,6 +22,7 @@ constexpr std::chrono::seconds makeWayBound{2};
 class NetworkManagerAgent final : public Agent {
   public:
     [[nodiscard]] std::string_view name() const noexcept override { return "networkmanager"; }
+    Outcome open(bool& running) { return daemon_.open(running); }
     Outcome takeSnapshots(std::span<const std::string> interfaces, std::vector<Snapshot>& snapshots,
                           std::vector<Trouble>& leftAlone) override;
     void start(std::span<Task> tasks, Clock::time_point deadline) override;
@@ -32,9 +33,10 @@ class NetworkManagerAgent final : public Agent {
     Outcome captureCard(const Device& device, const std::string& interface, CardSnapshot& earlier,
                         std::string& reason);
     Outcome prepare(std::span<Task> tasks, std::vector<std::shared_ptr<Place>>& places);
-    Outcome makeWay(std::span<Task> tasks);
+    Outcome awaitRest(std::span<const Device> devices);
 
     Daemon daemon_;
+    bool isJustConnected_ = false;
     std::vector<std::unique_ptr<Card>> cards_;
 };
 
@@ -75,6 +77,7 @@ Outcome NetworkManagerAgent::takeSnapshots(std::span<const std::string> interfac
     snapshots.clear();
     leftAlone.clear();
     RETURN_IF_FAILED(daemon_.connect());
+    isJustConnected_ = true;
     struct Ranked {
         std::uint32_t metric;
         Snapshot snapshot;
@@ -127,10 +130,18 @@ void NetworkManagerAgent::start(std::span<Task> tasks, Clock::time_point deadlin
     std::erase_if(cards_, [](const auto& card) { return card->step(); });
 }
 
+// The daemon gives the routes of a card a worse number than those of all cards that are active. A card of
+// this way back that is to have a worse one than one before it, and is on its earlier profile already because
+// the run that would have taken it over was ended before, makes way, and comes back when it is its turn.
 Outcome NetworkManagerAgent::prepare(std::span<Task> tasks, std::vector<std::shared_ptr<Place>>& places) {
-    RETURN_IF_FAILED(daemon_.connect());
+    // A look of a moment ago counts.
+    if (!std::exchange(isJustConnected_, false)) {
+        RETURN_IF_FAILED(daemon_.connect());
+    }
     RETURN_IF_FAILED(daemon_.listen());
     std::map<Device::Kind, std::shared_ptr<Place>> last;
+    std::vector<Device> makingWay;
+    bool isAnyAway = false;
     for (const Task& task : tasks) {
         std::optional<Device> device;
         if (task.plan == nullptr) {
@@ -139,38 +150,26 @@ Outcome NetworkManagerAgent::prepare(std::span<Task> tasks, std::vector<std::sha
         std::shared_ptr<Place>& before = last[device ? device->kind : Device::Kind::other];
         places.push_back(std::make_shared<Place>(Place{false, before}));
         before = places.back();
-    }
-    return makeWay(tasks);
-}
-
-// The daemon gives the routes of a card a worse number than those of all cards that are active. A card of
-// this way back that is to have a worse one than one before it, and is on its earlier profile already because
-// the run that would have taken it over was ended before, makes way, and comes back when it is its turn.
-Outcome NetworkManagerAgent::makeWay(std::span<Task> tasks) {
-    bool isAnyAway = false;
-    std::vector<Device> making;
-    for (const Task& task : tasks) {
         CardSnapshot earlier;
-        std::optional<Device> device;
-        std::optional<Active> active;
-        if (task.plan != nullptr || !values::fromPropertyList(task.before->state.get(), earlier) ||
+        if (!device || !values::fromPropertyList(task.before->state.get(), earlier) ||
             earlier.profile.uuid.empty()) {
             continue;
         }
-        RETURN_IF_FAILED(daemon_.findDevice(task.before->interface, device));
-        if (!device) {
-            continue;
-        }
+        std::optional<Active> active;
         RETURN_IF_FAILED(daemon_.findActive(*device, active));
         const bool isBack = active && active->uuid == earlier.profile.uuid;
         if (isBack && isAnyAway) {
             RETURN_IF_FAILED(daemon_.disconnect(*device));
-            making.push_back(*device);
+            makingWay.push_back(*device);
         }
         isAnyAway = isAnyAway || !isBack;
     }
+    return awaitRest(makingWay);
+}
+
+Outcome NetworkManagerAgent::awaitRest(std::span<const Device> devices) {
     const Clock::time_point deadline = Clock::now() + makeWayBound;
-    for (const Device& device : making) {
+    for (const Device& device : devices) {
         std::uint32_t state = 0;
         RETURN_IF_FAILED(daemon_.deviceState(device.path, state));
         while (state > deviceDisconnected && Clock::now() < deadline) {
@@ -202,13 +201,16 @@ bool NetworkManagerAgent::settle(Clock::time_point until) {
 
 }  // namespace
 
-std::shared_ptr<Agent> makeNetworkManagerAgent() {
-    return std::make_shared<NetworkManagerAgent>();
+Outcome findNetworkManagerAgent(std::shared_ptr<Agent>& agent) {
+    const auto made = std::make_shared<NetworkManagerAgent>();
+    bool running = false;
+    RETURN_IF_FAILED(made->open(running));
+    agent = running ? made : nullptr;
+    return {};
 }
 
-Outcome isNetworkManagerRunning(bool& running) {
-    Bus bus;
-    return bus.connect("org.freedesktop.NetworkManager", running);
+std::shared_ptr<Agent> makeNetworkManagerAgent() {
+    return std::make_shared<NetworkManagerAgent>();
 }
 
 }  // namespace platform::apply

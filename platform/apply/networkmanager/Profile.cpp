@@ -103,11 +103,8 @@ void keepSecretsInside(Dictionary& section) {
 
 void setWireless(const WirelessSettings& settings, const WirelessLink& link, Sections& profile) {
     if (!link.choice) {
-        profile.insert(link.current.begin(), link.current.end());
-        for (const char* const name : wirelessSectionNames) {
-            if (const auto section = profile.find(name); section != profile.end()) {
-                keepSecretsInside(section->second);
-            }
+        for (const auto& [name, section] : link.current) {
+            keepSecretsInside(profile[name] = section);
         }
         return;
     }
@@ -144,13 +141,13 @@ void setWireless(const WirelessSettings& settings, const WirelessLink& link, Sec
     }
 }
 
-const TextMap* userData(const Sections& profile) {
-    const auto user = profile.find("user");
-    if (user == profile.end()) {
-        return nullptr;
-    }
-    const auto data = user->second.find("data");
-    return data == user->second.end() ? nullptr : std::get_if<TextMap>(&data->second.content);
+Dictionary sectionIn(const Sections& profile, const char* name) {
+    const auto found = profile.find(name);
+    return found == profile.end() ? Dictionary() : found->second;
+}
+
+TextMap userData(const Sections& profile) {
+    return valueOf<TextMap>(sectionIn(profile, "user"), "data").value_or(TextMap());
 }
 
 }  // namespace
@@ -174,18 +171,13 @@ std::string profileUUID(const std::string& interface) {
 }
 
 bool isOurs(const Sections& profile) {
-    const TextMap* const data = userData(profile);
-    return data != nullptr && data->find(tagKey) != data->end();
+    return userData(profile).contains(tagKey);
 }
 
 ProfileSnapshot snapshotIn(const Sections& profile) {
-    const TextMap* const data = userData(profile);
-    const auto text = [data](const char* key) {
-        const auto found = data == nullptr ? TextMap::const_iterator() : data->find(key);
-        return data == nullptr || found == data->end() ? std::string() : found->second;
-    };
-    const std::string earlier = text(earlierKey);
-    return {earlier == none ? "" : earlier, text(autoconnectKey) != "no", text(radioKey) != "no"};
+    TextMap data = userData(profile);
+    const std::string earlier = data[earlierKey];
+    return {earlier == none ? "" : earlier, data[autoconnectKey] != "no", data[radioKey] != "no"};
 }
 
 Sections wirelessSections(const Sections& profile) {
@@ -202,9 +194,8 @@ Sections wirelessSections(const Sections& profile) {
 }
 
 std::string networkOf(const Sections& profile) {
-    const auto wireless = profile.find("802-11-wireless");
-    const auto ssid = wireless == profile.end() ? std::nullopt : valueOf<Bytes>(wireless->second, "ssid");
-    return ssid ? std::string(ssid->begin(), ssid->end()) : std::string();
+    const auto ssid = valueOf<Bytes>(sectionIn(profile, "802-11-wireless"), "ssid").value_or(Bytes());
+    return {ssid.begin(), ssid.end()};
 }
 
 Sections makeProfile(const InterfacePlan& plan, const WirelessLink* link, const ProfileSnapshot& before) {

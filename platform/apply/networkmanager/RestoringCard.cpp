@@ -15,17 +15,14 @@ class RestoringCard final : public Card {
   public:
     RestoringCard(Daemon& daemon, Task& task, CardSnapshot earlier, std::shared_ptr<Place> place,
                   Clock::time_point deadline)
-        : Card(daemon, task, deadline), before_(std::move(earlier)), place_(std::move(place)) {}
+        : Card(daemon, task, std::move(earlier), deadline), place_(std::move(place)) {
+        next(&RestoringCard::begin);
+    }
     RestoringCard(const RestoringCard&) = delete;
     RestoringCard& operator=(const RestoringCard&) = delete;
     ~RestoringCard() override { place_->isTaken = true; }
 
   private:
-    // One of the steps below; each names the one that comes next.
-    using Stage = Outcome (RestoringCard::*)();
-
-    Outcome advance() override { return (this->*stage_)(); }
-
     [[nodiscard]] const ProfileSnapshot& before() const { return before_.profile; }
 
     Outcome begin() {
@@ -48,7 +45,7 @@ class RestoringCard final : public Card {
             RETURN_IF_FAILED(daemon_.setManaged(device_, true));
             readyDeadline_ += readyBound;
         }
-        stage_ = &RestoringCard::becomeReady;
+        next(&RestoringCard::becomeReady);
         return {};
     }
 
@@ -59,30 +56,21 @@ class RestoringCard final : public Card {
     }
 
     Outcome becomeReady() {
-        std::uint32_t state = 0;
-        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
-        if (state < deviceDisconnected && Clock::now() < readyDeadline_) {
-            waitUntil(readyDeadline_);
+        bool isReady = false;
+        RETURN_IF_FAILED(awaitReady(isReady));
+        if (isWaiting()) {
             return {};
         }
         if (before().uuid.empty()) {
-            stage_ = &RestoringCard::comeToRest;
+            next(&RestoringCard::comeToRest);
             return daemon_.disconnect(device_);
         }
-        return activateEarlier(state >= deviceDisconnected);
+        return activateEarlier(isReady);
     }
 
     Outcome comeToRest() {
-        std::uint32_t state = 0;
-        RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
-        if (state <= deviceDisconnected) {
-            stage_ = &RestoringCard::finish;
-        } else if (isLate()) {
-            return {kSCStatusFailed, "NetworkManager did not switch the card off in time"};
-        } else {
-            waitUntil(deadline_);
-        }
-        return {};
+        RETURN_IF_FAILED(awaitRest());
+        return isWaiting() ? Outcome() : finishWith("");
     }
 
     Outcome activateEarlier(bool isReady) {
@@ -90,15 +78,13 @@ class RestoringCard final : public Card {
         RETURN_IF_FAILED(daemon_.findProfile(before().uuid, profile));
         if (!profile || !isReady) {
             // What is active next is up to the daemon, as if this system had never been there.
-            task_.trouble = profile ? "no profile can be active on it now"
-                                    : "the profile that was active on it is deleted";
-            stage_ = &RestoringCard::finish;
-            return {};
+            return finishWith(profile ? "no profile can be active on it now"
+                                      : "the profile that was active on it is deleted");
         }
         profile_ = profile->path;
         network_ = networkOf(profile->sections);
         placeDeadline_ = Clock::now() + placeBound;
-        stage_ = &RestoringCard::awaitPlace;
+        next(&RestoringCard::awaitPlace);
         return {};
     }
 
@@ -117,7 +103,7 @@ class RestoringCard final : public Card {
             RETURN_IF_FAILED(daemon_.activate(profile_, device_, active_->path));
         }
         placeDeadline_ = Clock::now() + placeBound;
-        stage_ = &RestoringCard::comeUp;
+        next(&RestoringCard::comeUp);
         return {};
     }
 
@@ -132,13 +118,13 @@ class RestoringCard final : public Card {
         const bool isEnough = !before_.wasUp && (place_->isTaken || device_.kind == Device::Kind::wireless ||
                                                  Clock::now() >= placeDeadline_);
         if (state == activeActivated || isEnough) {
-            stage_ = &RestoringCard::finish;
-        } else if (state == activeDeactivated) {
-            stage_ = &RestoringCard::tellFailure;
+            return finishWith("");
+        }
+        if (state == activeDeactivated) {
+            next(&RestoringCard::tellFailure);
             reasonDeadline_ = Clock::now() + reasonBound;
         } else if (isLate()) {
-            task_.trouble = "the profile that was active before is not up yet; NetworkManager goes on";
-            stage_ = &RestoringCard::finish;
+            return finishWith("the profile that was active before is not up yet; NetworkManager goes on");
         } else if (before_.wasUp && !network_.empty() && changesOnAir_ != daemon_.changesOnAir()) {
             return lookAgain();
         } else if (decideAt_ && Clock::now() >= *decideAt_) {
@@ -166,22 +152,22 @@ class RestoringCard final : public Card {
         std::vector<HeardNetwork> heard;
         RETURN_IF_FAILED(daemon_.readHeard(device_, network_, heard));
         if (std::ranges::none_of(heard, [](const HeardNetwork& one) { return one.age <= longestScan; })) {
-            task_.trouble = "the network of before is not there now, and is joined when it comes";
-            stage_ = &RestoringCard::finish;
-        } else if (!std::exchange(isAskedAgain_, true)) {
-            return daemon_.activate(profile_, device_, active_->path);
+            return finishWith("the network of before is not there now, and is joined when it comes");
         }
-        return {};
+        return std::exchange(isAskedAgain_, true) ? Outcome()
+                                                  : daemon_.activate(profile_, device_, active_->path);
     }
 
     Outcome tellFailure() {
-        const std::uint32_t reason = daemon_.failureOf(device_.path);
-        if (reason == 0 && Clock::now() < reasonDeadline_) {
-            waitUntil(reasonDeadline_);
-            return {};
-        }
-        task_.trouble = "the profile that was active before does not come up: " + describeFailure(reason);
-        stage_ = &RestoringCard::finish;
+        const std::uint32_t reason = awaitReason();
+        return isWaiting() ? Outcome()
+                           : finishWith("the profile that was active before does not come up: " +
+                                        describeFailure(reason));
+    }
+
+    Outcome finishWith(const std::string& trouble) {
+        task_.trouble = trouble;
+        next(&RestoringCard::finish);
         return {};
     }
 
@@ -193,6 +179,7 @@ class RestoringCard final : public Card {
         RETURN_IF_FAILED(findCard(device));
         if (device && device->autoconnect != before().autoconnect) {
             RETURN_IF_FAILED(daemon_.setAutoconnect(*device, before().autoconnect));
+            RETURN_IF_FAILED(findCard(device));
         }
         if (before_.radioOff.value_or(false)) {
             RETURN_IF_FAILED(switchRadio(interface_, false));
@@ -201,35 +188,22 @@ class RestoringCard final : public Card {
         }
         settle();
         RETURN_IF_FAILED(iwdOutcome_);
-        return task_.trouble.empty() ? compare() : Outcome();
+        return task_.trouble.empty() && device ? compare(*device) : Outcome();
     }
 
-    Outcome compare() {
-        std::optional<Device> device;
+    Outcome compare(const Device& device) {
         std::optional<Active> active;
-        RETURN_IF_FAILED(findCard(device));
-        if (!device) {
-            return {};
-        }
-        RETURN_IF_FAILED(daemon_.findActive(*device, active));
-        const bool isSame = (active ? active->uuid : "") == before().uuid && device->managed &&
-                            device->autoconnect == before().autoconnect;
+        RETURN_IF_FAILED(daemon_.findActive(device, active));
+        const bool isSame = (active ? active->uuid : "") == before().uuid && device.managed &&
+                            device.autoconnect == before().autoconnect;
         return isSame ? Outcome() : Outcome(kSCStatusFailed, "it is not as it was before");
     }
 
-    const CardSnapshot before_;
     const std::shared_ptr<Place> place_;
     std::string profile_;  // the path of the earlier profile
     Clock::time_point placeDeadline_;
-    Stage stage_ = &RestoringCard::begin;
     Outcome iwdOutcome_;
-    Device device_;
-    Clock::time_point readyDeadline_;
-    Clock::time_point reasonDeadline_;
-    std::optional<Active> active_;
     std::string network_;  // of the earlier profile; empty for a wired card
-    std::int64_t lastScan_ = 0;
-    unsigned changesOnAir_ = 0;
     std::optional<Clock::time_point> decideAt_;
     bool isAskedAgain_ = false;
 };

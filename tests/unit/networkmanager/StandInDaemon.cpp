@@ -151,6 +151,11 @@ void StandInDaemon::activate(const std::string& profile, sd_bus_message* reply) 
         moveCard(deviceDisconnected);
     } else if (!isLooking) {
         moveCard(deviceGetsAddresses);
+        if (forger != nullptr) {
+            sd_bus_emit_signal(forger, path.c_str(), "org.freedesktop.NetworkManager.Connection.Active",
+                               "StateChanged", "uu", activeActivated, 0U);
+            sd_bus_flush(forger);
+        }
         if (!hangs) {
             moveCard(deviceActivated);
             moveActive(path, activeActivated);

@@ -15,6 +15,9 @@ namespace testing_support {
 class StandInDaemon {
   public:
     explicit StandInDaemon(const StandInBus& bus);
+    ~StandInDaemon() { sd_bus_flush_close_unref(forger); }
+    StandInDaemon(const StandInDaemon&) = delete;
+    StandInDaemon& operator=(const StandInDaemon&) = delete;
 
     std::map<std::string, platform::apply::Sections> profiles;  // by path, with secrets
     // A network on the air; one that keeps quiet is told of once a profile was activated, and joined when
@@ -24,6 +27,7 @@ class StandInDaemon {
     // What the next requests meet. Set these between requests.
     std::uint32_t failure = 0;                                       // the reason for which activations fail
     bool hangs = false;                                              // activations get no address
+    sd_bus* forger = nullptr;                                        // somebody else, who says that they do
     void refuse(const std::string& why) { service_.refusal = why; }  // to change anything
     // Every request that changes something, in order.
     std::vector<std::string> changes;

@@ -54,7 +54,8 @@ class Scene {
         } else if (name == "home") {
             joinHome();
         } else if (name == "theirs") {
-            daemon_.profiles["/theirs"] = {{"connection", {{"uuid", {profileUUID("wlan0")}}}}};
+            daemon_.profiles["/theirs"] = {{"connection", {{"uuid", {profileUUID("wlan0")}}}},
+                                           {"user", {{"data", {TextMap{{"mine", "1"}}}}}}};
         } else if (name == "forget") {
             const auto isMeant = [part = word()](const auto& each) {
                 return each.first.find(part) != std::string::npos;
@@ -76,7 +77,7 @@ class Scene {
         } else if (name == "within") {
             deadline_ = std::chrono::milliseconds(number());
         } else if (name == "forge") {
-            isForged_ = true;
+            daemon_.forger = bus_.connect();
         } else if (name == "look") {
             return look();
         } else if (name == "ours") {
@@ -95,6 +96,9 @@ class Scene {
         Sections& sections = daemon_.profiles["/home"];
         sections = makeProfile(*planOf("join", "Home", canary), &link, {});
         sections.erase("user");
+        sections["802-11-wireless"].insert(
+            {{"hidden", {true}}, {"seen-bssids", {Texts{"00:11:22:33:44:55"}}}});
+        sections["802-11-wireless-security"].insert({{"psk-flags", {1U}}, {"leap-password-flags", {1U}}});
         sections["connection"]["uuid"] = {std::string("home")};
         sections["connection"]["id"] = {std::string("Home")};
         daemon_.objects["/home"];
@@ -118,24 +122,11 @@ class Scene {
 
     // The status of a refusal goes before its reason.
     std::string perform(const std::optional<InterfacePlan>& plan) {
-        std::thread forging([this] {
-            sd_bus* const forger = isForged_ ? bus_.connect() : nullptr;
-            for (unsigned i = 0; forger != nullptr && i < 160; ++i) {
-                const std::string path =
-                    StandInDaemon::manager + "/ActiveConnection/" + std::to_string(1 + i % 4);
-                sd_bus_emit_signal(forger, path.c_str(), "org.freedesktop.NetworkManager.Connection.Active",
-                                   "StateChanged", "uu", 2U, 0U);
-                sd_bus_flush(forger);
-                std::this_thread::sleep_for(std::chrono::milliseconds(3));
-            }
-            sd_bus_flush_close_unref(forger);
-        });
         std::vector<Task> tasks{{&before_, plan ? &*plan : nullptr, {}, {}}};
         const Clock::time_point deadline = Clock::now() + deadline_;
         agent_->start(tasks, deadline);
         while (!agent_->settle(deadline)) {
         }
-        forging.join();
         std::string text;
         for (const std::string& line : std::exchange(daemon_.changes, {})) {
             text += (text.empty() ? "" : "; ") + line;
@@ -170,7 +161,6 @@ class Scene {
     const std::shared_ptr<Agent> agent_ = makeNetworkManagerAgent();
     Snapshot before_;
     std::chrono::milliseconds deadline_{10'000};
-    bool isForged_ = false;
 };
 
 TEST(NetworkManager, GoesAndComesBack) {

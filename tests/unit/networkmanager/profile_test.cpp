@@ -3,7 +3,9 @@
 #include <gtest/gtest.h>
 
 #include <cstdlib>
+#include <numeric>
 
+#include "platform/apply/Digest.h"
 #include "platform/apply/networkmanager/Daemon.h"
 #include "platform/base/Host.h"
 #include "tests/unit/apply/Trees.h"
@@ -76,6 +78,13 @@ std::string joiningOf(const Inputs& inputs) {
     return showValue(wirelessSections(profile)) + reason;
 }
 
+TEST(Digest, IsThatOfTheAlgorithmsAuthors) {
+    std::array<std::uint8_t, 16> key{};
+    std::iota(key.begin(), key.end(), std::uint8_t{0});
+    EXPECT_EQ(0xa129ca6149be45e5U,
+              sipHash(key, std::string_view("\0\1\2\3\4\5\6\7\10\11\12\13\14\15\16", 15)));
+}
+
 TEST(Profile, IsAsItWas) {
     testing_support::Transcript transcript("profiles");
     transcript.replay("a wired card, by the entries of its service",
@@ -90,25 +99,6 @@ TEST(Profile, IsAsItWas) {
         return kept;
     });
     transcript.replay("networks on the air, and a key", joiningOf);
-}
-
-TEST(Profile, KeepsTheNetworkOfTheCard) {
-    const Sections home = {
-        {"802-11-wireless",
-         {{"ssid", {Bytes{'h', 'o', 'm', 'e'}}},
-          {"hidden", {true}},
-          {"seen-bssids", {Texts{"00:11:22:33:44:55"}}}}},
-        {"802-11-wireless-security",
-         {{"key-mgmt", {std::string("wpa-psk")}}, {"psk", {std::string("a secret")}}, {"psk-flags", {1U}}}},
-        {"connection", {{"id", {std::string("Home")}}}},
-    };
-    const WirelessLink link{{}, wirelessSections(home)};
-    const Sections profile = made(planOf("AirPort = {}"), &link);
-    EXPECT_EQ(
-        "{802-11-wireless = {hidden = #true; ssid = <home>}; 802-11-wireless-security = {key-mgmt = "
-        "wpa-psk; psk = a secret}}",
-        showValue(wirelessSections(profile)));
-    EXPECT_EQ(Value{std::string("location-assistant eth0")}, profile.at("connection").at("id"));
 }
 
 }  // namespace
