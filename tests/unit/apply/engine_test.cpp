@@ -2,11 +2,15 @@
 #include <cmath>
 #include <cstdlib>
 #include <filesystem>
+#include <memory>
 
+#include "platform/SystemConfiguration.h"
+#include "platform/base/Host.h"
+#include "platform/base/Log.h"
 #include "platform/values/PropertyListXML.h"
 #include "tests/unit/apply/Trees.h"
-#include "tests/unit/preferences/Store.h"
 #include "tests/unit/support/RecordingAgent.h"
+#include "tests/unit/support/TemporaryDirectory.h"
 #include "tests/unit/support/Transcript.h"
 
 namespace platform::apply {
