@@ -211,6 +211,8 @@ TEST(Live, TheContextLivesAsLongAsTheSession) {
     EXPECT_EQ(held, 1) << "the source holds the session";
     source = {};
     EXPECT_EQ(held, 0);
+    EXPECT_EQ(SCDynamicStoreCopyKeyList(nullptr, CFSTR(".*")), nullptr);
+    EXPECT_EQ(SCError(), 2001) << "no session";
 }
 
 }  // namespace
