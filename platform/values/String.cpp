@@ -1,3 +1,5 @@
+#include <unicode/unistr.h>
+
 #include <algorithm>
 #include <cassert>
 #include <cstring>
@@ -7,6 +9,19 @@
 #include "platform/values/Values.h"
 
 using namespace platform::values;
+
+namespace {
+
+// Half of a character of two units makes no string, so ranges that cut one need no look at where they do.
+bool isInside(CFRange range, const icu::UnicodeString& units) {
+    return range.location >= 0 && range.length >= 0 && range.location <= units.length() &&
+           range.length <= units.length() - range.location;
+}
+const UniChar* unitsOf(const icu::UnicodeString& units) {
+    return reinterpret_cast<const UniChar*>(units.getBuffer());
+}
+
+}  // namespace
 
 OpaqueCFString::OpaqueCFString(std::string_view text, TextTraits traits) noexcept
     : Object(Type::string), traits_(traits), size_(static_cast<std::uint32_t>(text.size())) {
@@ -73,18 +88,12 @@ CFMutableStringRef CFStringCreateMutableCopy(CFAllocatorRef, CFIndex, CFStringRe
     return new MutableString(std::string(string->text()), string->traits());
 }
 
-CFStringRef CFStringCreateWithSubstring(CFAllocatorRef, CFStringRef string, CFRange range) noexcept {
-    const std::string_view text = string->text();
-    if (range.location < 0 || range.length < 0) {
-        return nullptr;
-    }
-    const std::optional<std::size_t> begin = byteOfUnit(text, static_cast<std::size_t>(range.location));
-    if (!begin.has_value()) {
-        return nullptr;
-    }
-    const std::string_view rest = text.substr(*begin);
-    const std::optional<std::size_t> size = byteOfUnit(rest, static_cast<std::size_t>(range.length));
-    return size.has_value() ? makeString(rest.substr(0, *size)).take() : nullptr;
+CFStringRef CFStringCreateWithSubstring(CFAllocatorRef allocator, CFStringRef string,
+                                        CFRange range) noexcept {
+    const auto units = icu::UnicodeString::fromUTF8(string->text());
+    return isInside(range, units)
+               ? CFStringCreateWithCharacters(allocator, unitsOf(units) + range.location, range.length)
+               : nullptr;
 }
 
 CFArrayRef CFStringCreateArrayBySeparatingStrings(CFAllocatorRef, CFStringRef string,
@@ -124,14 +133,15 @@ CFRange CFStringFind(CFStringRef string, CFStringRef wanted, CFStringCompareFlag
 
 void CFStringReplace(CFMutableStringRef string, CFRange range, CFStringRef replacement) noexcept {
     assert(string->isMutable());
-    if (!string->isMutable() || range.location < 0 || range.length < 0) {
+    auto units = icu::UnicodeString::fromUTF8(string->text());
+    if (!string->isMutable() || !isInside(range, units)) {
         return;
     }
-    std::string text(string->text());
-    const auto begin = byteOfUnit(text, static_cast<std::size_t>(range.location));
-    const auto end = byteOfUnit(text, static_cast<std::size_t>(range.location + range.length));
-    if (begin.has_value() && end.has_value()) {
-        text.replace(*begin, *end - *begin, replacement->text());
-        static_cast<MutableString*>(string)->assign(std::move(text));
+    units.replace(static_cast<std::int32_t>(range.location), static_cast<std::int32_t>(range.length),
+                  icu::UnicodeString::fromUTF8(replacement->text()));
+    const auto changed =
+        Owned<CFStringRef>::adopt(CFStringCreateWithCharacters(nullptr, unitsOf(units), units.length()));
+    if (changed) {
+        static_cast<MutableString*>(string)->assign(std::string(textOf(changed.get())));
     }
 }

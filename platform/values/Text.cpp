@@ -63,15 +63,4 @@ std::size_t unitCount(std::string_view text) noexcept {
     return count;
 }
 
-std::optional<std::size_t> byteOfUnit(std::string_view text, std::size_t unit) noexcept {
-    std::size_t position = 0;
-    std::size_t units = 0;
-    while (units < unit && position < text.size()) {
-        UChar32 codePoint = 0;
-        U8_NEXT_UNSAFE(text.data(), position, codePoint);
-        units += codePoint >= 0x10000 ? 2U : 1U;
-    }
-    return units == unit ? std::optional(position) : std::nullopt;
-}
-
 }  // namespace platform::values

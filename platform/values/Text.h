@@ -18,10 +18,7 @@ inline constexpr TextTraits textBeyondXml = 4;    // holds a character that no X
 // Nothing when the bytes are not well-formed UTF-8.
 [[nodiscard]] std::optional<TextTraits> scanText(std::string_view bytes) noexcept;
 
-// The functions below take well-formed UTF-8.
-
+// Of well-formed UTF-8.
 [[nodiscard]] std::size_t unitCount(std::string_view text) noexcept;
-// The byte at which the unit begins, or nothing inside a character of two units or beyond the end.
-[[nodiscard]] std::optional<std::size_t> byteOfUnit(std::string_view text, std::size_t unit) noexcept;
 
 }  // namespace platform::values
