@@ -88,9 +88,12 @@ class Scene {
         } else if (name == "log") {
             return std::exchange(log_, "");
         } else if (name == "reach") {
+            if (network_) {
+                network_->asked.clear();
+            }
             SCNetworkConnectionFlags flags = 77;
             const bool isDone = SCNetworkCheckReachabilityByName(rest.c_str(), &flags) != 0;
-            return reached(isDone, flags);
+            return reached(isDone, flags) + (network_ && !network_->asked.empty() ? ", asked" : "");
         } else if (name == "ask") {
             return ask(words);
         } else if (name == "sh") {
