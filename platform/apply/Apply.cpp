@@ -32,24 +32,6 @@ void logFor(LogLevel level, const std::string& interface, const std::string& rea
     logLine(level, interface.empty() ? reason : interface + ": " + reason);
 }
 
-// Keeps the first failure, and logs every one.
-class Failures {
-  public:
-    bool note(const Outcome& outcome, const std::string& interface = {}) {
-        if (!outcome.ok()) {
-            logFor(LogLevel::error, interface, outcome.reason());
-            if (first_.ok()) {
-                first_ = outcome;
-            }
-        }
-        return outcome.ok();
-    }
-    [[nodiscard]] Outcome first() const { return first_; }
-
-  private:
-    Outcome first_;
-};
-
 // The tasks of each agent, in order.
 class Crew {
   public:
@@ -89,18 +71,63 @@ class Crew {
     std::vector<Group> groups_;
 };
 
-// One run under the lock.
+// Whether this process may try once more to make this location so.
+bool mayRetry(const std::optional<std::string>& location) {
+    static std::optional<std::string> tried;
+    static int tries = 0;
+    if (tried != location) {
+        tried = location;
+        tries = 0;
+    }
+    return tries++ < mostRetries;
+}
+
+bool isActivation(CFDictionaryRef root, CFDictionaryRef replaced, const Plan& plan) {
+    if (replaced == nullptr) {
+        return false;
+    }
+    std::vector<Trouble> ignored;
+    return CFEqual(replaced, root) != 0 ||
+           textIn(replaced, CFSTR("CurrentSet")) != textIn(root, CFSTR("CurrentSet")) ||
+           makePlan(replaced, ignored) != plan;
+}
+
 class Run {
   public:
-    Run(const Plan& plan, Record& record, Failures& failures, bool activates)
-        : plan_(plan), record_(record), failures_(failures), activates_(activates) {}
+    Run(CFDictionaryRef root, CFDictionaryRef replaced)
+        : location_(textIn(root, CFSTR("CurrentSet"))),
+          plan_(makePlan(root, troubles_)),
+          activates_(isActivation(root, replaced, plan_)) {}
 
-    void make() {
+    Outcome make() {
+        for (const Trouble& trouble : troubles_) {
+            if (activates_) {
+                logFor(LogLevel::warning, trouble.interface, trouble.reason);
+            }
+        }
+        // Without the lock: the file is replaced as a whole, and a run that is under way has marked what it
+        // changes.
+        FileDescriptor lock;
+        if (note(readRecord(record_)) && isAnythingToDo() && note(makeRuntimeDirectory()) &&
+            note(takeFileLock(runtimePath("applied.lock"), lockBound, lock)) && note(readRecord(record_)) &&
+            (activates_ || !record_.isOf(plan_))) {
+            makeUnderLock();
+        }
+        return activates_ ? first_ : Outcome();
+    }
+
+  private:
+    [[nodiscard]] bool isAnythingToDo() const {
+        return activates_ ? !record_.entries.empty() || !plan_.empty()
+                          : !record_.entries.empty() && !record_.isOf(plan_) && mayRetry(location_);
+    }
+
+    void makeUnderLock() {
         const Clock::time_point begin = Clock::now();
         // What was missing may have come since: it is looked at again.
         const bool isShorter =
             std::erase_if(record_.entries, [](const RecordEntry& entry) { return entry.isLeftAlone(); }) != 0;
-        const bool hasAgents = plan_.empty() || failures_.note(findAgents(agents_));
+        const bool hasAgents = plan_.empty() || note(findAgents(agents_));
         known_ = agents_;
         giveBack(begin + returningBound, isShorter);
         if (hasAgents && !plan_.empty() && takeSnapshots()) {
@@ -108,7 +135,24 @@ class Run {
         }
     }
 
-  private:
+    // Keeps the first failure, and logs every one.
+    bool note(const Outcome& outcome, const std::string& interface = {}) {
+        if (!outcome.ok()) {
+            logFor(LogLevel::error, interface, outcome.reason());
+            if (first_.ok()) {
+                first_ = outcome;
+            }
+        }
+        return outcome.ok();
+    }
+    bool note(const Task& task) {
+        const std::string& interface = task.before->interface;
+        if (task.refusal.ok() && !task.trouble.empty()) {
+            logFor(LogLevel::warning, interface, task.trouble);
+        }
+        return note(task.refusal, interface);
+    }
+
     // One agent of a name for the whole run.
     Outcome agentOf(const std::string& name, std::shared_ptr<Agent>& agent) {
         const auto known = std::ranges::find(known_, name, [](const auto& one) { return one->name(); });
@@ -157,7 +201,7 @@ class Run {
             isChanged = true;
             entry.completed = false;
             std::shared_ptr<Agent> agent;
-            if (failures_.note(agentOf(entry.agent, agent), interface)) {
+            if (note(agentOf(entry.agent, agent), interface)) {
                 crew.add(agent, {&entry.snapshot, nullptr, {}, {}});
             }
         }
@@ -165,7 +209,7 @@ class Run {
             return;
         }
         if (!changing.empty()) {
-            failures_.note(writeRecord(record_));
+            note(writeRecord(record_));
         }
         crew.run(deadline);
         std::vector<std::string> given;
@@ -177,15 +221,7 @@ class Run {
         std::erase_if(record_.entries, [&given](const RecordEntry& entry) {
             return std::ranges::count(given, entry.snapshot.interface) != 0;
         });
-        failures_.note(writeRecord(record_));
-    }
-
-    bool note(const Task& task) {
-        const std::string& interface = task.before->interface;
-        if (task.refusal.ok() && !task.trouble.empty()) {
-            logFor(LogLevel::warning, interface, task.trouble);
-        }
-        return failures_.note(task.refusal, interface);
+        note(writeRecord(record_));
     }
 
     // Puts on the disk how the interfaces are that are new to the record, and what all of them are to become.
@@ -203,7 +239,7 @@ class Run {
             if (names.empty() || !isWhole) {
                 break;
             }
-            isWhole = failures_.note(agent->takeSnapshots(names, snapshots, leftAlone));
+            isWhole = note(agent->takeSnapshots(names, snapshots, leftAlone));
             for (Snapshot& one : snapshots) {
                 std::erase(names, one.interface);
                 record_.entries.push_back({std::string(agent->name()), std::move(one), {}, false});
@@ -228,7 +264,7 @@ class Run {
                 entry->completed = entry->isLeftAlone();
             }
         }
-        return failures_.note(writeRecord(record_));
+        return note(writeRecord(record_));
     }
 
     void leaveAlone(const std::string& interface, const std::string& reason) {
@@ -246,8 +282,7 @@ class Run {
         for (const InterfacePlan& plan : plan_) {
             const RecordEntry* const entry = record_.find(plan.name);
             std::shared_ptr<Agent> agent;
-            if (entry != nullptr && !entry->isLeftAlone() &&
-                failures_.note(agentOf(entry->agent, agent), plan.name)) {
+            if (entry != nullptr && !entry->isLeftAlone() && note(agentOf(entry->agent, agent), plan.name)) {
                 crew.add(agent, {&entry->snapshot, &plan, {}, {}});
             }
         }
@@ -259,72 +294,24 @@ class Run {
             entry.completed = task.refusal.ok();
         });
         if (isChanged) {
-            failures_.note(writeRecord(record_));
+            note(writeRecord(record_));
         }
     }
 
-    const Plan& plan_;
-    Record& record_;
-    Failures& failures_;
-    bool activates_;  // false: it finishes what was activated before
-    Agents agents_;   // that may lead interfaces now
-    Agents known_;    // and those of the record
+    const std::optional<std::string> location_;
+    std::vector<Trouble> troubles_;
+    const Plan plan_;
+    const bool activates_;  // false: it finishes what was activated before
+    Record record_;
+    Outcome first_;
+    Agents agents_;  // that may lead interfaces now
+    Agents known_;   // and those of the record
 };
-
-// Whether this process may try once more to make this location so.
-bool mayRetry(const std::optional<std::string>& location) {
-    static std::optional<std::string> tried;
-    static int tries = 0;
-    if (tried != location) {
-        tried = location;
-        tries = 0;
-    }
-    return tries++ < mostRetries;
-}
-
-bool isActivation(CFDictionaryRef root, CFDictionaryRef replaced, const Plan& plan) {
-    if (replaced == nullptr) {
-        return false;
-    }
-    std::vector<Trouble> ignored;
-    return CFEqual(replaced, root) != 0 ||
-           textIn(replaced, CFSTR("CurrentSet")) != textIn(root, CFSTR("CurrentSet")) ||
-           makePlan(replaced, ignored) != plan;
-}
 
 }  // namespace
 
 Outcome applyTree(CFDictionaryRef root, CFDictionaryRef replaced) {
-    Failures failures;
-    std::vector<Trouble> troubles;
-    const Plan plan = makePlan(root, troubles);
-    const bool activates = isActivation(root, replaced, plan);
-    const auto outcome = [&failures, activates] { return activates ? failures.first() : Outcome(); };
-
-    for (const Trouble& trouble : troubles) {
-        if (activates) {
-            logFor(LogLevel::warning, trouble.interface, trouble.reason);
-        }
-    }
-    // Without the lock: the file is replaced as a whole, and a run that is under way has marked what it
-    // changes.
-    Record record;
-    if (!failures.note(readRecord(record))) {
-        return outcome();
-    }
-    if (record.entries.empty() ? !activates || plan.empty() : !activates && record.isOf(plan)) {
-        return {};
-    }
-    if (!activates && !mayRetry(textIn(root, CFSTR("CurrentSet")))) {
-        return {};
-    }
-    FileDescriptor lock;
-    if (failures.note(makeRuntimeDirectory()) &&
-        failures.note(takeFileLock(runtimePath("applied.lock"), lockBound, lock)) &&
-        failures.note(readRecord(record)) && (activates || !record.isOf(plan))) {
-        Run(plan, record, failures, activates).make();
-    }
-    return outcome();
+    return Run(root, replaced).make();
 }
 
 }  // namespace platform::apply

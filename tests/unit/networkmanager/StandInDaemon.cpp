@@ -102,10 +102,14 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
         readValue(call, profiles[added]);
         sd_bus_message_read(call, "u", &flags);
         changes.back() += (flags & 0x20U) != 0 ? " held back" : "";
+        changes.back() += (flags & 0x2U) != 0 ? "" : " on the disk";
         sd_bus_message_append(reply, "oa{sv}", added.c_str(), 0);
     } else if (member == "Update2") {
         profiles[path].clear();
         readValue(call, profiles[path]);
+        std::uint32_t flags = 0;
+        sd_bus_message_read(call, "u", &flags);
+        changes.back() += flags == 0x22U ? "" : " in another way";
         sd_bus_message_append(reply, "a{sv}", 0);
     } else if (member == "Delete") {
         profiles.erase(path);
