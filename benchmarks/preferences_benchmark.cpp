@@ -170,7 +170,7 @@ void readFile(benchmark::State& state) {
     const StoreFile file(store.directory());
     const UserTime user(state);
     for (auto _ : state) {
-        platform::preferences::remember(file, {});
+        platform::preferences::remember({});
         Snapshot snapshot;
         check(state, load(file, snapshot).ok());
     }

@@ -75,7 +75,7 @@ Outcome Session::write() {
     Outcome done = file_.replace(*content, known);
     if (done.ok()) {
         onDisk_ = {tree_.root(), std::move(known)};
-        remember(file_, onDisk_);
+        remember(onDisk_);
     } else if (known) {
         // In its place, but perhaps not durable: the next commit is not stale, and writes once more.
         onDisk_.file = std::move(known);

@@ -10,14 +10,9 @@
 namespace platform::preferences {
 namespace {
 
-struct Remembered {
-    std::string path;
-    Snapshot snapshot;
-};
-
 // One is enough: a process works on one store.
-Remembered& remembered() {
-    static Remembered last;
+Snapshot& remembered() {
+    static Snapshot last;
     return last;
 }
 
@@ -31,9 +26,8 @@ Outcome load(const StoreFile& file, Snapshot& snapshot) {
         snapshot.tree = makeFirstRunTree();
         return {};
     }
-    const Remembered& last = remembered();
-    if (last.path == file.path() && last.snapshot.isOf(now)) {
-        snapshot = last.snapshot;
+    if (remembered().isOf(now)) {
+        snapshot = remembered();
         return {};
     }
     std::string content;
@@ -42,12 +36,12 @@ Outcome load(const StoreFile& file, Snapshot& snapshot) {
     RETURN_IF_FAILED(values::parseDictionaryFile(file.path(), content, snapshot.tree));
     file.keepPrivate(known);
     snapshot.file = std::move(known);
-    remember(file, snapshot);
+    remember(snapshot);
     return {};
 }
 
-void remember(const StoreFile& file, const Snapshot& snapshot) {
-    remembered() = {file.path(), snapshot};
+void remember(const Snapshot& snapshot) {
+    remembered() = snapshot;
 }
 
 Outcome loadCommittedTree(values::Owned<CFDictionaryRef>& tree) {

@@ -24,7 +24,7 @@ struct Snapshot {
 // The store as it is now. An unchanged file costs one look at it; a changed one is read and parsed.
 Outcome load(const StoreFile& file, Snapshot& snapshot);
 // Notes what was just written, so that the next load need not read it.
-void remember(const StoreFile& file, const Snapshot& snapshot);
+void remember(const Snapshot& snapshot);
 
 // The tree of the host's preferences directory as it is on disk now, for who only reads it.
 Outcome loadCommittedTree(values::Owned<CFDictionaryRef>& tree);

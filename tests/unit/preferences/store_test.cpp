@@ -62,7 +62,7 @@ class Player : public StoreTest {
     std::string playOn(SessionRef& session, const std::string& verb, const std::string& path,
                        const std::string& value) {
         SCPreferencesRef const ref = session.get();
-        const auto key = text(path == "empty" ? "" : path);
+        const auto key = path == "nokey" ? Owned<CFStringRef>() : text(path == "empty" ? "" : path);
         Boolean done = 2;
         if (verb == "open") {
             session = open();
