@@ -273,7 +273,12 @@ class Scene {
     static constexpr int linkIndex = 7;
 
     std::string locate(const std::string& entities) {
-        const std::string reason = activate(makeTree({{"card0", entities}}).get());
+        // Behind "//" the second card's.
+        std::vector<Service> services{{"card0", entities.substr(0, entities.find("//"))}};
+        if (services[0].entries.size() < entities.size()) {
+            services.push_back({"card1", entities.substr(services[0].entries.size() + 2)});
+        }
+        const std::string reason = activate(makeTree(services).get());
         // A client that dies leaves its steps behind.
         shell(reason.empty() ? "while [ -e /run/offer ] || [ -e /run/taken ]; do sleep 0.02; done"
                              : "rm -f /run/taken");
