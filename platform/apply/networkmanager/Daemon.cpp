@@ -364,8 +364,8 @@ Outcome Daemon::scanFor(const Device& device, const std::string& network) {
     // Not every daemon below it can call out for a name.
     for (const Dictionary& options : {byName, Dictionary()}) {
         Message reply;
-        outcome =
-            bus_.call({device.path, wirelessInterface, "RequestScan", arguments(options), {}}, reply, &error);
+        const auto append = [&options](sd_bus_message* message) { return appendValue(message, options); };
+        outcome = bus_.call({device.path, wirelessInterface, "RequestScan", append, {}}, reply, &error);
         if (error.empty()) {
             return outcome;
         }

@@ -78,7 +78,7 @@ std::string joiningOf(const Inputs& inputs) {
     return showValue(wirelessSections(profile)) + reason;
 }
 
-TEST(Digest, IsThatOfTheAlgorithmsAuthors) {
+TEST(Profile, IsNamedByTheDigestOfTheAlgorithmsAuthors) {
     std::array<std::uint8_t, 16> key{};
     std::iota(key.begin(), key.end(), std::uint8_t{0});
     EXPECT_EQ(0xa129ca6149be45e5U,
