@@ -17,7 +17,7 @@ import unittest
 import urllib.request
 from pathlib import Path
 
-from machine import (CONNECTIONS, ENVIRONMENT, RESIDENT_LINE, RUNTIME, STORE, daemon_state, listen, nmcli, sh, sit_down,
+from machine import (CONNECTIONS, ENVIRONMENT, RESIDENT_LINE, RUNTIME, STORE, daemon_state, listen, nmcli, run, sh, sit_down,
                      start_tool, state, wait_until)
 
 HERE = Path(__file__).resolve().parent
@@ -30,85 +30,6 @@ NOBODY = 65534
 UPDATE = "--update" in sys.argv
 DAEMON = "--networkmanager" in sys.argv  # for the tests that can do without it
 FORBID_SKIPS = os.environ.get("LA_FORBID_SKIPS") == "1"
-
-# The second card of a kind gets the next number.
-PCI = {"eth": "0000:02:00.0", "wlan": "0000:03:00.0", "en": "0000:00:19.0"}
-DRIVER = {"eth": "e1000e", "wlan": "iwlwifi", "en": "e1000e"}
-
-NETWORK_MANAGER = """[main]
-plugins=keyfile
-dns=none
-auth-polkit=false
-no-auto-default=*
-"""
-PROFILE = """[connection]
-id={0}
-uuid={1}
-type=ethernet
-interface-name={2}
-[ipv4]
-method=manual
-{3}
-[ipv6]
-method=link-local
-"""
-PROFILES = {
-    "office": ("11111111-2222-4333-8444-555555555555", "eth0",
-               "address1=192.168.77.10/24,192.168.77.1\naddress2=192.168.77.11/24\nroute-metric=100"),
-    "lounge": ("66666666-7777-4888-9999-aaaaaaaaaaaa", "wlan0", "address1=10.20.0.7/16\nroute1=10.30.0.0/16,10.20.0.1\nroute-metric=600"),
-}
-
-PREPARE = """
-mount -t tmpfs -o mode=755 tmpfs /run
-mkdir -p {lab}/sys {lab}/made {lab}/bin {lab}/packages {lab}/etc/upper {lab}/etc/work {lab}/dev /run/netns
-mkdir -p {lab}/usr/bin
-mount -c --bind /proc/self/fd/{binaries} {lab}/bin
-cat >{lab}/usr/bin/xdg-open <<'END'
-#!/bin/sh
-echo "$(id -un) opens $*" >>/tmp/browser
-END
-chmod 755 {lab}/usr/bin/xdg-open
-usr=/usr etc=/etc
-if [ -d {packages}/usr ]; then
-    mount --bind {packages} {lab}/packages
-    usr={lab}/packages/usr:/usr etc={lab}/packages/etc:/etc
-fi
-mount -t overlay -o lowerdir={lab}/usr:$usr overlay /usr
-mount -t overlay -o lowerdir=$etc,upperdir={lab}/etc/upper,workdir={lab}/etc/work overlay /etc
-rm -f /etc/resolv.conf
-{{ cat /etc/passwd; echo '{resident}'; }} >{lab}/passwd
-mount --bind {lab}/passwd /etc/passwd
-[ -s /etc/machine-id ] || echo 0123456789abcdef0123456789abcdef >/etc/machine-id
-mkdir -p /etc/NetworkManager
-mount -t tmpfs -o mode=755 tmpfs /etc/NetworkManager
-mount -t tmpfs -o mode=755 tmpfs /var/lib
-mount -t tmpfs -o mode=1777 tmpfs /tmp
-
-mount -t tmpfs -o mode=755 tmpfs {lab}/dev
-cd {lab}/dev
-for node in null zero full random urandom tty; do
-    touch $node
-    mount --bind /dev/$node $node
-done
-mkdir pts shm
-mount --rbind /dev/pts pts
-mount -t tmpfs -o mode=1777 tmpfs shm
-ln -s pts/ptmx ptmx
-ln -s /proc/self/fd fd
-cd /
-mount --rbind {lab}/dev /dev
-
-mount -t sysfs -o ro sysfs {lab}/sys
-mount -t tmpfs -o mode=755 tmpfs {lab}/made
-mount --bind {lab}/made /sys
-mount -o remount,bind,ro /sys
-
-ip link set lo up
-ip netns add far
-ip -n far link set lo up
-for sysctl in default all; do echo 0 >/proc/sys/net/ipv6/conf/$sysctl/accept_dad; done
-"""
-
 
 def ip(arguments):
     return sh("ip " + arguments)
@@ -131,11 +52,10 @@ def enter():
     hidden = ("/tmp/", "/run/", "/var/lib/")
     kept = {path: os.open(path, os.O_PATH) for path in (PROJECT, BUILD, BINARY.parent) if str(path).startswith(hidden)}
     binaries = os.open(BINARY.parent, os.O_PATH)
-    sh(PREPARE.format(lab=LAB, binaries=binaries, resident=RESIDENT_LINE, packages=shlex.quote(str(PROJECT / ".lab/root"))),
-       pass_fds=[binaries], cwd="/")
+    run("sh", HERE / "laboratory/prepare", LAB, binaries, PROJECT / ".lab/root", RESIDENT_LINE, pass_fds=[binaries], cwd="/")
     for path, descriptor in kept.items():
         path.mkdir(parents=True, exist_ok=True)
-        sh(f"mount -c --bind /proc/self/fd/{descriptor} {shlex.quote(str(path))}", pass_fds=[descriptor])
+        run("mount", "-c", "--bind", f"/proc/self/fd/{descriptor}", path, pass_fds=[descriptor])
 
 
 def skip_all(reason):
@@ -192,7 +112,7 @@ class Lab:
                         f"--dhcp-leasefile={LAB}/leases", "--dhcp-authoritative", "--user=root",
                         f"--log-facility={LAB}/dhcp.log", far=True)
             wait_until(lambda: "DHCP, IP range" in self.file("dhcp.log"))
-        self._make_sysfs()
+        run("sh", HERE / "laboratory/make-sysfs", LAB, *cards)
         if daemon:
             self.start_bus()
             self.start_network_manager()
@@ -219,33 +139,6 @@ class Lab:
             rm -rf /etc/NetworkManager/* /run/NetworkManager /var/lib/NetworkManager
             find /tmp -xdev -mindepth 1 -not -type d -delete
         """)
-
-    def _make_sysfs(self):
-        lines = ["mkdir -p class/net class/tty bus/pci/devices bus/pci/drivers bus/pci/slots/3 devices/virtual/net",
-                 "echo 0000:02:00 >bus/pci/slots/3/address",
-                 f"ln -s {LAB}/sys/class/net/lo devices/virtual/net/lo",
-                 "ln -s ../../devices/virtual/net/lo class/net/lo"]
-        for card in self.cards:
-            kind = card.rstrip("0123456789")
-            pci, driver = PCI[kind][:-1] + card[-1], DRIVER[kind]
-            device, net = f"devices/pci0000:00/{pci}", f"devices/pci0000:00/{pci}/net/{card}"
-            lines += [
-                f"mkdir -p {net} bus/pci/drivers/{driver}",
-                f"for entry in {LAB}/sys/class/net/{card}/*; do ln -s $entry {net}/; done",
-                f"rm -f {net}/device {net}/subsystem {net}/uevent",
-                f"ln -s ../../../{pci} {net}/device",
-                f"ln -s ../../../../../class/net {net}/subsystem",
-                f"printf 'INTERFACE={card}\\nIFINDEX=%s\\n' $(cat {net}/ifindex) >{net}/uevent",
-                f"ln -s ../../../bus/pci {device}/subsystem",
-                f"ln -sfn ../../../bus/pci/drivers/{driver} {device}/driver",
-                f"ln -s ../../../devices/pci0000:00/{pci} bus/pci/devices/{pci}",
-                f"echo 0x8086 >{device}/vendor",
-                f"printf 'DRIVER={driver}\\nPCI_SLOT_NAME={pci}\\n' >{device}/uevent",
-                f"ln -s ../../devices/pci0000:00/{pci}/net/{card} class/net/{card}"]
-            if kind == "wlan":
-                lines += [f"mkdir -p {net}/wireless {device}/ieee80211/phy0",
-                          f"ln -s ../../ieee80211/phy0 {net}/phy80211", f"echo DEVTYPE=wlan >>{net}/uevent"]
-        sh("\n".join(lines), cwd=LAB / "made")
 
     def daemon(self, *command, far=False, **options):
         """Starts a process that ends with this laboratory, at the other end of the cables when far."""
@@ -274,11 +167,8 @@ class Lab:
 
     def start_network_manager(self):
         if not CONNECTIONS.exists():
-            CONNECTIONS.mkdir()
-            Path("/etc/NetworkManager/NetworkManager.conf").write_text(NETWORK_MANAGER)
-            for name, (uuid, card, lines) in PROFILES.items():
-                (CONNECTIONS / f"{name}.nmconnection").write_text(PROFILE.format(name, uuid, card, lines))
-                (CONNECTIONS / f"{name}.nmconnection").chmod(0o600)
+            run("cp", "-R", HERE / "laboratory/NetworkManager", "/etc")
+            sh(f"chmod 600 {CONNECTIONS}/*")
         log = (LAB / "networkmanager.log").open("ab")
         self.network_manager = self.daemon("NetworkManager", "--debug", stdout=log, stderr=log)
         wait_until(lambda: nmcli("-f DEVICE,STATE device").count(":connected\n") >= len({"eth0", "wlan0"} & set(self.cards)), 20)

@@ -19,12 +19,16 @@ ENVIRONMENT = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin"} | {
     key: value for key, value in os.environ.items() if key.endswith("SAN_OPTIONS")}
 
 
-def sh(script, **options):
-    """Runs a script and returns what it printed; an error tells what it printed on standard error."""
-    result = subprocess.run(["sh", "-ec", script], capture_output=True, text=True, check=False, **options)
+def run(*words, **options):
+    """Runs a command and returns what it printed; an error tells what it printed on standard error."""
+    result = subprocess.run([*map(str, words)], capture_output=True, text=True, check=False, **options)
     if result.returncode != 0:
-        raise RuntimeError(f"{script.strip()}: {result.stderr.strip() or result.returncode}")
+        raise RuntimeError(f"{shlex.join(map(str, words))}: {result.stderr.strip() or result.returncode}")
     return result.stdout
+
+
+def sh(script):
+    return run("sh", "-ec", script)
 
 
 def wait_until(condition, seconds=10, what="so", pause=0.01):

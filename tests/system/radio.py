@@ -59,45 +59,6 @@ READ = ("/bin", "/sbin", "/lib", "/lib64", "/etc/ld.so.cache", "/etc/nsswitch.co
 # What the emulator says of every hub that ends inside the machine, as ours shall, and the kernel's last words.
 NOISE = re.compile(r"hub 0 is not connected to host network$|\] sysrq: Power Off$|\] reboot: Power down$")
 
-INIT = """#!/bin/busybox sh
-/bin/busybox --install -s /bin
-mount -t proc proc /proc
-for module in {modules}; do insmod /modules/$module; done
-options=trans=virtio,version=9p2000.L,msize=512000
-mount -t 9p -o ro,cache=loose,$options files /host
-mount -t 9p -o ro,cache=loose,$options lab /lab
-mount -t tmpfs -o size=60%,mode=755 tmpfs /over
-mkdir /over/upper /over/work
-mount -t overlay -o lowerdir={lower},upperdir=/over/upper,workdir=/over/work overlay /new
-mkdir -p /new/host /new/report
-{extra}
-mount --move /host /new/host
-mount -t 9p -o $options report /new/report
-umount /proc
-exec switch_root /new {init}
-"""
-
-
-# A booted distribution plays the command in a unit of its own; nobody logs in on its console, and what the distribution
-# does every night (back up its package lists, say) is not done in the midst of a row.
-UNIT = """
-rm -f /new/etc/systemd/system/timers.target.wants/*
-cat >/new/etc/systemd/system/laboratory.service <<'END'
-[Unit]
-After=multi-user.target
-[Service]
-Type=oneshot
-ExecStart=/bin/sh /host{here}/radio/prepare
-StandardOutput=tty
-StandardError=tty
-TTYPath=/dev/ttyS0
-TimeoutStartSec=infinity
-END
-mkdir -p /new/etc/systemd/system/graphical.target.wants
-ln -s ../laboratory.service /new/etc/systemd/system/graphical.target.wants
-ln -sf /dev/null /new/etc/systemd/system/serial-getty@ttyS0.service
-"""
-
 
 def missing(distribution="host"):
     """What the machine needs and is not here, or nothing."""
@@ -126,9 +87,12 @@ def initial_root(folder, distribution, init):
             if path.name not in order:
                 order.append(path.name)
                 shutil.copy(path, root / "modules")
-    (root / "init").write_text(INIT.format(modules=" ".join(order), lower=LOWER[distribution], init=init,
-                                           extra=UNIT.format(here=HERE) if distribution == "debian" else ""))
+    settings = {"modules": " ".join(order), "lower": LOWER[distribution], "init": init, "here": HERE}
+    (root / "settings").write_text("".join(f"{key}={shlex.quote(str(value))}\n" for key, value in settings.items()))
+    shutil.copy(HERE / "radio/initial-init", root / "init")
     (root / "init").chmod(0o755)
+    if distribution == "debian":
+        shutil.copy(HERE / "radio/initial-debian", root / "extra")
     names = subprocess.run(["find", "."], cwd=root, check=True, capture_output=True).stdout
     archive = subprocess.run(["cpio", "-o", "-H", "newc", "-R", "0:0", "--quiet"], cwd=root, check=True, input=names,
                              capture_output=True).stdout

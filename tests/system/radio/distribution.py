@@ -14,7 +14,6 @@ from machine import RUNTIME, STORE, sh
 
 LEASE = "4m"
 AT_THE_PRINTER = 600  # seconds
-CONF = "ctrl_interface=/run/wpa_supplicant\n" + hosts.SUPPLICANT.split("\n", 1)[1]
 ALL = "NetworkManager wpa_supplicant wpa_supplicant@wlan0 systemd-networkd.socket systemd-networkd networking"
 
 
@@ -81,7 +80,7 @@ class Desktop(Debian, hosts.NetworkManager):
 class Networkd(Debian):
     units = "systemd-networkd wpa_supplicant@wlan0"
     files = {"/etc/systemd/network/20-wlan0.network": f"[Match]\nName={CARD}\n[Network]\nDHCP=ipv4\n",
-             "/etc/wpa_supplicant/wpa_supplicant-wlan0.conf": CONF}
+             "/etc/wpa_supplicant/wpa_supplicant-wlan0.conf": (hosts.ETC / "supplicant.conf").read_text()}
 
 
 class Ifupdown(Debian):

@@ -14,36 +14,10 @@ from pathlib import Path
 import air
 import machine
 from air import spawn, wait_until
-from machine import sh
+from machine import run, sh
 
 CARD = "wlan0"
-NETWORK_MANAGER = """[main]
-plugins=keyfile
-auth-polkit=false
-[device]
-wifi.backend={}
-wifi.scan-rand-mac-address=no
-"""
-HOME_PROFILE = f"""[connection]
-id={air.HOME}
-uuid=22222222-3333-4444-8555-666666666666
-type=wifi
-[wifi]
-ssid={air.HOME}
-[wifi-security]
-key-mgmt=wpa-psk
-psk={air.HOME_KEY}
-[ipv4]
-method=auto
-[ipv6]
-method=link-local
-"""
-SUPPLICANT = f"""ctrl_interface=/run/wpa_supplicant
-network={{
-    ssid="{air.HOME}"
-    psk="{air.HOME_KEY}"
-}}
-"""
+ETC = Path(__file__).resolve().parent / "etc"
 
 
 class Host:
@@ -157,10 +131,7 @@ class Supplicant(Host):
     wrong_key = "the network refused the key"
 
     def start(self):
-        path = Path("/etc/wpa_supplicant/lab.conf")
-        path.parent.mkdir(exist_ok=True)
-        path.write_text(SUPPLICANT)
-        self.daemons.append(spawn("wpa_supplicant", "-i", CARD, "-c", path, "-t", log="supplicant"))
+        self.daemons.append(spawn("wpa_supplicant", "-i", CARD, "-c", ETC / "supplicant.conf", "-t", log="supplicant"))
         sh(f"ip link set {CARD} up; ip addr add 192.168.50.20/24 brd + dev {CARD}; "
            f"ip route add default via {air.ADDRESS['home']} dev {CARD} metric 600")
 
@@ -187,10 +158,9 @@ class NetworkManager(Host):
 
     def start(self):
         sh("rm -rf /etc/NetworkManager/* /run/NetworkManager /var/lib/NetworkManager /run/dbus; mkdir /run/dbus")
-        machine.CONNECTIONS.mkdir()
-        Path("/etc/NetworkManager/NetworkManager.conf").write_text(NETWORK_MANAGER.format(self.backend))
-        (machine.CONNECTIONS / "home.nmconnection").write_text(HOME_PROFILE)
-        (machine.CONNECTIONS / "home.nmconnection").chmod(0o600)
+        run("install", "-D", "-m", "600", ETC / "home.nmconnection", "-t", machine.CONNECTIONS)
+        configuration = (ETC / "NetworkManager.conf").read_text()
+        Path("/etc/NetworkManager/NetworkManager.conf").write_text(f"{configuration}wifi.backend={self.backend}\n")
         # udev tells NetworkManager of devices and switches.
         self.daemons.append(spawn("/usr/lib/systemd/systemd-udevd", log="udev"))
         wait_until(Path("/run/udev/control").exists, 20, "udev")
