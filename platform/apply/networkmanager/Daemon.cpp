@@ -25,15 +25,15 @@ constexpr const char* propertiesInterface = "org.freedesktop.DBus.Properties";
 constexpr std::chrono::seconds startupBound{10};
 
 // Errors that are answers: the object is gone; there is none of that name; there is nothing to do.
-constexpr std::array<std::string_view, 3> gone = {SD_BUS_ERROR_UNKNOWN_OBJECT, SD_BUS_ERROR_UNKNOWN_METHOD,
-                                                  SD_BUS_ERROR_UNKNOWN_INTERFACE};
+constexpr std::array<std::string_view, 3> objectGone = {
+    SD_BUS_ERROR_UNKNOWN_OBJECT, SD_BUS_ERROR_UNKNOWN_METHOD, SD_BUS_ERROR_UNKNOWN_INTERFACE};
 constexpr std::array<std::string_view, 1> unknownDevice = {"org.freedesktop.NetworkManager.UnknownDevice"};
 constexpr std::array<std::string_view, 1> unknownProfile = {
     "org.freedesktop.NetworkManager.Settings.InvalidConnection"};
 constexpr std::array<std::string_view, 1> noSecrets = {
     "org.freedesktop.NetworkManager.AgentManager.NoSecrets"};
 constexpr std::array<std::string_view, 4> atRest = {"org.freedesktop.NetworkManager.Device.NotActive",
-                                                    gone[0], gone[1], gone[2]};
+                                                    objectGone[0], objectGone[1], objectGone[2]};
 
 constexpr std::uint32_t typeEthernet = 1;
 constexpr std::uint32_t typeWireless = 2;
@@ -140,7 +140,7 @@ Outcome Daemon::readObject(const std::string& path, const char* interface,
                            std::optional<Dictionary>& properties) {
     std::string error;
     Outcome outcome = bus_.readProperties(path, interface, properties.emplace(), &error);
-    if (std::ranges::find(gone, error) != gone.end()) {
+    if (std::ranges::find(objectGone, error) != objectGone.end()) {
         properties.reset();
         return {};
     }
@@ -215,7 +215,7 @@ Outcome Daemon::findProfile(const std::string& uuid, std::optional<Profile>& pro
         return {};
     }
     Message reply;
-    RETURN_IF_FAILED(call(path, profileInterface, "GetSettings", {}, reply, gone));
+    RETURN_IF_FAILED(call(path, profileInterface, "GetSettings", {}, reply, objectGone));
     if (reply != nullptr) {
         profile.emplace().path = path;
         return readReply("GetSettings", reply, profile->sections);
@@ -263,7 +263,7 @@ Outcome Daemon::updateProfile(const std::string& path, const Sections& sections,
 
 Outcome Daemon::deleteProfile(const std::string& path) {
     Message reply;
-    return call(path, profileInterface, "Delete", {}, reply, gone);
+    return call(path, profileInterface, "Delete", {}, reply, objectGone);
 }
 
 Outcome Daemon::activate(const std::string& profile, const Device& device, std::string& active) {
