@@ -207,18 +207,19 @@ TEST_F(DirectAgentTest, LooksAtTheMachineAgain) {
                 EXPECT_EQ(made == machineState(), isAgain);
                 EXPECT_TRUE(isAgain || kept().empty());
                 return shell("ip -br link show up dev card1 | cut -d' ' -f1") + addressesOf("card0") +
-                       defaultRoutes();
+                       defaultRoutes() + takeLog();
             });
         });
     }
 }
 
-// A DHCP client that does what the test writes into /run/offer, once each; $hook is the program that it
-// calls.
+// A DHCP client that does what the test writes into /run/begin at its start and into /run/offer, once each;
+// $hook is the program that it calls.
 const char* const client = R"(#!/bin/sh
 echo "$*" >/run/arguments
 hook=$7
 trap '"$hook" deconfig; exit' TERM
+[ ! -e /run/begin ] || . /run/begin
 while :; do
     if mv /run/offer /run/taken 2>/dev/null; then . /run/taken; rm /run/taken; fi
     sleep 0.02
