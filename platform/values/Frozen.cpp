@@ -50,6 +50,7 @@ Owned<CFTypeRef> copyOf(const Object& value, Copying, int) {
 }
 
 Owned<CFTypeRef> copyDeep(CFTypeRef value, Copying how, int depth) {
+    // NOLINTNEXTLINE(clang-analyzer-cplusplus.NewDeleteLeaks): it is owned
     return visit(value, [&](const auto& each) { return copyOf(each, how, depth); });
 }
 
