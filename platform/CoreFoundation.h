@@ -129,8 +129,8 @@ CFStringRef CFStringCreateWithBytes(CFAllocatorRef allocator, const UInt8* bytes
 // Null when the units hold an unpaired surrogate.
 CFStringRef CFStringCreateWithCharacters(CFAllocatorRef allocator, const UniChar* characters,
                                          CFIndex count) LA_NOEXCEPT;
-// %d and %i stand for an int, %ld for a long, %@ for a value (its CFCopyDescription, but a string as it
-// stands; a null one gives "(null)"), %% for itself. Null for every other conversion. formatOptions is null.
+// printf's conversions %d %i %u %ld %lu %s %c %x %% with flags, width and precision, and %@ for a value (its
+// CFCopyDescription; a null one gives "(null)"). formatOptions is null. Null when the result is not text.
 CFStringRef CFStringCreateWithFormat(CFAllocatorRef allocator, CFDictionaryRef formatOptions,
                                      CFStringRef format, ...) LA_NOEXCEPT;
 CFStringRef CFStringCreateCopy(CFAllocatorRef allocator, CFStringRef string) LA_NOEXCEPT;
@@ -186,27 +186,33 @@ void CFStringLowercase(CFMutableStringRef string, const void* locale) LA_NOEXCEP
 #endif
 CFStringRef CFStringMakeConstant(const char* text) LA_NOEXCEPT;
 
-// --- Numbers, booleans, data ---
+// --- Numbers, booleans, data, dates ---
 
 typedef CFIndex CFNumberType;
 LA_CONSTANT(CFNumberType, kCFNumberSInt32Type, 3);
+LA_CONSTANT(CFNumberType, kCFNumberSInt64Type, 4);
 // The system's long integer: 32 bits, signed, whatever the machine's own long is.
 LA_CONSTANT(CFNumberType, kCFNumberLongType, kCFNumberSInt32Type);
 
 CFTypeID CFNumberGetTypeID(void) LA_NOEXCEPT;
-// Both types are of 32 bits.
 CFNumberRef CFNumberCreate(CFAllocatorRef allocator, CFNumberType type, const void* value) LA_NOEXCEPT;
 // False when the number cannot be given in the type without loss; the value is then the nearest one of the
 // type on the way to zero.
 Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value) LA_NOEXCEPT;
+// True for a number that holds a real.
+Boolean CFNumberIsFloatType(CFNumberRef number) LA_NOEXCEPT;
 
 extern const CFBooleanRef kCFBooleanTrue;
 extern const CFBooleanRef kCFBooleanFalse;
+CFTypeID CFBooleanGetTypeID(void) LA_NOEXCEPT;
+Boolean CFBooleanGetValue(CFBooleanRef boolean) LA_NOEXCEPT;
 
 CFTypeID CFDataGetTypeID(void) LA_NOEXCEPT;
 CFDataRef CFDataCreate(CFAllocatorRef allocator, const UInt8* bytes, CFIndex length) LA_NOEXCEPT;
 CFIndex CFDataGetLength(CFDataRef data) LA_NOEXCEPT;
 const UInt8* CFDataGetBytePtr(CFDataRef data) LA_NOEXCEPT;
+
+CFTypeID CFDateGetTypeID(void) LA_NOEXCEPT;
 
 // --- Dictionaries and arrays ---
 
@@ -274,17 +280,20 @@ CFIndex CFArrayBSearchValues(CFArrayRef array, CFRange range, const void* value,
                              CFComparatorFunction comparator, void* context) LA_NOEXCEPT;
 
 typedef CFOptionFlags CFPropertyListMutabilityOptions;
+LA_CONSTANT(CFPropertyListMutabilityOptions, kCFPropertyListImmutable, 0);
 LA_CONSTANT(CFPropertyListMutabilityOptions, kCFPropertyListMutableContainersAndLeaves, 2);
-// A copy of the whole value, every container and string in it mutable, which is the only option. Null when
-// the value is nested too deep or holds something that is not a property-list value.
+// A copy of the whole value, every container and leaf in it mutable (strings and containers) or immutable as
+// asked. Null when the value is nested too deep or holds something that is not a property-list value.
 CFPropertyListRef CFPropertyListCreateDeepCopy(CFAllocatorRef allocator, CFPropertyListRef value,
                                                CFPropertyListMutabilityOptions options) LA_NOEXCEPT;
 
 // --- URLs ---
 
+CFTypeID CFURLGetTypeID(void) LA_NOEXCEPT;
 // Null when the text is not a URL (RFC 3986: a scheme, and no character that would have to be escaped). base
 // is null.
 CFURLRef CFURLCreateWithString(CFAllocatorRef allocator, CFStringRef text, CFURLRef base) LA_NOEXCEPT;
+CFStringRef CFURLGetString(CFURLRef url) LA_NOEXCEPT;
 
 // --- Run loop ---
 
@@ -301,8 +310,10 @@ CFRunLoopRef CFRunLoopGetCurrent(void) LA_NOEXCEPT;
 // does nothing.
 void CFRunLoopAddSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) LA_NOEXCEPT;
 void CFRunLoopRemoveSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStringRef mode) LA_NOEXCEPT;
-// Runs the calling thread's loop until it is stopped or has no source left, for at most that many seconds (0:
-// what is ready now), or until one source was handled when asked so.
+// Runs the calling thread's loop until it is stopped or has no source left.
+void CFRunLoopRun(void) LA_NOEXCEPT;
+// The same for at most that many seconds (0: what is ready now), or until one source was handled when asked
+// so.
 SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds,
                           Boolean returnAfterSourceHandled) LA_NOEXCEPT;
 // Makes the innermost run of the loop that is under way return; it does nothing to a loop that does not run.

@@ -95,9 +95,7 @@ bool FieldReader::decode(CFTypeRef value, Owned<CFDictionaryRef>& dictionary) {
 
 bool FieldReader::decodeNumber(CFTypeRef value, std::int64_t& number) {
     const auto found = as<CFNumberRef>(value);
-    const auto integer = found != nullptr ? integerOf(found) : std::nullopt;
-    number = integer.value_or(0);
-    return integer.has_value();
+    return found != nullptr && CFNumberGetValue(found, kCFNumberSInt64Type, &number) != 0;
 }
 
 bool FieldReader::decodeData(CFTypeRef value, std::span<std::byte> bytes) {

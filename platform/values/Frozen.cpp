@@ -96,6 +96,7 @@ void removeAtPath(Owned<CFDictionaryRef>& root, std::span<const Owned<CFStringRe
 using namespace platform::values;
 
 CFPropertyListRef CFPropertyListCreateDeepCopy(CFAllocatorRef, CFPropertyListRef value,
-                                               CFPropertyListMutabilityOptions) noexcept {
-    return copyDeep(value, Copying::allMutable, 0).take();
+                                               CFPropertyListMutabilityOptions options) noexcept {
+    return copyDeep(value, options == kCFPropertyListImmutable ? Copying::frozen : Copying::allMutable, 0)
+        .take();
 }

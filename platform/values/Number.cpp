@@ -16,6 +16,19 @@ namespace {
 constinit Immortal<OpaqueCFBoolean> trueValue(true);
 constinit Immortal<OpaqueCFBoolean> falseValue(false);
 
+// The nearest integer towards zero that the type holds, 0 for what is not a number; whether that is the very
+// value.
+bool integerFromReal(double real, std::int64_t& integer) {
+    constexpr double beyond = 9223372036854775808.0;
+    using Limits = std::numeric_limits<std::int64_t>;
+    if (!(real >= -beyond && real < beyond)) {
+        integer = std::isnan(real) ? 0 : real < 0 ? Limits::min() : Limits::max();
+        return false;
+    }
+    integer = static_cast<std::int64_t>(real);
+    return static_cast<double>(integer) == real;
+}
+
 }  // namespace
 
 const CFBooleanRef kCFBooleanTrue = &trueValue.value;
@@ -61,22 +74,43 @@ CFTypeID CFNumberGetTypeID() noexcept {
     return static_cast<CFTypeID>(Type::number);
 }
 
-CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType, const void* value) noexcept {
-    return makeNumber(*static_cast<const SInt32*>(value)).take();
+CFNumberRef CFNumberCreate(CFAllocatorRef, CFNumberType type, const void* value) noexcept {
+    switch (type) {
+        case kCFNumberSInt32Type:
+            return makeNumber(*static_cast<const SInt32*>(value)).take();
+        case kCFNumberSInt64Type:
+            return makeNumber(*static_cast<const std::int64_t*>(value)).take();
+        default:
+            return nullptr;
+    }
 }
 
-Boolean CFNumberGetValue(CFNumberRef number, CFNumberType, void* value) noexcept {
-    using Limits = std::numeric_limits<SInt32>;
-    auto& nearest = *static_cast<SInt32*>(value);
-    if (!number->isReal) {
-        nearest =
-            static_cast<SInt32>(std::clamp<std::int64_t>(number->integer, Limits::min(), Limits::max()));
-        return static_cast<Boolean>(nearest == number->integer);
+Boolean CFNumberGetValue(CFNumberRef number, CFNumberType type, void* value) noexcept {
+    std::int64_t integer = number->isReal ? 0 : number->integer;
+    const bool exact = !number->isReal || integerFromReal(number->real, integer);
+    if (type == kCFNumberSInt64Type) {
+        *static_cast<std::int64_t*>(value) = integer;
+        return static_cast<Boolean>(exact);
     }
-    nearest = std::isnan(number->real)
-                  ? 0
-                  : static_cast<SInt32>(std::clamp<double>(number->real, Limits::min(), Limits::max()));
-    return static_cast<Boolean>(nearest == number->real);
+    if (type != kCFNumberSInt32Type) {
+        return 0;
+    }
+    using Limits = std::numeric_limits<SInt32>;
+    const auto nearest = static_cast<SInt32>(std::clamp<std::int64_t>(integer, Limits::min(), Limits::max()));
+    *static_cast<SInt32*>(value) = nearest;
+    return static_cast<Boolean>(exact && nearest == integer);
+}
+
+Boolean CFNumberIsFloatType(CFNumberRef number) noexcept {
+    return static_cast<Boolean>(number->isReal);
+}
+
+CFTypeID CFBooleanGetTypeID() noexcept {
+    return static_cast<CFTypeID>(Type::boolean);
+}
+
+Boolean CFBooleanGetValue(CFBooleanRef boolean) noexcept {
+    return static_cast<Boolean>(boolean->value);
 }
 
 CFTypeID CFDataGetTypeID() noexcept {
@@ -95,4 +129,8 @@ CFIndex CFDataGetLength(CFDataRef data) noexcept {
 
 const UInt8* CFDataGetBytePtr(CFDataRef data) noexcept {
     return reinterpret_cast<const UInt8*>(data->bytes.data());
+}
+
+CFTypeID CFDateGetTypeID() noexcept {
+    return static_cast<CFTypeID>(Type::date);
 }

@@ -171,6 +171,10 @@ void CFRunLoopRemoveSource(CFRunLoopRef loop, CFRunLoopSourceRef source, CFStrin
     }
 }
 
+void CFRunLoopRun() noexcept {
+    (void)CFRunLoopRunInMode(kCFRunLoopDefaultMode, 1e9, false);
+}
+
 SInt32 CFRunLoopRunInMode(CFStringRef mode, CFTimeInterval seconds,
                           Boolean returnAfterSourceHandled) noexcept {
     if (!isDefaultMode(mode)) {

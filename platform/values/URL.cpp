@@ -28,9 +28,17 @@ bool isURL(const std::string& text) {
 
 }  // namespace
 
+CFTypeID CFURLGetTypeID() noexcept {
+    return static_cast<CFTypeID>(Type::url);
+}
+
 CFURLRef CFURLCreateWithString(CFAllocatorRef, CFStringRef text, CFURLRef) noexcept {
     if (!isURL(std::string(text->text()))) {
         return nullptr;
     }
     return new OpaqueCFURL(Owned<CFStringRef>::adopt(CFStringCreateCopy(nullptr, text)));
+}
+
+CFStringRef CFURLGetString(CFURLRef url) noexcept {
+    return url->text.get();
 }

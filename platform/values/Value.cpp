@@ -19,13 +19,9 @@ const Object& objectOf(CFTypeRef value) {
 
 // The integer that a number is equal to.
 std::optional<std::int64_t> integerIn(const OpaqueCFNumber& number) {
-    if (!number.isReal) {
-        return number.integer;
-    }
-    constexpr double beyond = 9223372036854775808.0;
-    const bool isInteger =
-        number.real >= -beyond && number.real < beyond && std::trunc(number.real) == number.real;
-    return isInteger ? std::optional(static_cast<std::int64_t>(number.real)) : std::nullopt;
+    std::int64_t integer = 0;
+    const bool isInteger = CFNumberGetValue(&number, kCFNumberSInt64Type, &integer) != 0;
+    return isInteger ? std::optional(integer) : std::nullopt;
 }
 
 using Pairs = std::vector<std::pair<CFTypeRef, CFTypeRef>>;

@@ -68,10 +68,12 @@ std::string decodingOf(const Inputs& inputs) {
 
 std::string numberIn(const Inputs& inputs) {
     const auto value = parsed(inputs[0]);
-    const auto number = as<CFNumberRef>(value.get());
     SInt32 as32 = 99;
-    const bool fits = CFNumberGetValue(number, kCFNumberLongType, &as32) != 0;
-    return std::to_string(as32) + (fits ? "" : " lossy") + (integerOf(number) ? "" : ", a real");
+    std::int64_t as64 = 99;
+    const bool fits32 = CFNumberGetValue(as<CFNumberRef>(value.get()), kCFNumberLongType, &as32) != 0;
+    const bool fits64 = CFNumberGetValue(as<CFNumberRef>(value.get()), kCFNumberSInt64Type, &as64) != 0;
+    return std::to_string(as32) + (fits32 ? ", " : " lossy, ") + std::to_string(as64) +
+           (fits64 ? "" : " lossy");
 }
 
 // Equal values are the same key.
@@ -117,7 +119,7 @@ TEST(Values, DoWhatTheirTablesSay) {
         return readingOf("<plist version=\"1.0\">" + inputs[0] + "</plist>");
     });
     transcript.replay("bytes", decodingOf);
-    transcript.replay("numbers in 32 bits", numberIn);
+    transcript.replay("numbers in 32 and 64 bits", numberIn);
     transcript.replay("equality", equalityOf);
     transcript.replay("comparison", comparisonOf);
     transcript.replay("edits", editOf);
@@ -143,10 +145,12 @@ TEST(Values, AreFormatted) {
     const auto own = [](CFStringRef string) {
         return descriptionOf(Owned<CFStringRef>::adopt(string).get());
     };
-    EXPECT_EQ(own(CFStringCreateWithFormat(nullptr, nullptr, CFSTR("%@|%@|%d%i|%ld|100%%|%@"),
-                                           CFSTR("\xC3\xA4\n"), nullptr, -1, 7, -(1L << 40), kCFBooleanTrue)),
-              "\xC3\xA4 |(null)|-17|-1099511627776|100%|true");
-    for (const CFStringRef format : {CFSTR("%n"), CFSTR("%5d"), CFSTR("%l"), CFSTR("%lu"), CFSTR("50%")}) {
+    EXPECT_EQ(own(CFStringCreateWithFormat(
+                  nullptr, nullptr, CFSTR("%@|%@|%d %5.3i|%-4u|%ld|%lu|%.2s|%c|%#x|%05d|100%%"),
+                  CFSTR("\xC3\xA4"), nullptr, -1, 7, 8U, -(1L << 40), 1UL << 40, "cut", 'c', 255U, -42)),
+              "\xC3\xA4|(null)|-1   007|8   |-1099511627776|1099511627776|cu|c|0xff|-0042|100%");
+    EXPECT_EQ(own(CFStringCreateWithFormat(nullptr, nullptr, CFSTR("%.1s"), "\xC3\xA4")), "(null)");
+    for (const CFStringRef format : {CFSTR("%n"), CFSTR("%*d"), CFSTR("%ls"), CFSTR("50%")}) {
         EXPECT_EQ(own(CFStringCreateWithFormat(nullptr, nullptr, format, 1, 2)), "(null)");
     }
 }
