@@ -34,6 +34,7 @@ bool arrangeDescriptors(int channel) {
 }
 
 [[noreturn]] void runChild(const std::function<void(int)>& work, int channel) {
+    // Whoever ends this run from its terminal does not mean this one.
     setsid();
     restoreSignals();
     try {
@@ -64,6 +65,7 @@ Outcome startDetached(const std::function<void(int channel)>& work, FileDescript
     }
     channel.reset(ends[0]);
     const FileDescriptor childsEnd(ends[1]);
+    // Twice: the system's first process sees to its end, and nobody here has to.
     const pid_t between = fork();
     if (between < 0) {
         return Outcome::fromErrno("cannot start a process");

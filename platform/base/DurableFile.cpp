@@ -81,6 +81,7 @@ Outcome replace(const std::string& path, std::string_view content, const FileOwn
     const std::string temporary = temporaryFor(path);
     Outcome done = writeTemporary(temporary, content, ownership, written);
     if (done.ok() && (!isStepAllowed("rename", path) || ::rename(temporary.c_str(), path.c_str()) != 0)) {
+        // Something is mounted upon the name, as containers do with /etc/resolv.conf.
         isMount = errno == EBUSY;
         done = Outcome::fromErrno("cannot replace " + path);
     }
@@ -98,6 +99,7 @@ bool isStepAllowed(const char* step, const std::string& path) {
 }
 
 FileDescriptor openFile(const std::string& path, int flags) {
+    // Neither through a link that somebody planted, nor waiting for the other end of a FIFO.
     return FileDescriptor(isStepAllowed("open", path)
                               ? ::open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600)
                               : -1);
@@ -171,6 +173,7 @@ Outcome replaceFileOrMount(const std::string& path, std::string_view content,
 }
 
 Outcome removeFile(const std::string& path) {
+    // With what a run that was ended left beside it.
     (void)unlinkFile(temporaryFor(path));
     if (!unlinkFile(path)) {
         return errno == ENOENT ? Outcome() : Outcome::fromErrno("cannot remove " + path);
@@ -179,6 +182,7 @@ Outcome removeFile(const std::string& path) {
 }
 
 Outcome syncDirectory(const std::string& path) {
+    // By its "." it is opened through a link as well, which openFile would refuse.
     const FileDescriptor directory = openFile(path + "/.", O_RDONLY | O_DIRECTORY);
     return directory.isOpen() ? sync(directory.get(), path)
                               : Outcome::fromErrno("cannot put " + path + " on the disk");

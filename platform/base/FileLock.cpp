@@ -13,6 +13,7 @@
 namespace platform {
 namespace {
 
+// The kernel's own waiting has no end that could be given in advance.
 constexpr std::chrono::milliseconds pauseBetweenTries{5};
 
 }  // namespace
@@ -27,6 +28,7 @@ Outcome takeFileLock(const std::string& path, std::chrono::milliseconds wait, Fi
     RETURN_IF_FAILED(checkRegular(status, path));
     RETURN_IF_FAILED(checkTrusted(status, path));
     const auto deadline = std::chrono::steady_clock::now() + wait;
+    // flock(2), not fcntl's locks: those would go as soon as this process closes any descriptor of the file.
     while (::flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
         if (errno != EWOULDBLOCK && errno != EINTR) {
             return Outcome::fromErrno("cannot lock " + path);

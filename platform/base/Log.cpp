@@ -49,6 +49,7 @@ void send(LogLevel level, const std::string& text) {
 }  // namespace
 
 void logLine(LogLevel level, std::string_view text) {
+    // RFC 3164 lets a daemon cut what is longer than 1,024 bytes, the time and the name included.
     constexpr std::size_t longest = 1000;
     std::string line(text.substr(0, longest));
     for (char& c : line) {

@@ -123,12 +123,14 @@ Outcome Bus::connect(const std::string& service, bool& owned) {
         result = sd_bus_set_bus_client(made, 1);
     }
     if (result >= 0) {
+        // Of the library's own calls: saying hello, and asking for signals.
         result = sd_bus_set_method_call_timeout(made, timeout());
     }
     if (result >= 0) {
         result = sd_bus_start(made);
     }
     if (result == -ENOENT) {
+        // No socket: a machine without a bus, which is no failure.
         bus_.reset();
         return {};
     }
@@ -173,9 +175,11 @@ Outcome Bus::call(const Call& call, Message& reply, std::string* errorName) {
                                                       call.interface.c_str(), call.member);
     const Message message(made);
     if (result >= 0) {
+        // A daemon that the user has stopped stays so.
         result = sd_bus_message_set_auto_start(made, 0);
     }
     if (result >= 0 && !call.secret.empty()) {
+        // The library wipes its copies of the message.
         result = sd_bus_message_sensitive(made);
     }
     if (result >= 0 && call.arguments) {
@@ -245,6 +249,7 @@ Outcome Bus::handleSignals(Clock::time_point until) {
     bool inTime = true;
     RETURN_IF_FAILED(process(until, inTime));
     int result = 0;
+    // All that has come, before anybody decides by a part of it.
     do {
         result = sd_bus_process(bus_.get(), nullptr);
     } while (result > 0);

@@ -66,8 +66,7 @@ inline int appendValue(sd_bus_message* message, const Path& path) {
 
 // Of text or a path, a Value, a Dictionary, Sections, Objects (a{oa{sa{sv}}}) or Texts (as or ao). Values of
 // other types than the ones above are left out. More than a hundred thousand elements in one container are an
-// error
-// (-EMSGSIZE).
+// error (-EMSGSIZE).
 template <class T>
 int readValue(sd_bus_message* message, T& value);
 

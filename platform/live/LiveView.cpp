@@ -87,6 +87,7 @@ std::vector<LiveView::Service> LiveView::services() const {
 }
 
 std::optional<std::string> LiveView::serviceNaming(const std::string& interface) const {
+    // Several may name it, with different settings: the first in the order is the one that counts.
     std::vector<std::string> found;
     for (const Service& service : services()) {
         const auto name = valueIn<CFStringRef>(entityIn(service.content, "Interface"), CFSTR("DeviceName"));

@@ -14,7 +14,9 @@ namespace {
 
 // The largest datagram that the kernel makes for a dump.
 constexpr std::size_t largestDatagram = std::size_t{64} << 10U;
+// The kernel says of a list that something changed while it was made.
 constexpr int dumpTries = 5;
+// Notices that come faster than they are read do not keep the reader for ever.
 constexpr int mostNotices = 1000;
 
 // An NLMSG_ERROR as an outcome: the errno, and the text that the kernel puts behind it when the socket asks
@@ -90,6 +92,7 @@ Outcome Socket::receive(Deadline deadline, Bytes& datagram) {
         if (ready == 0) {
             return {};
         }
+        // With MSG_TRUNC the size is that of the whole, also of what does not fit.
         datagram.resize(largestDatagram);
         sockaddr_nl sender{};
         socklen_t senderSize = sizeof sender;
@@ -102,6 +105,7 @@ Outcome Socket::receive(Deadline deadline, Bytes& datagram) {
         if (size > static_cast<ssize_t>(largestDatagram)) {
             return {kSCStatusFailed, "the kernel sent a netlink answer that is too large"};
         }
+        // From the kernel: other processes can send to this socket too.
         if (size > 0 && sender.nl_pid == 0) {
             datagram.resize(static_cast<std::size_t>(size));
             return {};
@@ -128,6 +132,7 @@ Outcome Socket::exchange(Message& message, std::vector<Message>& answers,
             return {kSCStatusFailed, "the kernel's netlink dump is too large"};
         }
         for (Message& part : messagesIn(datagram)) {
+            // The answer to a question that was given up.
             if (part.header().nlmsg_seq != sequence_) {
                 continue;
             }

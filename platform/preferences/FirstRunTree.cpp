@@ -6,6 +6,7 @@
 namespace platform::preferences {
 namespace {
 
+// The IDs are decimal numbers: whoever makes locations and services counts on from the largest one.
 constexpr std::string_view document = R"(<plist version="1.0"><dict>
     <key>CurrentSet</key><string>/Sets/0</string>
     <key>NetworkServices</key><dict><key>0</key><dict>

@@ -44,6 +44,8 @@ CFDictionaryRef dictionaryAt(SCPreferencesRef reference, CFStringRef path) {
     CFPropertyListRef value = nullptr;
     int status = session->tree().find(textOf(path), value);
     const auto dictionary = as<CFDictionaryRef>(value);
+    // There, but nothing that a path may end in: not taken for absent, or a caller would put something else
+    // in its place.
     if (status == kSCStatusOK && dictionary == nullptr) {
         status = kSCStatusFailed;
     }
@@ -55,6 +57,7 @@ CFDictionaryRef dictionaryAt(SCPreferencesRef reference, CFStringRef path) {
 
 SCPreferencesRef SCPreferencesCreate(CFAllocatorRef /*allocator*/, CFStringRef name,
                                      CFStringRef prefsID) noexcept {
+    // An ID would name another store than the one that there is.
     if (as<CFStringRef>(name) == nullptr || prefsID != nullptr) {
         setStatus(kSCStatusInvalidArgument);
         return nullptr;

@@ -41,6 +41,8 @@ Outcome Session::checkFresh() const {
 }
 
 bool Session::isChanged() const {
+    // Most sessions only read, and then the two are one object. What was changed and changed back is no
+    // change either.
     return tree_.root().get() != onDisk_.tree.get() && CFEqual(tree_.root().get(), onDisk_.tree.get()) == 0;
 }
 
@@ -50,6 +52,7 @@ Outcome Session::lock(std::chrono::milliseconds wait) {
     }
     FileDescriptor lock;
     RETURN_IF_FAILED(file_.lock(wait, lock));
+    // Behind the lock: whoever held it until now may have committed.
     RETURN_IF_FAILED(checkFresh());
     lock_ = std::move(lock);
     return {};
@@ -68,6 +71,7 @@ Outcome Session::write() {
     if (!content) {
         return {kSCStatusFailed, "the tree holds a value that an XML property list cannot carry"};
     }
+    // Or no session could read it again.
     if (content->size() > largestPreferencesFile) {
         return {kSCStatusFailed, "the tree is larger than a preferences file may be"};
     }
@@ -91,6 +95,7 @@ Outcome Session::commit(std::chrono::milliseconds wait) {
 }
 
 Outcome Session::makeDurable(std::chrono::milliseconds wait) {
+    // Without a file the first-run tree is written as it is: from then on there is one.
     if (onDisk_.file && !isChanged()) {
         return checkFresh();
     }

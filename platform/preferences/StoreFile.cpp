@@ -12,6 +12,7 @@
 namespace platform::preferences {
 namespace {
 
+// Whoever commits puts a new file in place of this one; only an editor writes into it while it is read.
 constexpr int readTries = 3;
 
 std::int64_t nanoseconds(const timespec& time) {
@@ -53,6 +54,7 @@ StoreFile::StoreFile(std::string directory)
 
 Outcome StoreFile::checkDirectory() const {
     struct stat status {};
+    // Not through a link, whose owner would choose what is read.
     if (::lstat(directory_.c_str(), &status) != 0) {
         return Outcome::fromErrno("cannot look at " + directory_);
     }

@@ -78,6 +78,7 @@ int Tree::set(std::span<const values::Owned<CFStringRef>> keys, CFPropertyListRe
     if (!frozen || (keys.empty() && dictionary == nullptr)) {
         return kSCStatusInvalidArgument;
     }
+    // What is missing on the way is made; what is no dictionary is not written over.
     CFPropertyListRef present = nullptr;
     if (follow(root_.get(), keys, present) == kSCStatusFailed) {
         return kSCStatusFailed;
