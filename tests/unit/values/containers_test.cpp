@@ -27,6 +27,11 @@ TEST(Dictionary, KeepsOrderReferencesAndAnyKey) {
     EXPECT_EQ(text(CFDictionaryGetValue(dictionary.get(), makeReal(1).get())), "number");
     EXPECT_EQ(text(dictionary.get()), "{b = replaced in place; a = first; 1 = number}");
     CFDictionarySetValue(dictionary.get(), CFSTR("held"), value.get());
+    {
+        const auto copy =
+            Owned<CFDictionaryRef>::adopt(CFDictionaryCreateMutableCopy(nullptr, 0, dictionary.get()));
+        EXPECT_EQ(CFGetRetainCount(value.get()), 5) << "as a key and as a value of each";
+    }
     CFDictionaryRemoveValue(dictionary.get(), CFSTR("held"));
     CFDictionaryRemoveValue(dictionary.get(), value.get());
     EXPECT_EQ(CFGetRetainCount(value.get()), 1);

@@ -65,6 +65,9 @@ TEST(Frozen, DeepMutableCopyIsApartThroughout) {
                     CFSTR("changed"));
     CFDictionaryRemoveValue(sets, CFSTR("1"));
     EXPECT_EQ(show(copy.get()), "{Sets = {0 = {Name = changed}}; CurrentSet = /Sets/0}");
+    const auto kept = Owned<CFTypeRef>::adopt(
+        CFPropertyListCreateDeepCopy(nullptr, original.get(), kCFPropertyListImmutable));
+    EXPECT_EQ(kept.get(), original.get()) << "what cannot change needs no second one";
     EXPECT_EQ(show(original.get()), tree);
 }
 
