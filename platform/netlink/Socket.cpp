@@ -19,27 +19,6 @@ constexpr int dumpTries = 5;
 // Notices that come faster than they are read do not keep the reader for ever.
 constexpr int mostNotices = 1000;
 
-// An NLMSG_ERROR as an outcome: the errno, and the text that the kernel puts behind it when the socket asks
-// for it.
-Outcome outcomeOfError(const Message& message, std::initializer_list<int> tolerated, int& code) {
-    const auto error = message.family<nlmsgerr>();
-    if (!error) {
-        return {kSCStatusFailed, "the kernel sent a short netlink answer"};
-    }
-    code = -error->error;
-    if (code == 0 || std::ranges::count(tolerated, code) != 0) {
-        return {};
-    }
-    std::string what = "the kernel refused a netlink request";
-    // The request itself is not repeated before them: the socket asks for that too.
-    if ((message.header().nlmsg_flags & NLM_F_ACK_TLVS) != 0) {
-        if (const auto text = message.attributes<nlmsgerr>().find(NLMSGERR_ATTR_MSG)) {
-            what += " (" + std::string(text->text()) + ")";
-        }
-    }
-    return Outcome::fromErrno(what, code);
-}
-
 }  // namespace
 
 Outcome Socket::open(int protocol) {
@@ -113,16 +92,14 @@ Outcome Socket::receive(Deadline deadline, Bytes& datagram) {
     }
 }
 
-Outcome Socket::exchange(Message& message, std::vector<Message>& answers,
-                         std::initializer_list<int> tolerated, bool& isInterrupted) {
-    answers.clear();
-    isInterrupted = false;
+Outcome Socket::exchange(Message& message, Answers& answers) {
+    answers.sequence = ++sequence_;
+    message.setSequence(sequence_);
     error_ = 0;
-    message.setSequence(++sequence_);
     RETURN_IF_FAILED(send(message));
     const auto deadline = std::chrono::steady_clock::now() + answerTime;
     std::size_t total = 0;
-    for (Bytes datagram;;) {
+    for (Bytes datagram; !answers.end;) {
         RETURN_IF_FAILED(receive(deadline, datagram));
         if (datagram.empty()) {
             return {kSCStatusFailed, "the kernel did not answer a netlink request"};
@@ -131,24 +108,10 @@ Outcome Socket::exchange(Message& message, std::vector<Message>& answers,
         if (total > largestDump) {
             return {kSCStatusFailed, "the kernel's netlink dump is too large"};
         }
-        for (Message& part : messagesIn(datagram)) {
-            // The answer to a question that was given up.
-            if (part.header().nlmsg_seq != sequence_) {
-                continue;
-            }
-            isInterrupted = isInterrupted || (part.header().nlmsg_flags & NLM_F_DUMP_INTR) != 0;
-            if (part.type() == NLMSG_ERROR) {
-                return outcomeOfError(part, tolerated, error_);
-            }
-            if (part.type() == NLMSG_DONE) {
-                error_ = std::max(-part.family<std::int32_t>().value_or(0), 0);
-                return error_ == 0 || std::ranges::count(tolerated, error_) != 0
-                           ? Outcome()
-                           : Outcome::fromErrno("the kernel ended a netlink dump", error_);
-            }
-            answers.push_back(std::move(part));
-        }
+        answers.take(datagram);
     }
+    error_ = answers.error;
+    return *answers.end;
 }
 
 Outcome Socket::request(Message message, std::initializer_list<int> tolerated) {
@@ -158,19 +121,22 @@ Outcome Socket::request(Message message, std::initializer_list<int> tolerated) {
 
 Outcome Socket::ask(Message message, Message& answer, std::initializer_list<int> tolerated) {
     answer = {};
-    std::vector<Message> answers;
-    bool isInterrupted = false;
-    RETURN_IF_FAILED(exchange(message, answers, tolerated, isInterrupted));
-    if (!answers.empty()) {
-        answer = std::move(answers.back());
+    Answers answers{.tolerated = tolerated};
+    RETURN_IF_FAILED(exchange(message, answers));
+    if (!answers.messages.empty()) {
+        answer = std::move(answers.messages.back());
     }
     return {};
 }
 
-Outcome Socket::dump(Message message, std::vector<Message>& answers, std::initializer_list<int> tolerated) {
+Outcome Socket::dump(Message message, std::vector<Message>& list, std::initializer_list<int> tolerated) {
     bool isInterrupted = true;
     for (int attempt = 0; attempt < dumpTries && isInterrupted; ++attempt) {
-        RETURN_IF_FAILED(exchange(message, answers, tolerated, isInterrupted));
+        Answers answers{.tolerated = tolerated};
+        const Outcome done = exchange(message, answers);
+        list = std::move(answers.messages);
+        RETURN_IF_FAILED(done);
+        isInterrupted = answers.isInterrupted;
     }
     // After that many tries the last list is as good as the kernel gives; a caller that acts on it compares
     // later.

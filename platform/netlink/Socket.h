@@ -10,6 +10,7 @@
 
 #include "platform/base/FileDescriptor.h"
 #include "platform/base/Outcome.h"
+#include "platform/netlink/Answers.h"
 #include "platform/netlink/Message.h"
 
 namespace platform::netlink {
@@ -40,7 +41,7 @@ class Socket {
     Outcome ask(Message message, Message& answer, std::initializer_list<int> tolerated = {});
     // Everything that a dump request lists; nothing after an error in `tolerated`, something or nothing on
     // failure. A dump that a change ran into is taken again, a few times.
-    Outcome dump(Message message, std::vector<Message>& answers, std::initializer_list<int> tolerated = {});
+    Outcome dump(Message message, std::vector<Message>& list, std::initializer_list<int> tolerated = {});
 
     // For a socket with groups: takes the notices that are there, without waiting. overrun: the kernel
     // dropped some, so what is known has to be looked up anew.
@@ -53,10 +54,8 @@ class Socket {
     Outcome send(const Message& message);
     // One datagram of the kernel's; empty when none has come by the deadline.
     Outcome receive(Deadline deadline, Bytes& datagram);
-    // Sends a request and takes the answers to it, up to the one that ends them. isInterrupted: a change ran
-    // into the dump.
-    Outcome exchange(Message& message, std::vector<Message>& answers, std::initializer_list<int> tolerated,
-                     bool& isInterrupted);
+    // Sends a request and takes the answers to it, up to the one that ends them.
+    Outcome exchange(Message& message, Answers& answers);
 
     FileDescriptor socket_;
     std::uint32_t sequence_ = 0;

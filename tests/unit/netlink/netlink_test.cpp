@@ -1,8 +1,12 @@
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 
+#include <array>
 #include <bit>
 #include <cerrno>
+#include <sstream>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "platform/netlink/Generic.h"
@@ -10,6 +14,7 @@
 #include "platform/netlink/Socket.h"
 #include "tests/unit/support/Hexadecimal.h"
 #include "tests/unit/support/PrivateNetwork.h"
+#include "tests/unit/support/Transcript.h"
 
 namespace platform::netlink {
 namespace {
@@ -21,56 +26,89 @@ using testing_support::toHex;
 static_assert(std::endian::native == std::endian::little,
               "the messages below were captured on such a machine");
 
-// inet 10.1.0.5/24 brd 10.1.0.255 scope global card0, index 3
-const std::string addressBody =
-    "0218800003000000080001000a010005080002000a010005080004000a0100ff0a0003006361726430000000080008008000000"
-    "0";
+using Inputs = testing_support::Transcript::Inputs;
 
-TEST(Message, LengthsThatLeaveItEndTheWalk) {
-    const auto size = static_cast<std::uint32_t>(sizeof(nlmsghdr) + addressBody.size() / 2);
-    const std::string whole = toHex(bytesOf(nlmsghdr{size, RTM_NEWADDR, 2, 7, 0})) + addressBody;
-    for (std::size_t length = 0; length < whole.size() / 2; ++length) {
-        EXPECT_TRUE(messagesIn(fromHex(whole.substr(0, length * 2))).empty()) << length;
-    }
-    const std::vector<Message> taken = messagesIn(fromHex(whole + whole));
-    ASSERT_EQ(2U, taken.size());
-    EXPECT_EQ("card0", taken[1].attributes<ifaddrmsg>().find(IFA_LABEL)->text());
-    EXPECT_EQ(addressBody, toHex(taken[1].payload()));
-    EXPECT_FALSE(taken[1].attributes<ifaddrmsg>().u32(IFA_LABEL)) << "six bytes";
-    const struct {
-        const char* attributes;
-        int count;
-    } rows[] = {
-        {"", 0},
-        {"0800", 0},
-        {"00000100", 0},                  // a length of nothing would never end
-        {"03000100", 0},                  // shorter than its own header
-        {"0400010004000200", 2},          // two without a value
-        {"05000100aa00000008000200", 1},  // the second one leaves the row
-        {"05000180aa", 1},                // flag bits in the type, no padding at the end
-    };
-    for (const auto& row : rows) {
-        const Bytes attributes = fromHex(row.attributes);
-        int count = 0;
-        for (const Attribute& attribute : Attributes(attributes)) {
-            EXPECT_EQ(attribute.type, ++count);
-            EXPECT_FALSE(attribute.as<std::uint32_t>());
+// "type flags sequence" and the payload's digits.
+std::string told(const Message& message) {
+    const nlmsghdr& header = message.header();
+    return std::to_string(header.nlmsg_type) + " " + std::to_string(header.nlmsg_flags) + " " +
+           std::to_string(header.nlmsg_seq) + " " + toHex(message.payload());
+}
+
+// A datagram of messages that are noted so, "; " between two of them; digits alone stand for themselves.
+Bytes datagramIn(const std::string& line) {
+    Bytes datagram;
+    std::istringstream messages(line);
+    for (std::string each; std::getline(messages, each, ';');) {
+        unsigned type = 0, flags = 0, sequence = 0;
+        std::array<char, 256> digits{};
+        Message message;
+        if (std::sscanf(each.c_str(), "%u %u %u %255s", &type, &flags, &sequence, digits.data()) >= 3) {
+            message = Message(static_cast<std::uint16_t>(type), static_cast<std::uint16_t>(flags),
+                              ByteView(fromHex(digits.data())));
+            message.setSequence(sequence);
+        } else {
+            message = Message(fromHex(each));
         }
-        EXPECT_EQ(row.count, count) << row.attributes;
+        std::ranges::copy(message.bytes(), std::back_inserter(datagram));
     }
-    // Next hops: one with a gateway over interface 3, one that leaves the row, one shorter than its header.
-    for (const char* const broken : {"0900000004000000", "0700000004000000", "08000000"}) {
-        Bytes hops = fromHex(std::string("1000000003000000080005000a010001") + broken);
-        std::vector<int> seen;
-        forEachHop(hops, [&seen](rtnexthop& hop, const Attributes& parts) {
-            EXPECT_EQ(0x0100010AU, parts.u32(RTA_GATEWAY));
-            seen.push_back(hop.rtnh_ifindex);
-            hop.rtnh_ifindex = 9;
-            return true;
-        });
-        EXPECT_EQ(std::vector<int>{3}, seen);
-        EXPECT_EQ(std::string("1000000009000000080005000a010001") + broken, toHex(hops));
+    return datagram;
+}
+
+// Behind a fixed part of three bytes and one of padding: their numbers, digits and texts.
+std::string attributesIn(const Inputs& lines) {
+    const Bytes bytes = fromHex(lines[0]);
+    const Attributes attributes = attributesBehind<std::array<char, 3>>(bytes);
+    std::string text;
+    for (const Attribute& each : attributes) {
+        const bool isFirst = attributes.find(each.type)->payload.data() == each.payload.data();
+        text += std::to_string(each.type) + "=" + toHex(each.payload) + " \"" +
+                testing_support::escaped(each.text()) + "\"" + (each.as<std::uint32_t>() ? " u32" : "") +
+                (isFirst ? ", " : " again, ");
     }
+    return text + "end";
+}
+
+// Next hops up to the first one that goes over interface 9; each is led over 7.
+std::string hopsIn(Bytes hops) {
+    std::string text;
+    forEachHop(hops, [&text](rtnexthop& hop, const Attributes& parts) {
+        text += std::to_string(hop.rtnh_ifindex) + " " + std::to_string(parts.u32(RTA_GATEWAY).value_or(0)) +
+                ", ";
+        return std::exchange(hop.rtnh_ifindex, 7) != 9;
+    });
+    return text + toHex(hops);
+}
+
+// To request 7, of which ENOENT is tolerated.
+std::string answersIn(const Inputs& datagrams) {
+    Answers answers{.sequence = 7, .tolerated = {ENOENT}};
+    std::string text;
+    for (const std::string& datagram : datagrams) {
+        answers.take(datagramIn(datagram));
+    }
+    for (const Message& message : answers.messages) {
+        text += told(message) + ", ";
+    }
+    return text + (answers.isInterrupted ? "interrupted, " : "") + "error " + std::to_string(answers.error) +
+           ", " +
+           (!answers.end        ? "goes on"
+            : answers.end->ok() ? "done"
+                                : answers.end->reason());
+}
+
+TEST(Netlink, TakesApartWhatItsTablesSay) {
+    testing_support::Transcript transcript("netlink");
+    transcript.replay("messages", [](const Inputs& lines) {
+        std::string text;
+        for (const Message& message : messagesIn(datagramIn(lines[0]))) {
+            text += (text.empty() ? "" : "; ") + told(message);
+        }
+        return text.empty() ? "none" : text;
+    });
+    transcript.replay("attributes", attributesIn);
+    transcript.replay("next hops", [](const Inputs& lines) { return hopsIn(fromHex(lines[0])); });
+    transcript.replay("answers", answersIn);
 }
 
 class SocketTest : public testing_support::PrivateNetworkTest {};
@@ -104,6 +142,11 @@ TEST_F(SocketTest, AsksDumpsExplainsAndTakesNotices) {
         ASSERT_TRUE(socket.joinGroup(RTNLGRP_IPV4_IFADDR).ok());
         EXPECT_TRUE(socket.takeNotices(overrun).empty());
         shell("ip addr add 10.0.0.1/8 dev lo; ip addr add 10.0.0.2/8 dev lo");
+        // Another process's word is none; the first socket of a process has its number.
+        const sockaddr_nl ours{AF_NETLINK, 0, static_cast<std::uint32_t>(getpid()), 0};
+        const FileDescriptor other(::socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC, NETLINK_ROUTE));
+        EXPECT_LT(0, ::sendto(other.get(), links[0].bytes().data(), links[0].bytes().size(), 0,
+                              reinterpret_cast<const sockaddr*>(&ours), sizeof ours));
         EXPECT_EQ(2U, socket.takeNotices(overrun).size());
         EXPECT_FALSE(overrun);
         shell("ip addr del 10.0.0.2/8 dev lo");
