@@ -93,7 +93,6 @@ void ChangeWatch::watchPreferences() {
 
 // Takes the sources of news out of the poll set instead of masking them: an overrun is reported all the same.
 void ChangeWatch::listen(bool on) {
-    isPausing_ = !on;
     for (const int source : {kernel_.get(), files_.get()}) {
         if (on) {
             (void)addTo(poll_.get(), source);
@@ -114,9 +113,6 @@ void ChangeWatch::pauseFor(std::chrono::milliseconds time) {
 bool ChangeWatch::take() {
     std::uint64_t expirations = 0;
     const bool isPauseOver = ::read(timer_.get(), &expirations, sizeof expirations) == sizeof expirations;
-    if (isPausing_ && !isPauseOver) {
-        return false;
-    }
     const bool kernelNews = drainKernel(kernel_.get());
     const bool fileNews = drainFiles(files_.get());
     if (fileNews) {

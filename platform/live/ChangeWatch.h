@@ -42,7 +42,6 @@ class ChangeWatch {
     FileDescriptor kernel_;
     FileDescriptor files_;
     std::string directory_;
-    bool isPausing_ = false;
 };
 
 }  // namespace platform::live

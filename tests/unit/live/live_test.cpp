@@ -65,7 +65,7 @@ class Scene {
         } else if (name == "commit") {
             const bool isTree = rest.starts_with('{');
             const std::string file = directory_.write(
-                "new.plist",
+                "elsewhere/new.plist",
                 isTree ? *platform::values::writePropertyListXML(testing_support::read(rest).get()) : rest);
             std::filesystem::create_directories(directory_.at("store"));
             std::filesystem::rename(file, directory_.at("store/preferences.plist"));
@@ -195,7 +195,10 @@ TEST(Live, TellsAndWatchesAStoreAndANetwork) {
 class KernelNetworkTest : public testing_support::PrivateNetworkTest {};
 
 TEST_F(KernelNetworkTest, FollowsTheKernel) {
-    testing_support::PrivateNetwork::run([] { playTranscript("live_kernel", nullptr); });
+    testing_support::PrivateNetwork::run([] {
+        EXPECT_EQ(unshare(CLONE_NEWNET), 0);
+        playTranscript("live_kernel", nullptr);
+    });
 }
 
 TEST(Live, TheContextLivesAsLongAsTheSession) {
