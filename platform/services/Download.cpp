@@ -193,7 +193,6 @@ class Transfer {
         set(result, CURLOPT_HTTP_VERSION, long{CURL_HTTP_VERSION_1_1});
         // The server is asked directly, whatever the environment says, and nowhere else than here.
         set(result, CURLOPT_PROXY, "");
-        set(result, CURLOPT_NOPROXY, "*");
         set(result, CURLOPT_FOLLOWLOCATION, 0L);
         set(result, CURLOPT_NETRC, long{CURL_NETRC_IGNORED});
         set(result, CURLOPT_NOSIGNAL, 1L);
