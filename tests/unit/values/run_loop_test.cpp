@@ -1,11 +1,9 @@
 #include <gtest/gtest.h>
 #include <poll.h>
-#include <signal.h>
 #include <sys/eventfd.h>
 #include <unistd.h>
 
-#include <chrono>
-#include <thread>
+#include <csignal>
 #include <vector>
 
 #include "platform/base/FileDescriptor.h"
@@ -59,7 +57,7 @@ TEST_F(RunLoop, ReturnsForEachOfItsReasons) {
     add(source);
     add(source);
     EXPECT_EQ(CFGetRetainCount(source.get()), 2);
-    EXPECT_EQ(runFor(0), kCFRunLoopRunTimedOut);
+    EXPECT_EQ(runFor(0, true), kCFRunLoopRunTimedOut);
     bell.send();
     bell.send();
     EXPECT_EQ(runFor(10, true), kCFRunLoopRunHandledSource);
@@ -119,19 +117,11 @@ TEST_F(RunLoop, StopsFromACallbackAndASignalHandler) {
         EXPECT_EQ(runFor(10), kCFRunLoopRunStopped);
         EXPECT_EQ(calls, stops);
     }
-    static CFRunLoopRef signalled;
-    signalled = loop;
-    struct sigaction action {};
-    struct sigaction previous {};
-    action.sa_handler = [](int) { CFRunLoopStop(signalled); };
-    ASSERT_EQ(::sigaction(SIGUSR1, &action, &previous), 0);
-    std::thread sender([thread = ::pthread_self()] {
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-        ::pthread_kill(thread, SIGUSR1);
-    });
+    static const CFRunLoopRef signalled = loop;
+    const auto previous = std::signal(SIGALRM, [](int) { CFRunLoopStop(signalled); });
+    ::ualarm(20'000, 0);
     EXPECT_EQ(runFor(10), kCFRunLoopRunStopped);
-    sender.join();
-    ::sigaction(SIGUSR1, &previous, nullptr);
+    std::signal(SIGALRM, previous);
     for (const auto& stopper : stoppers) {
         remove(stopper);
     }
