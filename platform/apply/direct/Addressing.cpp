@@ -154,15 +154,15 @@ std::optional<Route> decodeRoute(const Message& message, int index, const std::v
         (each == index ? isOurs : route.isShared) = true;
         each = each == index ? 0 : each;
     });
-    if (const auto source = attributes.find(RTA_PREFSRC); source != attributes.end() && !isOurs) {
-        // The kernel drops such a route together with the address.
-        isOurs = std::ranges::any_of(addresses, [&source](const Address& address) {
+    if (const auto source = attributes.find(RTA_PREFSRC); source != attributes.end()) {
+        // The kernel drops a route together with the address that it leaves from.
+        const bool isSourceOurs = std::ranges::any_of(addresses, [&source](const Address& address) {
             const auto local = netlink::attributesBehind<ifaddrmsg>(address.key).find(IFA_LOCAL);
             return local && std::ranges::equal(local->payload, source->second);
         });
-        route.isShared = route.isElsewhere = isOurs;
-    } else if (source != attributes.end() && header->rtm_family == AF_INET6) {
-        route.isShared = true;
+        route.isElsewhere = isSourceOurs && !isOurs;
+        route.isShared = route.isShared || isSourceOurs != isOurs || header->rtm_family == AF_INET6;
+        isOurs = isOurs || isSourceOurs;
     }
     if (!isOurs) {
         return std::nullopt;

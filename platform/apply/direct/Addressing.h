@@ -59,8 +59,8 @@ struct Route {
     netlink::Bytes key;     // rtmsg and attributes
     bool preceded = false;  // an equally good route to the same place stood before it
     bool isKernelManaged = false;
-    // It needs more than this interface: other ones, a next-hop object, a source address that the network has
-    // to confirm first.
+    // It needs more than this interface: other ones, a next-hop object, a source address of another interface
+    // or one that the network has to confirm first.
     bool isShared = false;
     std::int64_t endsAt = 0;   // in seconds since the machine's start, sleep included; 0 for never
     bool isElsewhere = false;  // it goes through another interface, but from one of this one's addresses

@@ -19,8 +19,8 @@ namespace platform::apply {
 class StandInSupplicant {
   public:
     // All of this is written before a command and read after its answer. By the first two words of a command
-    // its answer; else it is "OK".
-    std::map<std::string, std::string> answers{{"BSS FIRST", ""}, {"GET_NETWORK 0", "FAIL"}};
+    // its answer, nothing for one that does not come; else it is "OK".
+    std::map<std::string, std::string> answers{{"BSS FIRST", "\n"}, {"GET_NETWORK 0", "FAIL"}};
     std::string notice = "CTRL-EVENT-CONNECTED";  // what choosing a network comes to
     std::string heardLater;                       // what is on the air from then on
     int next = 0;                                 // the number of the network that is added next
@@ -71,7 +71,9 @@ class StandInSupplicant {
             };
             const std::string command(buffer, static_cast<std::size_t>(std::max<ssize_t>(length, 0)));
             send("<3>a notice at any time");
-            send(answer(command));
+            if (const std::string text = answer(command); !text.empty()) {
+                send(text);
+            }
             if (command.starts_with("SELECT_NETWORK")) {
                 send("<3>CTRL-EVENT-SCAN-RESULTS ");
                 send("<3>" + notice);
@@ -82,7 +84,8 @@ class StandInSupplicant {
     std::string answer(const std::string& command) {
         const std::string key =
             command.substr(0, command.find(' ', std::min(command.find(' '), command.size() - 1) + 1));
-        if (command.find("_NETWORK") != std::string::npos && command[0] != 'G' && command[0] != 'L') {
+        if (command == "SCAN" ||
+            (command.find("_NETWORK") != std::string::npos && command[0] != 'G' && command[0] != 'L')) {
             changes_.push_back(command);
         }
         if (command.starts_with("SELECT_NETWORK") && !heardLater.empty()) {

@@ -3,8 +3,9 @@
 
 #include <gtest/gtest.h>
 
-#include <sstream>
+#include <numeric>
 
+#include "platform/apply/Digest.h"
 #include "platform/apply/direct/Lease.h"
 #include "tests/unit/apply/Trees.h"
 #include "tests/unit/support/Transcript.h"
@@ -30,15 +31,17 @@ std::string describe(const std::vector<ManualAddress>& addresses, IPv4Address ro
     return text;
 }
 
-// Services, "device entries": what each interface is to be, and what is wrong with the location.
+// Services, "device entries", or a whole tree: what each interface is to be, and what is wrong with the
+// location.
 std::string planOf(const Inputs& inputs) {
     std::vector<Service> services;
     for (const std::string& each : inputs) {
         services.push_back(serviceOf(each));
     }
+    const auto tree = inputs[0][0] == '{' ? readTree(inputs[0]) : makeTree(services);
     std::vector<Trouble> troubles;
     std::string text;
-    for (const InterfacePlan& one : makePlan(makeTree(services).get(), troubles)) {
+    for (const InterfacePlan& one : makePlan(tree.get(), troubles)) {
         static constexpr const char* methods[] = {" none", " manual", " dhcp"};
         text += (text.empty() ? "" : ", ") + one.name;
         text +=
@@ -72,6 +75,14 @@ std::string leaseOf(const Inputs& inputs) {
                                        lease.nameService.domains) +
                               (lease.seconds == forever ? "" : " for " + std::to_string(lease.seconds))
                         : outcome.reason();
+}
+
+TEST(Digest, IsThatOfTheAlgorithmsAuthors) {
+    std::array<std::uint8_t, 16> key{};
+    std::string text(63, '\0');
+    std::iota(key.begin(), key.end(), std::uint8_t{0});
+    std::iota(text.begin(), text.end(), '\0');
+    EXPECT_EQ(0x958a324ceb064572U, sipHash(key, text));
 }
 
 TEST(Plan, TrustsNoStoreAndNoServer) {

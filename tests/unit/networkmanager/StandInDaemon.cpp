@@ -4,6 +4,8 @@
 #include <ctime>
 #include <utility>
 
+#include "tests/unit/networkmanager/Show.h"
+
 namespace testing_support {
 
 using namespace platform::apply;
@@ -52,6 +54,19 @@ void StandInDaemon::offer(const std::string& network, std::uint32_t mode, std::u
     (isQuiet ? quietPoints_ : points_).push_back(path);
 }
 
+void StandInDaemon::starts() {
+    objects[manager]["Startup"] = {true};
+    // Until it was asked twice how far it is.
+    service_.behind = [this, state = std::exchange(objects[card], {})] {
+        service_.behind = [this, state] {
+            objects[card] = state;
+            objects[manager]["Startup"] = {false};
+            service_.tell(manager, nullptr, "PropertiesChanged", "sa{sv}as", "org.freedesktop.NetworkManager",
+                          0, 0);
+        };
+    };
+}
+
 std::string StandInDaemon::answer(sd_bus_message* call, sd_bus_message* reply) {
     const std::string path = sd_bus_message_get_path(call);
     const std::string member = sd_bus_message_get_member(call);
@@ -77,7 +92,8 @@ std::string StandInDaemon::answer(sd_bus_message* call, sd_bus_message* reply) {
         }
         sd_bus_message_close_container(reply);
     } else {
-        return service_.refusal.empty() ? change(member, path, call, reply) : ".PermissionDenied";
+        const bool isRefused = !service_.refusal.empty() && service_.refused.empty();
+        return isRefused ? ".PermissionDenied" : change(member, path, call, reply);
     }
     return "";
 }
@@ -90,6 +106,9 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
         StandInService::readText(call);
         const std::string name = StandInService::readText(call);
         sd_bus_message_read(call, "v", "b", &flag);
+        if (name == service_.refused) {
+            return ".PermissionDenied";
+        }
         objects[path][name] = {flag != 0};
         changes.back() = name + (flag != 0 ? " on" : " off");
         if (name != "Autoconnect") {
@@ -124,7 +143,11 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
             return ".Device.NotActive";
         }
         leave(39);
-    } else if (member != "RequestScan") {
+    } else if (member == "RequestScan") {
+        Dictionary options;
+        readValue(call, options);
+        changes.back() += showValue(options);
+    } else {
         changes.pop_back();
         return SD_BUS_ERROR_UNKNOWN_METHOD;
     }
@@ -141,8 +164,9 @@ void StandInDaemon::activate(const std::string& profile, sd_bus_message* reply) 
     objects[card]["Autoconnect"] = {true};
     sd_bus_message_append(reply, "o", path.c_str());
     const bool isLooking = !quietPoints_.empty();
-    for (const std::string& point : std::exchange(quietPoints_, {})) {
-        points_.push_back(point);
+    if (isLooking) {
+        points_.push_back(quietPoints_.front());
+        quietPoints_.erase(quietPoints_.begin());
         objects[card]["LastScan"] = {std::int64_t{++next_}};
         service_.tell(card, ".Device.Wireless", "AccessPointAdded", "");
     }

@@ -20,15 +20,20 @@ class StandInDaemon {
     StandInDaemon& operator=(const StandInDaemon&) = delete;
 
     std::map<std::string, platform::apply::Sections> profiles;  // by path, with secrets
-    // A network on the air; one that keeps quiet is told of once a profile was activated, and joined when
-    // asked again.
+    // A network on the air; of those that keep quiet one is told of whenever a profile is activated, and the
+    // network is joined when it is asked for once more than that.
     void offer(const std::string& network, std::uint32_t mode, std::uint32_t privacy,
                std::uint32_t protection, bool isQuiet = false);
     // What the next requests meet. Set these between requests.
-    std::uint32_t failure = 0;                                       // the reason for which activations fail
-    bool hangs = false;                                              // activations get no address
-    sd_bus* forger = nullptr;                                        // somebody else, who says that they do
-    void refuse(const std::string& why) { service_.refusal = why; }  // to change anything
+    std::uint32_t failure = 0;  // the reason for which activations fail
+    bool hangs = false;         // activations get no address
+    sd_bus* forger = nullptr;   // somebody else, who says that they do
+    // To change anything, or one call, or all about one object.
+    void refuse(const std::string& why, const std::string& what) {
+        service_.refusal = why;
+        service_.refused = what;
+    }
+    void starts();  // it is not what it will be, once
     // Every request that changes something, in order.
     std::vector<std::string> changes;
 

@@ -73,7 +73,10 @@ class Scene {
         } else if (name == "hang") {
             daemon_.hangs = true;
         } else if (name == "refuse") {
-            daemon_.refuse(word());
+            const std::string why = word();
+            daemon_.refuse(why, word());
+        } else if (name == "start") {
+            daemon_.starts();
         } else if (name == "within") {
             deadline_ = std::chrono::milliseconds(number());
         } else if (name == "forge") {

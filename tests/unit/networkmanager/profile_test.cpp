@@ -3,9 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <cstdlib>
-#include <numeric>
 
-#include "platform/apply/Digest.h"
 #include "platform/apply/networkmanager/Daemon.h"
 #include "platform/base/Host.h"
 #include "tests/unit/apply/Trees.h"
@@ -76,13 +74,6 @@ std::string joiningOf(const Inputs& inputs) {
     const Sections profile = made(plan, &link);
     EXPECT_EQ("Printer", networkOf(profile));
     return showValue(wirelessSections(profile)) + reason;
-}
-
-TEST(Profile, IsNamedByTheDigestOfTheAlgorithmsAuthors) {
-    std::array<std::uint8_t, 16> key{};
-    std::iota(key.begin(), key.end(), std::uint8_t{0});
-    EXPECT_EQ(0xa129ca6149be45e5U,
-              sipHash(key, std::string_view("\0\1\2\3\4\5\6\7\10\11\12\13\14\15\16", 15)));
 }
 
 TEST(Profile, IsAsItWas) {

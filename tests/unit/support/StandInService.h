@@ -86,13 +86,17 @@ class StandInService {
 
     // The properties of each object, of all its interfaces together. Set these between requests.
     std::map<std::string, platform::bus::Dictionary> objects;
-    std::string refusal;  // a part of every error's text
+    std::string refusal;           // a part of every error's text
+    std::string refused;           // the call, or the object, that is
+    std::function<void()> behind;  // what happens behind the next answer about properties
 
     // A signal that is sent behind the answer; the arguments are as sd_bus_message_append takes them.
     template <class... Arguments>
     void tell(const std::string& path, const char* interface, const char* member, Arguments... arguments) {
         sd_bus_message* made = nullptr;
-        sd_bus_message_new_signal(bus_, &made, path.c_str(), (name_ + interface).c_str(), member);
+        sd_bus_message_new_signal(
+            bus_, &made, path.c_str(),
+            interface == nullptr ? "org.freedesktop.DBus.Properties" : (name_ + interface).c_str(), member);
         sd_bus_message_append(made, arguments...);
         signals_.emplace_back(made);
     }
@@ -123,8 +127,14 @@ class StandInService {
     std::string respond(sd_bus_message* call, sd_bus_message* reply) {
         const std::string member = sd_bus_message_get_member(call);
         const auto object = objects.find(sd_bus_message_get_path(call));
+        if (member == refused || refused == sd_bus_message_get_path(call)) {
+            return ".PermissionDenied";
+        }
         if (member == "GetAll" && object != objects.end()) {
             platform::bus::appendValue(reply, object->second);
+            if (const std::function<void()> once = std::exchange(behind, nullptr)) {
+                once();
+            }
             return "";
         }
         if (member == "Get" && object != objects.end()) {
