@@ -18,7 +18,7 @@ using testing_support::SysfsTree;
 
 class Registry : public testing::Test {
   protected:
-    Registry() : host_(hostOn(sysfs)) { EXPECT_EQ(IOMasterPort(MACH_PORT_NULL, &master), KERN_SUCCESS); }
+    Registry() { EXPECT_EQ(IOMasterPort(MACH_PORT_NULL, &master), KERN_SUCCESS); }
     ~Registry() override { EXPECT_EQ(IOObjectRelease(master), KERN_SUCCESS); }
 
     io_iterator_t find(CFDictionaryRef matching) {
@@ -37,12 +37,11 @@ class Registry : public testing::Test {
     mach_port_t master = MACH_PORT_NULL;
 
   private:
-    static platform::Host hostOn(const SysfsTree& tree) {
-        platform::Host host;
-        host.sysfsRoot = tree.root();
-        return host;
-    }
-    platform::HostOverride host_;
+    const platform::HostOverride host_{[this] {
+        platform::Host made;
+        made.sysfsRoot = sysfs.root();
+        return made;
+    }()};
 };
 
 // Data as an input of a transcript notes it.

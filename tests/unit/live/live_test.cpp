@@ -35,8 +35,6 @@ class Scene {
         CFRunLoopAddSource(CFRunLoopGetCurrent(), source_.get(), kCFRunLoopDefaultMode);
     }
     ~Scene() { CFRunLoopRemoveSource(CFRunLoopGetCurrent(), source_.get(), kCFRunLoopDefaultMode); }
-    Scene(const Scene&) = delete;
-    Scene& operator=(const Scene&) = delete;
 
     // A step, and what came of it.
     std::string play(const std::string& step) {

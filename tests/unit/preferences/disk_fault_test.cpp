@@ -1,4 +1,5 @@
 #include <sys/resource.h>
+#include <sys/stat.h>
 
 #include <cerrno>
 #include <csignal>
@@ -147,6 +148,16 @@ TEST_F(DiskFaultTest, AFileThatWasWrittenInPartIsNotTaken) {
     static_cast<void>(std::signal(SIGXFSZ, before));
     EXPECT_EQ(std::filesystem::file_size(file), smallTree.size());
     EXPECT_EQ(shown(open(), "/Sets/1"), "{Name = one}");
+}
+
+// The kernel's own have no size, and come in pieces.
+TEST_F(DiskFaultTest, AFileIsReadToItsEndOrNotAtAll) {
+    std::string content;
+    EXPECT_TRUE(platform::readWholeFile("/proc/self/smaps", content).ok());
+    EXPECT_GT(content.size(), 8192U);
+    EXPECT_FALSE(platform::readWholeFile("/proc/self/smaps", content, 8192).ok());
+    EXPECT_EQ(mkfifo(directory.at("fifo").c_str(), 0600), 0);
+    EXPECT_FALSE(platform::readWholeFile(directory.at("fifo"), content).ok());
 }
 
 }  // namespace

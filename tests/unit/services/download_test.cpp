@@ -40,8 +40,6 @@ class Server {
         thread_ = std::thread([this, &answer] { serve(answer); });
     }
     ~Server() { finish(); }
-    Server(const Server&) = delete;
-    Server& operator=(const Server&) = delete;
 
     // What was asked, once the client is gone.
     const std::string& finish() {

@@ -21,20 +21,17 @@ using testing_support::TemporaryDirectory;
 
 class Folders : public testing::Test {
   protected:
-    Folders() : host_(hostIn(directory)) {}
-
     TemporaryDirectory directory;
 
   private:
-    static platform::Host hostIn(const TemporaryDirectory& directory) {
-        platform::Host host;
-        host.userModemScripts = directory.at("user");
-        host.networkModemScripts = directory.at("network");
-        host.localModemScripts = directory.at("local");
-        host.systemModemScripts = directory.at("system");
-        return host;
-    }
-    platform::HostOverride host_;
+    const platform::HostOverride host_{[this] {
+        platform::Host made;
+        made.userModemScripts = directory.at("user");
+        made.networkModemScripts = directory.at("network");
+        made.localModemScripts = directory.at("local");
+        made.systemModemScripts = directory.at("system");
+        return made;
+    }()};
 };
 
 // The items of a folder, read 50 at a time, in the order of their names: "name=flags".

@@ -4,9 +4,7 @@
 #include <gtest/gtest.h>
 #include <sched.h>
 #include <sys/mount.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -18,7 +16,6 @@
 #include <vector>
 
 #include "platform/CoreServices.h"
-#include "platform/base/FileDescriptor.h"
 #include "platform/base/Host.h"
 #include "platform/base/Log.h"
 #include "platform/values/Values.h"
@@ -102,21 +99,20 @@ class DesktopTest : public testing::Test {
 
 TEST_F(DesktopTest, WaitsNeitherForTheUsersManagerNorForTheProgram) {
     seat();
-    // Takes connections and never says a word.
-    const platform::FileDescriptor mute(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    (runtime + "/bus").copy(address.sun_path, sizeof address.sun_path - 1);
-    ASSERT_EQ(bind(mute.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-    ASSERT_EQ(listen(mute.get(), 4), 0);
-    chmod(address.sun_path, 0777);
+    // Is on the bus and never says a word.
+    const StandInBus bus(runtime + "/bus");
+    sd_bus* const mute = bus.connect();
+    ASSERT_GE(sd_bus_request_name(mute, "org.freedesktop.systemd1", 0), 0);
     EXPECT_EQ(openOn(withProgram("echo $DISPLAY; echo $$", "exec sleep 60\n")), 0);
     const std::string told = recorded();
     ASSERT_EQ(told.substr(0, 3), ":7\n");
+    const pid_t program = std::stoi(told.substr(3));
     siginfo_t ended{};
-    EXPECT_EQ(waitid(P_ALL, 0, &ended, WEXITED | WNOHANG | WNOWAIT), -1) << "a child is left to reap";
-    EXPECT_EQ(errno, ECHILD);
-    EXPECT_EQ(kill(std::stoi(told.substr(3)), SIGKILL), 0);
+    EXPECT_EQ(kill(program, SIGKILL), 0);
+    EXPECT_EQ(waitid(P_PID, static_cast<id_t>(program), &ended, WEXITED), -1) << "it is nobody's child";
+    EXPECT_EQ(waitid(P_ALL, 0, &ended, WEXITED | WNOHANG | WNOWAIT), 0);
+    EXPECT_EQ(ended.si_pid, 0) << "a child is left to reap";
+    sd_bus_unref(mute);
 }
 
 TEST_F(DesktopTest, DoesWhatItsTableSays) {

@@ -38,14 +38,12 @@ TEST(PropertyListXML, BoundsTheDepth) {
     };
     const auto deepest = nested(deepestPropertyList, "<array>", "</array>");
     ASSERT_TRUE(deepest);
-    EXPECT_TRUE(frozen(deepest.get()));
     EXPECT_TRUE(CFEqual(parse(writePropertyListXML(deepest.get()).value_or("")).get(), deepest.get()));
     for (const std::size_t levels : {deepestPropertyList + 1UL, 20'000UL}) {
         EXPECT_FALSE(nested(levels, "<array>", "</array>"));
         EXPECT_FALSE(nested(levels, "<dict><key>k</key>", "</dict>"));
         EXPECT_FALSE(nested(levels, "<x>", "</x>"));
     }
-    EXPECT_FALSE(writePropertyListXML(nestedArrays(deepestPropertyList + 1).get()));
 }
 
 TEST(PropertyListXML, FindsASecondKeyAmongMany) {
@@ -57,7 +55,8 @@ TEST(PropertyListXML, FindsASecondKeyAmongMany) {
     EXPECT_FALSE(parsed("<dict>" + entries + "<key>4321</key><true/></dict>"));
 }
 
-TEST(PropertyListXML, WritesNoDateThatItCannotReadBack) {
+TEST(PropertyListXML, WritesNothingThatItCannotReadBack) {
+    EXPECT_FALSE(writePropertyListXML(nestedArrays(deepestPropertyList + 1).get()));
     EXPECT_FALSE(writePropertyListXML(makeDate(253'402'300'800).get()));
     EXPECT_FALSE(writePropertyListXML(makeDate(-62'167'219'201).get()));
 }
