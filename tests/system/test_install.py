@@ -1,5 +1,6 @@
 #!/usr/bin/env python3
-"""What is installed, and programs of others that are built upon it."""
+"""What is installed, and programs that are built upon it: others' and the examples."""
+import fcntl
 import os
 import re
 import shlex
@@ -19,6 +20,9 @@ SANITIZE = [f"-fsanitize={CACHE['LA_SANITIZE']}"] if CACHE["LA_SANITIZE"] else [
 STRICT = "-Wall", "-Wextra", "-Wpedantic", "-Wshadow", "-Wconversion", "-Wsign-conversion", "-Wundef", "-Werror"
 ENVIRONMENT = lab.ENVIRONMENT | {"PKG_CONFIG_PATH": f"{LIBRARIES}/pkgconfig", "LD_LIBRARY_PATH": str(LIBRARIES)}
 DEFAULT_ROUTE = "{PrimaryInterface = eth0; Router = 192.168.77.1}\n"
+TAKEN = ["DHCPDISCOVER", "DHCPOFFER", "DHCPREQUEST", "DHCPACK"]
+CHANGED = 'the network configuration changed!\nMain Key 0="State:/Network/Global/IPv4"\n'
+GONE = CHANGED + "Main Key Dict is nil\nsetting gIsNetworkReady to FALSE\n\n"
 
 
 def run(*words, **options):
@@ -112,10 +116,48 @@ class Built(lab.LabTest):
             clients = [path.read_bytes().decode().split("\0") for path in Path("/proc").glob("[0-9]*/cmdline")]
             return [words[words.index("-s") + 1] for words in clients if "udhcpc" in words]
         hook = os.path.realpath(PREFIX / CACHE["CMAKE_INSTALL_LIBEXECDIR"] / "location-assistant/location-assistant-dhcp-hook")
-        for command in ([PREFIX / CACHE["CMAKE_INSTALL_SBINDIR"] / "location-assistant", "create", "auto"], [locations, "renew"]):
-            run(*command)
-            self.assertEqual([hook], [os.path.realpath(each) for each in called()])
+        run(PREFIX / CACHE["CMAKE_INSTALL_SBINDIR"] / "location-assistant", "create", "auto")
+        self.assertEqual([hook], [os.path.realpath(each) for each in called()])
+        listed = run(locations, "list")
+        for line in "  Automatic", "* kv zat temp set", "eth0", "default route: {PrimaryInterface = eth0":
+            self.assertIn(line, listed)
+        service = next(key for key, value in self.lab.store()["NetworkServices"].items()
+                       if value.get("IPv4") == {"ConfigMethod": "DHCP"})
+        self.assertEqual(f"renewing the lease of service {service}\n", run(locations, "renew"))
+        self.assertEqual([hook], [os.path.realpath(each) for each in called()])
+        log = [line.split("(")[0].split()[-1] for line in self.lab.file("dhcp.log").splitlines() if "far-eth0)" in line]
+        self.assertEqual([*TAKEN, "DHCPRELEASE", *TAKEN], log)
         self.assertEqual(1, len(self.lab.ipv4("eth0")))
+
+    def test_watcher(self):
+        watcher = self.lab.daemon(lab.BUILD / "examples/watch_network", stdout=subprocess.PIPE)
+        self.assertEqual(b"watching\n", watcher.stdout.readline())
+        fcntl.fcntl(watcher.stdout, fcntl.F_SETFL, os.O_NONBLOCK)
+
+        def expect(text):
+            heard = []
+            lab.wait_until(lambda: heard.append(watcher.stdout.read() or b"") or sum(map(len, heard)) >= len(text))
+            self.assertEqual(text, b"".join(heard).decode())
+
+        def there(card, router):
+            return (f'{CHANGED}setting gIsNetworkReady to TRUE\nMain Key Dict:\nkey="PrimaryInterface", value="{card}"\n'
+                    f'key="Router", value="{router}"\n\n')
+
+        default = "default via 192.168.77.{} dev eth0 metric 100"
+        lab.ip("route del " + default.format(1))
+        expect(GONE)
+        lab.ip("route add " + default.format(2))
+        expect(there("eth0", "192.168.77.2"))
+        lab.ip("route add default via 10.20.0.1 dev wlan0 metric 50")
+        expect(there("wlan0", "10.20.0.1"))
+        burst = "".join(f"addr {verb} 10.20.{i}.9/16 dev wlan0\n" for i in range(100) for verb in ["add", "del"] * 25)
+        subprocess.run(["ip", "-batch", "-"], input=burst * 2, text=True, check=True)
+        lab.ip("-n far link del far-wlan0")
+        expect(there("eth0", "192.168.77.2"))
+        self.assertLess(int(Path(f"/proc/{watcher.pid}/status").read_text().split("VmHWM:")[1].split()[0]), 200_000)
+        watcher.terminate()
+        expect("the network is ready\n")
+        self.assertEqual(0, watcher.wait())
 
     def test_code_in_the_documentation(self):
         for page, start, end in ("docs/morescf.3", r"\.EX", r"\.EE"), ("README.md", "```c", "```"):
