@@ -57,7 +57,10 @@ void WriteSetIDFile(const char* path, const char* text) {
         error = errno;
     }
     if (isDone && rename(beside.c_str(), path) != 0) {
-        isDone = false;
+        // A directory there, which anybody can make, is moved aside: no file can take its place.
+        std::string aside = std::string(path) + ".XXXXXX";
+        isDone = errno == EISDIR && mkdtemp(aside.data()) != nullptr && rename(path, aside.c_str()) == 0 &&
+                 rename(beside.c_str(), path) == 0;
         error = errno;
     }
     if (!isDone) {

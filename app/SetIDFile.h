@@ -8,8 +8,8 @@
 #include "platform/CoreFoundation.h"
 
 // Puts a new file with the text, without a line break and with mode 0600, in the place of whatever stands
-// there: another user's file or a link is replaced, not written to. When that fails the old content stays and
-// the system log says why.
+// there: another user's file or a link is replaced, not written to, and a directory gets another name. When
+// that fails the old content stays and the system log says why.
 void WriteSetIDFile(const char* path, const char* text);
 
 // Reads one line of at most 1023 bytes, a line break at its end included, as an ID in the system's text

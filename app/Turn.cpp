@@ -12,6 +12,7 @@
 namespace {
 
 constexpr const char* kTurnFile = "/run/location-assistant.lock";
+constexpr const char* kWithoutTurn = "this run cannot take its turn, and goes on without";
 constexpr unsigned kLongestRun = 120;  // seconds
 
 // Of the turn that this process has; -1 for none.
@@ -30,7 +31,12 @@ void WaitForTurn() {
     if (gTurnDescriptor < 0 || SetLock(F_SETLK, F_WRLCK) == 0) {
         return;
     }
-    // The alarm ends the wait: its handler does nothing, and nothing is restarted behind it.
+    // The alarm ends the wait, also for a caller that blocks alarms: its handler does nothing, and nothing is
+    // restarted behind it.
+    sigset_t alarms;
+    sigemptyset(&alarms);
+    sigaddset(&alarms, SIGALRM);
+    sigprocmask(SIG_UNBLOCK, &alarms, nullptr);
     struct sigaction interrupt = {};
     struct sigaction before = {};
     interrupt.sa_handler = Interrupt;
@@ -39,7 +45,7 @@ void WaitForTurn() {
     if (SetLock(F_SETLKW, F_WRLCK) != 0) {
         SystemLog(errno == EINTR
                       ? "another run has kept its turn for two minutes; this one does not wait longer"
-                      : "this run cannot take its turn, and goes on without");
+                      : kWithoutTurn);
     }
     alarm(0);
     sigaction(SIGALRM, &before, nullptr);
@@ -50,6 +56,9 @@ void WaitForTurn() {
 Turn::Turn() {
     descriptor = open(kTurnFile, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, S_IRUSR | S_IWUSR);
     gTurnDescriptor = descriptor;
+    if (descriptor < 0 && errno != EACCES && errno != EPERM) {
+        SystemLog(kWithoutTurn);
+    }
     WaitForTurn();
 }
 

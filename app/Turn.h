@@ -7,15 +7,13 @@
 class Turn {
   public:
     // Waits until no other run has the turn, for two minutes at most, which is longer than a run can take;
-    // what then keeps it is in the system log, and this run goes on all the same. Without the rights to take
-    // a turn there is nothing to change either.
+    // what then keeps it is in the system log, and this run goes on all the same, as without a file to take a
+    // turn with. Without the rights to take one there is nothing to change either.
     Turn();
     // The turn ends with the object, or with the process.
     ~Turn();
     Turn(const Turn&) = delete;
     Turn& operator=(const Turn&) = delete;
-
-    bool IsTaken() const { return descriptor >= 0; }
 
   private:
     int descriptor = -1;

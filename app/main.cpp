@@ -122,9 +122,7 @@ int ProcessArguments(int argc, const char** argv) {
     for (const auto& [known, run] : commands) {
         if (IsWord(word(1), known)) {
             const Turn turn;
-            if (turn.IsTaken()) {
-                FinishEarlierRun();
-            }
+            FinishEarlierRun();
             static_cast<void>(run());
             return 1;
         }

@@ -54,8 +54,9 @@ TEST(SetIDFile, IsWhatItsTableSays) {
         struct stat status {};
         EXPECT_EQ(stat(path.c_str(), &status), 0);
         EXPECT_EQ(read(directory.at("victim")), "untouched");
-        EXPECT_EQ(std::distance(std::filesystem::directory_iterator(directory.path()), {}), 2);
-        return before + ", " + read(path) + (status.st_mode % 01000 == 0600 ? ", private" : "") + log;
+        const auto names = std::distance(std::filesystem::directory_iterator(directory.path()), {});
+        return before + ", " + read(path) + (status.st_mode % 01000 == 0600 ? ", private" : "") + log +
+               (names == 2 ? "" : ", " + std::to_string(names) + " names in the folder");
     });
     std::signal(SIGXFSZ, handler);
 }
