@@ -78,10 +78,13 @@ Outcome Session::write() {
     std::optional<KnownFile> known;
     Outcome done = file_.replace(*content, known);
     if (done.ok()) {
+        isUncertain_ = false;
         onDisk_ = {tree_.root(), std::move(known)};
         remember(onDisk_);
     } else if (known) {
-        // In its place, but perhaps not durable: the next commit is not stale, and writes once more.
+        // In its place, but perhaps not durable: the next commit is not stale, and writes once more, also
+        // when its tree is the one of before.
+        isUncertain_ = true;
         onDisk_.file = std::move(known);
     }
     return done;
@@ -96,7 +99,7 @@ Outcome Session::commit(std::chrono::milliseconds wait) {
 
 Outcome Session::makeDurable(std::chrono::milliseconds wait) {
     // Without a file the first-run tree is written as it is: from then on there is one.
-    if (onDisk_.file && !isChanged()) {
+    if (onDisk_.file && !isUncertain_ && !isChanged()) {
         return checkFresh();
     }
     const bool held = lock_.isOpen();

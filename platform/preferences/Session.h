@@ -54,6 +54,7 @@ class Session final : public values::Object {
     std::string name_;
     StoreFile file_;
     Snapshot onDisk_;
+    bool isUncertain_ = false;  // whether the file holds that tree
     values::Owned<CFDictionaryRef> replaced_;
     Tree tree_;
     FileDescriptor lock_;
