@@ -1,6 +1,9 @@
 #include "platform/values/Fields.h"
 
 #include <algorithm>
+#include <optional>
+
+#include "platform/values/Text.h"
 
 namespace platform::values {
 namespace {
@@ -30,8 +33,11 @@ Owned<CFTypeRef> FieldWriter::encode(bool flag) {
 }
 
 Owned<CFTypeRef> FieldWriter::encode(const std::string& text) {
-    Owned<CFStringRef> string = makeString(text);
-    return string ? Owned<CFTypeRef>::adopt(string.take()) : encodeData(std::as_bytes(std::span(text)));
+    // The SSID of a network, or a file of somebody else's, may hold any byte.
+    const std::optional<TextTraits> traits = scanText(text);
+    const bool isForXml = traits && (*traits & textBeyondXml) == 0;
+    return isForXml ? Owned<CFTypeRef>::adopt(makeString(text).take())
+                    : encodeData(std::as_bytes(std::span(text)));
 }
 
 Owned<CFTypeRef> FieldWriter::encode(const std::vector<std::byte>& bytes) {

@@ -42,7 +42,7 @@ class FieldWriter {
     [[nodiscard]] Owned<CFDictionaryRef> take() noexcept;
 
     [[nodiscard]] static Owned<CFTypeRef> encode(bool flag);
-    // Text that is not UTF-8 is kept as data.
+    // Text that no XML document can carry is kept as data.
     [[nodiscard]] static Owned<CFTypeRef> encode(const std::string& text);
     [[nodiscard]] static Owned<CFTypeRef> encode(const std::vector<std::byte>& bytes);
     [[nodiscard]] static Owned<CFTypeRef> encode(const Owned<CFDictionaryRef>& dictionary);
