@@ -34,6 +34,8 @@ struct Task {
     // What a network, a cable, a key, a switch or a card that is away did; empty for nothing. The settings
     // stand all the same, and whoever leads the interface goes on by itself where it can.
     std::string trouble;
+    // Of an interface that is given back: the trouble keeps it from being so, and the next run goes on.
+    bool isUnfinished = false;
 };
 
 // Every interface is started before any is waited for: start() gives each its settings and asks for what

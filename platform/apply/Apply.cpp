@@ -214,7 +214,7 @@ class Run {
         crew.run(deadline);
         std::vector<std::string> given;
         crew.forEach([this, &given](const Task& task) {
-            if (note(task)) {
+            if (note(task) && !task.isUnfinished) {
                 given.push_back(task.before->interface);
             }
         });

@@ -78,6 +78,11 @@ struct InterfacePlan {
     }
 };
 
+// Whether the interface is to be off: its service is, or its radio is not to be on.
+[[nodiscard]] inline bool isOff(const InterfacePlan& plan) noexcept {
+    return !plan.active || (plan.wireless && plan.wireless->powerEnabled == false);
+}
+
 // In service order: the first active interface is the preferred one. An interface stands here once; of
 // several services for it the first active one counts. Interfaces that are not named are left to the system.
 using Plan = std::vector<InterfacePlan>;

@@ -14,6 +14,7 @@ namespace {
 
 constexpr const char* propertiesInterface = "org.freedesktop.DBus.Properties";
 constexpr std::size_t longestText = 300;
+constexpr int mostAtOnce = 1000;
 
 std::uint64_t microseconds(Clock::duration duration) {
     const auto count = std::chrono::duration_cast<std::chrono::microseconds>(duration).count();
@@ -249,10 +250,12 @@ Outcome Bus::handleSignals(Clock::time_point until) {
     bool inTime = true;
     RETURN_IF_FAILED(process(until, inTime));
     int result = 0;
-    // All that has come, before anybody decides by a part of it.
+    // All that has come, before anybody decides by a part of it; but every user of the machine may send, and
+    // more and more.
+    int taken = 0;
     do {
         result = sd_bus_process(bus_.get(), nullptr);
-    } while (result > 0);
+    } while (result > 0 && ++taken < mostAtOnce);
     if (ownerLeft_) {
         return {kSCStatusFailed, service_ + " left the bus while it was waited for"};
     }

@@ -61,7 +61,12 @@ class Progress {
         RETURN_IF_FAILED(interface_.open());
         // Asked before there is a network to answer, a DHCP client would ask again many seconds later.
         waitsForCarrier_ = waitsForOthers_ = interface_.link() && before_->hasLedAddress();
-        return interface_.giveBack(*before_, join_);
+        std::string obstacle;
+        RETURN_IF_FAILED(interface_.giveBack(*before_, join_, obstacle));
+        if (!obstacle.empty()) {
+            leaveUnfinished(obstacle);
+        }
+        return {};
     }
 
     [[nodiscard]] std::optional<LinkSnapshot> snapshot() const {
@@ -70,13 +75,25 @@ class Progress {
                                                                             : std::nullopt;
     }
 
-    // Keeps the machine's refusal, after which nothing is waited for.
+    // Keeps the machine's first refusal, after which nothing is waited for. What fails for a card that is
+    // gone is no refusal.
     bool check(const Outcome& outcome) {
-        if (!outcome.ok()) {
-            task_->refusal = outcome;
+        if (outcome.ok()) {
+            return true;
+        }
+        if (interface_.refresh().ok() && !interface_.link()) {
+            leaveUnfinished("the card was taken out");
+        } else {
+            task_->refusal = task_->refusal.ok() ? outcome : task_->refusal;
             stopWaiting();
         }
-        return outcome.ok();
+        return false;
+    }
+
+    // For the next run, which finds the switch turned or the card back, or gone for good.
+    void leaveUnfinished(const std::string& trouble) {
+        giveUp(trouble);
+        task_->isUnfinished = task_->plan == nullptr;
     }
 
     void stopWaiting() {
@@ -98,7 +115,7 @@ class Progress {
         if (before_ && !isResumed_) {
             isResumed_ = true;
             resumedAt_ = Clock::now();
-            check(interface_.letOthersIn(*before_, task_->refusal.ok()));
+            check(interface_.letOthersIn(*before_, task_->refusal.ok() && !task_->isUnfinished));
         } else if (waitsForOthers_ && !isLate()) {
             return advanceOthers();
         } else {

@@ -59,10 +59,6 @@ List lasting(List list) {
 
 }  // namespace
 
-bool isOff(const InterfacePlan& plan) noexcept {
-    return !plan.active || (plan.wireless && plan.wireless->powerEnabled == false);
-}
-
 bool joinsNetwork(const InterfacePlan& plan) noexcept {
     return !isOff(plan) && plan.wireless && plan.wireless->network;
 }
@@ -112,8 +108,10 @@ Outcome DirectInterface::apply(const InterfacePlan& plan, const std::optional<Li
     std::optional<DhcpClient> client;
     RETURN_IF_FAILED(readDhcpClient(interface_, client));
     const bool wantsClient = !isOff(plan) && plan.method == IPv4Method::dhcp;
-    if (client && !(wantsClient && client->settings == dhcpSettings(plan))) {
-        // While the address is still there, so that the server hears of it.
+    const bool staysOnNetwork = mayStay || (!earlier.joined && !joinsNetwork(plan));
+    if (client && !(wantsClient && staysOnNetwork && client->settings == dhcpSettings(plan))) {
+        // While the address is still there, so that the server hears of it: what one network lent is nothing
+        // on the next.
         RETURN_IF_FAILED(stopDhcpClient(interface_));
     }
     if (earlier.joined && !joinsNetwork(plan)) {
@@ -227,7 +225,9 @@ void DirectInterface::noteJoined() {
     }
 }
 
-Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<WirelessJoin>& join) {
+Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<WirelessJoin>& join,
+                                  std::string& obstacle) {
+    obstacle.clear();
     std::optional<AppliedLink> applied;
     RETURN_IF_FAILED(readState(appliedPath(interface_), applied));
     if (!applied) {
@@ -258,7 +258,7 @@ Outcome DirectInterface::giveBack(const LinkSnapshot& before, std::unique_ptr<Wi
             if (const Outcome noted = writeState(appliedPath(interface_), *applied); !noted.ok()) {
                 logLine(LogLevel::warning, interface_ + ": " + noted.reason());
             }
-            take(done, restore(before));
+            take(done, restore(before, obstacle));
             if (before.radioOff.value_or(false)) {
                 take(done, switchRadio(interface_, false));
             }
@@ -316,17 +316,7 @@ Outcome DirectInterface::removeOurs(const AppliedLink& applied, const LinkSnapsh
     return done;
 }
 
-// Without its radio a card cannot be switched on, and no route goes through it.
-Outcome DirectInterface::checkRadio(const LinkSnapshot& before) {
-    const std::optional<Radio> radio = readRadio(interface_);
-    const bool isOff = radio && (radio->isOff || radio->isBlocked);
-    return before.up && isOff ? Outcome(kSCStatusFailed,
-                                        "its radio was switched off meanwhile: the next run gives it back "
-                                        "when it is on again")
-                              : Outcome();
-}
-
-Outcome DirectInterface::restore(const LinkSnapshot& before) {
+Outcome DirectInterface::restore(const LinkSnapshot& before, std::string& obstacle) {
     std::vector<Address> addresses = before.state.addresses;
     const std::int64_t elapsed = std::max<std::int64_t>(secondsSinceStart() - before.takenAt, 0);
     for (Address& address : addresses) {
@@ -340,7 +330,12 @@ Outcome DirectInterface::restore(const LinkSnapshot& before) {
     }
     // IPv6 before the link, so that the kernel makes its own addresses when the link comes up.
     RETURN_IF_FAILED(kernel_.setIPv6Disabled(before.ipv6Disabled));
-    RETURN_IF_FAILED(checkRadio(before));
+    // Without its radio a card cannot be switched on, and no route goes through it.
+    const std::optional<Radio> radio = readRadio(interface_);
+    if (before.up && radio && (radio->isOff || radio->isBlocked)) {
+        obstacle = "its radio was switched off meanwhile: the next run gives it back when it is on again";
+        return {};
+    }
     RETURN_IF_FAILED(kernel_.setUp(before.up));
     RETURN_IF_FAILED(kernel_.makeAddresses(addresses));
     RETURN_IF_FAILED(kernel_.makeRoutes(before.state.routes, false));

@@ -16,8 +16,6 @@
 
 namespace platform::apply {
 
-// Whether the plan asks for the interface to be off, its radio included.
-[[nodiscard]] bool isOff(const InterfacePlan& plan) noexcept;
 [[nodiscard]] bool joinsNetwork(const InterfacePlan& plan) noexcept;
 
 class DirectInterface {
@@ -34,9 +32,10 @@ class DirectInterface {
     // to wait for. trouble is told when settings stand that help nothing.
     Outcome apply(const InterfacePlan& plan, const std::optional<LinkSnapshot>& before,
                   std::unique_ptr<WirelessJoin>& join, std::string& trouble);
-    // Makes it as it was, and compares. The same for `join`. Once this was begun, letOthersIn ends it, also
+    // Makes it as it was, and compares. The same for `join`. `obstacle` is told, and it is no failure, when
+    // that cannot be done until somebody has turned a switch. Once this was begun, letOthersIn ends it, also
     // after a failure.
-    Outcome giveBack(const LinkSnapshot& before, std::unique_ptr<WirelessJoin>& join);
+    Outcome giveBack(const LinkSnapshot& before, std::unique_ptr<WirelessJoin>& join, std::string& obstacle);
     // Lets those lead it again who did before. With isBack, nothing is left to be given back.
     Outcome letOthersIn(const LinkSnapshot& before, bool isBack);
     // Whether it has an IPv4 address that reaches further than its link.
@@ -56,9 +55,8 @@ class DirectInterface {
     // Whether somebody else has configured the interface since: it has addresses that it neither had nor got
     // from here, or was switched off here and is on.
     Outcome isTakenOver(const AppliedLink& applied, const LinkSnapshot& before, bool& taken);
-    Outcome checkRadio(const LinkSnapshot& before);
     Outcome removeOurs(const AppliedLink& applied, const LinkSnapshot& before);
-    Outcome restore(const LinkSnapshot& before);
+    Outcome restore(const LinkSnapshot& before, std::string& obstacle);
     Outcome compare(const LinkSnapshot& before);
 
     std::string interface_;

@@ -27,8 +27,8 @@ Outcome Card::awaitReady(bool& isReady) {
     std::uint32_t state = 0;
     RETURN_IF_FAILED(daemon_.deviceState(device_.path, state));
     isReady = state >= deviceDisconnected;
-    if (!isReady && Clock::now() < readyDeadline_) {
-        waitUntil(readyDeadline_);
+    if (!isReady) {
+        waitsUntil(readyDeadline_);
     }
     return {};
 }
@@ -47,8 +47,8 @@ Outcome Card::awaitRest() {
 
 std::uint32_t Card::awaitReason() {
     const std::uint32_t reason = daemon_.failureOf(device_.path);
-    if (reason == 0 && Clock::now() < reasonDeadline_) {
-        waitUntil(reasonDeadline_);
+    if (reason == 0) {
+        waitsUntil(reasonDeadline_);
     }
     return reason;
 }

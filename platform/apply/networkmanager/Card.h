@@ -72,6 +72,13 @@ class Card {
         isWaiting_ = true;
         wakeAt_ = time;
     }
+    // The same, unless that time or the deadline has come; whether it waits.
+    bool waitsUntil(Clock::time_point time) {
+        if (Clock::now() < std::min(time, deadline_)) {
+            waitUntil(time);
+        }
+        return isWaiting_;
+    }
     [[nodiscard]] bool isWaiting() const noexcept { return isWaiting_; }
     [[nodiscard]] bool isLate() const { return Clock::now() >= deadline_; }
     // Nothing, and success, when there is no such card.

@@ -32,11 +32,11 @@ class ConfiguringCard final : public Card {
         std::optional<Device> device;
         RETURN_IF_FAILED(findCard(device));
         if (!device) {
-            settle(plan_.active ? "there is no such interface" : "");
+            settle(isOff(plan_) ? "" : "there is no such interface");
             return {};
         }
         device_ = std::move(*device);
-        if (!plan_.active) {
+        if (isOff(plan_)) {
             next(&ConfiguringCard::comeToRest);
             return daemon_.disconnect(device_);
         }

@@ -90,8 +90,7 @@ class RestoringCard final : public Card {
 
     Outcome awaitPlace() {
         const bool isBack = active_ && active_->uuid == before().uuid;
-        if (!isBack && place_->before && !place_->before->isTaken && Clock::now() < placeDeadline_) {
-            waitUntil(placeDeadline_);
+        if (!isBack && place_->before && !place_->before->isTaken && waitsUntil(placeDeadline_)) {
             return {};
         }
         changesOnAir_ = daemon_.changesOnAir();
