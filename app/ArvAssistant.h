@@ -63,8 +63,10 @@ class ArvAssistant {
     OSStatus SaveTemporarySet();
 
     // Builds the temporary location, committed as one change or not at all, and keeps its ID in the object
-    // (null when none was made). mode is "auto", "wirelessAuto", "from_intro" or null; networkName and
-    // password may be null. Status 0 with no location: no service fits the mode.
+    // (null when none was made, but that of what was not kept after a failed commit). mode is "auto",
+    // "wirelessAuto" or "from_intro"; anything else counts as null. networkName and password may be null.
+    // Status 0 with no location: no service fits the mode. What a service's settings come to is told of the
+    // last service only: 0 does not mean that each one before has its settings.
     OSStatus CreateTemporarySet(char* mode, char* networkName, char* password);
     // Makes the temporary location current: -50 when there is none.
     OSStatus ActivateTemporarySet();
@@ -79,7 +81,8 @@ class ArvAssistant {
 
     // Opens the printer's configuration page and waits until the user is done; always 0.
     OSStatus ConfigureWirelessPrinter();
-    // 1 when the kernel has a route to the printer and its web server answers, else 0.
+    // 1 when the kernel has a route to the printer and its web server answers the probe with HTTP status 404,
+    // else 0.
     int IsWirelessPrinterReachable();
 
     // Remembers the current location, whatever its name, in the object and in kZATSetFile.

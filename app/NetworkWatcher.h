@@ -8,8 +8,8 @@
 extern bool gIsNetworkReady;
 
 // Starts watching "State:/Network/Global/IPv4" on the calling thread's run loop, which the caller has to run.
-// A failure is reported in two lines on standard error and leaves nothing that works. Called again it makes a
-// session of its own beside the one before, which is handed to the callback as its info.
+// A failure is reported in two lines on standard error and leaves no new session that works. Called again it
+// makes a session of its own beside the one before, which goes on and is handed to the callback as its info.
 void watchForNetworkChanges();
 
 // Takes the source off the calling thread's run loop and stops that loop. Session and source stay held.

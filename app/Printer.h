@@ -25,6 +25,6 @@ void OpenConfigurationPage();
 
 // Asks on standard output until standard input answers "y"; always 0. Line breaks in front of an answer
 // are ignored, and one character behind each answer is taken away unread. Without a "y" it asks for ever,
-// at the end of the input too; while it asks, SIGPIPE ends the process when nobody reads the questions, and
-// so does the end of the input when they cannot be written.
+// at the end of the input too; while it asks, SIGPIPE ends the process when nobody reads the questions. Once
+// something could not be written to standard output, the end of the input ends the asking as "y" does.
 OSStatus WaitForUserToBeDone();

@@ -43,13 +43,17 @@
 //   of memory ends the process (CoreFoundation.h). -4960: a value cannot be made, or one that is expected in
 //   the tree is missing or has the wrong type (a name that is no string counts as missing).
 // - A location without a readable "ServiceOrder" fails whatever has to know its services: listing, adding,
-//   duplicating and deleting them, and duplicating it. So does an entry of the order without a link that
-//   leads somewhere, wherever the resolved IDs are needed. Removing the services that no location lists needs
+//   duplicating and deleting them, and duplicating it. So does an entry of the order without a link whose
+//   text is a path, wherever the resolved IDs are needed. Removing the services that no location lists needs
 //   those of every location, so that one such location fails every MoreSCDeleteSet and MoreSCDeleteService,
 //   after what they do besides.
 // - What an operation undoes after a failure it undoes in the session's tree, before anything is committed.
 //   The services that it made are removed with those that no location lists; where that fails as described
-//   above, they stay in "NetworkServices", listed by nobody, until a removal succeeds.
+//   above, they stay in "NetworkServices", listed by nobody, until a removal succeeds. Without a usable
+//   "CurrentSet" no location can be removed, and one that was made stays.
+// - An operation that looks at the computer's ports or modem scripts (MoreSCNewService, MoreSCNewSet,
+//   MoreSCMakeNewDialupSet) gives back their statuses too (MoreSCFPortScanner.h, MoreSCFCCLScanner.h), and
+//   those of MoreSCFStringToMacAddress for a "MACAddress".
 #pragma once
 
 #include "platform/CoreFoundation.h"
@@ -59,10 +63,10 @@ LA_BEGIN_DECLARATIONS
 
 // --- Session ---
 
-// Begins one use of the session, opening it when none is open. lockThePrefs takes the store's lock against
-// other processes, until the outermost close; waitForLock waits for it, at most half a minute (3002). Whoever
-// waited for a process that then committed gets 3005, since the session was read before: close, and open
-// again. Match every call with MoreSCClose, a failed one too. Store's status.
+// Begins one use of the session, opening it when it is the outermost one. lockThePrefs takes the store's lock
+// against other processes, until the outermost close; waitForLock waits for it, at most half a minute (3002).
+// Whoever waited for a process that then committed gets 3005, since the session was read before: close, and
+// open again. Match every call with MoreSCClose, a failed one too. Store's status.
 OSStatus MoreSCOpen(Boolean lockThePrefs, Boolean waitForLock);
 // Ends one use. err is the caller's status, which must not be null. dirty says that the caller changed the
 // tree: when *err is 0 the session is marked for a commit; a failed caller does not mark it, and cannot clear
@@ -94,7 +98,7 @@ OSStatus MoreSCSetSetsDict(CFDictionaryRef setsDict);
 
 // The IDs of all locations, in the store's order. indexOfCurrentSet (optional) receives the position of the
 // current one and stays as it is when "CurrentSet" names none of them; without a usable "CurrentSet" the call
-// fails. *setIDs is null on failure.
+// then fails. *setIDs is null on failure.
 OSStatus MoreSCCopySetIDs(CFArrayRef* setIDs, CFIndex* indexOfCurrentSet);
 
 OSStatus MoreSCCopyUserVisibleNameOfSet(CFStringRef setID, CFStringRef* userVisibleName);
@@ -113,8 +117,9 @@ OSStatus MoreSCNewSet(CFStringRef userVisibleName, CFStringRef* newSetID);
 OSStatus MoreSCDuplicateSet(CFStringRef setID, CFStringRef newSetUserVisibleName, CFStringRef* newSetID);
 // Removes a location, and every service that no location lists any more. -50 for the current location, which
 // stays (services that no location lists are still removed from the session, but do not mark it), and for a
-// null ID, with nothing changed. When the removal of services fails, the location is gone from the session
-// all the same; a call that is the outermost one then commits nothing.
+// null ID, with nothing changed. 1004 or -4960 without a usable "CurrentSet", and the location stays. When
+// the removal of services fails, the location is gone from the session all the same; a call that is the
+// outermost one then commits nothing.
 OSStatus MoreSCDeleteSet(CFStringRef setID);
 OSStatus MoreSCRenameSet(CFStringRef setID, CFStringRef userVisibleName);
 
@@ -131,11 +136,13 @@ OSStatus MoreSCCopyServicesDict(CFStringRef setID, CFDictionaryRef* servicesDict
 // success.
 OSStatus MoreSCCopyServicesDictMutable(CFStringRef setID, CFMutableDictionaryRef* servicesDict,
                                        CFMutableArrayRef* serviceOrder);
-// Replaces the links, then the service order; null leaves what is there.
+// Replaces the links, then the service order; null leaves what is there. When the order fails, the links are
+// replaced in the session all the same; a call that is the outermost one then commits nothing.
 OSStatus MoreSCSetServicesDict(CFStringRef setID, CFDictionaryRef servicesDict, CFArrayRef serviceOrder);
 
-// The IDs of the location's services in service order, either optional. For the resolved ones every link has
-// to lead somewhere, else the store's status; an entry of the order that is no string is -4960.
+// The IDs of the location's services in service order, either optional. For the resolved ones every entry
+// needs a link (else the store's status) whose text is a path of at least two slashes (else -4960); whether
+// the service is there is not asked. An entry of the order that is no string is -4960.
 OSStatus MoreSCCopyServiceIDs(CFStringRef setID, CFArrayRef* localServiceIDs, CFArrayRef* resolvedServiceIDs);
 
 OSStatus MoreSCCopyUserVisibleNameOfService(CFStringRef setID, CFStringRef serviceID,

@@ -3,13 +3,13 @@
 // An entity is the dictionary that holds one protocol's configuration in a service. Fill the protocol's
 // digest (start from zeros; a member left zero is absent or false), and the builder returns the dictionary,
 // ready for MoreSCNewEntity or MoreSCSetEntity. Strings and arrays in a digest are borrowed: the entity
-// retains the very objects. Flags and numbers are stored as 32-bit numbers, flags as 0 and 1, addresses as
-// dotted quads, MAC addresses as lower-case hexadecimal bytes between colons.
+// retains the very objects. Flags and numbers are stored as 32-bit numbers, a flag as its byte (use 0 and 1),
+// addresses as dotted quads, MAC addresses as lower-case hexadecimal bytes between colons.
 //
 // Every builder's output is a new mutable dictionary of the caller's, null on failure; a null output pointer
 // means that the dictionary is not wanted, only the status. Statuses: -50 for a null digest (the two global
 // builders read none and take null) or a null member that must not be (marked "required"), -4960 when a value
-// cannot be made. Nothing here touches the preferences.
+// cannot be made, -108 without memory for a password. Nothing here touches the preferences.
 #pragma once
 
 #include <netinet/in.h>
@@ -67,9 +67,9 @@ typedef struct MoreSCAppleTalkDigest {
 // "DNS"; all zeros make an empty dictionary.
 typedef struct MoreSCDNSDigest {
     UInt32 serverAddressesCount;
-    const struct in_addr* serverAddresses;  // "ServerAddresses", an array of dotted quads
+    const struct in_addr* serverAddresses;  // "ServerAddresses", dotted quads; required with a count
     UInt32 searchDomainsCount;
-    const CFStringRef* searchDomains;  // "SearchDomains", an array; none of them null
+    const CFStringRef* searchDomains;  // "SearchDomains"; required with a count, and each of them
 } MoreSCDNSDigest;
 
 // "IPv4"; an address of 0 is absent.

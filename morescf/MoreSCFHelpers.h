@@ -1,5 +1,6 @@
 // Ready-made tasks on locations, services and the live network state. The conventions of MoreSCF.h hold: each
-// opens the session by itself, alone or inside the caller's.
+// opens the session by itself, alone or inside the caller's, but MoreSCCreateActiveDHCPServicesArray, which
+// needs none.
 #pragma once
 
 #include "morescf/MoreSCFDigest.h"
@@ -15,9 +16,11 @@ OSStatus MoreSCIsAppleTalkActive(CFStringRef setID, Boolean* active);
 // something changed.
 OSStatus MoreSCSetAppleTalkActive(CFStringRef setID, Boolean active);
 
-// The IDs of the services of the committed current location whose "IPv4" is configured by DHCP, as the
-// dynamic store tells ("Setup:/Network/Service/<service ID>/IPv4"); empty when there is none, null on
-// failure. -2 for a record without "ConfigMethod", -4960 for one that is no dictionary.
+// The local IDs, sorted by their text, of the services of the committed current location that are on and
+// whose "IPv4" is on and configured by DHCP, as the dynamic store tells
+// ("Setup:/Network/Service/<service ID>/IPv4", for every service that the location links to); empty when
+// there is none, null on failure. -2 for a record without "ConfigMethod", -4960 for one that is no
+// dictionary.
 OSStatus MoreSCCreateActiveDHCPServicesArray(CFArrayRef* activeDHCP);
 // Gives up a service's DHCP lease and asks for a new one: its "IPv4" entity in the current location is
 // switched off, committed and applied, and then on again just so. Inside a caller's session nothing is
@@ -26,7 +29,7 @@ OSStatus MoreSCCreateActiveDHCPServicesArray(CFArrayRef* activeDHCP);
 OSStatus MoreSCDHCPRelease(CFStringRef serviceID);
 
 // The first location, in store order, with exactly that name. No such location is success, with the output as
-// it was: set it to null beforehand.
+// it was: set it to null beforehand. A location without a name before it fails the search (-4960).
 OSStatus MoreSCFindSetByUserVisibleNameAndCopyID(CFStringRef userVisibleName, CFStringRef* setID);
 
 // A new location in which only the modem's service is on, with entities made from the digests: "PPP" always

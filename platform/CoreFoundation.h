@@ -129,8 +129,9 @@ CFStringRef CFStringCreateWithBytes(CFAllocatorRef allocator, const UInt8* bytes
 // Null when the units hold an unpaired surrogate.
 CFStringRef CFStringCreateWithCharacters(CFAllocatorRef allocator, const UniChar* characters,
                                          CFIndex count) LA_NOEXCEPT;
-// printf's conversions %d %i %u %ld %lu %s %c %x %% with flags, width and precision, and %@ for a value (its
-// CFCopyDescription; a null one gives "(null)"). formatOptions is null. Null when the result is not text.
+// printf's conversions %d %i %u %ld %lu %s %c %x %% with flags, width and precision, and %@ for a value (a
+// string as it stands, else its CFCopyDescription; a null one gives "(null)"). formatOptions is null. Null
+// when the result is not text.
 CFStringRef CFStringCreateWithFormat(CFAllocatorRef allocator, CFDictionaryRef formatOptions,
                                      CFStringRef format, ...) LA_NOEXCEPT;
 CFStringRef CFStringCreateCopy(CFAllocatorRef allocator, CFStringRef string) LA_NOEXCEPT;

@@ -40,7 +40,8 @@ LA_CONSTANT(SInt16, kSystemDomain, -32766);
 #define kModemScriptsFolderType 0xC46D6F64U  // more than an int of C holds
 
 // The folder of that kind in a domain. createFolder must be false. fnfErr when it does not exist, permErr
-// when it may not be seen, paramErr for an unknown kind or domain; the reference is then untouched. The user
+// when it may not be seen, ioErr when it cannot, paramErr for an unknown kind or domain; the reference is
+// then untouched. The user
 // is the one who runs the process, and the home is that of the password database.
 OSErr FSFindFolder(SInt16 domain, OSType folderType, Boolean createFolder, FSRef* folder) LA_NOEXCEPT;
 
@@ -78,7 +79,8 @@ OSStatus LSCopyItemInfoForRef(const FSRef* item, UInt32 requestedInfo, LSItemInf
 
 // A growable buffer.
 typedef struct HandleBlock* Handle;
-// A buffer of that many zero bytes; null without memory. It lives until the process ends or DisposeHandle.
+// A buffer of that many zero bytes; null for a negative size. It lives until the process ends or
+// DisposeHandle.
 Handle NewHandle(long size) LA_NOEXCEPT;
 void DisposeHandle(Handle handle) LA_NOEXCEPT;
 long GetHandleSize(Handle handle) LA_NOEXCEPT;
@@ -96,14 +98,18 @@ LA_CONSTANT(OSStatus, kURLClientError, -30795);  // the HTTP client library is m
 // larger than the bounds of platform/services/Download.cpp. 0 for an answer of class 2xx; the HTTP status for
 // every other answer (404, a redirect's 302), whatever its body; a negative value when there was no answer,
 // or a 2xx did not arrive whole, with the reason in the log. Only a 2xx fills the buffer. destination,
-// eventProc and context are null, flags is 0.
+// eventProc and context are null, flags is 0; else, and without a url or a buffer of NewHandle's, -50 with
+// the buffer as it was.
 OSStatus URLSimpleDownload(const char* url, const void* destination, Handle buffer, UInt32 flags,
                            const void* eventProc, void* context) LA_NOEXCEPT;
 
 // --- Opening a URL ---
 
-// Opens the URL in the browser of the user who sits at the computer, as that user, and returns without
-// waiting for it. Nothing happens when nobody does (fnfErr). openedURL must be null.
+// Opens an http or https URL in the browser of the user who sits at the computer, as that user, and returns
+// without waiting for it; asking the user's session about its display takes at most some 1.5 s. openedURL
+// must be null. paramErr for that, for a null URL and for another scheme; fnfErr when nobody sits there, the
+// password database does not know who, or there is no program that opens URLs; permErr when it is root, or
+// another user's session; ioErr when the program cannot be started. The reason is in the log.
 OSStatus LSOpenCFURLRef(CFURLRef url, CFURLRef* openedURL) LA_NOEXCEPT;
 
 // --- System log ---

@@ -20,7 +20,8 @@
 //   The type is "IOModemSerialStream" for a USB modem (base name "usbmodem") and a Bluetooth serial port
 //   (base name "Bluetooth-Modem"), else "IORS232SerialStream" with the kernel's name for a base name.
 //   - Its parent, the device: "Product Name", from USB.
-// Names and texts are printable UTF-8 of at most 64 bytes: a device whose name is not has no entry, and what
+// The names and texts of devices and firmware are printable UTF-8 of at most 64 bytes: a device whose name is
+// not has no entry, and what
 // does not print of a product's text is a '?'.
 #pragma once
 

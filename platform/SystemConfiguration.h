@@ -11,14 +11,15 @@ LA_BEGIN_DECLARATIONS
 struct sockaddr;
 
 LA_CONSTANT(int, kSCStatusOK, 0);
-LA_CONSTANT(int, kSCStatusFailed, 1001);           // the reason is in the system log
-LA_CONSTANT(int, kSCStatusInvalidArgument, 1002);  // a null session, key or value, or a malformed path
+// A value on the way has the wrong type, or the reason is in the system log.
+LA_CONSTANT(int, kSCStatusFailed, 1001);
+LA_CONSTANT(int, kSCStatusInvalidArgument, 1002);  // a null key or value, or a malformed path
 LA_CONSTANT(int, kSCStatusAccessError, 1003);      // no rights to read or to write
 LA_CONSTANT(int, kSCStatusNoKey, 1004);            // nothing at the key or path
 LA_CONSTANT(int, kSCStatusKeyExists, 1005);
 LA_CONSTANT(int, kSCStatusLocked, 1006);
 LA_CONSTANT(int, kSCStatusNeedLock, 1007);
-LA_CONSTANT(int, kSCStatusNoStoreSession, 2001);
+LA_CONSTANT(int, kSCStatusNoStoreSession, 2001);  // the session on the live state is null
 LA_CONSTANT(int, kSCStatusNoStoreServer, 2002);
 LA_CONSTANT(int, kSCStatusNotifierActive, 2003);
 LA_CONSTANT(int, kSCStatusNoPrefsSession, 3001);  // the session is null
@@ -42,7 +43,7 @@ typedef struct OpaqueSCPreferences* SCPreferencesRef;
 // too large, a symbolic link or anything else that is not a regular file, in a directory that somebody other
 // than this user or root owns or may write to), 1003 without the rights, 1002 without a name. Without a file
 // the session holds the first-run tree, in memory until something commits it, and whoever could not make the
-// file is refused with 1003.
+// file is refused with 1003. A file of this user's that others could read or write gets mode 0600.
 SCPreferencesRef SCPreferencesCreate(CFAllocatorRef allocator, CFStringRef name,
                                      CFStringRef prefsID) LA_NOEXCEPT;
 // Takes the store's cross-process lock. False: 3002 when another process holds it (with wait: still holds it
@@ -67,7 +68,7 @@ CFDictionaryRef SCPreferencesPathGetValue(SCPreferencesRef session, CFStringRef 
 Boolean SCPreferencesPathSetValue(SCPreferencesRef session, CFStringRef path,
                                   CFDictionaryRef value) LA_NOEXCEPT;
 // The path that the dictionary's "__LINK__" names, borrowed; null: 1004 when the dictionary is absent or is
-// no link, 1001 when something on the way or the link itself has the wrong type.
+// no link, 1001 when something on the way or the link itself has the wrong type, 1002 for a malformed path.
 CFStringRef SCPreferencesPathGetLink(SCPreferencesRef session, CFStringRef path) LA_NOEXCEPT;
 // Removes whatever is at the path. False: 1004 when nothing is there, 1001, 1002.
 Boolean SCPreferencesPathRemoveValue(SCPreferencesRef session, CFStringRef path) LA_NOEXCEPT;
@@ -101,11 +102,11 @@ extern const CFStringRef kSCDynamicStoreDomainState;  // "State:"
 extern const CFStringRef kSCDynamicStoreDomainSetup;  // "Setup:"
 extern const CFStringRef kSCEntNetIPv4;               // "IPv4"
 
-// A session on the live state, released with CFRelease. name, which is for the log, may be null; callBack
-// and context may be null when no notices are wanted. The state is computed when it is asked for, from the
-// kernel and from the committed preferences; the keys are "State:/Network/Global/IPv4" and, for what is
-// switched on in the current location, "Setup:/Network/Global/<entity>" and
-// "Setup:/Network/Service/<serviceID>/<entity>".
+// A session on the live state, released with CFRelease; the calls below give 2001 for a null one. name, which
+// is for the log, may be null; callBack and context may be null when no notices are wanted. The state is
+// computed when it is asked for, from the kernel and from the committed preferences; the keys are
+// "State:/Network/Global/IPv4" and, for what is switched on in the current location and in the services that
+// it links to, "Setup:/Network/Global/<entity>" and "Setup:/Network/Service/<serviceID>/<entity>".
 SCDynamicStoreRef SCDynamicStoreCreate(CFAllocatorRef allocator, CFStringRef name,
                                        SCDynamicStoreCallBack callBack,
                                        SCDynamicStoreContext* context) LA_NOEXCEPT;
@@ -117,9 +118,10 @@ CFStringRef SCDynamicStoreKeyCreateNetworkServiceEntity(CFAllocatorRef allocator
                                                         CFStringRef serviceID,
                                                         CFStringRef entity) LA_NOEXCEPT;
 // The keys that match the whole of a POSIX extended regular expression, sorted by their text; an empty array
-// when none does. Null: 1002 for a malformed expression, 1001 or 1003 when the state cannot be read.
+// when none does. Null: 1002 for a null or malformed expression, 1001 or 1003 when the state cannot be read.
 CFArrayRef SCDynamicStoreCopyKeyList(SCDynamicStoreRef store, CFStringRef pattern) LA_NOEXCEPT;
-// The value at a key; null with 1004 when there is none, 1001 or 1003 when it cannot be read.
+// The value at a key; null with 1004 when there is none, 1002 for a null key, 1001 or 1003 when it cannot be
+// read.
 //
 // "State:/Network/Global/IPv4" is there while there is a default route: "PrimaryInterface", the interface's
 // name; "Router", a dotted quad, when the route has one; "PrimaryService", the ID of the first service of the

@@ -32,7 +32,7 @@ struct StatusText {
 
 constexpr StatusText statusTexts[] = {
     {kSCStatusOK, "Success"},
-    {kSCStatusFailed, "Failed; the reason is in the system log"},
+    {kSCStatusFailed, "Failed: a value has the wrong type, or the reason is in the system log"},
     {kSCStatusInvalidArgument, "Invalid argument"},
     {kSCStatusAccessError, "Permission denied"},
     {kSCStatusNoKey, "No such key"},
