@@ -52,8 +52,6 @@ Outcome startHeld(const DhcpSettings& settings, const std::string& hook, Process
         (void)std::signal(SIGUSR1, SIG_IGN);
         const pid_t number = getpid();
         char go = 0;
-        // Told to hurry before it listens for that, it would end.
-        (void)std::signal(SIGUSR1, SIG_IGN);
         if (::write(channel, &number, sizeof number) == sizeof number && ::read(channel, &go, 1) == 1 &&
             ::chdir("/") == 0) {
             (void)becomeProgram(currentHost().dhcpClient, argumentsFor(settings, hook),
