@@ -63,12 +63,11 @@ class DiskFaultTest : public StoreTest {
             errno = error;
             return false;
         }
-        if (step == "write") {
-            unsynced_.insert(path);
-        } else if (step == "fsync") {
+        if (step == "fsync") {
             ++syncs;
             unsynced_.erase(path);
-        } else if (step == "rename" && unsynced_.erase(platform::temporaryFor(path)) != 0) {
+        } else if (step == "write" ||
+                   (step == "rename" && unsynced_.erase(platform::temporaryFor(path)) != 0)) {
             unsynced_.insert(path);
         }
         return true;

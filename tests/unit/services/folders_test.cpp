@@ -74,12 +74,13 @@ std::string statusesWith(const std::vector<std::string>& inputs) {
     const std::size_t wrong = std::stoul(inputs[0]);
     FSRef folder{}, item{}, found{};
     const FSRef unknown{};
-    FSIterator iterator = nullptr, other = nullptr, none = nullptr;
+    FSIterator iterator = nullptr, other = nullptr;
     UInt32 count = 9;
     SInt32 version = 9;
     LSItemInfoRecord info{9};
     EXPECT_EQ(FSFindFolder(kLocalDomain, kModemScriptsFolderType, false, &folder), noErr);
     EXPECT_EQ(FSOpenIterator(&folder, kFSIterateFlat, &iterator), noErr);
+    FSIterator none = iterator;
     Handle const buffer = NewHandle(2);
     void* odd[8] = {};
     odd[wrong] = &info;
@@ -101,7 +102,7 @@ std::string statusesWith(const std::vector<std::string>& inputs) {
     EXPECT_EQ(count, wrong == 0 ? 1U : wrong == 3 ? 9U : 0U);
     EXPECT_EQ(version, wrong == 1 || wrong == 2 ? 9 : 0x1040);
     EXPECT_EQ(GetHandleSize(buffer), wrong % 7 == 0 ? 0 : 2);
-    EXPECT_EQ(NewHandle(-1), nullptr);
+    EXPECT_TRUE(NewHandle(-1) == nullptr && none == nullptr);
     DisposeHandle(buffer);
     std::string told;
     for (const OSStatus status : statuses) {

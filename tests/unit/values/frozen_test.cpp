@@ -86,6 +86,7 @@ TEST(Editing, WritesInPlaceWhatNobodyElseHolds) {
     const auto held = Owned<CFDictionaryRef>::retained(set);
     rename("newer");
     EXPECT_EQ(show(held.get()), "{Name = new}");
+    const auto whole = Owned<CFDictionaryRef>::retained(root.get());
     removeAtPath(root, std::vector{str("Sets"), str("0")});
     setAtPath(root, std::vector{str("a"), str("b"), str("c")}, kCFBooleanTrue);
     EXPECT_EQ(show(root.get()), "{Sets = {1 = {Name = newer}}; CurrentSet = /Sets/0; a = {b = {c = #true}}}");
