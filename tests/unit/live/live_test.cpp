@@ -28,13 +28,18 @@ using StoreRef = Owned<SCDynamicStoreRef>;
 class Scene {
   public:
     explicit Scene(std::shared_ptr<FakeNetworkState> network) : network_(std::move(network)) {
-        SCDynamicStoreContext context{0, this, nullptr, nullptr, nullptr};
+        SCDynamicStoreContext context{0, this,
+                                      [](const void* info) {
+                                          ++held_;
+                                          return info;
+                                      },
+                                      [](const void* /*info*/) { --held_; }, nullptr};
         store_ = StoreRef::adopt(SCDynamicStoreCreate(nullptr, CFSTR("tester"), &Scene::changed, &context));
         source_ =
             Owned<CFRunLoopSourceRef>::adopt(SCDynamicStoreCreateRunLoopSource(nullptr, store_.get(), 0));
         CFRunLoopAddSource(CFRunLoopGetCurrent(), source_.get(), kCFRunLoopDefaultMode);
     }
-    ~Scene() { CFRunLoopRemoveSource(CFRunLoopGetCurrent(), source_.get(), kCFRunLoopDefaultMode); }
+    ~Scene() { close(); }
 
     // A step, and what came of it.
     std::string play(const std::string& step) {
@@ -79,6 +84,17 @@ class Scene {
                                                      arrayIn(rest.substr(bar + 3)).get()) != 0
                        ? ""
                        : "status " + std::to_string(SCError());
+        } else if (name == "key") {
+            return told(SCDynamicStoreKeyCreateNetworkServiceEntity(nullptr, text(rest).get(), CFSTR("id"),
+                                                                    CFSTR("IPv4")));
+        } else if (name == "source") {
+            return told(SCDynamicStoreCreateRunLoopSource(nullptr, store_.get(), 0));
+        } else if (name == "held") {
+            return std::to_string(held_);
+        } else if (name == "close") {
+            store_ = {};
+        } else if (name == "stop") {
+            close();
         } else if (name == "news") {
             return news(std::stoul(rest), 10);
         } else if (name == "none") {
@@ -108,7 +124,13 @@ class Scene {
     }
 
   private:
-    static Owned<CFStringRef> text(std::string_view bytes) { return platform::values::makeString(bytes); }
+    void close() {
+        CFRunLoopRemoveSource(CFRunLoopGetCurrent(), source_.get(), kCFRunLoopDefaultMode);
+        source_ = {};
+    }
+    static Owned<CFStringRef> text(std::string_view bytes) {
+        return platform::values::makeString(testing_support::unescaped(bytes));
+    }
     static Owned<CFArrayRef> arrayIn(std::string_view notation) {
         return Owned<CFArrayRef>::retained(
             platform::values::as<CFArrayRef>(testing_support::read(notation).get()));
@@ -176,6 +198,7 @@ class Scene {
     std::string news_;
     std::size_t count_ = 0;
     int calls_ = 0;
+    static inline int held_ = 0;  // by those who may call back
 };
 
 void playTranscript(const std::string& name, const std::shared_ptr<FakeNetworkState>& network) {
@@ -197,26 +220,6 @@ TEST_F(KernelNetworkTest, FollowsTheKernel) {
         EXPECT_EQ(unshare(CLONE_NEWNET), 0);
         playTranscript("live_kernel", nullptr);
     });
-}
-
-TEST(Live, TheContextLivesAsLongAsTheSession) {
-    static int held = 0;
-    SCDynamicStoreContext context{0, &held,
-                                  [](const void* info) {
-                                      ++held;
-                                      return info;
-                                  },
-                                  [](const void* /*info*/) { --held; }, nullptr};
-    StoreRef store = StoreRef::adopt(SCDynamicStoreCreate(nullptr, nullptr, nullptr, &context));
-    auto source =
-        Owned<CFRunLoopSourceRef>::adopt(SCDynamicStoreCreateRunLoopSource(nullptr, store.get(), 0));
-    EXPECT_EQ(held, 1);
-    store = {};
-    EXPECT_EQ(held, 1) << "the source holds the session";
-    source = {};
-    EXPECT_EQ(held, 0);
-    EXPECT_EQ(SCDynamicStoreCopyKeyList(nullptr, CFSTR(".*")), nullptr);
-    EXPECT_EQ(SCError(), 2001) << "no session";
 }
 
 }  // namespace

@@ -66,30 +66,27 @@ TEST(Dictionary, BehavesAsAModelThroughRandomChanges) {
     std::mt19937 generator(4);
     const auto random = [&] { return static_cast<unsigned>(generator()); };
     for (const unsigned keyCount : {5U, 20U, 400U}) {
-        std::vector<Owned<CFNumberRef>> keys;
-        for (unsigned i = 0; i < keyCount; ++i) {
-            keys.push_back(makeNumber(i));
-        }
         auto dictionary = mutableDictionary();
         std::vector<unsigned> model;
         std::vector<std::pair<Owned<CFMutableDictionaryRef>, std::vector<unsigned>>> copies;
         for (int step = 0; step < 6000; ++step) {
             const unsigned key = random() % keyCount;
+            const auto number = makeNumber(key);
             const auto place = std::ranges::find(model, key);
             if (random() % 100 < (step / 1000 % 2 == 0 ? 70U : 30U)) {
-                CFDictionarySetValue(dictionary.get(), keys[key].get(), keys[key].get());
+                CFDictionarySetValue(dictionary.get(), number.get(), number.get());
                 if (place == model.end()) {
                     model.push_back(key);
                 }
             } else {
-                CFDictionaryRemoveValue(dictionary.get(), keys[key].get());
+                CFDictionaryRemoveValue(dictionary.get(), number.get());
                 if (place != model.end()) {
                     model.erase(place);
                 }
             }
             ASSERT_EQ(CFDictionaryGetCount(dictionary.get()), static_cast<CFIndex>(model.size()));
             const unsigned asked = random() % keyCount;
-            ASSERT_EQ(CFDictionaryContainsKey(dictionary.get(), keys[asked].get()) != 0,
+            ASSERT_EQ(CFDictionaryContainsKey(dictionary.get(), makeNumber(asked).get()) != 0,
                       std::ranges::find(model, asked) != model.end());
             if (step % 500 == 0) {
                 copies.emplace_back(dictionary, model);
