@@ -41,11 +41,11 @@ class StandInSupplicant {
     StandInSupplicant& operator=(const StandInSupplicant&) = delete;
 
     // One network on the air: its flags and its name.
-    void hear(const std::string& network, int age = 0) {
+    void hear(const std::string& network) {
         const std::size_t space = network.find(' ');
         answers["BSS FIRST"] =
-            "id=7\nbssid=02:00:00:00:00:01\nfreq=2462\nlevel=-50\nage=" + std::to_string(age) +
-            "\nflags=" + network.substr(0, space) + "\nssid=" + network.substr(space + 1) + "\n";
+            "id=7\nbssid=02:00:00:00:00:01\nfreq=2462\nlevel=-50\nage=0\nflags=" + network.substr(0, space) +
+            "\nssid=" + network.substr(space + 1) + "\n";
     }
     // The card is on the network of that number.
     void join(int number, const std::string& bssid = "02:00:00:00:00:01") {

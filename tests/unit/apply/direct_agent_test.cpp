@@ -17,6 +17,7 @@
 #include "tests/unit/apply/StandInSupplicant.h"
 #include "tests/unit/support/Interrupted.h"
 #include "tests/unit/support/PrivateNetwork.h"
+#include "tests/unit/support/TemporaryDirectory.h"
 #include "tests/unit/support/Transcript.h"
 
 namespace platform::apply {
@@ -36,7 +37,7 @@ std::string machineState() {
     for (std::string line; std::getline(all, line);) {
         const auto has = [&line](const char* text) { return line.find(text) != std::string::npos; };
         if (has("valid_lft") || has("scope link \n") || has("inet6 fe80") || has("table local") ||
-            has("proto ra") || (has("proto kernel") && has("::"))) {
+            has("mngtmpaddr") || has("proto ra") || (has("proto kernel") && has("::"))) {
             continue;
         }
         for (const char* word : {"NO-CARRIER,", ",LOWER_UP", ",M-DOWN", " linkdown"}) {
@@ -95,15 +96,9 @@ class DirectAgentTest : public testing_support::PrivateNetworkTest {
     }
     // What the body gives back, which is all that comes out of there.
     static std::string seen(const std::function<std::string()>& body) {
-        FILE* const file = tmpfile();
-        run([&] {
-            const std::string text = body();
-            EXPECT_EQ(text.size(), fwrite(text.data(), 1, text.size(), file));
-        });
-        rewind(file);
-        std::string text(4096, '\0');
-        text.resize(fread(text.data(), 1, text.size(), file));
-        fclose(file);
+        const testing_support::TemporaryDirectory folder;
+        run([&] { (void)folder.write("seen", body()); });
+        std::string text = shell("cat " + folder.at("seen"));
         std::ranges::replace(text, '\n', ';');
         return text;
     }
@@ -114,9 +109,11 @@ std::string takeLog() {
 }
 
 values::Owned<CFDictionaryRef> thereTree(const std::string& address = "192.0.0.199") {
-    Service card0 = fixedService("card0", address);
-    card0.entries += "DNS = {ServerAddresses = (192.0.0.53)};";
-    return makeTree({{"card1", switchedOff}, card0, {"missing", switchedOff}});
+    return makeTree({"card1 __INACTIVE__ = #1",
+                     "card0 IPv4 = {ConfigMethod = Manual; Addresses = (" + address +
+                         "); SubnetMasks = (255.255.255.0); Router = 192.0.0.192};"
+                         "DNS = {ServerAddresses = (192.0.0.53)}",
+                     "missing __INACTIVE__ = #1"});
 }
 
 // The process ends before every single step of going there, elsewhere and back; the next run goes on, or
@@ -235,14 +232,13 @@ class Scene {
             return bring(words);
         } else if (name == "daemons") {
             daemons_ = findOtherDaemons("card0", linkIndex);
-            return std::string(daemons_.networkd ? "networkd" : "no networkd") + ", clients " +
+            return std::string(daemons_.networkd ? "networkd" : "no networkd") +
+                   (isNetworkdSettled(linkIndex) ? ", settled, clients " : ", clients ") +
                    std::to_string(daemons_.dhcpClients.size());
         } else if (name == "suspend") {
             suspendOtherDaemons(rest, linkIndex, daemons_);
         } else if (name == "resume") {
             return resumeOtherDaemons("card0", daemons_).reason();
-        } else if (name == "settled") {
-            return isNetworkdSettled(linkIndex) ? "yes" : "no";
         } else if (name == "forget") {
             Kernel kernel;
             EXPECT_TRUE(kernel.open("card0").ok() && kernel.link());
@@ -258,9 +254,10 @@ class Scene {
 
     std::string locate(const std::string& entities) {
         // Behind "//" the second card's.
-        std::vector<Service> services{{"card0", entities.substr(0, entities.find("//"))}};
-        if (services[0].entries.size() < entities.size()) {
-            services.push_back({"card1", entities.substr(services[0].entries.size() + 2)});
+        const std::size_t end = std::min(entities.find("//"), entities.size());
+        Lines services{"card0 " + entities.substr(0, end)};
+        if (end < entities.size()) {
+            services.push_back("card1 " + entities.substr(end + 2));
         }
         const std::string reason = activate(makeTree(services).get());
         // A client that dies leaves its steps behind.
@@ -303,8 +300,6 @@ class Scene {
                 testing_support::unescaped(rest.substr(equals + 3));
         } else if (name == "hear") {
             supplicant_->hear(rest);
-        } else if (name == "hear-of-old") {
-            supplicant_->hear(rest, 16);
         } else if (name == "hear-later") {
             supplicant_->heardLater = rest;
         } else if (name == "notice") {

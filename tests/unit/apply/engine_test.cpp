@@ -96,11 +96,8 @@ class Scene {
         override_ = std::make_unique<HostOverride>(host);
     }
     values::Owned<CFDictionaryRef> treeOf(const std::string& services) const {
-        std::vector<Service> all;
-        for (const std::string& each : testing_support::Transcript::inputsIn(services)) {
-            all.push_back(serviceOf(each));
-        }
-        return makeTree(services.empty() ? std::vector<Service>() : all, location_);
+        return makeTree(services.empty() ? Lines() : testing_support::Transcript::inputsIn(services),
+                        location_);
     }
     void write(const std::string& services) const {
         (void)folder_.write("store/preferences.plist", *values::writePropertyListXML(treeOf(services).get()));

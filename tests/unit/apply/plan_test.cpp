@@ -34,11 +34,7 @@ std::string describe(const std::vector<ManualAddress>& addresses, IPv4Address ro
 // Services, "device entries", or a whole tree: what each interface is to be, and what is wrong with the
 // location.
 std::string planOf(const Inputs& inputs) {
-    std::vector<Service> services;
-    for (const std::string& each : inputs) {
-        services.push_back(serviceOf(each));
-    }
-    const auto tree = inputs[0][0] == '{' ? readTree(inputs[0]) : makeTree(services);
+    const auto tree = inputs[0][0] == '{' ? readTree(inputs[0]) : makeTree(inputs);
     std::vector<Trouble> troubles;
     std::string text;
     for (const InterfacePlan& one : makePlan(tree.get(), troubles)) {

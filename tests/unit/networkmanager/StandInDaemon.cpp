@@ -61,8 +61,8 @@ void StandInDaemon::starts() {
         service_.behind = [this, state] {
             objects[card] = state;
             objects[manager]["Startup"] = {false};
-            service_.tell(manager, nullptr, "PropertiesChanged", "sa{sv}as", "org.freedesktop.NetworkManager",
-                          0, 0);
+            service_.tell(manager, "org.freedesktop.DBus.Properties", "PropertiesChanged", "sa{sv}as",
+                          "org.freedesktop.NetworkManager", 0, 0);
         };
     };
 }

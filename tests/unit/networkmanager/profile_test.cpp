@@ -35,7 +35,7 @@ Sections made(const InterfacePlan& plan, const WirelessLink* link = nullptr,
 // The second of two active interfaces, by the entries of its service.
 InterfacePlan planOf(const std::string& entries) {
     std::vector<Trouble> troubles;
-    return makePlan(makeTree({{"eth1", ""}, {"eth0", entries}}).get(), troubles).at(1);
+    return makePlan(makeTree({"eth1", "eth0 " + entries}).get(), troubles).at(1);
 }
 
 // Of networks on the air, "SECURITY STRENGTH [old] [cell]", and a key: the profile's sections about the

@@ -94,9 +94,8 @@ class StandInService {
     template <class... Arguments>
     void tell(const std::string& path, const char* interface, const char* member, Arguments... arguments) {
         sd_bus_message* made = nullptr;
-        sd_bus_message_new_signal(
-            bus_, &made, path.c_str(),
-            interface == nullptr ? "org.freedesktop.DBus.Properties" : (name_ + interface).c_str(), member);
+        const std::string name = (*interface == '.' ? name_ : "") + interface;
+        sd_bus_message_new_signal(bus_, &made, path.c_str(), name.c_str(), member);
         sd_bus_message_append(made, arguments...);
         signals_.emplace_back(made);
     }
