@@ -32,11 +32,11 @@ std::string textIn(const Sections& sections, const char* key) {
 }  // namespace
 
 StandInDaemon::StandInDaemon(const StandInBus& bus)
-    : service_(bus, "org.freedesktop.NetworkManager",
-               [this](sd_bus_message* call, sd_bus_message* reply) { return answer(call, reply); }) {
-    objects[manager] = {
+    : service(bus, "org.freedesktop.NetworkManager",
+              [this](sd_bus_message* call, sd_bus_message* reply) { return answer(call, reply); }) {
+    service.objects[manager] = {
         {"Startup", {false}}, {"WirelessEnabled", {true}}, {"WirelessHardwareEnabled", {true}}};
-    objects[card] = {
+    service.objects[card] = {
         {"DeviceType", {2U}}, {"State", {deviceDisconnected}}, {"Managed", {true}}, {"Autoconnect", {true}}};
 }
 
@@ -45,24 +45,24 @@ void StandInDaemon::offer(const std::string& network, std::uint32_t mode, std::u
     timespec now{};
     clock_gettime(CLOCK_BOOTTIME, &now);
     const std::string path = manager + "/AccessPoint/" + std::to_string(++next_);
-    objects[path] = {{"Ssid", {Bytes(network.begin(), network.end())}},
-                     {"Mode", {mode}},
-                     {"Flags", {privacy}},
-                     {"RsnFlags", {protection}},
-                     {"Frequency", {2412U}},
-                     {"LastSeen", {static_cast<std::int32_t>(now.tv_sec)}}};
+    service.objects[path] = {{"Ssid", {Bytes(network.begin(), network.end())}},
+                             {"Mode", {mode}},
+                             {"Flags", {privacy}},
+                             {"RsnFlags", {protection}},
+                             {"Frequency", {2412U}},
+                             {"LastSeen", {static_cast<std::int32_t>(now.tv_sec)}}};
     (isQuiet ? quietPoints_ : points_).push_back(path);
 }
 
 void StandInDaemon::starts() {
-    objects[manager]["Startup"] = {true};
+    service.objects[manager]["Startup"] = {true};
     // Until it was asked twice how far it is.
-    service_.behind = [this, state = std::exchange(objects[card], {})] {
-        service_.behind = [this, state] {
-            objects[card] = state;
-            objects[manager]["Startup"] = {false};
-            service_.tell(manager, "org.freedesktop.DBus.Properties", "PropertiesChanged", "sa{sv}as",
-                          "org.freedesktop.NetworkManager", 0, 0);
+    service.behind = [this, state = std::exchange(service.objects[card], {})] {
+        service.behind = [this, state] {
+            service.objects[card] = state;
+            service.objects[manager]["Startup"] = {false};
+            service.tell(manager, "org.freedesktop.DBus.Properties", "PropertiesChanged", "sa{sv}as",
+                         "org.freedesktop.NetworkManager", 0, 0);
         };
     };
 }
@@ -92,7 +92,7 @@ std::string StandInDaemon::answer(sd_bus_message* call, sd_bus_message* reply) {
         }
         sd_bus_message_close_container(reply);
     } else {
-        const bool isRefused = !service_.refusal.empty() && service_.refused.empty();
+        const bool isRefused = !service.refusal.empty() && service.refused.empty();
         return isRefused ? ".PermissionDenied" : change(member, path, call, reply);
     }
     return "";
@@ -106,10 +106,10 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
         StandInService::readText(call);
         const std::string name = StandInService::readText(call);
         sd_bus_message_read(call, "v", "b", &flag);
-        if (name == service_.refused) {
+        if (name == service.refused) {
             return ".PermissionDenied";
         }
-        objects[path][name] = {flag != 0};
+        service.objects[path][name] = {flag != 0};
         changes.back() = name + (flag != 0 ? " on" : " off");
         if (name != "Autoconnect") {
             moveCard(flag != 0 ? deviceDisconnected : 10);
@@ -117,7 +117,7 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
     } else if (member == "AddConnection2") {
         std::uint32_t flags = 0;
         const std::string added = manager + "/Settings/" + std::to_string(++next_);
-        objects[added];
+        service.objects[added];
         readValue(call, profiles[added]);
         sd_bus_message_read(call, "u", &flags);
         changes.back() += (flags & 0x20U) != 0 ? " held back" : "";
@@ -137,8 +137,8 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
         changes.back() = "Activate " + textIn(profiles.at(profile), "id");
         activate(profile, reply);
     } else if (member == "Disconnect") {
-        objects[card]["Autoconnect"] = {false};
-        if (!objects[card].contains("ActiveConnection")) {
+        service.objects[card]["Autoconnect"] = {false};
+        if (!service.objects[card].contains("ActiveConnection")) {
             changes.pop_back();
             return ".Device.NotActive";
         }
@@ -155,27 +155,27 @@ std::string StandInDaemon::change(const std::string& member, const std::string& 
 }
 
 void StandInDaemon::activate(const std::string& profile, sd_bus_message* reply) {
-    if (objects[card].contains("ActiveConnection")) {
+    if (service.objects[card].contains("ActiveConnection")) {
         leave(60);
     }
     const std::string path = manager + "/ActiveConnection/" + std::to_string(++next_);
-    objects[path] = {{"Connection", {profile}}, {"Uuid", {textIn(profiles[profile], "uuid")}}};
-    objects[card]["ActiveConnection"] = {path};
-    objects[card]["Autoconnect"] = {true};
+    service.objects[path] = {{"Connection", {profile}}, {"Uuid", {textIn(profiles[profile], "uuid")}}};
+    service.objects[card]["ActiveConnection"] = {path};
+    service.objects[card]["Autoconnect"] = {true};
     sd_bus_message_append(reply, "o", path.c_str());
     const bool isLooking = !quietPoints_.empty();
     if (isLooking) {
         points_.push_back(quietPoints_.front());
         quietPoints_.erase(quietPoints_.begin());
-        objects[card]["LastScan"] = {std::int64_t{++next_}};
-        service_.tell(card, ".Device.Wireless", "AccessPointAdded", "");
+        service.objects[card]["LastScan"] = {std::int64_t{++next_}};
+        service.tell(card, ".Device.Wireless", "AccessPointAdded", "");
     }
     moveCard(40);
     moveActive(path, 1);
     if (failure != 0) {
         moveActive(path, activeDeactivated);
         moveCard(deviceFailed, failure);
-        objects[card].erase("ActiveConnection");
+        service.objects[card].erase("ActiveConnection");
         moveCard(deviceDisconnected);
     } else if (!isLooking) {
         moveCard(deviceGetsAddresses);
@@ -193,19 +193,20 @@ void StandInDaemon::activate(const std::string& profile, sd_bus_message* reply) 
 
 void StandInDaemon::leave(std::uint32_t reason) {
     moveCard(deviceDeactivating, reason);
-    moveActive(valueOf<std::string>(objects[card], "ActiveConnection").value_or(""), activeDeactivated);
-    objects[card].erase("ActiveConnection");
+    moveActive(valueOf<std::string>(service.objects[card], "ActiveConnection").value_or(""),
+               activeDeactivated);
+    service.objects[card].erase("ActiveConnection");
     moveCard(deviceDisconnected);
 }
 
 void StandInDaemon::moveCard(std::uint32_t state, std::uint32_t reason) {
-    objects[card]["State"] = {state};
-    service_.tell(card, ".Device", "StateChanged", "uuu", state, 0U, reason);
+    service.objects[card]["State"] = {state};
+    service.tell(card, ".Device", "StateChanged", "uuu", state, 0U, reason);
 }
 
 void StandInDaemon::moveActive(const std::string& path, std::uint32_t state) {
-    objects[path]["State"] = {state};
-    service_.tell(path, ".Connection.Active", "StateChanged", "uu", state, 0U);
+    service.objects[path]["State"] = {state};
+    service.tell(path, ".Connection.Active", "StateChanged", "uu", state, 0U);
 }
 
 }  // namespace testing_support

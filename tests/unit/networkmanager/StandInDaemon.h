@@ -28,12 +28,7 @@ class StandInDaemon {
     std::uint32_t failure = 0;  // the reason for which activations fail
     bool hangs = false;         // activations get no address
     sd_bus* forger = nullptr;   // somebody else, who says that they do
-    // To change anything, or one call, or all about one object.
-    void refuse(const std::string& why, const std::string& what) {
-        service_.refusal = why;
-        service_.refused = what;
-    }
-    void starts();  // it is not what it will be, once
+    void starts();              // it is not what it will be, once
     // Every request that changes something, in order.
     std::vector<std::string> changes;
 
@@ -52,10 +47,9 @@ class StandInDaemon {
     platform::apply::Texts points_;
     platform::apply::Texts quietPoints_;
     unsigned next_ = 0;
-    StandInService service_;
 
   public:
-    std::map<std::string, platform::apply::Dictionary>& objects = service_.objects;
+    StandInService service;  // which refuses to change anything, or one call, or all about one object
 };
 
 }  // namespace testing_support

@@ -60,11 +60,12 @@ class Scene {
             const auto isMeant = [part = word()](const auto& each) {
                 return each.first.find(part) != std::string::npos;
             };
-            std::erase_if(daemon_.objects, isMeant);
+            std::erase_if(daemon_.service.objects, isMeant);
             std::erase_if(daemon_.profiles, isMeant);
         } else if (name == "set") {
             const std::string path = word(), property = word(), value = word();
-            daemon_.objects[path[0] == '/' ? path : StandInDaemon::manager + path.substr(1)][property] =
+            daemon_.service
+                .objects[path[0] == '/' ? path : StandInDaemon::manager + path.substr(1)][property] =
                 value == "true" || value == "false" ? Value{value == "true"}
                 : std::isdigit(value[0]) != 0       ? Value{static_cast<std::uint32_t>(std::stoul(value))}
                                                     : Value{value};
@@ -73,8 +74,8 @@ class Scene {
         } else if (name == "hang") {
             daemon_.hangs = true;
         } else if (name == "refuse") {
-            const std::string why = word();
-            daemon_.refuse(why, word());
+            daemon_.service.refusal = word();
+            daemon_.service.refused = word();
         } else if (name == "start") {
             daemon_.starts();
         } else if (name == "within") {
@@ -104,12 +105,12 @@ class Scene {
         sections["802-11-wireless-security"].insert({{"psk-flags", {1U}}, {"leap-password-flags", {1U}}});
         sections["connection"]["uuid"] = {std::string("home")};
         sections["connection"]["id"] = {std::string("Home")};
-        daemon_.objects["/home"];
-        daemon_.objects["/onHome"] = {{"Connection", {std::string("/home")}},
-                                      {"Uuid", {std::string("home")}},
-                                      {"State", {activeActivated}}};
-        daemon_.objects[StandInDaemon::card]["ActiveConnection"] = {std::string("/onHome")};
-        daemon_.objects[StandInDaemon::card]["State"] = {deviceActivated};
+        daemon_.service.objects["/home"];
+        daemon_.service.objects["/onHome"] = {{"Connection", {std::string("/home")}},
+                                              {"Uuid", {std::string("home")}},
+                                              {"State", {activeActivated}}};
+        daemon_.service.objects[StandInDaemon::card]["ActiveConnection"] = {std::string("/onHome")};
+        daemon_.service.objects[StandInDaemon::card]["State"] = {deviceActivated};
     }
 
     std::string look() {
