@@ -19,6 +19,7 @@ using platform::preferences::Session;
 //
 //     store                        a good store instead of all that there was, and no sessions
 //     sh COMMAND                   in the directory that holds the store's
+//     status NUMBER                what it means
 //     a open                       a close
 //     a lock, a lock wait          a unlock           a commit, a commit soon: waiting for no lock
 //     a get PATH                   a link PATH        a remove PATH      a value KEY
@@ -46,6 +47,9 @@ class Player : public StoreTest {
             const std::string output =
                 testing_support::shell("cd " + directory.path().string() + "\n" + step.substr(3));
             return output.empty() ? "" : "    " + output.substr(0, output.size() - 1);
+        }
+        if (name == "status") {
+            return std::string("    ") + SCErrorString(std::stoi(verb));
         }
         if (name == "held") {
             std::string all;
