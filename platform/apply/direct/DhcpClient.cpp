@@ -48,6 +48,8 @@ std::vector<std::string> argumentsFor(const DhcpSettings& settings, const std::s
 Outcome startHeld(const DhcpSettings& settings, const std::string& hook, Process& client,
                   FileDescriptor& gate) {
     const auto run = [&](int channel) {
+        // Until it listens: on a network that the card is on already it is hurried at once.
+        (void)std::signal(SIGUSR1, SIG_IGN);
         const pid_t number = getpid();
         char go = 0;
         if (::write(channel, &number, sizeof number) == sizeof number && ::read(channel, &go, 1) == 1 &&
