@@ -76,7 +76,8 @@ SupplicantValues valuesIn(std::string_view answer) {
 // The protection that the flags of a scan result tell of.
 Security securityOf(std::string_view flags) {
     const auto has = [flags](const char* flag) { return flags.find(flag) != std::string_view::npos; };
-    // Of several ways the supplicant tells all; that of a network which hands over its members is another one.
+    // Of several ways the supplicant tells all; that of a network which hands over its members is another
+    // one.
     if (has("-PSK") || has("+PSK")) {
         return Security::wpa;
     }
