@@ -28,7 +28,7 @@ std::optional<InterfacePlan> planOf(const std::string& task, const std::string& 
     plan.method = plan.active ? IPv4Method::dhcp : IPv4Method::none;
     plan.rank = task == "join-second" ? 1 : 0;
     if (task.starts_with("join")) {
-        plan.wireless = WirelessSettings{true, {}, {}};
+        plan.wireless = WirelessSettings{task != "join-dark", {}, {}};
         plan.wireless->network = network.empty() ? std::nullopt : std::optional(network);
         plan.wireless->key = key.empty() ? std::nullopt : std::optional(key);
     }
