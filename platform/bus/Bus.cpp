@@ -168,13 +168,13 @@ Outcome Bus::readOwner(bool& owned) {
                                            : fromBus("asking for the owner of " + service_, result);
 }
 
-Outcome Bus::call(const Call& call, Message& reply, std::string* errorName) {
+Outcome Bus::call(const Call& call, MessageRef& reply, std::string* errorName) {
     sd_bus_message* made = nullptr;
     int result = bus_ == nullptr
                      ? -ENOTCONN
                      : sd_bus_message_new_method_call(bus_.get(), &made, service_.c_str(), call.path.c_str(),
                                                       call.interface.c_str(), call.member);
-    const Message message(made);
+    const MessageRef message(made);
     if (result >= 0) {
         // A daemon that the user has stopped stays so.
         result = sd_bus_message_set_auto_start(made, 0);
@@ -201,7 +201,7 @@ Outcome Bus::call(const Call& call, Message& reply, std::string* errorName) {
 Outcome Bus::readProperties(const std::string& path, const char* interface, Dictionary& properties,
                             std::string* error) {
     properties.clear();
-    Message reply;
+    MessageRef reply;
     RETURN_IF_FAILED(call({path, propertiesInterface, "GetAll", arguments(interface), {}}, reply, error));
     const int result = readValue(reply.get(), properties);
     return result < 0 ? fromBus("the properties of " + path, result) : Outcome();
@@ -209,7 +209,7 @@ Outcome Bus::readProperties(const std::string& path, const char* interface, Dict
 
 Outcome Bus::readProperty(const std::string& path, const char* interface, const char* property,
                           Value& value) {
-    Message reply;
+    MessageRef reply;
     RETURN_IF_FAILED(call({path, propertiesInterface, "Get", arguments(interface, property), {}}, reply));
     const int result = readValue(reply.get(), value);
     return result < 0 ? fromBus(property, result) : Outcome();
@@ -217,7 +217,7 @@ Outcome Bus::readProperty(const std::string& path, const char* interface, const 
 
 Outcome Bus::setProperty(const std::string& path, const char* interface, const char* property,
                          const Value& value) {
-    Message reply;
+    MessageRef reply;
     Outcome outcome =
         call({path, propertiesInterface, "Set", arguments(interface, property, value), {}}, reply);
     return outcome.ok() ? outcome

@@ -64,7 +64,7 @@ class Bus {
         Arguments arguments;
         std::string_view secret;
     };
-    Outcome call(const Call& call, Message& reply, std::string* error = nullptr);
+    Outcome call(const Call& call, MessageRef& reply, std::string* error = nullptr);
 
     // All properties of an interface of an object; of a type that Value does not know: left out.
     Outcome readProperties(const std::string& path, const char* interface, Dictionary& properties,

@@ -20,15 +20,15 @@ using Dictionary = std::map<std::string, Value, std::less<>>;
 using Sections = std::map<std::string, Dictionary, std::less<>>;
 // Objects by path, each with its interfaces.
 using Objects = std::map<std::string, Sections, std::less<>>;
-using Bytes = std::vector<std::uint8_t>;
+using ByteArray = std::vector<std::uint8_t>;
 using Texts = std::vector<std::string>;
 using TextMap = std::map<std::string, std::string, std::less<>>;
 
 // The D-Bus types in use, in order: b, i, u, x, t, s, ay, as, au, aay, a{ss}, aa{sv}. A single byte (y) is
 // read as an u, a path (o) as a string, an array of paths as an array of strings.
 struct Value {
-    std::variant<bool, std::int32_t, std::uint32_t, std::int64_t, std::uint64_t, std::string, Bytes, Texts,
-                 std::vector<std::uint32_t>, std::vector<Bytes>, TextMap, std::vector<Dictionary>>
+    std::variant<bool, std::int32_t, std::uint32_t, std::int64_t, std::uint64_t, std::string, ByteArray,
+                 Texts, std::vector<std::uint32_t>, std::vector<ByteArray>, TextMap, std::vector<Dictionary>>
         content;
     bool operator==(const Value&) const = default;
 };
@@ -44,7 +44,7 @@ template <class T>
 struct MessageUnref {
     void operator()(sd_bus_message* message) const noexcept { sd_bus_message_unref(message); }
 };
-using Message = std::unique_ptr<sd_bus_message, MessageUnref>;
+using MessageRef = std::unique_ptr<sd_bus_message, MessageUnref>;
 
 // Both return 0 or more, or a negative errno, as sd-bus does. Appending writes at the message's end; reading
 // takes what comes next.

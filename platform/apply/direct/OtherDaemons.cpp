@@ -56,7 +56,7 @@ std::string networkdFile(const std::string& interface) {
 
 Outcome reloadNetworkd(bool& isRunning) {
     bus::Bus bus;
-    bus::Message reply;
+    bus::MessageRef reply;
     RETURN_IF_FAILED(bus.connect("org.freedesktop.network1", isRunning));
     return isRunning
                ? bus.call({"/org/freedesktop/network1", "org.freedesktop.network1.Manager", "Reload", {}, {}},

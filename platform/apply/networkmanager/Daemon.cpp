@@ -74,7 +74,7 @@ Security securityOf(const Dictionary& point) {
 
 // Nothing is read, and that is a success, without a reply.
 template <class T>
-Outcome readReply(const char* what, const Message& reply, T& value) {
+Outcome readReply(const char* what, const MessageRef& reply, T& value) {
     return reply != nullptr && readValue(reply.get(), value) < 0
                ? Outcome(kSCStatusFailed, std::string(what) + ": the answer of NetworkManager cannot be read")
                : Outcome();
@@ -83,7 +83,7 @@ Outcome readReply(const char* what, const Message& reply, T& value) {
 }  // namespace
 
 Outcome Daemon::call(const std::string& path, const char* interface, const char* member, Arguments arguments,
-                     Message& reply, Answers answers, std::string_view secret) {
+                     MessageRef& reply, Answers answers, std::string_view secret) {
     std::string error;
     Outcome outcome = bus_.call({path, interface, member, std::move(arguments), secret}, reply, &error);
     return std::ranges::find(answers, error) != answers.end() ? Outcome() : outcome;
@@ -150,7 +150,7 @@ Outcome Daemon::readObject(const std::string& path, const char* interface,
 Outcome Daemon::findPath(const std::string& object, const char* interface, const char* member,
                          const std::string& name, Answers unknown, std::string& path) {
     path.clear();
-    Message reply;
+    MessageRef reply;
     RETURN_IF_FAILED(call(object, interface, member, arguments(name), reply, unknown));
     return readReply(member, reply, path);
 }
@@ -214,7 +214,7 @@ Outcome Daemon::findProfile(const std::string& uuid, std::optional<Profile>& pro
     if (path.empty()) {
         return {};
     }
-    Message reply;
+    MessageRef reply;
     RETURN_IF_FAILED(call(path, profileInterface, "GetSettings", {}, reply, objectGone));
     if (reply != nullptr) {
         profile.emplace().path = path;
@@ -236,7 +236,7 @@ Outcome Daemon::readSecrets(const std::string& profile, Sections& sections) {
         if (section == sections.end()) {
             continue;
         }
-        Message reply;
+        MessageRef reply;
         Sections secrets;
         RETURN_IF_FAILED(call(profile, profileInterface, "GetSecrets", arguments(name), reply, noSecrets));
         RETURN_IF_FAILED(readReply("GetSecrets", reply, secrets));
@@ -247,7 +247,7 @@ Outcome Daemon::readSecrets(const std::string& profile, Sections& sections) {
 
 Outcome Daemon::addProfile(const Sections& sections, Adding adding, std::string_view secret,
                            std::string& path) {
-    Message reply;
+    MessageRef reply;
     const std::uint32_t flags = inMemory | (adding == Adding::heldBack ? blockAutoconnect : 0);
     // Not AddAndActivateConnection, which completes what is missing or wrong instead of refusing it.
     RETURN_IF_FAILED(call(settingsPath, settingsInterface, "AddConnection2",
@@ -256,18 +256,18 @@ Outcome Daemon::addProfile(const Sections& sections, Adding adding, std::string_
 }
 
 Outcome Daemon::updateProfile(const std::string& path, const Sections& sections, std::string_view secret) {
-    Message reply;
+    MessageRef reply;
     return call(path, profileInterface, "Update2",
                 arguments(sections, inMemory | blockAutoconnect, Dictionary()), reply, {}, secret);
 }
 
 Outcome Daemon::deleteProfile(const std::string& path) {
-    Message reply;
+    MessageRef reply;
     return call(path, profileInterface, "Delete", {}, reply, objectGone);
 }
 
 Outcome Daemon::activate(const std::string& profile, const Device& device, std::string& active) {
-    Message reply;
+    MessageRef reply;
     failures_.erase(device.path);
     // Until a signal tells how far the new one is.
     devices_[device.path] = deviceDisconnected;
@@ -277,7 +277,7 @@ Outcome Daemon::activate(const std::string& profile, const Device& device, std::
 }
 
 Outcome Daemon::disconnect(const Device& device) {
-    Message reply;
+    MessageRef reply;
     RETURN_IF_FAILED(call(device.path, deviceInterface, "Disconnect", {}, reply, atRest));
     if (reply == nullptr) {
         // No signal will tell of a card that is gone: its state is asked for again.
@@ -325,7 +325,7 @@ Outcome Daemon::setRadio(bool on) {
 Outcome Daemon::readHeard(const Device& device, const std::string& network,
                           std::vector<HeardNetwork>& heard) {
     heard.clear();
-    Message reply;
+    MessageRef reply;
     RETURN_IF_FAILED(call(device.path, wirelessInterface, "GetAllAccessPoints", {}, reply));
     Texts paths;
     RETURN_IF_FAILED(readReply("GetAllAccessPoints", reply, paths));
@@ -338,7 +338,7 @@ Outcome Daemon::readHeard(const Device& device, const std::string& network,
         const Dictionary point = found.value_or(Dictionary());
         // One that was never heard is the daemon's own note of a network that it is to join.
         const std::int32_t lastHeard = valueOf<std::int32_t>(point, "LastSeen").value_or(-1);
-        if (valueOf<Bytes>(point, "Ssid") != Bytes(network.begin(), network.end()) || lastHeard < 0) {
+        if (valueOf<ByteArray>(point, "Ssid") != ByteArray(network.begin(), network.end()) || lastHeard < 0) {
             continue;
         }
         heard.push_back({numberIn(point, "Mode") == modeAdHoc, securityOf(point),
@@ -358,12 +358,12 @@ Outcome Daemon::readLastScan(const Device& device, std::int64_t& time) {
 }
 
 Outcome Daemon::scanFor(const Device& device, const std::string& network) {
-    const Dictionary byName{{"ssids", {std::vector<Bytes>{Bytes(network.begin(), network.end())}}}};
+    const Dictionary byName{{"ssids", {std::vector<ByteArray>{ByteArray(network.begin(), network.end())}}}};
     Outcome outcome;
     std::string error;
     // Not every daemon below it can call out for a name.
     for (const Dictionary& options : {byName, Dictionary()}) {
-        Message reply;
+        MessageRef reply;
         const auto append = [&options](sd_bus_message* message) { return appendValue(message, options); };
         outcome = bus_.call({device.path, wirelessInterface, "RequestScan", append, {}}, reply, &error);
         if (error.empty()) {

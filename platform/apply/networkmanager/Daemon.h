@@ -22,7 +22,7 @@ using bus::Arguments;
 using bus::arguments;
 using bus::Bus;
 using bus::Clock;
-using bus::Message;
+using bus::MessageRef;
 using bus::Path;
 using bus::readValue;
 
@@ -138,7 +138,7 @@ class Daemon {
     // Names of errors that are answers too: a success without a reply.
     using Answers = std::span<const std::string_view>;
     Outcome call(const std::string& path, const char* interface, const char* member, Arguments arguments,
-                 Message& reply, Answers answers = {}, std::string_view secret = {});
+                 MessageRef& reply, Answers answers = {}, std::string_view secret = {});
     Outcome readManager();
     Outcome awaitStartup();
     // Nothing, and success, when the object is gone.

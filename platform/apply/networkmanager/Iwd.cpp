@@ -27,7 +27,7 @@ Outcome Iwd::readKnown(std::vector<KnownNetwork>& known) {
     if (!running) {
         return {};
     }
-    bus::Message reply;
+    bus::MessageRef reply;
     RETURN_IF_FAILED(
         bus_.call({"/", "org.freedesktop.DBus.ObjectManager", "GetManagedObjects", {}, {}}, reply));
     bus::Objects objects;

@@ -110,7 +110,7 @@ void setWireless(const WirelessSettings& settings, const WirelessLink& link, Sec
     }
     const JoinChoice& choice = *link.choice;
     const std::string network = settings.network.value_or("");
-    Dictionary wireless = {{"ssid", {Bytes(network.begin(), network.end())}},
+    Dictionary wireless = {{"ssid", {ByteArray(network.begin(), network.end())}},
                            {"mode", {std::string(choice.isAdHoc ? "adhoc" : "infrastructure")}}};
     if (!choice.isHeard) {
         // It may be one that does not announce its name and has to be asked for.
@@ -194,7 +194,7 @@ Sections wirelessSections(const Sections& profile) {
 }
 
 std::string networkOf(const Sections& profile) {
-    const auto ssid = valueOf<Bytes>(sectionIn(profile, "802-11-wireless"), "ssid").value_or(Bytes());
+    const auto ssid = valueOf<ByteArray>(sectionIn(profile, "802-11-wireless"), "ssid").value_or(ByteArray());
     return {ssid.begin(), ssid.end()};
 }
 

@@ -12,7 +12,7 @@
 
 namespace platform::apply {
 
-using bus::Bytes;
+using bus::ByteArray;
 using bus::Dictionary;
 using bus::Sections;
 using bus::TextMap;

@@ -19,7 +19,7 @@ std::string showValue(const T& value) {
         return value ? "#true" : "#false";
     } else if constexpr (std::is_integral_v<T>) {
         return std::to_string(value) + (sizeof value == 8 ? "x" : std::is_signed_v<T> ? "i" : "u");
-    } else if constexpr (std::is_same_v<T, platform::bus::Bytes>) {
+    } else if constexpr (std::is_same_v<T, platform::bus::ByteArray>) {
         return "<" + std::string(value.begin(), value.end()) + ">";
     } else if constexpr (requires { typename T::mapped_type; }) {
         for (const auto& [key, each] : value) {

@@ -45,7 +45,7 @@ void StandInDaemon::offer(const std::string& network, std::uint32_t mode, std::u
     timespec now{};
     clock_gettime(CLOCK_BOOTTIME, &now);
     const std::string path = manager + "/AccessPoint/" + std::to_string(++next_);
-    service.objects[path] = {{"Ssid", {Bytes(network.begin(), network.end())}},
+    service.objects[path] = {{"Ssid", {ByteArray(network.begin(), network.end())}},
                              {"Mode", {mode}},
                              {"Flags", {privacy}},
                              {"RsnFlags", {protection}},

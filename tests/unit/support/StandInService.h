@@ -112,13 +112,13 @@ class StandInService {
             sd_bus_message_new_method_return(call, &made) < 0) {
             return 0;
         }
-        const platform::bus::Message reply(made);
+        const platform::bus::MessageRef reply(made);
         if (const std::string error = self.respond(call, made); !error.empty()) {
             return sd_bus_reply_method_errorf(call, (error[0] == '.' ? self.name_ + error : error).c_str(),
                                               "no: %s", self.refusal.c_str());
         }
         sd_bus_send(nullptr, made, nullptr);
-        for (const platform::bus::Message& signal : std::exchange(self.signals_, {})) {
+        for (const platform::bus::MessageRef& signal : std::exchange(self.signals_, {})) {
             sd_bus_send(self.bus_, signal.get(), nullptr);
         }
         return 1;
@@ -150,7 +150,7 @@ class StandInService {
     sd_bus* bus_;
     const std::string name_;
     const Answer answer_;
-    std::vector<platform::bus::Message> signals_;
+    std::vector<platform::bus::MessageRef> signals_;
     std::atomic<bool> isOver_ = false;
     std::thread thread_;
 };
