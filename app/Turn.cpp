@@ -31,16 +31,16 @@ void WaitForTurn() {
     if (gTurnDescriptor < 0 || SetLock(F_SETLK, F_WRLCK) == 0) {
         return;
     }
-    // The alarm ends the wait, also for a caller that blocks alarms: its handler does nothing, and nothing is
-    // restarted behind it.
-    sigset_t alarms;
-    sigemptyset(&alarms);
-    sigaddset(&alarms, SIGALRM);
-    sigprocmask(SIG_UNBLOCK, &alarms, nullptr);
+    // The alarm ends the wait: its handler does nothing, and nothing is restarted behind it. A caller that
+    // blocks alarms may have left one waiting, so the handler comes first.
     struct sigaction interrupt = {};
     struct sigaction before = {};
     interrupt.sa_handler = Interrupt;
     sigaction(SIGALRM, &interrupt, &before);
+    sigset_t alarms;
+    sigemptyset(&alarms);
+    sigaddset(&alarms, SIGALRM);
+    sigprocmask(SIG_UNBLOCK, &alarms, nullptr);
     alarm(kLongestRun);
     if (SetLock(F_SETLKW, F_WRLCK) != 0) {
         SystemLog(errno == EINTR

@@ -2,6 +2,7 @@
 """What others put in the tool's way: odd arguments, an output that is gone, two runs at once, eyes on a password. Broken
 and planted files, and runs that are ended, the unit tests show."""
 import os
+import signal
 import time
 from pathlib import Path
 
@@ -64,12 +65,16 @@ class BadInput(lab.LabTest):
                 self.assert_whole()
 
     def test_two_at_once(self):
+        def blocked():
+            """The caller blocks alarms, and one has come."""
+            signal.pthread_sigmask(signal.SIG_BLOCK, {signal.SIGALRM})
+            signal.raise_signal(signal.SIGALRM)
         rounds = [("create", "create"), ("create", "remove"), ("remove", "remove"), ("create", "save"),
                   ("save", "restoreZAT")] * 6
         self.lab.tool("saveZAT")
         for number, words in enumerate(rounds):
             with self.subTest(words, round=number):
-                runs = [self.lab.start(word) for word in words]
+                runs = [self.lab.start(word, preexec_fn=blocked) for word in words]
                 for run in runs:
                     out, errors = run.communicate(timeout=120)
                     self.assertEqual((0, b""), (run.returncode, errors), out)
