@@ -131,6 +131,7 @@ class Scene {
         agent_->start(tasks, deadline);
         while (!agent_->settle(deadline)) {
         }
+        EXPECT_LT(Clock::now(), deadline + std::chrono::seconds(1));
         std::string text;
         for (const std::string& line : std::exchange(daemon_.changes, {})) {
             text += (text.empty() ? "" : "; ") + line;
